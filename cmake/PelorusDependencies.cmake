@@ -1,0 +1,31 @@
+# The three libraries a firmware updates on its own; all linked dynamically.
+find_package(CURL REQUIRED)
+
+function(pelorus_import name header library)
+  find_path(${name}_INCLUDE_DIR ${header} REQUIRED)
+  find_library(${name}_LIBRARY ${library} REQUIRED)
+  mark_as_advanced(${name}_INCLUDE_DIR ${name}_LIBRARY)
+  add_library(pelorus_${name} INTERFACE)
+  target_include_directories(pelorus_${name} SYSTEM INTERFACE ${${name}_INCLUDE_DIR})
+  target_link_libraries(pelorus_${name} INTERFACE ${${name}_LIBRARY})
+endfunction()
+
+pelorus_import(miniupnpc miniupnpc/miniupnpc.h miniupnpc)
+pelorus_import(natpmp natpmp.h natpmp)
+
+# The device's structured event log; a build host rarely has it.
+add_library(pelorus_qvlog INTERFACE)
+if(NOT PELORUS_QVLOG STREQUAL "BUNDLED")
+  find_path(QVLOG_INCLUDE_DIR qvlog.h)
+  find_library(QVLOG_LIBRARY qvlog)
+  mark_as_advanced(QVLOG_INCLUDE_DIR QVLOG_LIBRARY)
+endif()
+if(QVLOG_INCLUDE_DIR AND QVLOG_LIBRARY)
+  target_include_directories(pelorus_qvlog SYSTEM INTERFACE ${QVLOG_INCLUDE_DIR})
+  target_link_libraries(pelorus_qvlog INTERFACE ${QVLOG_LIBRARY})
+elseif(PELORUS_QVLOG STREQUAL "SYSTEM")
+  message(FATAL_ERROR "PELORUS_QVLOG=SYSTEM, but qvlog.h or libqvlog was not found")
+else()
+  add_subdirectory(${CMAKE_CURRENT_SOURCE_DIR}/src/common/qvlog)
+  target_link_libraries(pelorus_qvlog INTERFACE qvlog)
+endif()

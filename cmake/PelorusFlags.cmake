@@ -1,0 +1,33 @@
+# Flags every target of the project is built with.
+#   pelorus_flags: warnings, sanitizers and, in a release, hardening.
+
+add_library(pelorus_flags INTERFACE)
+
+target_compile_options(pelorus_flags INTERFACE
+  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion -Wcast-align -Wcast-qual
+  -Wold-style-cast -Wnon-virtual-dtor -Woverloaded-virtual -Wsuggest-override -Wextra-semi
+  -Wzero-as-null-pointer-constant -Wformat=2 -Wredundant-decls -Wundef -Wvla
+  -Wmissing-declarations -Wdouble-promotion)
+if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+  target_compile_options(pelorus_flags INTERFACE
+    -Wformat-overflow=2 -Wformat-truncation=2 -Wduplicated-cond -Wduplicated-branches -Wlogical-op
+    -Wunused-const-variable=2 -Wimplicit-fallthrough=5)
+endif()
+if(PELORUS_WERROR)
+  target_compile_options(pelorus_flags INTERFACE -Werror)
+endif()
+
+if(PELORUS_SANITIZE)
+  target_compile_options(pelorus_flags INTERFACE
+    -fsanitize=${PELORUS_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+  string(REPLACE "fuzzer-no-link," "" PELORUS_SANITIZE_LINK "${PELORUS_SANITIZE}")
+  target_link_options(pelorus_flags INTERFACE -fsanitize=${PELORUS_SANITIZE_LINK})
+elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
+  # Fortify and the sanitizers exclude each other.
+  set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
+  target_compile_options(pelorus_flags INTERFACE
+    -D_FORTIFY_SOURCE=2 -D_GLIBCXX_ASSERTIONS -fstack-protector-strong -fstack-clash-protection
+    -fPIE -ffunction-sections -fdata-sections)
+  target_link_options(pelorus_flags INTERFACE
+    -pie -Wl,-z,relro,-z,now -Wl,--gc-sections -Wl,--as-needed)
+endif()

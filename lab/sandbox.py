@@ -1,0 +1,190 @@
+"""The closed world a lab runs in: own network, processes, mounts, users and host name.
+
+`run` starts a Python module as the first process of fresh namespaces. When that process or the
+one that called `run` goes away, for whatever reason, the kernel ends everything inside and drops
+the namespaces with their mounts, so nothing has to be cleaned up by hand.
+"""
+
+from __future__ import annotations
+
+import os
+import signal
+import stat
+import subprocess
+import sys
+from pathlib import Path
+
+FORBIDDEN = 77
+PROJECT = Path(__file__).resolve().parent.parent
+PYTHON = "/usr/bin/python3"
+
+# unshare outlives a killed parent unless it is told not to; its child then dies with it.
+_UNSHARE = ["setpriv", "--pdeathsig", "KILL", "unshare", "--user", "--map-root-user", "--net",
+            "--mount", "--pid", "--uts", "--fork", "--mount-proc", "--kill-child"]
+_INSIDE = "PELORUS_LAB_INSIDE"
+_PID_PIPE = "PELORUS_LAB_PID_PIPE"
+_PRIVATE = ("/tmp", "/run", "/dev", "/mnt", "/etc")
+_DEVICES = ("null", "zero", "full", "random", "urandom", "tty", "net/tun")
+
+
+def binary() -> Path:
+    """The daemon under test: $PELORUS, or the release build of this project."""
+    default = PROJECT / "build/release/src/daemon/pelorus"
+    return Path(os.environ.get("PELORUS", default)).absolute()
+
+
+def is_inside() -> bool:
+    """True in a process that `run` started."""
+    return _INSIDE in os.environ
+
+
+def why_forbidden() -> str | None:
+    """None where this machine lets us make namespaces, else the reason in one line."""
+    try:
+        probe = subprocess.run([*_UNSHARE, "true"], capture_output=True, text=True, check=False)
+    except FileNotFoundError as missing:
+        return f"{missing.filename} is not installed"
+    if probe.returncode == 0:
+        return None
+    return (probe.stderr.strip().splitlines() or ["unshare failed without a word"])[-1]
+
+
+def run(module: str, arguments: list[str], timeout: float | None = None,
+        capture: bool = False) -> subprocess.CompletedProcess[str]:
+    """Run `python -m module arguments` as process 1 of a new sandbox and wait for its end.
+
+    Ctrl-C reaches the module through the terminal and is left to it; a SIGTERM or SIGHUP for the
+    caller, a second Ctrl-C and the timeout end the sandbox at once.
+    """
+    read_end, write_end = os.pipe()
+    environment = dict(os.environ, PYTHONPATH=str(PROJECT), PYTHONDONTWRITEBYTECODE="1",
+                       **{_INSIDE: "1", _PID_PIPE: str(read_end)})
+    output = subprocess.PIPE if capture else None
+    process = subprocess.Popen(
+        [*_UNSHARE, PYTHON, "-m", "lab.sandbox", module, *arguments], env=environment,
+        cwd=PROJECT, pass_fds=[read_end], stdout=output, text=True,
+        stderr=subprocess.STDOUT if capture else None)
+    os.close(read_end)
+    _tell_pid(process, write_end)
+    restore = {} if capture else _end_with(process)
+    try:
+        text, _ = process.communicate(timeout=timeout)
+    finally:
+        process.kill()
+        process.wait()
+        for number, handler in restore.items():
+            signal.signal(number, handler)
+    return subprocess.CompletedProcess(process.args, process.returncode, text, "")
+
+
+def pid_outside() -> int:
+    """Number of this sandbox's first process as the machine outside sees it; readable once."""
+    with os.fdopen(int(os.environ[_PID_PIPE])) as pipe:
+        return int(pipe.read())
+
+
+def _tell_pid(process: subprocess.Popen[str], write_end: int) -> None:
+    """Send the first process its own outside number, which it cannot see from in there."""
+    with os.fdopen(write_end, "w") as pipe:
+        while process.poll() is None:
+            found = subprocess.run(["pgrep", "-P", str(process.pid)], capture_output=True,
+                                   text=True, check=False).stdout.split()
+            if found:
+                pipe.write(found[0])
+                return
+
+
+def _end_with(process: subprocess.Popen[str]) -> dict[int, object]:
+    """Make the signals that end this process end the sandbox; returns the handlers replaced."""
+    interrupts = 0
+
+    def on_interrupt(_number: int, _frame: object) -> None:
+        nonlocal interrupts
+        interrupts += 1
+        if interrupts > 1:
+            process.kill()
+
+    def on_end(number: int, _frame: object) -> None:
+        process.kill()
+        process.wait()
+        signal.signal(number, signal.SIG_DFL)
+        os.kill(os.getpid(), number)
+
+    return {signal.SIGINT: signal.signal(signal.SIGINT, on_interrupt),
+            signal.SIGTERM: signal.signal(signal.SIGTERM, on_end),
+            signal.SIGHUP: signal.signal(signal.SIGHUP, on_end)}
+
+
+def _mount(*arguments: str) -> None:
+    subprocess.run(["mount", *arguments], check=True)
+
+
+def _hold(paths: list[Path]) -> list[tuple[int, Path]]:
+    """Open what the private folders would cover, so that it can be shown again afterwards."""
+    covered = tuple(f"{folder}/" for folder in _PRIVATE)
+    return [(os.open(path, os.O_PATH), path) for path in paths
+            if str(path).startswith(covered) and path.exists()]
+
+
+def _show_again(held: list[tuple[int, Path]]) -> None:
+    for number, path in held:
+        folder = path if stat.S_ISDIR(os.fstat(number).st_mode) else path.parent
+        folder.mkdir(parents=True, exist_ok=True)
+        if folder != path:
+            path.touch()
+        _mount("--no-canonicalize", "--rbind", f"/proc/{os.getpid()}/fd/{number}", str(path))
+        os.close(number)
+
+
+def _private_devices() -> None:
+    """A /dev of our own with only what the servers need, so that /dev/log is ours too."""
+    host = Path("/mnt/dev")
+    host.mkdir()
+    _mount("--rbind", "/dev", str(host))
+    _mount("-t", "tmpfs", "-o", "mode=755", "lab-dev", "/dev")
+    for name in _DEVICES:
+        if (host / name).exists():
+            Path("/dev", name).parent.mkdir(exist_ok=True)
+            Path("/dev", name).touch()
+            _mount("--bind", str(host / name), f"/dev/{name}")
+    Path("/dev/fd").symlink_to("/proc/self/fd")
+    Path("/dev/shm").mkdir(mode=0o1777)
+
+
+def _private_etc() -> None:
+    """An /etc that shows the host's files and can take the folders the lab adds."""
+    host = Path("/mnt/etc")
+    host.mkdir()
+    _mount("--rbind", "/etc", str(host))
+    _mount("-t", "tmpfs", "-o", "mode=755", "lab-etc", "/etc")
+    own = {"hosts": "127.0.0.1 localhost\n", "resolv.conf": "",
+           "nsswitch.conf": "passwd: files\ngroup: files\nhosts: files dns\n"}
+    for entry in host.iterdir():
+        if entry.name not in own and entry.name not in ("ssl", "netns"):
+            Path("/etc", entry.name).symlink_to(entry)
+    for name, text in own.items():
+        Path("/etc", name).write_text(text)
+    for name in ("ssl", "netns"):
+        Path("/etc", name).mkdir()
+
+
+def _furnish() -> None:
+    """Replace every place a server or the daemon writes to by a private one."""
+    held = _hold([PROJECT, binary()])
+    _mount("-t", "tmpfs", "lab", "/mnt")
+    _private_devices()
+    _private_etc()
+    _mount("-t", "tmpfs", "-o", "mode=755", "lab-run", "/run")
+    _mount("-t", "tmpfs", "-o", "mode=1777", "lab-tmp", "/tmp")
+    _show_again(held)
+
+
+def main() -> None:
+    """Furnish the sandbox, then become the wanted module (still process 1)."""
+    _furnish()
+    os.chdir(PROJECT)
+    os.execv(PYTHON, [PYTHON, "-m", *sys.argv[1:]])
+
+
+if __name__ == "__main__":
+    main()

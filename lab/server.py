@@ -1,0 +1,49 @@
+"""A real server as a child process on one of the lab's hosts."""
+
+from __future__ import annotations
+
+import subprocess
+from collections.abc import Callable
+from pathlib import Path
+
+from lab import network
+from lab.waiting import LabError, last_lines, wait_until
+
+
+class Server:
+    """One server process; its output goes to `log`."""
+
+    def __init__(self, name: str, host: str, argv: list[str], log: Path) -> None:
+        self.name = name
+        self.log = log
+        self._host = host
+        self._argv = argv
+        self._process: subprocess.Popen[bytes] | None = None
+
+    def start(self, answers: Callable[[], object], seconds: float = 15) -> None:
+        """Start the process and return once `answers` holds; fail with its last words if never."""
+        self.log.parent.mkdir(parents=True, exist_ok=True)
+        with self.log.open("ab") as log:
+            self._process = subprocess.Popen(network.command(self._host, *self._argv),
+                                             stdin=subprocess.DEVNULL, stdout=log, stderr=log)
+        try:
+            wait_until(lambda: self._ended() or answers(), f"{self.name} to answer", seconds)
+        except LabError as late:
+            raise LabError(f"{late}\n{self.name}, end of its log:\n{last_lines(self.log)}") from None
+        if self._ended():
+            raise LabError(f"{self.name} ended with status {self._process.returncode} "
+                           f"before it answered; end of its log:\n{last_lines(self.log)}")
+
+    def send_signal(self, number: int) -> None:
+        """Pass a signal to the running process."""
+        assert self._process is not None
+        self._process.send_signal(number)
+
+    def state(self) -> str:
+        """One line for a failure report."""
+        if self._process is None:
+            return f"{self.name}: not started"
+        return f"{self.name}: {'ended' if self._ended() else 'running'}"
+
+    def _ended(self) -> bool:
+        return self._process is not None and self._process.poll() is not None

@@ -1,0 +1,34 @@
+// Filling the configured request URLs.
+#ifndef PELORUS_CLOUD_URL_TEMPLATE_H
+#define PELORUS_CLOUD_URL_TEMPLATE_H
+
+#include <cstddef>
+#include <initializer_list>
+#include <string>
+#include <variant>
+
+namespace pelorus {
+
+/// Longest formatted URL plus one; the rest is cut off.
+inline constexpr std::size_t kUrlBufferSize = 1024;
+
+/// One argument of a URL template.
+using TemplateArgument = std::variant<int, std::string>;
+
+/// Fills a printf template that comes from configuration: %s takes a text, %d, %i and %u a
+/// number, %% is a percent sign. Fewer placeholders than arguments are fine. A template that asks
+/// for more, for another kind or for anything else gives an empty URL and one error line that
+/// names @p key, the setting the template came from.
+[[nodiscard]] std::string fillTemplate(const std::string& key,
+                                       const std::string& urlTemplate,
+                                       std::initializer_list<TemplateArgument> arguments);
+
+/// A request as it goes over the wire and as it may be logged.
+struct MaskedUrl {
+    std::string request;  ///< with the real credentials: never log it
+    std::string logged;   ///< with masks in their place
+};
+
+}  // namespace pelorus
+
+#endif

@@ -1,0 +1,27 @@
+// The one way to the system log.
+#ifndef PELORUS_COMMON_LOG_H
+#define PELORUS_COMMON_LOG_H
+
+#include <syslog.h>
+
+#include <cstddef>
+
+namespace pelorus {
+
+/// Size of the buffer a log line is formatted into, terminator included; the rest is cut off.
+inline constexpr std::size_t kLogLineSize = 1280;
+
+/// Formats one line and sends it to syslog with @p priority (LOG_ERR, LOG_INFO, ...).
+///
+/// Text from outside (answers, configured values, names) must be an argument, never the format.
+/// Safe to call from the termination signal handler: the termination signals are blocked while
+/// the C library holds its log lock.
+void logLine(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
+
+/// As logLine, cut to @p size bytes, terminator included; at most kLogLineSize.
+void logLineCut(std::size_t size, int priority, const char* format, ...)
+    __attribute__((format(printf, 3, 4)));
+
+}  // namespace pelorus
+
+#endif

@@ -1,0 +1,22 @@
+// What the termination signal handler leaves for the rest of the process.
+#ifndef PELORUS_COMMON_TERMINATION_H
+#define PELORUS_COMMON_TERMINATION_H
+
+#include <atomic>
+
+namespace pelorus {
+
+/// Value of sigConnKilled while no termination signal has come.
+inline constexpr int kNoSignal = -1;
+
+/// Number of the termination signal that ended remote access, or kNoSignal. Written by the
+/// signal handler, raised again when everything is torn down.
+extern std::atomic<int> sigConnKilled;
+static_assert(std::atomic<int>::is_always_lock_free, "written by a signal handler");
+
+/// True once a termination signal has come; for waits that have no bound of their own.
+[[nodiscard]] bool terminationRequested();
+
+}  // namespace pelorus
+
+#endif

@@ -1,0 +1,296 @@
+#include "config/global_config.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <array>
+#include <cstdlib>
+#include <cstring>
+#include <string_view>
+
+#include "common/handles.h"
+#include "common/log.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr std::size_t kLineSize = 300;        // bytes of one fgets, terminator included
+constexpr std::size_t kConfigLogSize = 1024;  // bytes of one log line of this store
+constexpr mode_t kCopyMode = 0666;            // other programs of the device rewrite the copy
+
+const std::string kTmpPathKey = "DYNAMIC_CONFIG_TMP";
+
+bool namesACopy(const std::string& path) {
+    return !path.empty() && path != "empty";
+}
+
+FileHandle openFile(const std::string& path, const char* mode) {
+    return FileHandle{std::fopen(path.c_str(), mode)};
+}
+
+struct Setting {
+    std::string_view key;
+    std::string_view value;
+};
+
+// Splits one line. The key is empty when the line holds no setting.
+Setting parseLine(std::string_view line) {
+    const std::size_t split = line.find('=', 1);
+    if (split == std::string_view::npos) return {};
+    const std::size_t keyStart = line.find_first_not_of(" \t");
+    const std::string_view key = line.substr(keyStart, split - keyStart);
+
+    std::string_view value = line.substr(split + 1);
+    value.remove_prefix(std::min(value.find_first_not_of(" \t\""), value.size()));
+    value = value.substr(0, value.find_last_not_of(" \t\"\n") + 1);
+    return {key, value};
+}
+
+std::string quotedForShell(const std::string& text) {
+    std::string quoted;
+    for (const char c : text) {
+        if (c == '\'') {
+            quoted += "'\\''";
+        } else {
+            quoted += c;
+        }
+    }
+    return quoted;
+}
+
+// Puts a backslash before each of the characters in @p special, and before each backslash.
+std::string escapedForSed(const std::string& text, const char* special) {
+    std::string escaped;
+    for (const char c : text) {
+        if (c == '\\' || std::strchr(special, c) != nullptr) escaped += '\\';
+        escaped += c;
+    }
+    return escaped;
+}
+
+std::string pathForShell(const std::string& path) {
+    constexpr const char* kPlain =
+        "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_/.-+,:@";
+    if (path.find_first_not_of(kPlain) == std::string::npos) return path;
+    return "'" + quotedForShell(path) + "'";
+}
+
+// The command that replaces a setting in a file. Key, values and path mean themselves only:
+// nothing in them is read by the shell or by sed.
+std::string replaceCommand(const std::string& key,
+                           const std::string& oldValue,
+                           const std::string& value,
+                           const std::string& path) {
+    const std::string from = escapedForSed(key + "=" + oldValue, "/.*[]^$");
+    const std::string to = escapedForSed(key + "=" + value, "/&");
+    return "sed -i 's/" + quotedForShell(from) + "/" + quotedForShell(to) + "/g' " +
+           pathForShell(path);
+}
+
+bool copyFile(std::FILE* from, std::FILE* to) {
+    std::array<char, kLineSize> piece{};
+    while (std::fgets(piece.data(), piece.size(), from) != nullptr) {
+        if (std::fputs(piece.data(), to) == EOF) return false;
+    }
+    return std::fflush(to) == 0;
+}
+
+}  // namespace
+
+GlobalConfig* GlobalConfig::getInstance() {
+    static GlobalConfig instance;
+    return &instance;
+}
+
+bool GlobalConfig::loadConfig(const std::string& path) {
+    configPath = path;
+    bool parsed = false;
+    {
+        const FileHandle file = openFile(path, "re");
+        if (!file) {
+            logLineCut(kConfigLogSize, LOG_ERR,
+                       "GlobalConfig::loadConfig() - failed to open config file: [%s].\n",
+                       path.c_str());
+            return false;
+        }
+        parsed = loadConfigSettings(file.get());
+    }
+    if (properties.empty()) {
+        // Says "open", but means a file without a single setting.
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::loadConfigSettings() - failed to open config file: [%s].\n",
+                   path.c_str());
+        return false;
+    }
+    if (!parsed) return false;
+
+    logLineCut(kConfigLogSize, LOG_INFO, "Getting path for dynamic config file.\n");
+    const std::string dynamicPath = getProperty("DYNAMIC_CONFIG") + "/dynamicconfig.ini";
+    logLineCut(kConfigLogSize, LOG_INFO, "Getting path for TEMP dynamic config file.\n");
+    const std::string copyPath = getProperty(kTmpPathKey);
+    return namesACopy(copyPath) ? loadTemporaryCopy(dynamicPath, copyPath)
+                                : loadDynamicConfig(dynamicPath);
+}
+
+bool GlobalConfig::loadDynamicConfig(const std::string& path) {
+    logLineCut(kConfigLogSize, LOG_INFO, "OPENING dynamic config file for read: \n");
+    logLineCut(kConfigLogSize, LOG_INFO, "%s", path.c_str());
+    const FileHandle file = openFile(path, "re");
+    if (!file) {
+        logLineCut(
+            kConfigLogSize, LOG_ERR,
+            "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [%s].\n",
+            path.c_str());
+        return false;
+    }
+    logLineCut(kConfigLogSize, LOG_INFO, "LOADING dynamic config file settings.\n");
+    return loadConfigSettings(file.get());
+}
+
+namespace {
+
+// Makes the first temporary copy. False, with the cause logged, when it cannot be made.
+bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
+    logLineCut(kConfigLogSize, LOG_INFO, "Opening dynamic config file for copy.\n");
+    const FileHandle dynamicFile = openFile(dynamicPath, "re");
+    if (!dynamicFile) {
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
+                   dynamicPath.c_str());
+        return false;
+    }
+    logLineCut(kConfigLogSize, LOG_INFO, "Creating temp copy of dynamic config file.\n");
+    const FileHandle copy = openFile(copyPath, "we");
+    if (!copy) {
+        logLineCut(
+            kConfigLogSize, LOG_ERR,
+            "GlobalConfig::loadConfig() - failed to create temporary dynamic config file: %s\n",
+            copyPath.c_str());
+        return false;
+    }
+    logLineCut(kConfigLogSize, LOG_INFO, "Copying dynamic config file.\n");
+    if (!copyFile(dynamicFile.get(), copy.get())) {
+        logLineCut(
+            kConfigLogSize, LOG_ERR,
+            "GlobalConfig::loadConfig() - failed to write temporary dynamic config file: %s\n",
+            copyPath.c_str());
+    }
+    return true;
+}
+
+}  // namespace
+
+bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
+    logLineCut(kConfigLogSize, LOG_INFO, "Loading TEMP dynamic config file.\n");
+    FileHandle copy = openFile(copyPath, "re");
+    if (!copy) {
+        if (!createTemporaryCopy(dynamicPath, copyPath)) return false;
+        static_cast<void>(chmod(copyPath.c_str(), kCopyMode));
+        logLineCut(kConfigLogSize, LOG_INFO, "Re-opening TEMP dynamic config file.\n");
+        copy = openFile(copyPath, "re");
+    }
+    if (!copy) {
+        logLineCut(
+            kConfigLogSize, LOG_ERR,
+            "GlobalConfig::loadConfig() - failed to open temp dynamic config settings file: [%s].\n",
+            copyPath.c_str());
+        return false;
+    }
+    const bool parsed = loadConfigSettings(copy.get());
+    copy.reset();
+    struct stat status {};
+    if (stat(copyPath.c_str(), &status) == 0) tmpModTime = status.st_mtime;
+    return parsed;
+}
+
+bool GlobalConfig::loadConfigSettings(std::FILE* file) {
+    std::array<char, kLineSize> line{};
+    while (std::fgets(line.data(), line.size(), file) != nullptr) {
+        const Setting setting = parseLine(line.data());
+        if (setting.key.empty()) continue;
+        properties[std::string{setting.key}] = setting.value;
+    }
+    return true;
+}
+
+const std::string& GlobalConfig::getProperty(const std::string& key) {
+    static const std::string absent;
+    if (properties.empty()) loadConfig(configPath);
+    if (key != kTmpPathKey) reloadChangedCopy();
+    const auto found = properties.find(key);
+    return found == properties.end() ? absent : found->second;
+}
+
+void GlobalConfig::reloadChangedCopy() {
+    const auto found = properties.find(kTmpPathKey);
+    if (found == properties.end() || !namesACopy(found->second)) return;
+    const std::string& path = found->second;
+    struct stat status {};
+    if (stat(path.c_str(), &status) != 0) {
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [%s].\n",
+                   path.c_str());
+        return;
+    }
+    if (status.st_mtime == tmpModTime) return;
+    // Stored even when the copy cannot be opened: the next change brings the next attempt.
+    tmpModTime = status.st_mtime;
+    const FileHandle copy = openFile(path, "re");
+    if (!copy) return;
+    logLineCut(kConfigLogSize, LOG_INFO, "Reload dynamicconfig.ini file.\n");
+    loadConfigSettings(copy.get());
+}
+
+std::string& GlobalConfig::setProperty(const std::string& key,
+                                       const std::string& value,
+                                       bool writeThrough) {
+    if (properties.empty()) loadConfig(configPath);
+    if (writeThrough) {
+        const auto found = properties.find(key);
+        writeToStaticFile(key, found == properties.end() ? std::string{} : found->second, value);
+    }
+    return properties[key] = value;
+}
+
+void GlobalConfig::writeToStaticFile(const std::string& key,
+                                     const std::string& oldValue,
+                                     const std::string& value) const {
+    const bool isNew = oldValue.empty();
+    const std::string text =
+        isNew ? key + "=" + value + "\n" : replaceCommand(key, oldValue, value, configPath);
+    // A line or command that was cut short would damage the file, so it is not used at all.
+    if (text.size() >= kLineSize || (key + value).find('\n') != std::string::npos) {
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::setProperty() - setting cannot be written to config file: %s\n",
+                   configPath.c_str());
+        return;
+    }
+    if (!isNew) {
+        if (std::system(text.c_str()) != 0) {
+            logLineCut(kConfigLogSize, LOG_ERR,
+                       "GlobalConfig::setProperty() - failed to update config file: %s\n",
+                       configPath.c_str());
+        }
+        return;
+    }
+    const FileHandle file = openFile(configPath, "ae");
+    if (!file) {
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::setProperty() - failed to open config file: %s\n",
+                   configPath.c_str());
+        return;
+    }
+    static_cast<void>(std::fputs(text.c_str(), file.get()));
+}
+
+void GlobalConfig::deleteProperty(const std::string& key) {
+    if (properties.empty()) loadConfig(configPath);
+    properties.erase(key);
+}
+
+bool GlobalConfig::refresh() {
+    return loadConfig(configPath);
+}
+
+}  // namespace pelorus

@@ -1,0 +1,24 @@
+// Termination by signal.
+#ifndef PELORUS_DAEMON_SIGNALS_H
+#define PELORUS_DAEMON_SIGNALS_H
+
+namespace pelorus {
+
+/// Numbers that switch remote access on and off. sigTrap knows them, but nothing installs it for
+/// them: sent to the process they keep their default action.
+// NOLINTBEGIN(bugprone-reserved-identifier): names other programs of the device use
+inline constexpr int _SIGENABLEREMOTEACCESS = 30;
+inline constexpr int _SIGDISABLEREMOTEACCESS = 31;
+// NOLINTEND(bugprone-reserved-identifier)
+
+/// Handler for SIGINT, SIGTERM and SIGQUIT: disables remote access and leaves the number in
+/// sigConnKilled, so that the main loop tears everything down and ends by that signal. A second
+/// signal of the same kind ends the process at once.
+void sigTrap(int sig);
+
+/// Installs sigTrap. False when the system refused.
+[[nodiscard]] bool installSignalHandlers();
+
+}  // namespace pelorus
+
+#endif

@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <string>
 
 namespace pelorus {
 
@@ -13,6 +14,12 @@ struct FileCloser {
 };
 /// An open file, closed at the end of the scope.
 using FileHandle = std::unique_ptr<std::FILE, FileCloser>;
+
+/// Opens @p path as fopen does; null, and errno set, when that fails. Pass "e" in @p mode, so that
+/// no child process inherits the file.
+inline FileHandle openFile(const std::string& path, const char* mode) {
+    return FileHandle{std::fopen(path.c_str(), mode)};
+}
 
 struct PipeCloser {
     void operator()(std::FILE* pipe) const { static_cast<void>(pclose(pipe)); }

@@ -25,10 +25,6 @@ bool namesACopy(const std::string& path) {
     return !path.empty() && path != "empty";
 }
 
-FileHandle openFile(const std::string& path, const char* mode) {
-    return FileHandle{std::fopen(path.c_str(), mode)};
-}
-
 struct Setting {
     std::string_view key;
     std::string_view value;
@@ -291,6 +287,10 @@ void GlobalConfig::deleteProperty(const std::string& key) {
 
 bool GlobalConfig::refresh() {
     return loadConfig(configPath);
+}
+
+std::string setting(const std::string& key) {
+    return GlobalConfig::getInstance()->getProperty(key);
 }
 
 }  // namespace pelorus

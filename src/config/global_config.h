@@ -62,6 +62,9 @@ private:
     std::map<std::string, std::string> properties;
 };
 
+/// A copy of the value of @p key, for callers that keep it; empty when it is absent.
+[[nodiscard]] std::string setting(const std::string& key);
+
 }  // namespace pelorus
 
 #endif

@@ -1,1 +1,346 @@
-// pending
+#include "relay/vpn_manager.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "common/handles.h"
+#include "common/log.h"
+#include "common/text.h"
+#include "config/global_config.h"
+#include "config/scrub.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr int kMaxStarts = 4;
+constexpr int kChecksPerStart = 7;
+constexpr unsigned kStartCheckDelay = 10;  // seconds
+constexpr int kMaxStopPasses = 5;
+constexpr int kGracefulStopPasses = 3;
+constexpr unsigned kStopDelay = 3;  // seconds
+
+constexpr std::size_t kPathSize = 1024;        // bytes, terminator included
+constexpr std::size_t kOutputLineSize = 1024;  // bytes
+constexpr std::size_t kPidLineSize = 81;       // bytes: 80 characters and the terminator
+constexpr std::size_t kStopPidLineSize = 128;  // bytes
+constexpr std::size_t kLinkTargetSize = 512;   // bytes
+constexpr const char* kPeerText = "Peer Connection Initiated with [AF_INET]";
+
+int runShell(const std::string& command) {
+    return std::system(command.c_str());
+}
+
+// Works in another directory until the end of the scope.
+class WorkingDirectory {
+public:
+    explicit WorkingDirectory(const std::string& path) {
+        if (getcwd(saved.data(), saved.size()) == nullptr) saved.front() = '\0';
+        change(path.c_str());
+    }
+    ~WorkingDirectory() { change(saved.data()); }
+    WorkingDirectory(const WorkingDirectory&) = delete;
+    WorkingDirectory& operator=(const WorkingDirectory&) = delete;
+
+private:
+    // A directory that is not there shows when the client does not come up.
+    static bool change(const char* path) { return chdir(path) == 0; }
+
+    std::array<char, kPathSize> saved{};
+};
+
+bool isNumber(const std::string& text) {
+    return !text.empty() && text.find_first_not_of("0123456789") == std::string::npos;
+}
+
+// Sends one signal through the shell. False, with the cause logged, when that failed.
+bool killProcess(const std::string& pid, const char* signal) {
+    const int result = runShell(std::string{"kill "} + signal + " " + pid);
+    if (result == 0) return true;
+    logLine(
+        LOG_ERR,
+        "VPNManager::closeVPNConnection() - failed to stop openVPN process with PID: %s, result %d\n",
+        pid.c_str(), result);
+    return false;
+}
+
+bool stopProcess(const std::string& pid, int pass) {
+    if (pass <= kGracefulStopPasses) {
+        logLine(LOG_INFO,
+                "VPNManager::closeVPNConnection() - attempting to stop process with PID: %s \n",
+                pid.c_str());
+        return killProcess(pid, "-15");
+    }
+    logLine(
+        LOG_ERR,
+        "VPNManager::closeVPNConnection() - failed to gracefully stop openVPN, terminating with SIGKILL\n");
+    logLine(LOG_ERR,
+            "VPNManager::closeVPNConnection() - attempting to SIGKILL process with PID: %s \n",
+            pid.c_str());
+    return killProcess(pid, "-9");
+}
+
+}  // namespace
+
+VPNManager* VPNManager::getInstance() {
+    static VPNManager instance;
+    return &instance;
+}
+
+bool VPNManager::openVPNConnection() {
+    const WorkingDirectory inConfigPath{setting("OPENVPN_CONFIG_PATH")};
+    logLine(LOG_INFO, "VPNManager::openVPNConnection() - checking if openVPN is running...\n");
+    if (isVPNRunning()) {
+        logLine(LOG_INFO, "VPNManager::openVPNConnection() - openVPN is already running\n");
+        return true;
+    }
+    if (!writeCredentials()) return false;
+    runShell(setting("UPDATE_CONF_WITH_SERVER_CMD"));
+    logLine(
+        LOG_NOTICE,
+        "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.\n");
+    return startClient();
+}
+
+bool VPNManager::writeCredentials() {
+    logLine(LOG_INFO, "VPNManager::openVPNConnection() - creating auth.txt \n");
+    const std::string deviceId = setting("DEVICEID");
+    const std::string deviceAuth = setting("DEVICEAUTH");
+    if (deviceId.empty() || deviceAuth.empty()) {
+        logLine(
+            LOG_ERR,
+            "VPNManager::openVPNConnection() - failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n");
+        return false;
+    }
+    const FileHandle file = openFile(setting("OPENVPN_AUTH_FILE"), "we");
+    if (!file) {
+        logLine(LOG_ERR,
+                "VPNManager::openVPNConnection() - failed to open VPN Auth file for write!\n");
+        return false;
+    }
+    static_cast<void>(std::fprintf(file.get(), "%s\n%s\n", deviceId.c_str(), deviceAuth.c_str()));
+    return true;
+}
+
+bool VPNManager::startClient() {
+    for (int start = 0; start < kMaxStarts; ++start) {
+        runShell(setting("STARTCMD"));
+        bool isUp = false;
+        if (!waitUntilUp(isUp)) return false;
+        if (isUp) return true;
+        closeVPNConnection();
+    }
+    logLine(
+        LOG_ERR,
+        "VPNManager::openVPNConnection() - Failed to establish VPN connection, retries exceeded\n");
+    return false;
+}
+
+namespace {
+
+bool holdsSuccessText(std::FILE* output, const std::string& successText) {
+    std::array<char, kOutputLineSize> line{};
+    while (std::fgets(line.data(), line.size(), output) != nullptr) {
+        if (contains(line.data(), successText)) return true;
+    }
+    return false;
+}
+
+}  // namespace
+
+// False when the client's output cannot be read, which ends all attempts.
+bool VPNManager::waitUntilUp(bool& isUp) {
+    for (int check = 0; check < kChecksPerStart && !isUp; ++check) {
+        sleep(kStartCheckDelay);
+        const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
+        if (!output) {
+            logLine(LOG_ERR,
+                    "VPNManager::openVPNConnection() - failed to open openVPN stdout file!\n");
+            return false;
+        }
+        isUp = holdsSuccessText(output.get(), setting("LOG_SUCCESS_TEXT"));
+        if (isUp) {
+            logLine(LOG_INFO,
+                    "VPNManager::openVPNConnection() - openVPN has started successfully\n");
+        } else {
+            logLine(
+                LOG_INFO,
+                "VPNManager::openVPNConnection() - openVPN initialization did not complete, waiting...\n");
+        }
+    }
+    return true;
+}
+
+bool VPNManager::isVPNRunning() {
+    const std::string pidFile = setting("OPENVPN_PID_FILE");
+    std::array<char, kPidLineSize> line{};
+    {
+        const FileHandle file = openFile(pidFile, "re");
+        if (!file) return false;
+        if (std::fgets(line.data(), line.size(), file.get()) == nullptr) line.front() = '\0';
+    }
+    std::string pid;
+    if (line.front() == '\0') {
+        logLine(LOG_WARNING, "VPNManager::isVPNRunning() - openVPN pid file %s is empty\n",
+                pidFile.c_str());
+    } else if (pidIsOpenVPNProcess(line.data(), pid)) {
+        return true;
+    }
+    logLine(LOG_WARNING, "VPNManager::isVPNRunning() - unlink stale openVPN pid file %s\n",
+            pidFile.c_str());
+    if (unlink(pidFile.c_str()) != 0) {
+        logLine(
+            LOG_WARNING,
+            "VPNManager::isVPNRunning() - failed to unlink stale openVPN pid file %s, errno %d.\n",
+            pidFile.c_str(), errno);
+    }
+    return false;
+}
+
+bool VPNManager::pidIsOpenVPNProcess(char* line, std::string& pid) {
+    pid = line;
+    trim(pid);
+    const std::string exePath = "/proc/" + pid + "/exe";
+    // The pid file is a configured path: it may name any file, the credentials file included.
+    const std::string shownPid = scrubSecrets(pid);
+    const std::string shownPath = "/proc/" + shownPid + "/exe";
+    logLine(LOG_INFO, "VPNManager::pidIsOpenVPNProcess() - openvpn proc_pid_exe path %s\n",
+            shownPath.c_str());
+    struct stat status {};
+    if (stat(exePath.c_str(), &status) != 0) {
+        logLine(LOG_WARNING, "VPNManager::pidIsOpenVPNProcess() - stat %s failed, errno %d\n",
+                shownPath.c_str(), errno);
+        return false;
+    }
+    std::array<char, kLinkTargetSize> target{};
+    if (readlink(exePath.c_str(), target.data(), target.size() - 1) < 0) {
+        logLine(LOG_WARNING, "VPNManager::pidIsOpenVPNProcess() - readlink %s failed, errno %d\n",
+                shownPath.c_str(), errno);
+        return false;
+    }
+    logLine(LOG_INFO, "VPNManager::pidIsOpenVPNProcess() - readlink %s succeeded, symlink %s\n",
+            shownPath.c_str(), target.data());
+
+    const std::string pidFile = setting("OPENVPN_PID_FILE");
+    // The text ends up in a shell command: whatever /proc makes of it, only a number is a pid.
+    if (isNumber(pid) && strcasestr(target.data(), "openvpn") != nullptr) {
+        logLine(LOG_INFO,
+                "VPNManager::pidIsOpenVPNProcess() - pid %s in %s matches %s symlink %s\n",
+                shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
+        return true;
+    }
+    logLine(LOG_WARNING,
+            "VPNManager::pidIsOpenVPNProcess() - pid %s in %s does not match %s symlink %s\n",
+            shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
+    return false;
+}
+
+bool VPNManager::closeVPNConnection() {
+    if (!isVPNRunning()) {
+        logLine(
+            LOG_ERR,
+            "VPNManager::closeVPNConnection() - openVPN process is not running, so return true.\n");
+        return true;
+    }
+    for (int pass = 1; pass <= kMaxStopPasses && isVPNRunning(); ++pass) {
+        if (!stopOnce(pass)) break;
+    }
+    if (!isVPNRunning()) return true;
+    logLine(LOG_ERR, "VPNManager::closeVPNConnection() - failed to stop openVPN process\n");
+    return false;
+}
+
+// One pass. False when the pid file cannot be read, so that another pass has no use.
+bool VPNManager::stopOnce(int pass) {
+    const std::string pidFile = setting("OPENVPN_PID_FILE");
+    logLine(LOG_INFO, "VPNManager::closeVPNConnection() - openVPN process is running\n");
+    bool allStopped = true;
+    {
+        const FileHandle file = openFile(pidFile, "re");
+        if (!file) {
+            logLine(LOG_ERR, "VPNManager::closeVPNConnection() - failed to open PID output file\n");
+            return false;
+        }
+        std::array<char, kStopPidLineSize> line{};
+        while (std::fgets(line.data(), line.size(), file.get()) != nullptr) {
+            std::string pid;
+            if (line.front() == '\0' || !pidIsOpenVPNProcess(line.data(), pid)) continue;
+            allStopped = stopProcess(pid, pass) && allStopped;
+        }
+        sleep(kStopDelay);
+    }
+    // Without the file the client counts as stopped, even if it is still on its way out.
+    if (allStopped && unlink(pidFile.c_str()) != 0) {
+        logLine(
+            LOG_ERR,
+            "VPNManager::closeVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
+            pidFile.c_str(), errno);
+    }
+    return true;
+}
+
+bool VPNManager::cleanupVPNConnection() {
+    const std::string pidFile = setting("OPENVPN_PID_FILE");
+    struct stat status {};
+    if (stat(pidFile.c_str(), &status) != 0) return true;
+    if (unlink(pidFile.c_str()) == 0) return true;
+    logLine(
+        LOG_ERR,
+        "VPNManager::cleanupVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
+        pidFile.c_str(), errno);
+    return false;
+}
+
+namespace {
+
+// The dotted address at the start of @p text. False when four numbers cannot be read.
+bool readAddress(const char* text, std::string& address) {
+    std::array<int, 4> part{};
+    // NOLINTNEXTLINE(cert-err34-c): the count of conversions and the signs are checked
+    if (std::sscanf(text, "%d.%d.%d.%d", &part[0], &part[1], &part[2], &part[3]) != 4) return false;
+    if (std::any_of(part.begin(), part.end(), [](int number) { return number < 0; })) return false;
+    address = std::to_string(part[0]) + "." + std::to_string(part[1]) + "." +
+              std::to_string(part[2]) + "." + std::to_string(part[3]);
+    return true;
+}
+
+}  // namespace
+
+bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
+    const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
+    if (!output) {
+        logLine(LOG_ERR,
+                "VPNManager::fetchOpenVPN_IPAddr() - failed to open openVPN stdout file!\n");
+        return false;
+    }
+    std::array<char, kOutputLineSize> line{};
+    while (std::fgets(line.data(), line.size(), output.get()) != nullptr) {
+        const char* peer = std::strstr(line.data(), kPeerText);
+        if (peer == nullptr) continue;
+        if (readAddress(peer + std::strlen(kPeerText), ip)) {
+            logLine(LOG_INFO,
+                    "VPNManager::fetchOpenVPN_IPAddr - found openVPN AF_INET IP address %s.\n",
+                    ip.c_str());
+        } else {
+            logLine(
+                LOG_ERR,
+                "VPNManager::fetchOpenVPN_IPAddr - failed to fetch openVPN AF_INET IP address from line %s.\n",
+                scrubSecrets(line.data()).c_str());
+        }
+    }
+    return !ip.empty();
+}
+
+void VPNManager::trim(std::string& text) {
+    text.erase(text.find_last_not_of(" \n\t\r") + 1);
+    text.erase(0, text.find_first_not_of(" \t"));
+}
+
+}  // namespace pelorus

@@ -1,0 +1,49 @@
+#include "support/fake_files.h"
+
+#include <cerrno>
+
+// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
+extern "C" {
+std::FILE* __real_fopen(const char* path, const char* mode);
+std::FILE* __wrap_fopen(const char* path, const char* mode);
+}
+// NOLINTEND(bugprone-reserved-identifier)
+
+namespace pelorus::support {
+
+FakeFiles::FakeFiles() {
+    reset();
+}
+
+FakeFiles& FakeFiles::get() {
+    static FakeFiles instance;
+    return instance;
+}
+
+void FakeFiles::redirect(const std::string& path, const std::string& target) {
+    targets[path] = target;
+}
+
+void FakeFiles::remove(const std::string& path) {
+    targets[path].clear();
+}
+
+void FakeFiles::reset() {
+    targets.clear();
+    remove(kIdleMinutesFile);
+}
+
+std::FILE* FakeFiles::open(const char* path, const char* mode) {
+    const auto found = targets.find(path);
+    if (found == targets.end()) return __real_fopen(path, mode);
+    if (!found->second.empty()) return __real_fopen(found->second.c_str(), mode);
+    errno = ENOENT;
+    return nullptr;
+}
+
+}  // namespace pelorus::support
+
+// NOLINTNEXTLINE(bugprone-reserved-identifier): a name the linker gives
+std::FILE* __wrap_fopen(const char* path, const char* mode) {
+    return pelorus::support::FakeFiles::get().open(path, mode);
+}

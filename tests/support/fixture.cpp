@@ -1,0 +1,114 @@
+#include "support/fixture.h"
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <sstream>
+#include <stdexcept>
+
+#include "config/global_config.h"
+
+namespace pelorus::support {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+std::string makeFolder() {
+    std::string name = (fs::temp_directory_path() / "pelorus-test-XXXXXX").string();
+    if (mkdtemp(name.data()) == nullptr) throw std::runtime_error{"no temporary folder"};
+    return name;
+}
+
+std::string asLines(const std::map<std::string, std::string>& settings) {
+    std::string lines;
+    for (const auto& [key, value] : settings) {
+        lines.append(key).append("=").append(value).append("\n");
+    }
+    return lines;
+}
+
+void resetSeams() {
+    LogCapture::get().reset();
+    VirtualClock::get().reset();
+    FakeCommands::get().reset();
+    FakeNet::get().reset();
+}
+
+}  // namespace
+
+std::size_t openDescriptors() {
+    const fs::directory_iterator all{"/proc/self/fd"};
+    return static_cast<std::size_t>(std::distance(begin(all), end(all))) - 1;
+}
+
+PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescriptors()} {
+    resetSeams();
+    pthread_sigmask(SIG_SETMASK, nullptr, &maskAtStart);
+}
+
+PelorusTest::~PelorusTest() {
+    for (const std::string& key : configured) GlobalConfig::getInstance()->deleteProperty(key);
+    resetSeams();
+    std::error_code ignored;
+    fs::remove_all(folder, ignored);
+}
+
+void PelorusTest::TearDown() {
+    log.checkSecrets();
+    commands.checkClosed();
+    net.checkReleased();
+    EXPECT_EQ(openDescriptors(), descriptorsAtStart) << "descriptors now and at the start";
+    sigset_t mask;
+    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    for (int signal = 1; signal < SIGRTMIN; ++signal) {
+        EXPECT_EQ(sigismember(&mask, signal), sigismember(&maskAtStart, signal))
+            << "mask of signal " << signal << " now and at the start";
+    }
+}
+
+std::string PelorusTest::writeFile(const std::string& name, const std::string& content) const {
+    std::ofstream{path(name), std::ios::binary} << content;
+    return path(name);
+}
+
+std::string PelorusTest::readFile(const std::string& file) {
+    std::ostringstream content;
+    content << std::ifstream{file, std::ios::binary}.rdbuf();
+    return content.str();
+}
+
+void PelorusTest::noteSetting(const std::string& key, const std::string& value) {
+    configured.insert(key);
+    if (key == "DEVICEID" || key == "DEVICEAUTH" || key == "SUBDOMAIN") log.addSecret(value);
+}
+
+void PelorusTest::givenConfig(const Settings& settings, const Settings& dynamicSettings) {
+    Settings fixed = settings;
+    fixed.emplace("DYNAMIC_CONFIG", folder);
+    fixed.emplace("DYNAMIC_CONFIG_TMP", "empty");
+    Settings changing = dynamicSettings;
+    const Settings identity{
+        {"DEVICEID", kDeviceId}, {"DEVICEAUTH", kDeviceAuth}, {"SUBDOMAIN", kSubdomain}};
+    for (const auto& [key, value] : identity) {
+        if (fixed.count(key) == 0) changing.emplace(key, value);
+    }
+    for (const auto& [key, value] : fixed) noteSetting(key, value);
+    for (const auto& [key, value] : changing) noteSetting(key, value);
+    writeFile("dynamicconfig.ini", asLines(changing));
+    ASSERT_TRUE(GlobalConfig::getInstance()->loadConfig(writeFile("static.ini", asLines(fixed))))
+        << log.dump();
+    log.clear();
+}
+
+void PelorusTest::setConfig(const std::string& key, const std::string& value) {
+    noteSetting(key, value);
+    GlobalConfig::getInstance()->setProperty(key, value, false);
+}
+
+void PelorusTest::forgetConfig(const std::string& key) {
+    GlobalConfig::getInstance()->deleteProperty(key);
+}
+
+}  // namespace pelorus::support

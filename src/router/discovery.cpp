@@ -1,1 +1,285 @@
-// pending
+#include <arpa/inet.h>
+#include <ifaddrs.h>
+#include <net/if.h>
+#include <netinet/in.h>
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <memory>
+#include <new>
+#include <string>
+#include <vector>
+
+#include "common/log.h"
+#include "common/miniupnpc_api.h"
+#include "common/text.h"
+#include "config/scrub.h"
+#include "router/reply_text.h"
+#include "router/router.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr int kDiscoverDelay = 2000;  // milliseconds
+
+struct InterfacesFreer {
+    void operator()(ifaddrs* list) const { freeifaddrs(list); }
+};
+using Interfaces = std::unique_ptr<ifaddrs, InterfacesFreer>;
+
+struct DevicesFreer {
+    void operator()(UPNPDev* list) const { freeUPNPDevlist(list); }
+};
+using Devices = std::unique_ptr<UPNPDev, DevicesFreer>;
+
+struct UrlsFreer {
+    void operator()(UPNPUrls* urls) const { FreeUPNPUrls(urls); }
+};
+/// What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
+using UrlContents = std::unique_ptr<UPNPUrls, UrlsFreer>;
+
+Interfaces localInterfaces() {
+    ifaddrs* list = nullptr;
+    return Interfaces(getifaddrs(&list) == 0 ? list : nullptr);
+}
+
+/// A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
+bool leadsToLan(const ifaddrs& entry) {
+    constexpr unsigned kUnfit = IFF_LOOPBACK | IFF_POINTOPOINT | IFF_NOARP;
+    constexpr unsigned kInUse = IFF_UP | IFF_RUNNING;
+    return entry.ifa_addr != nullptr && (entry.ifa_flags & kUnfit) == 0 &&
+           (entry.ifa_flags & kInUse) != 0 && !contains(entry.ifa_name, "docker");
+}
+
+/// Where the address bytes stand in an interface's socket address.
+const void* addressBytes(const sockaddr* address) {
+    const void* const raw = address;
+    if (address->sa_family == AF_INET6) return &static_cast<const sockaddr_in6*>(raw)->sin6_addr;
+    return &static_cast<const sockaddr_in*>(raw)->sin_addr;
+}
+
+/// The address text of one interface, empty when it cannot be had.
+std::string addressText(const ifaddrs& entry) {
+    const int family = entry.ifa_addr->sa_family;
+    const char* const familyName = family == AF_INET6 ? "AF_INET6" : "AF_INET";
+    std::array<char, INET6_ADDRSTRLEN> text{};
+    const socklen_t room = family == AF_INET6 ? INET6_ADDRSTRLEN : INET_ADDRSTRLEN;
+    if (inet_ntop(family, addressBytes(entry.ifa_addr), text.data(), room) == nullptr) {
+        const int error = errno;
+        logLine(
+            LOG_ERR,
+            "Router::initLocalIp() - inet_ntop failed, errno [%d]  Address Name: [%s]   Address Family: [%s][%d]   Flags: [%#08x]\n",
+            error, entry.ifa_name, familyName, family, entry.ifa_flags);
+        return "";
+    }
+    logLine(
+        LOG_DEBUG,
+        "Router::initLocalIp() - Address Name: [%s]   Address Family: [%s][%d]   Address: [%s]  Flags: [%#08x]\n",
+        entry.ifa_name, familyName, family, text.data(), entry.ifa_flags);
+    return text.data();
+}
+
+std::string textOf(const char* text) {
+    return text == nullptr ? "" : text;
+}
+
+void logDevices(const UPNPDev* device) {
+    logLine(LOG_INFO, "Router::upnp_discover - List of UPNP devices found on the network :\n");
+    for (; device != nullptr; device = device->pNext) {
+        logLine(LOG_INFO, " desc: %s\n st: %s\n\n", scrubSecrets(textOf(device->descURL)).c_str(),
+                scrubSecrets(textOf(device->st)).c_str());
+    }
+}
+
+/// Some hosts announce a gateway that their own "udhisapi.dll" only pretends to be.
+bool isGateway(const UPNPDev& device) {
+    const std::string target = textOf(device.st);
+    const bool wanted = target == "urn:schemas-upnp-org:device:InternetGatewayDevice:1" ||
+                        target == "urn:schemas-upnp-org:service:WANIPConnection:1" ||
+                        target == "urn:schemas-upnp-org:service:WANPPPConnection:1";
+    return wanted && !contains(textOf(device.descURL), "udhisapi.dll");
+}
+
+/// The gateways among @p device and what follows it, as a list of its own in the same order. The
+/// texts stay those of the original list.
+std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
+    std::vector<UPNPDev> gateways;
+    for (; device != nullptr; device = device->pNext) {
+        if (isGateway(*device)) gateways.push_back(*device);
+    }
+    UPNPDev* next = nullptr;
+    for (auto gateway = gateways.rbegin(); gateway != gateways.rend(); ++gateway) {
+        gateway->pNext = next;
+        next = &*gateway;
+    }
+    return gateways;
+}
+
+void logChosenDevice(int state, const std::string& controlUrl, const char* lanAddress) {
+    const std::string url = scrubSecrets(controlUrl);
+    switch (state) {
+        case miniupnpc::CONNECTED_IGD:
+            logLine(LOG_INFO,
+                    "Router::upnp_discover - IGD found at: %s, local host IP address: %s \n",
+                    url.c_str(), lanAddress);
+            break;
+        case miniupnpc::UNCONNECTED_IGD:
+            logLine(
+                LOG_INFO,
+                "Router::upnp_discover - Unconnected IGD found at: %s local host IP address: %s, proceeding anyway \n",
+                url.c_str(), lanAddress);
+            break;
+        case miniupnpc::OTHER_UPNP_DEVICE:
+            logLine(
+                LOG_INFO,
+                "Router::upnp_discover - Non-IGD UPnP device found at: %s local hostIP address: %s , proceeding anyway \n",
+                url.c_str(), lanAddress);
+            break;
+        default:
+            logLine(
+                LOG_INFO,
+                "Router::upnp_discover - Unknown device type found at: %s local address: %s, proceeding anyway \n",
+                url.c_str(), lanAddress);
+            break;
+    }
+}
+
+}  // namespace
+
+bool Router::discover() {
+    initialized = false;
+    isNatPMP = false;
+    forgetSeenChanges();
+    initLocalIp();
+    return upnp_discover() || natpmp_discover();
+}
+
+void Router::forgetSeenChanges() {
+    if (externalIpChangeSeen) externalIpChanged = false;
+    externalIpChangeSeen = false;
+    if (localIpChangeSeen) localIpChanged = false;
+    localIpChangeSeen = false;
+}
+
+void Router::initLocalIp() {
+    const Interfaces interfaces = localInterfaces();
+    if (!interfaces) {
+        logLine(LOG_ERR, "Router::initLocalIP() - failed to get local NIC info.\n");
+        return;
+    }
+    std::string ipv4;
+    std::string ipv6;
+    for (const ifaddrs* entry = interfaces.get(); entry != nullptr; entry = entry->ifa_next) {
+        if (!leadsToLan(*entry)) continue;
+        const int family = entry->ifa_addr->sa_family;
+        if (family == AF_INET && ipv4.empty()) ipv4 = addressText(*entry);
+        if (family == AF_INET6 && ipv6.empty()) ipv6 = addressText(*entry);
+    }
+    takeLocalIp(ipv4, ipv6);
+}
+
+void Router::takeLocalIp(const std::string& ipv4, const std::string& ipv6) {
+    if (ipv4.empty() && ipv6.empty()) {
+        logLine(LOG_ERR, "Router::initLocalIP() - failed to retrieve local IPv4 or IPv6\n");
+        return;
+    }
+    if (!localIp.empty() && (localIp == ipv4 || localIp == ipv6)) return;
+    localIp = ipv4.empty() ? ipv6 : ipv4;
+    localIpChanged = true;
+    logLine(LOG_INFO, "Router::initLocalIP() - IPv4: [%s]  IPv6: [%s]  setting localIP to: [%s] \n",
+            ipv4.c_str(), ipv6.c_str(), localIp.c_str());
+}
+
+bool Router::upnp_discover() {
+    Devices devices(miniupnpc::discover(kDiscoverDelay));
+    if (!devices) {
+        logLine(LOG_ERR, "Router::upnp_discover - UPnP Discover failed to return any response.\n");
+        return false;
+    }
+    logDevices(devices.get());
+    std::vector<UPNPDev> gateways = gatewaysOf(devices.get());
+    if (gateways.empty()) return false;
+    const bool success = useGateway(gateways.front());
+    devices.reset();
+    gateways.clear();
+    logLine(LOG_INFO, "Router::upnp_discover - finished discovery, success = %s \n",
+            success ? "true" : "false");
+    return success;
+}
+
+/// Chooses among the gateways of a list and learns the external address from the chosen one.
+bool Router::useGateway(UPNPDev& gateways) {
+    UPNPUrls urls{};
+    IGDdatas data{};
+    ReplyText<64> lanAddress;
+    const int state =
+        miniupnpc::getValidIgd(&gateways, urls, data, lanAddress.buffer(), lanAddress.documented());
+    if (state == miniupnpc::NO_IGD) {
+        logLine(LOG_INFO, "Router::upnp_discover - invalid device type \n");
+        return false;
+    }
+    const UrlContents contents(&urls);
+    const char* const type = data.first.servicetype;
+    controlUrl = textOf(urls.controlURL);
+    serviceType.assign(type, strnlen(type, sizeof data.first.servicetype));
+    logChosenDevice(state, controlUrl, lanAddress.text());
+    const bool found = findExternalIp();
+    logLine(LOG_INFO, "Router::upnp_discover - FreeUPNPUrls.\n");
+    return found;
+}
+
+bool Router::findExternalIp() {
+    ReplyText<16> address;
+    const int status = miniupnpc::call(UPNP_GetExternalIPAddress, controlUrl.c_str(),
+                                       serviceType.c_str(), address.buffer());
+    if (status != 0 || address.empty()) {
+        logLine(
+            LOG_INFO,
+            "Router::upnp_discover - failed to get External IP address, ipStatus: %d, value received: %s \n",
+            status, address.text());
+        return false;
+    }
+    if (takeExternalIp(address.text())) {
+        logLine(LOG_NOTICE, "Router::upnp_discover - Router's external IP address has changed!\n");
+    }
+    logLine(LOG_INFO, "Router::upnp_discover - Router's external IP address: %s \n",
+            address.text());
+    initialized = true;
+    return true;
+}
+
+bool Router::natpmp_discover() {
+    if (!pNatpmp) {
+        pNatpmp.reset(new (std::nothrow) CMnatpmp);
+        logLine(LOG_NOTICE, "Router::natpmp_discover - unexpected pNatpmp is NULL.\n");
+    }
+    if (!pNatpmp) {
+        logLine(LOG_NOTICE, "Router::natpmp_discover - unexpected pNatpmp is still NULL.\n");
+        return false;
+    }
+    std::string ip;
+    if (!pNatpmp->retrieveExternalIP(ip) || ip.empty()) {
+        logLine(LOG_INFO, "Router::natpmp_discover - failed to get External IP address\n");
+        return false;
+    }
+    isNatPMP = true;
+    if (takeExternalIp(ip)) {
+        logLine(LOG_NOTICE,
+                "Router::natpmp_discover - Router's external IP address has changed!\n");
+    }
+    logLine(LOG_INFO, "Router::natpmp_discover - Router's external IP address: %s \n", ip.c_str());
+    initialized = true;
+    return true;
+}
+
+/// True when @p address is new.
+bool Router::takeExternalIp(const std::string& address) {
+    if (externalIp == address) return false;
+    externalIp = address;
+    externalIpChanged = true;
+    return true;
+}
+
+}  // namespace pelorus

@@ -28,6 +28,14 @@ private:
     long duration = 0;
 };
 
+/// What a PMTracker holds.
+struct TrackedMapping {
+    int internalPort = 0;
+    int externalPort = 0;
+    unsigned lifetime = 0;  ///< seconds
+    TimeIntervalTrack interval;
+};
+
 /// One port mapping and its lease. All zero means that nothing is tracked; such a tracker is past
 /// its half, so a renewal of it is attempted and has to be refused by the mapping call.
 class PMTracker {
@@ -38,15 +46,14 @@ public:
                    int& external,
                    unsigned& leaseSeconds,
                    TimeIntervalTrack& leaseInterval) const;
+    /// The same four in one piece.
+    [[nodiscard]] TrackedMapping read() const { return mapping; }
 
     /// True once more than half of the lease has passed: the mapping is due for renewal.
-    [[nodiscard]] bool pastHalfway() const { return interval.pastHalfway(); }
+    [[nodiscard]] bool pastHalfway() const { return mapping.interval.pastHalfway(); }
 
 private:
-    int internalPort = 0;
-    int externalPort = 0;
-    unsigned lifetime = 0;
-    TimeIntervalTrack interval;
+    TrackedMapping mapping;
 };
 
 /// The lease to ask for, and the mappings of the device's two services.

@@ -1,1 +1,196 @@
-// pending
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <unistd.h>
+
+#include <array>
+#include <charconv>
+#include <cstdlib>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "common/handles.h"
+#include "common/log.h"
+#include "router/router.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr const char* kHelperScript = "/etc/scripts/tavik_helper.sh";
+constexpr const char* kListCommand = "/etc/scripts/tavik_helper.sh list";
+constexpr const char* kWanAddressCommand = "/etc/scripts/getip.sh wan";
+constexpr const char* kLanAddressCommand = "/etc/scripts/getip.sh lan";
+
+constexpr const char* kOwnerSelf = "BRENVIK";
+constexpr const char* kOwnerOther = "OTHER";
+
+constexpr int kHighestPort = 65535;
+constexpr unsigned kPauseAfterRemoval = 1;  // seconds, for the router to apply it
+constexpr std::size_t kLongestLine = 1024;  // what follows in a line is dropped
+constexpr std::size_t kFieldsBeforeDescription = 5;
+
+bool readLine(std::FILE* stream, std::string& line) {
+    line.clear();
+    int next = std::getc(stream);
+    if (next == EOF) return false;
+    for (; next != EOF && next != '\n'; next = std::getc(stream)) {
+        if (line.size() < kLongestLine) line.push_back(static_cast<char>(next));
+    }
+    return true;
+}
+
+std::string trimmed(const std::string& text) {
+    constexpr const char* kBlanks = " \t\r\n";
+    const std::size_t first = text.find_first_not_of(kBlanks);
+    if (first == std::string::npos) return "";
+    return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
+}
+
+bool isAddress(const std::string& text) {
+    in6_addr bytes{};
+    return inet_pton(AF_INET, text.c_str(), &bytes) == 1 ||
+           inet_pton(AF_INET6, text.c_str(), &bytes) == 1;
+}
+
+/// The address a script prints in its first line; empty when it prints none. Anything but an
+/// address would travel on into shell commands and requests, so it counts as none.
+std::string askForAddress(const char* command) {
+    const PipeHandle answer(popen(command, "re"));
+    std::string line;
+    if (!answer || !readLine(answer.get(), line)) return "";
+    line = trimmed(line);
+    return isAddress(line) ? line : "";
+}
+
+bool parsePort(const std::string& text, int& port) {
+    const char* const end = text.data() + text.size();
+    int number = 0;
+    const auto result = std::from_chars(text.data(), end, number);
+    if (result.ec != std::errc() || result.ptr != end) return false;
+    if (number < 1 || number > kHighestPort) return false;
+    port = number;
+    return true;
+}
+
+bool parsePortRange(const std::string& text, int& first, int& last) {
+    const std::size_t dash = text.find('-');
+    if (!parsePort(trimmed(text.substr(0, dash)), first)) return false;
+    if (dash == std::string::npos) {
+        last = first;
+        return true;
+    }
+    return parsePort(trimmed(text.substr(dash + 1)), last) && first <= last;
+}
+
+/// Cuts @p line at its first commas; the last part is the description, commas and all.
+std::vector<std::string> splitFields(const std::string& line) {
+    std::vector<std::string> fields;
+    std::size_t start = 0;
+    while (fields.size() < kFieldsBeforeDescription) {
+        const std::size_t comma = line.find(',', start);
+        if (comma == std::string::npos) return fields;
+        fields.push_back(trimmed(line.substr(start, comma - start)));
+        start = comma + 1;
+    }
+    fields.push_back(trimmed(line.substr(start)));
+    return fields;
+}
+
+/// OWNER,PROTOCOL,FIRST[-LAST],LANADDRESS,INTERNALPORT,DESCRIPTION
+bool parseEntry(const std::string& line, _BrenvikPortIp& entry) {
+    const std::vector<std::string> fields = splitFields(line);
+    if (fields.size() <= kFieldsBeforeDescription) return false;
+    entry.owner = fields[0];
+    entry.protocol = fields[1];
+    entry.localIp = fields[3];
+    entry.description = fields[5];
+    return (entry.owner == kOwnerSelf || entry.owner == kOwnerOther) &&
+           (entry.protocol == "TCP" || entry.protocol == "UDP") &&
+           parsePortRange(fields[2], entry.firstExternal, entry.lastExternal) &&
+           isAddress(entry.localIp) && parsePort(fields[4], entry.internalPort);
+}
+
+/// Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
+/// be started, else 1; what the script made of it is not known.
+int runHelper(const char* action, const std::string& argument) {
+    constexpr std::string_view kSpecialInQuotes = "\"$`\\";
+    std::string command = std::string(kHelperScript) + " " + action + " \"";
+    for (const char character : argument) {
+        if (kSpecialInQuotes.find(character) != std::string_view::npos) command.push_back('\\');
+        command.push_back(character);
+    }
+    command += "\"";
+    return std::system(command.c_str()) == -1 ? 0 : 1;
+}
+
+}  // namespace
+
+int Router::initIpAddrBrenvik() {
+    const std::string wan = askForAddress(kWanAddressCommand);
+    const std::string lan = askForAddress(kLanAddressCommand);
+    if (!wan.empty()) externalIp = wan;
+    if (!lan.empty()) localIp = lan;
+    if (wan.empty()) {
+        logLine(
+            LOG_ERR,
+            "Router::initIpAddrBrenvik - Not connected to internet. Please check network connectivity.\n");
+        return 0;
+    }
+    return 1;
+}
+
+int Router::mapPortBrenvik(int internalPort,
+                           int externalPort,
+                           const std::string& protocol,
+                           const std::string& description) {
+    if (externalPort < 1) return 0;
+    const std::string own = getLocalIp();
+    loadPortListBrenvik();
+    for (const _BrenvikPortIp& entry : brenvikPorts) {
+        const bool covers = entry.protocol == protocol && entry.firstExternal <= externalPort &&
+                            externalPort <= entry.lastExternal;
+        if (!covers) continue;
+        if (entry.owner == kOwnerOther) return 0;
+        if (entry.localIp == own) return 1;
+    }
+    return runHelper("add", protocol + "," + std::to_string(externalPort) + "," + own + "," +
+                                std::to_string(internalPort) + "," + description);
+}
+
+int Router::unmapPortBrenvik(int internalPort, int externalPort, const std::string& protocol) {
+    if (externalPort == 0) return 1;
+    return runHelper("remove", protocol + "," + std::to_string(externalPort) + "," + getLocalIp() +
+                                   "," + std::to_string(internalPort));
+}
+
+void Router::unmapAllPortBrenvik(const std::string& protocol) {
+    for (const _BrenvikPortIp& entry : getPortListBrenvik(protocol)) {
+        unmapPortBrenvik(entry.internalPort, entry.firstExternal, protocol);
+        sleep(kPauseAfterRemoval);
+    }
+}
+
+std::vector<_BrenvikPortIp> Router::getPortListBrenvik(const std::string& protocol) {
+    loadPortListBrenvik();
+    if (brenvikPorts.empty()) return {};
+    const std::string own = getLocalIp();
+    std::vector<_BrenvikPortIp> mine;
+    for (const _BrenvikPortIp& entry : brenvikPorts) {
+        if (entry.protocol == protocol && entry.localIp == own) mine.push_back(entry);
+    }
+    return mine;
+}
+
+void Router::loadPortListBrenvik() {
+    brenvikPorts.clear();
+    const PipeHandle list(popen(kListCommand, "re"));
+    if (!list) return;
+    std::string line;
+    while (readLine(list.get(), line)) {
+        _BrenvikPortIp entry;
+        if (parseEntry(line, entry)) brenvikPorts.push_back(entry);
+    }
+}
+
+}  // namespace pelorus

@@ -1,1 +1,278 @@
-// pending
+#include "router/natpmp.h"
+
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <sys/select.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <ctime>
+
+#include "common/log.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr int kMaxReads = 3;
+constexpr int kSelectDescriptors = FD_SETSIZE;
+
+/// The protocol's number for "TCP" or "UDP", 0 for anything else.
+int protocolNumber(const std::string& protocol) {
+    if (protocol == "TCP") return NATPMP_PROTOCOL_TCP;
+    if (protocol == "UDP") return NATPMP_PROTOCOL_UDP;
+    return 0;
+}
+
+// The client's socket outlives many child processes (openvpn stays for weeks); none may hold it.
+void closeOnExec(int socket) {
+    const int flags = fcntl(socket, F_GETFD);
+    if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));
+}
+
+void waitForAnswer(int socket, timeval timeout) {
+    fd_set readable;
+    FD_ZERO(&readable);
+    if (socket >= 0 && socket < kSelectDescriptors) FD_SET(socket, &readable);
+    // Whatever ends the wait, the read that follows finds out.
+    static_cast<void>(select(kSelectDescriptors, &readable, nullptr, nullptr, &timeout));
+}
+
+}  // namespace
+
+CMnatpmp::~CMnatpmp() {
+    close();
+}
+
+bool CMnatpmp::init() {
+    if (initialized) return true;
+    const int status = initnatpmp(&natpmp, 0, 0);
+    initialized = status == 0;
+    if (initialized) {
+        closeOnExec(natpmp.s);
+    } else {
+        logLine(LOG_ERR, "CMnatpmp::init  initnatpmp failed %d\n", status);
+    }
+    return initialized;
+}
+
+bool CMnatpmp::close() {
+    if (initialized) {
+        const int status = closenatpmp(&natpmp);
+        if (status < 0) logLine(LOG_ERR, "CMnatpmp::close  closenatpmp failed %d\n", status);
+        initialized = false;
+    }
+    return true;
+}
+
+int CMnatpmp::CheckNATPMPResponse() {
+    int status = NATPMP_TRYAGAIN;
+    for (int reads = 0; status == NATPMP_TRYAGAIN && reads < kMaxReads; ++reads) {
+        timeval timeout{};
+        const int timeoutStatus = getnatpmprequesttimeout(&natpmp, &timeout);
+        if (timeoutStatus < 0) {
+            logLine(LOG_ERR, "CMnatpmp::CheckNATPMPResponse  getnatpmprequesttimeout error %d\n",
+                    timeoutStatus);
+            return timeoutStatus;
+        }
+        waitForAnswer(natpmp.s, timeout);
+        status = readnatpmpresponseorretry(&natpmp, &response);
+    }
+    return status;
+}
+
+bool CMnatpmp::retrieveExternalIP(std::string& ip) {
+    if (!init()) {
+        logLine(LOG_ERR,
+                "CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
+        return false;
+    }
+    const int sent = sendpublicaddressrequest(&natpmp);
+    if (sent < 0) {
+        const int error = errno;
+        logLine(LOG_ERR,
+                "CMnatpmp::retrieveExternalIP  sendpublicaddressrequest error %d, errno %d\n", sent,
+                error);
+        return false;
+    }
+    if (CheckNATPMPResponse() < 0) {
+        const int error = errno;
+        externalIp.clear();
+        ip.clear();
+        logLine(LOG_INFO,
+                "CMnatpmp::retrieveExternalIP  failed to fetched external IP address, errno %d\n",
+                error);
+        return false;
+    }
+    std::array<char, INET_ADDRSTRLEN> text{};
+    static_cast<void>(
+        inet_ntop(AF_INET, &response.pnu.publicaddress.addr, text.data(), text.size()));
+    externalIp = text.data();
+    ip = externalIp;
+    logLine(LOG_INFO, "CMnatpmp::retrieveExternalIP  fetched external IP address %s\n",
+            externalIp.c_str());
+    return true;
+}
+
+bool CMnatpmp::portMappingRequest(int internalPort,
+                                  int& externalPort,
+                                  const std::string& protocol,
+                                  const std::string& /*description*/,
+                                  bool isHttps,
+                                  unsigned& lifetime) {
+    if (!init()) {
+        logLine(LOG_ERR,
+                "CMnatpmp::portMappingRequest  libnatpmp was not previously initialized.\n");
+        return false;
+    }
+    if (protocolNumber(protocol) == 0) {
+        logLine(LOG_ERR, "CMnatpmp::portMappingRequest  invalid protocol string %s\n",
+                protocol.c_str());
+        return false;
+    }
+    if (!exchangeMapping(protocolNumber(protocol), internalPort, externalPort, lifetime)) {
+        return false;
+    }
+    if (lifetime != 0) {
+        trackMapping(internalPort, externalPort, isHttps, lifetime);
+    } else if (internalPort != 0) {
+        forgetMapping(internalPort);
+    } else {
+        forgetAllMappings(internalPort, externalPort, lifetime);
+    }
+    return true;
+}
+
+/// Sends one request and takes over what the gateway granted: it wins over what was asked.
+bool CMnatpmp::exchangeMapping(int protocol,
+                               int internalPort,
+                               int& externalPort,
+                               unsigned& lifetime) {
+    const int sent =
+        sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
+                                  static_cast<std::uint16_t>(externalPort), lifetime);
+    if (sent < 0) {
+        const int error = errno;
+        logLine(
+            LOG_ERR,
+            "CMnatpmp::portMappingRequest  sendnewportmappingrequest error %d, protocol %d, internalPort %d, externalPort %d, lifetime %u, errno %d\n",
+            sent, protocol, internalPort, externalPort, lifetime, error);
+        return false;
+    }
+    if (CheckNATPMPResponse() < 0) {
+        const int error = errno;
+        logLine(
+            LOG_ERR,
+            "CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u, errno %d\n",
+            externalPort, internalPort, protocol, lifetime, error);
+        return false;
+    }
+    const auto& granted = response.pnu.newportmapping;
+    logLine(
+        LOG_INFO,
+        "CMnatpmp::portMappingRequest  mapped public port %hu to localport %hu protocol %d, lifetime %u\n",
+        granted.mappedpublicport, granted.privateport, static_cast<int>(response.type),
+        granted.lifetime);
+    externalPort = granted.mappedpublicport;
+    lifetime = granted.lifetime;
+    if (granted.privateport != internalPort) {
+        logLine(
+            LOG_INFO,
+            "CMnatpmp::portMappingRequest  requested internal port does not match the response internal port. req_internal_port %d, resp_internal_port %hu, external_port %d, lifetime %u\n",
+            internalPort, granted.privateport, externalPort, lifetime);
+    }
+    return true;
+}
+
+void CMnatpmp::trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime) {
+    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
+    const char* const label = isHttps ? "HTTPS" : "HTTP";
+    tracker.setParams(internalPort, externalPort, lifetime);
+    logLine(
+        LOG_INFO,
+        "CMnatpmp::portMappingRequest  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
+        label, internalPort, externalPort, lifetime);
+    const TrackedMapping tracked = tracker.read();
+    logLine(
+        LOG_INFO,
+        "CMnatpmp::portMappingRequest - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
+        label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
+}
+
+void CMnatpmp::forgetMapping(int internalPort) {
+    const TrackedMapping http = gwPorts.http.read();
+    const TrackedMapping https = gwPorts.https.read();
+    if (http.internalPort == internalPort) {
+        gwPorts.http.setParams(0, 0, 0);
+        logLine(
+            LOG_INFO,
+            "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+            http.internalPort, http.externalPort, http.lifetime);
+    } else if (https.internalPort == internalPort) {
+        gwPorts.https.setParams(0, 0, 0);
+        logLine(
+            LOG_INFO,
+            "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+            https.internalPort, https.externalPort, https.lifetime);
+    } else {
+        logLine(
+            LOG_INFO,
+            "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    }
+}
+
+void CMnatpmp::forgetAllMappings(int internalPort, int externalPort, unsigned lifetime) {
+    gwPorts.http.setParams(0, 0, 0);
+    gwPorts.https.setParams(0, 0, 0);
+    logLine(
+        LOG_INFO,
+        "CMnatpmp::portMappingRequest  destroyed all mappings. internal_port %d, external_port %d, lifetime %u\n",
+        internalPort, externalPort, lifetime);
+}
+
+bool CMnatpmp::mapPort(int internalPort,
+                       int& externalPort,
+                       const std::string& protocol,
+                       const std::string& description,
+                       bool isHttps) {
+    unsigned lifetime = getReqPortMappingLifetime();
+    return portMappingRequest(internalPort, externalPort, protocol, description, isHttps, lifetime);
+}
+
+bool CMnatpmp::unmapPort(int internalPort, int /*externalPort*/, const std::string& protocol) {
+    int anyPort = 0;
+    unsigned lifetime = 0;
+    return portMappingRequest(internalPort, anyPort, protocol, "", true, lifetime);
+}
+
+bool CMnatpmp::unmapAllPorts(const std::string& protocol, const std::string& description) {
+    int anyPort = 0;
+    unsigned lifetime = 0;
+    return portMappingRequest(0, anyPort, protocol, description, true, lifetime);
+}
+
+void CMnatpmp::renewPortMapping(const char* which) {
+    const bool isHttps = std::strcmp(which, "HTTPS") == 0;
+    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
+    if (!tracker.pastHalfway()) return;
+    const unsigned requested = getReqPortMappingLifetime();
+    logLine(LOG_INFO, "CMnatpmp::renewPortMapping - pastHalfway() returned TRUE\n");
+    TrackedMapping tracked = tracker.read();
+    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    logLine(
+        LOG_INFO,
+        "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
+        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
+        tracked.interval.GetIntervalDuration(), requested);
+}
+
+void CMnatpmp::CheckExpiredMappings() {
+    renewPortMapping("HTTP");
+    renewPortMapping("HTTPS");
+}
+
+}  // namespace pelorus

@@ -69,6 +69,7 @@ public:
     void setReqPortMappingLifetime(unsigned seconds) { gwPorts.reqLifetime = seconds; }
 
 private:
+    bool exchangeMapping(int protocol, int internalPort, int& externalPort, unsigned& lifetime);
     void trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime);
     void forgetMapping(int internalPort);
     void forgetAllMappings(int internalPort, int externalPort, unsigned lifetime);

@@ -1,1 +1,365 @@
-// pending
+#include <cstring>
+#include <ctime>
+#include <string>
+
+#include "common/log.h"
+#include "common/miniupnpc_api.h"
+#include "common/text.h"
+#include "config/scrub.h"
+#include "router/reply_text.h"
+#include "router/router.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr int kReservedPorts = 10;  // ports up to this one are never mapped
+constexpr std::size_t kPortDigits = 5;
+constexpr int kEnumerationPasses = 2;
+constexpr int kNoPort = -1;
+
+// A mapping's index is a 16-bit number. A gateway that answers beyond it will answer for ever.
+constexpr int kLastMappingIndex = 65535;
+
+bool isKnownProtocol(const std::string& protocol) {
+    return protocol == "TCP" || protocol == "UDP";
+}
+
+/// The number as the UPnP library takes it.
+std::string portText(int port) {
+    return std::to_string(port).substr(0, kPortDigits);
+}
+
+int portNumber(const char* text) {
+    int port = kNoPort;
+    return scanInt(text, port) ? port : kNoPort;
+}
+
+/// One mapping as the gateway tells it.
+struct MappingReply {
+    ReplyText<6> externalPort;
+    ReplyText<16> internalClient;
+    ReplyText<6> internalPort;
+    ReplyText<4> protocol;
+    ReplyText<80> description;
+    ReplyText<4> enabled;
+    ReplyText<64> remoteHost;
+    ReplyText<16> duration;
+};
+
+/// Whether an address names a host of its own: dotted, and not ending in 0.
+bool namesOneHost(const std::string& client) {
+    const std::size_t dot = client.rfind('.');
+    if (dot == std::string::npos) return false;
+    long last = 0;
+    return scanLong(client.c_str() + dot + 1, last) && last != 0;
+}
+
+/// Hands the gateway's mappings one by one to @p visit(entry), which returns false to stop. True
+/// when neither the gateway nor the visitor ended the enumeration.
+template <typename Visitor>
+bool enumerateMappings(const std::string& controlUrl,
+                       const std::string& serviceType,
+                       Visitor visit) {
+    for (int index = 0; index <= kLastMappingIndex; ++index) {
+        MappingReply entry;
+        const int status = miniupnpc::call(
+            UPNP_GetGenericPortMappingEntry, controlUrl.c_str(), serviceType.c_str(),
+            portText(index).c_str(), entry.externalPort.buffer(), entry.internalClient.buffer(),
+            entry.internalPort.buffer(), entry.protocol.buffer(), entry.description.buffer(),
+            entry.enabled.buffer(), entry.remoteHost.buffer(), entry.duration.buffer());
+        if (status != 0 || !visit(entry)) return false;
+    }
+    return true;
+}
+
+}  // namespace
+
+bool Router::mapPort(int internalPort,
+                     int& externalPort,
+                     const std::string& protocol,
+                     const std::string& description,
+                     bool isHttps) {
+    if (internalPort <= kReservedPorts || externalPort <= kReservedPorts) {
+        logLine(LOG_ERR,
+                "Router::mapPort() - internal and external ports must be greater than 10\n");
+        return false;
+    }
+    if (!initialized) {
+        logLine(
+            LOG_ERR,
+            "Router::mapPort() - must call Router:: discover() to load port map before calling this function \n");
+        return false;
+    }
+    if (!isKnownProtocol(protocol)) {
+        logLine(LOG_ERR, "Router::mapPort() - protocol must be either 'TCP' or 'UDP' \n");
+        return false;
+    }
+    if (isNatPMPGateway()) {
+        return mapThroughNatpmp(internalPort, externalPort, protocol, description, isHttps);
+    }
+    if (heldByAnother(internalPort, externalPort, protocol)) return false;
+    if (!addMapping(internalPort, externalPort, protocol, description)) return false;
+    trackMapping(internalPort, externalPort, isHttps);
+    return true;
+}
+
+bool Router::mapThroughNatpmp(int internalPort,
+                              int& externalPort,
+                              const std::string& protocol,
+                              const std::string& description,
+                              bool isHttps) {
+    const bool mapped =
+        pNatpmp->mapPort(internalPort, externalPort, protocol, description, isHttps);
+    if (mapped) {
+        logLine(
+            LOG_INFO,
+            "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
+            externalPort, internalPort);
+    } else {
+        logLine(
+            LOG_INFO,
+            "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d\n",
+            externalPort, internalPort);
+    }
+    return mapped;
+}
+
+/// Asks the gateway who has the external port. An entry counts whatever the status of the answer,
+/// and one that leads to another port of this device counts as another's.
+bool Router::heldByAnother(int internalPort, int externalPort, const std::string& protocol) const {
+    MappingReply entry;
+    const int status = miniupnpc::getSpecificPortMappingEntry(
+        controlUrl.c_str(), serviceType.c_str(), portText(externalPort).c_str(), protocol.c_str(),
+        entry.internalClient.buffer(), entry.internalPort.buffer(), entry.description.buffer(),
+        entry.enabled.buffer(), entry.duration.buffer());
+    if (status == 0) {
+        logLine(
+            LOG_INFO,
+            "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d], intClient[%s], intPort[%s], desc[%s], enabled[%s], leaseDuration[%s]\n",
+            status, entry.internalClient.text(), entry.internalPort.text(),
+            scrubSecrets(entry.description.text()).c_str(), entry.enabled.text(),
+            entry.duration.text());
+    } else {
+        logLine(LOG_INFO,
+                "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
+                status);
+    }
+    if (entry.internalClient.empty()) return false;
+    const std::string client = entry.internalClient.text();
+    if (portNumber(entry.internalPort.text()) == internalPort && client == localIp) {
+        logLine(LOG_INFO,
+                "Router::mapPort() - internal port: %d is already mapped to external port: %d\n",
+                internalPort, externalPort);
+        return false;
+    }
+    if (!namesOneHost(client)) return false;
+    logLine(LOG_INFO, "Router::mapPort() - internal port: %d is already mapped to another IP: %s\n",
+            internalPort, client.c_str());
+    return true;
+}
+
+bool Router::addMapping(int internalPort,
+                        int externalPort,
+                        const std::string& protocol,
+                        const std::string& description) const {
+    logLine(LOG_DEBUG, "Router::mapPort() - lifetime %s\n", "0");
+    // Without a lease the gateway keeps the mapping for good; the lease is this side's own.
+    const int status =
+        miniupnpc::call(UPNP_AddPortMapping, controlUrl.c_str(), serviceType.c_str(),
+                        portText(externalPort).c_str(), portText(internalPort).c_str(),
+                        localIp.c_str(), description.c_str(), protocol.c_str(), nullptr, nullptr);
+    if (status != 0) {
+        logLine(
+            LOG_INFO,
+            "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d\n",
+            externalPort, internalPort, status);
+        return false;
+    }
+    logLine(
+        LOG_INFO,
+        "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
+        externalPort, internalPort);
+    return true;
+}
+
+void Router::trackMapping(int internalPort, int externalPort, bool isHttps) {
+    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
+    const char* const label = isHttps ? "HTTPS" : "HTTP";
+    unsigned upnpLease = 0;
+    unsigned natpmpLease = 0;
+    getReqPortMappingLifetime(upnpLease, natpmpLease);
+    tracker.setParams(internalPort, externalPort, upnpLease);
+    logLine(
+        LOG_INFO,
+        "Router::mapPort  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
+        label, internalPort, externalPort, upnpLease);
+    const TrackedMapping tracked = tracker.read();
+    logLine(
+        LOG_INFO,
+        "Router::mapPort - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
+        label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
+}
+
+bool Router::unmapPort(int internalPort, int externalPort, const std::string& protocol) {
+    if (!initialized) {
+        logLine(LOG_INFO, "Router::unmapPort() - router discovery failed or was not done \n");
+        return false;
+    }
+    if (!isKnownProtocol(protocol)) {
+        logLine(LOG_ERR, "Router::unmapPort() - protocol must be either 'TCP' or 'UDP' \n");
+        return false;
+    }
+    const bool natpmp = isNatPMPGateway();
+    const bool removed = natpmp ? pNatpmp->unmapPort(internalPort, externalPort, protocol)
+                                : deleteMapping(externalPort, protocol);
+    if (!removed) {
+        logLine(LOG_INFO, "Router::unmapPort() - fail - failed to unmap external port: %d\n",
+                externalPort);
+        return false;
+    }
+    logLine(LOG_INFO, "Router::unmapPort() - success - external port: %d has been unmapped\n",
+            externalPort);
+    if (!natpmp) forgetMapping(internalPort);
+    return true;
+}
+
+bool Router::deleteMapping(int externalPort, const std::string& protocol) const {
+    return miniupnpc::call(UPNP_DeletePortMapping, controlUrl.c_str(), serviceType.c_str(),
+                           portText(externalPort).c_str(), protocol.c_str(), nullptr) == 0;
+}
+
+/// Port 0 stands for no mapping and belongs to no tracker, idle ones included.
+void Router::forgetMapping(int internalPort) {
+    const TrackedMapping http = gwPorts.http.read();
+    const TrackedMapping https = gwPorts.https.read();
+    if (internalPort != 0 && http.internalPort == internalPort) {
+        gwPorts.http.setParams(0, 0, 0);
+        logLine(
+            LOG_INFO,
+            "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+            http.internalPort, http.externalPort, http.lifetime);
+    } else if (internalPort != 0 && https.internalPort == internalPort) {
+        gwPorts.https.setParams(0, 0, 0);
+        logLine(
+            LOG_INFO,
+            "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+            https.internalPort, https.externalPort, https.lifetime);
+    } else {
+        logLine(
+            LOG_INFO,
+            "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    }
+}
+
+bool Router::unmapAllPorts(const std::string& protocol, const std::string& description) {
+    if (!initialized) {
+        logLine(
+            LOG_ERR,
+            "Router::unmapAllPorts() - must call Router:: discover() to load port map before calling this function \n");
+        return false;
+    }
+    if (!isKnownProtocol(protocol)) {
+        logLine(LOG_ERR, "Router::unmapAllPorts() - protocol must be either 'TCP' or 'UDP' \n");
+        return false;
+    }
+    const bool natpmp = isNatPMPGateway();
+    const bool removed = natpmp ? pNatpmp->unmapAllPorts(protocol, description)
+                                : removeOwnMappings(protocol, description);
+    if (!removed) {
+        logLine(LOG_INFO, "Router::unmapAllPorts() - fail\n");
+        return false;
+    }
+    logLine(LOG_INFO, "Router::unmapAllPorts() - success\n");
+    if (!natpmp) {
+        gwPorts.http.setParams(0, 0, 0);
+        gwPorts.https.setParams(0, 0, 0);
+        logLine(LOG_INFO, "Router::unmapAllPorts()  destroyed all mappings.\n");
+    }
+    return true;
+}
+
+/// A removal moves the next entry into its place, where the first pass does not look again; the
+/// second pass is for those. The end of the gateway's table counts as failure, so the result is
+/// false on every gateway whose table ends.
+bool Router::removeOwnMappings(const std::string& protocol, const std::string& description) {
+    bool removed = false;
+    const auto removeOwn = [&](const MappingReply& entry) {
+        if (localIp != entry.internalClient.text() || protocol != entry.protocol.text() ||
+            description != entry.description.text()) {
+            return true;
+        }
+        const int port = portNumber(entry.externalPort.text());
+        logLine(LOG_INFO, "Router::unmapAllPorts() - un-mapping port: %d for IP: %s \n", port,
+                entry.internalClient.text());
+        unmapPort(0, port, protocol);
+        removed = true;
+        return true;
+    };
+    for (int pass = 0; pass < kEnumerationPasses; ++pass) {
+        if (!enumerateMappings(controlUrl, serviceType, removeOwn)) removed = false;
+    }
+    return removed;
+}
+
+int Router::getMappedInternalPort(int externalPort, const std::string& protocol) {
+    if (!initialized) {
+        logLine(
+            LOG_ERR,
+            "Router::getMappedInternalPort - must call Router:: discover() to load port map before calling this function \n");
+        return 0;
+    }
+    if (!isKnownProtocol(protocol)) {
+        logLine(LOG_ERR,
+                "Router::getMappedInternalPort - protocol must be either 'TCP' or 'UDP' \n");
+        return 0;
+    }
+    int internalPort = kNoPort;
+    const auto findPort = [&](const MappingReply& entry) {
+        if (localIp != entry.internalClient.text() || protocol != entry.protocol.text() ||
+            portNumber(entry.externalPort.text()) != externalPort) {
+            return true;
+        }
+        internalPort = portNumber(entry.internalPort.text());
+        return false;
+    };
+    for (int pass = 0; pass < kEnumerationPasses && internalPort == kNoPort; ++pass) {
+        static_cast<void>(enumerateMappings(controlUrl, serviceType, findPort));
+    }
+    return internalPort;
+}
+
+bool Router::isPortMapped(int externalPort, const std::string& protocol) {
+    return getMappedInternalPort(externalPort, protocol) != kNoPort;
+}
+
+void Router::renewPortMapping(const char* which) {
+    const bool isHttps = std::strcmp(which, "HTTPS") == 0;
+    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
+    if (!tracker.pastHalfway()) return;
+    unsigned upnpLease = 0;
+    unsigned natpmpLease = 0;
+    getReqPortMappingLifetime(upnpLease, natpmpLease);
+    logLine(LOG_INFO, "Router::renewPortMapping - pastHalfway() returned TRUE\n");
+    TrackedMapping tracked = tracker.read();
+    // An idle tracker has port 0, which mapPort refuses.
+    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    logLine(
+        LOG_INFO,
+        "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
+        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
+        tracked.interval.GetIntervalDuration(), upnpLease);
+}
+
+void Router::CheckExpiredMappings() {
+    if (isNatPMPGateway()) {
+        pNatpmp->CheckExpiredMappings();
+        return;
+    }
+    renewPortMapping("HTTP");
+    renewPortMapping("HTTPS");
+}
+
+}  // namespace pelorus

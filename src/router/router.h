@@ -9,6 +9,8 @@
 #include "router/lease_tracking.h"
 #include "router/natpmp.h"
 
+struct UPNPDev;
+
 namespace pelorus {
 
 /// One line of the mapping list of the maker's own router.
@@ -121,8 +123,29 @@ public:
     [[nodiscard]] std::vector<_BrenvikPortIp> getPortListBrenvik(const std::string& protocol);
 
 private:
+    void forgetSeenChanges();
+    void takeLocalIp(const std::string& ipv4, const std::string& ipv6);
+    bool useGateway(UPNPDev& gateways);
     bool findExternalIp();
-    void takeExternalIp(const std::string& address, const char* changedMessage);
+    bool takeExternalIp(const std::string& address);
+
+    bool mapThroughNatpmp(int internalPort,
+                          int& externalPort,
+                          const std::string& protocol,
+                          const std::string& description,
+                          bool isHttps);
+    [[nodiscard]] bool heldByAnother(int internalPort,
+                                     int externalPort,
+                                     const std::string& protocol) const;
+    [[nodiscard]] bool addMapping(int internalPort,
+                                  int externalPort,
+                                  const std::string& protocol,
+                                  const std::string& description) const;
+    void trackMapping(int internalPort, int externalPort, bool isHttps);
+    [[nodiscard]] bool deleteMapping(int externalPort, const std::string& protocol) const;
+    void forgetMapping(int internalPort);
+    bool removeOwnMappings(const std::string& protocol, const std::string& description);
+
     void loadPortListBrenvik();
 
     std::string externalIp;

@@ -1,1 +1,263 @@
-// pending
+#include <arpa/inet.h>
+#include <curl/curl.h>
+#include <netdb.h>
+#include <netinet/in.h>
+
+#include <array>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <utility>
+
+#include "cloud/tavik_client.h"
+#include "common/handles.h"
+#include "common/log.h"
+#include "common/text.h"
+#include "config/global_config.h"
+#include "config/scrub.h"
+
+namespace pelorus {
+
+std::map<std::string, std::string> Status2LogState;
+std::map<std::string, std::string> Status2LogType;
+
+namespace {
+
+constexpr std::size_t kReceiveBlockSize = 10240;  // bytes
+constexpr std::size_t kLargestAnswer = 10238;     // bytes
+constexpr long kTransferTimeout = 30000;          // milliseconds, for the whole transfer
+constexpr long kVerifyPeer = 1;
+
+struct CurlCleaner {
+    void operator()(CURL* handle) const { curl_easy_cleanup(handle); }
+};
+using CurlHandle = std::unique_ptr<CURL, CurlCleaner>;
+
+struct AddrInfoFreer {
+    void operator()(addrinfo* list) const { freeaddrinfo(list); }
+};
+using AddrInfoHandle = std::unique_ptr<addrinfo, AddrInfoFreer>;
+
+void releaseBlock(CurlRcvBuffer& buffer) {
+    std::free(buffer.data);  // NOLINT(*-no-malloc): allocated by curlRcvData
+    buffer = {};
+}
+
+void setOptions(CURL* handle, const char* url, CurlRcvBuffer& buffer) {
+    curl_easy_setopt(handle, CURLOPT_TIMEOUT_MS, kTransferTimeout);
+    curl_easy_setopt(handle, CURLOPT_WRITEFUNCTION, curlRcvData);
+    curl_easy_setopt(handle, CURLOPT_WRITEDATA, &buffer);
+    curl_easy_setopt(handle, CURLOPT_SSLVERSION, long{CURL_SSLVERSION_DEFAULT});
+    curl_easy_setopt(handle, CURLOPT_URL, url);
+    curl_easy_setopt(handle, CURLOPT_SSL_VERIFYPEER, kVerifyPeer);
+}
+
+// The address field of the entry's own family; null for families without one.
+const void* addressOf(const addrinfo& entry) {
+    const void* address = entry.ai_addr;
+    if (entry.ai_family == AF_INET) return &static_cast<const sockaddr_in*>(address)->sin_addr;
+    if (entry.ai_family == AF_INET6) return &static_cast<const sockaddr_in6*>(address)->sin6_addr;
+    return nullptr;
+}
+
+std::string firstAddress(const addrinfo* list) {
+    for (; list != nullptr; list = list->ai_next) {
+        const void* address = addressOf(*list);
+        if (address == nullptr) continue;
+        std::array<char, INET6_ADDRSTRLEN> text{};
+        if (inet_ntop(list->ai_family, address, text.data(), text.size()) != nullptr) {
+            return text.data();
+        }
+    }
+    return {};
+}
+
+}  // namespace
+
+std::size_t curlRcvData(void* data, std::size_t elemSize, std::size_t count, void* context) try {
+    auto& buffer = *static_cast<CurlRcvBuffer*>(context);
+    if (buffer.data == nullptr) {
+        // The block leaves through httpGet, whose callers release it with free.
+        buffer.data = static_cast<char*>(std::malloc(kReceiveBlockSize));  // NOLINT(*-no-malloc)
+        if (buffer.data == nullptr) {
+            logLine(
+                LOG_ERR,
+                "TavikClient curlRcvData - failed to allocate memory for receive buffer, transfer aborted\n");
+            return 0;
+        }
+    }
+    const std::size_t room = kLargestAnswer - static_cast<std::size_t>(buffer.size);
+    const bool fits = count == 0 || elemSize <= room / count;
+    if (!fits) {
+        logLine(
+            LOG_ERR,
+            "TavikClient curlRcvData - Buffer overrun detected, read buffer too small, transfer aborted\n");
+        releaseBlock(buffer);
+        return 0;
+    }
+    const std::size_t bytes = elemSize * count;
+    std::memcpy(buffer.data + buffer.size, data, bytes);
+    buffer.size += static_cast<int>(bytes);
+    return bytes;
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient curlRcvData - Throw exception error. **\n");
+    return 0;
+}
+
+TavikClient::TavikClient() {
+    Status2LogState["disabled"] = "connecting";
+    Status2LogState["connecting"] = "connecting";
+    Status2LogState["portforwarded"] = "connected";
+    Status2LogState["relayed"] = "connected";
+    Status2LogState["failed"] = "failed";
+
+    Status2LogType["disabled"] = "disabled";
+    Status2LogType["connecting"] = "disabled";
+    Status2LogType["portforwarded"] = "portforwarded";
+    Status2LogType["relayed"] = "relayed";
+    Status2LogType["failed"] = "disabled";
+}
+
+TavikClient::~TavikClient() {
+    cleanup();
+}
+
+TavikClient* TavikClient::getInstance() {
+    static TavikClient instance;
+    static bool initialized = false;
+    if (!initialized) {
+        if (!instance.initialize()) {
+            instance.updateLocalCommStatus("disabled");
+            logLine(
+                LOG_ERR,
+                "TavikClient::getInstance() - initialize() returned false, set Comm Status to [disabled]\n");
+        }
+        initialized = true;
+    }
+    return &instance;
+}
+
+bool TavikClient::initialize() {
+    portMapCheckSuccess = true;
+    const bool complete = !getDeviceID().empty() && !getDeviceAuth().empty();
+    if (!complete) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file\n");
+    }
+    if (curl_global_init(CURL_GLOBAL_ALL) != CURLE_OK) {
+        logLine(LOG_ERR, "TavikClient::initialize() - CURL initialization failed.\n");
+    }
+    return complete;
+}
+
+void TavikClient::cleanup() {
+    curl_global_cleanup();
+}
+
+std::string TavikClient::getDeviceID() const {
+    return GlobalConfig::getInstance()->getProperty("DEVICEID");
+}
+
+std::string TavikClient::getDeviceAuth() const {
+    return GlobalConfig::getInstance()->getProperty("DEVICEAUTH");
+}
+
+// Only the host part of the setting counts: both schemes are offered whatever it names.
+bool TavikClient::deriveServerUrls() {
+    const std::string base = GlobalConfig::getInstance()->getProperty("SERVER_BASE_URL");
+    const std::size_t slash = base.find('/');
+    if (slash != std::string::npos) {
+        const std::size_t host = slash + 2;
+        if (host + 1 < base.size()) serverHost = base.substr(host);
+    }
+    if (base.empty() || serverHost.empty()) {
+        logLine(LOG_ERR,
+                "TavikClient::getRestUrl - Invalid base server url %s. Return input urn.\n",
+                base.c_str());
+        return false;
+    }
+    baseServerUrl = "http://" + serverHost;
+    logLine(LOG_INFO, "TavikClient::getRestUrl - baseServerUrl %s.\n", baseServerUrl.c_str());
+    baseSSLServerUrl = "https://" + serverHost;
+    logLine(LOG_INFO, "TavikClient::getRestUrl - baseSSLServerUrl %s.\n", baseSSLServerUrl.c_str());
+    return true;
+}
+
+std::string TavikClient::getRestUrl(const std::string& urn, HttpType type) {
+    if ((baseServerUrl.empty() || baseSSLServerUrl.empty()) && !deriveServerUrls()) return urn;
+
+    std::string url = urn;
+    if (type == HTTP) {
+        url = baseServerUrl + urn;
+    } else if (type == HTTPS) {
+        url = baseSSLServerUrl + urn;
+    } else {
+        logLine(LOG_INFO,
+                "TavikClient::getRestUrl - Invalid http type %d. Use only the input urn.\n",
+                static_cast<int>(type));
+    }
+    std::string logged = url;
+    replaceAll(logged, "%", "_");
+    logLine(LOG_INFO, "TavikClient::getRestUrl - restURL %s.\n", logged.c_str());
+    return url;
+}
+
+char* TavikClient::httpGet(const char* url, int& size) {
+    if (url == nullptr || *url == '\0') {
+        logLine(LOG_INFO, "TavikClient:httpGet - empty url\n");
+        return nullptr;
+    }
+    rcvBuffer = {};
+    try {
+        const CurlHandle handle{curl_easy_init()};
+        if (handle) {
+            setOptions(handle.get(), url, rcvBuffer);
+            const CURLcode result = curl_easy_perform(handle.get());
+            if (result != CURLE_OK) {
+                logLine(LOG_ERR, "TavikClient::httpGet  Error: [%s]\n", curl_easy_strerror(result));
+            }
+        }
+    } catch (...) {
+        logLine(LOG_ERR, "** TavikClient::httpGet - Throw exception error. **\n");
+        releaseBlock(rcvBuffer);
+        return nullptr;
+    }
+    size = rcvBuffer.size;
+    return std::exchange(rcvBuffer.data, nullptr);
+}
+
+std::optional<Answer> TavikClient::fetchCentral(const MaskedUrl& url) {
+    int size = 0;
+    const MallocHandle<char> data{httpGet(url.request.c_str(), size)};
+    if (!data) return std::nullopt;
+    return Answer{data.get(), size};
+}
+
+std::string TavikClient::nsLookup(const std::string& hostname) const {
+    addrinfo* found = nullptr;
+    const int error = getaddrinfo(hostname.c_str(), nullptr, nullptr, &found);
+    if (error != 0) {
+        logLine(LOG_ERR, "TavikClient::nsLookup() - getAddrInfo failed with error: %s\n",
+                gai_strerror(error));
+        logLine(LOG_ERR, "TavikClient::nsLookup() - getAddrInfo failed hostname: %s\n",
+                scrubSecrets(hostname).c_str());
+        return {};
+    }
+    const AddrInfoHandle list{found};
+    return firstAddress(list.get());
+}
+
+void TavikClient::ReplaceStringInPlace(std::string& subject,
+                                       const std::string& search,
+                                       const std::string& replace) const {
+    replaceAll(subject, search, replace);
+}
+
+bool TavikClient::validateIpAddress(std::string address) const {
+    in_addr parsed{};
+    const bool isText = std::strlen(address.c_str()) == address.size();
+    return isText && inet_pton(AF_INET, address.c_str(), &parsed) != 0;
+}
+
+}  // namespace pelorus

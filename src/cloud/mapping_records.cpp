@@ -1,1 +1,148 @@
-// pending
+#include "cloud/tavik_client.h"
+#include "common/log.h"
+#include "common/masks.h"
+#include "common/text.h"
+#include "config/global_config.h"
+#include "config/scrub.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr const char* kRemoteKey = "REMOTE_SETFORWARDURL";
+constexpr const char* kLocalSetKey = "LOCAL_SETFORWARDURL";
+constexpr const char* kLocalDeleteKey = "LOCAL_DELFORWARDURL";
+constexpr const char* kNoAddress = "NULL";  // withdraws a record
+constexpr const char* kLocalSuccess = "success";
+
+// What the local back end is told; its objections are logged and do not count.
+bool updateLocalRecord(const std::string& url) {
+    logLine(LOG_INFO, "TavikClient::updateServerMapping - update local config url: %s\n",
+            url.c_str());
+    const auto answer = fetchLocal(url);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateServerMapping - failed to get response from localhost for url: [%s].\n",
+            url.c_str());
+        return false;
+    }
+    if (!contains(answer->text, kLocalSuccess)) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateServerMapping - failure response received from localhost for url: [%s].\n",
+            url.c_str());
+        logLine(LOG_ERR, "Response: %s", scrubSecrets(answer->text).c_str());
+    }
+    return true;
+}
+
+bool deleteLocalRecord(const std::string& url) {
+    const auto answer = fetchLocal(url);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::deleteServerMapping - failed to get response from localhost for url: [%s]\n",
+            url.c_str());
+        return false;
+    }
+    if (!contains(answer->text, kLocalSuccess)) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::deleteServerMapping - failure response received from localhost for url: [%s]\n",
+            url.c_str());
+        logLine(LOG_ERR, "Response: [%s]\n", scrubSecrets(answer->text).c_str());
+        return false;
+    }
+    return true;
+}
+
+std::string property(const char* key) {
+    return GlobalConfig::getInstance()->getProperty(key);
+}
+
+}  // namespace
+
+MaskedUrl TavikClient::forwardingUrl(const std::string& externalIp,
+                                     const std::string& localIp,
+                                     int externalHttpPort,
+                                     int externalHttpsPort) {
+    return fillMaskedTemplate(
+        kRemoteKey, getRestUrl(property(kRemoteKey), HTTPS),
+        {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL}, externalIp, localIp, externalHttpPort,
+         externalHttpsPort, SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}});
+}
+
+bool TavikClient::updateServerMapping(const std::string& externalIp,
+                                      int externalHttpPort,
+                                      int externalHttpsPort,
+                                      const std::string& localIp,
+                                      int internalHttpPort,
+                                      int /*internalHttpsPort*/) try {
+    if (getDeviceID().empty()) {
+        logLine(LOG_ERR,
+                "TavikClient::updateServerMapping - failed to get Device ID from DynamicConfig.\n");
+        return false;
+    }
+    if (getDeviceAuth().empty()) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateServerMapping - failed to get Device Auth Code from DynamicConfig.\n");
+        return false;
+    }
+    const MaskedUrl url = forwardingUrl(externalIp, localIp, externalHttpPort, externalHttpsPort);
+    logLine(LOG_INFO, "TavikClient::updateServerMapping - set port forward url: %s\n",
+            url.logged.c_str());
+    const auto answer = fetchCentral(url);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateServerMapping - httpGet failed to get response from central server for url %s.\n",
+            url.logged.c_str());
+        return false;
+    }
+    logLine(LOG_NOTICE, "TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
+            scrubSecrets(answer->text).c_str(), answer->size);
+    // The local back end expects the internal HTTP port in the last place too.
+    return updateLocalRecord(fillTemplate(kLocalSetKey, property(kLocalSetKey),
+                                          {internalHttpPort, externalIp, externalHttpPort,
+                                           externalHttpsPort, localIp, internalHttpPort}));
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::updateServerMapping - Throw exception error. **\n");
+    return false;
+}
+
+bool TavikClient::deleteServerMapping(int internalHttpPort, const std::string& localIp) try {
+    if (getDeviceID().empty()) {
+        logLine(LOG_ERR,
+                "TavikClient::deleteServerMapping - failed to get Device ID from DynamicConfig.\n");
+        return false;
+    }
+    if (getDeviceAuth().empty()) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::deleteServerMapping - failed to get Device Auth Code from DynamicConfig.\n");
+        return false;
+    }
+    const MaskedUrl url = forwardingUrl(kNoAddress, localIp, 0, 0);
+    logLine(LOG_INFO,
+            "TavikClient::deleteServerMapping - Deleting port mapping from server, url: [%s].\n",
+            url.logged.c_str());
+    const auto answer = fetchCentral(url);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::deleteServerMapping - httpGet failed to get response from central server for url %s.\n",
+            url.logged.c_str());
+        return false;
+    }
+    logLine(LOG_NOTICE, "TavikClient::deleteServerMapping - httpGet got %s, %d bytes.\n",
+            scrubSecrets(answer->text).c_str(), answer->size);
+    return deleteLocalRecord(fillTemplate(kLocalDeleteKey, property(kLocalDeleteKey),
+                                          {internalHttpPort, internalHttpPort}));
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::deleteServerMapping - Throw exception error. **\n");
+    return false;
+}
+
+}  // namespace pelorus

@@ -1,1 +1,121 @@
-// pending
+#include <algorithm>
+#include <cerrno>
+
+#include "cloud/tavik_client.h"
+#include "common/log.h"
+#include "common/masks.h"
+#include "common/text.h"
+#include "config/scrub.h"
+
+namespace pelorus {
+
+namespace {
+
+constexpr const char* kRemoteStatusPath = "/api/1.0/rest/remote_access_status/%s";
+constexpr const char* kWaitAction = "<action>wait</action>";
+constexpr const char* kProceedAction = "<action>proceed</action>";
+const std::string kWaitTimeTag = "<wait_time>";
+
+constexpr int kShortestPause = 120;  // seconds between two cycles
+
+}  // namespace
+
+int TavikClient::pollServerForSleepTime() {
+    if (serverPolled) {
+        logLine(
+            LOG_INFO,
+            "TavikClient::pollServerForSleepTime - central server already polled. Sleep time is %d secs.\n",
+            serverSleepTime);
+        return serverSleepTime;
+    }
+    const std::string id = getDeviceID();
+    if (id.empty()) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::pollServerForSleepTime - failed to get Device ID from DynamicConfig. Therefore using sleep time %d secs.\n",
+            serverSleepTime);
+        return serverSleepTime;
+    }
+    const MaskedUrl url =
+        fillMaskedTemplate("the remote access status path", getRestUrl(kRemoteStatusPath, HTTP),
+                           {SecretArgument{id, STRIPPED_DEVID_VAL}});
+    logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - remote status url: %s.\n",
+            url.logged.c_str());
+    try {
+        if (const auto answer = fetchCentral(url)) {
+            logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - httpGet got %s, %d bytes.\n",
+                    scrubSecrets(answer->text).c_str(), answer->size);
+            applySleepAnswer(answer->text);
+        } else {
+            logLine(
+                LOG_ERR,
+                "TavikClient::pollServerForSleepTime - httpGet for %s, failed to get response from central server. Therefore using sleep time %d secs.\n",
+                url.logged.c_str(), serverSleepTime);
+        }
+    } catch (...) {
+        const int error = errno;
+        logLine(
+            LOG_ERR,
+            "TavikClient::pollServerForSleepTime - caught exception error %d. Therefore using sleep time %d secs.\n",
+            error, serverSleepTime);
+    }
+    serverPolled = true;
+    return serverSleepTime;
+}
+
+// An answer that is not understood leaves the wait as it is, so that the device proceeds.
+void TavikClient::applySleepAnswer(const std::string& answer) {
+    const std::size_t wait = answer.find(kWaitAction);
+    if (wait != std::string::npos) {
+        readWaitTime(answer, wait);
+    } else if (contains(answer, kProceedAction)) {
+        serverSleepTime = 0;
+        logLine(
+            LOG_INFO,
+            "TavikClient::pollServerForSleepTime - central server gave permission to proceed. Sleep time is %d secs.\n",
+            serverSleepTime);
+    } else {
+        logLine(
+            LOG_INFO,
+            "TavikClient::pollServerForSleepTime - missing action from central server. Therefore using sleep time %d secs.\n",
+            serverSleepTime);
+    }
+}
+
+// The time counts only behind the action.
+void TavikClient::readWaitTime(const std::string& answer, std::size_t action) {
+    const std::size_t tag = answer.find(kWaitTimeTag, action);
+    if (tag == std::string::npos) {
+        logLine(
+            LOG_INFO,
+            "TavikClient::pollServerForSleepTime - malformed wait_time from central server. Therefore using sleep time %d secs.\n",
+            serverSleepTime);
+        return;
+    }
+    int seconds = 0;
+    if (!scanInt(answer.c_str() + tag + kWaitTimeTag.size(), seconds) || seconds < 0) {
+        logLine(
+            LOG_INFO,
+            "TavikClient::pollServerForSleepTime - received garbage sleep time from central server. Therefore using sleep time %d secs.\n",
+            serverSleepTime);
+        return;
+    }
+    serverSleepTime = seconds;
+    logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
+            serverSleepTime);
+}
+
+bool TavikClient::serverRequestedSleep() {
+    return pollServerForSleepTime() > 0;
+}
+
+int TavikClient::getServerSleepTime() const {
+    return std::max(serverSleepTime, kShortestPause);
+}
+
+void TavikClient::resetServerSleepTime() {
+    serverPolled = false;
+    serverSleepTime = 0;
+}
+
+}  // namespace pelorus

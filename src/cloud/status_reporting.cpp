@@ -1,1 +1,254 @@
-// pending
+#include <qvlog.h>
+#include <unistd.h>
+
+#include <array>
+#include <cstdio>
+#include <cstdlib>
+
+#include "cloud/tavik_client.h"
+#include "common/handles.h"
+#include "common/log.h"
+#include "common/masks.h"
+#include "common/text.h"
+#include "config/global_config.h"
+#include "config/scrub.h"
+
+namespace pelorus {
+
+const std::array<const char*, 5> ConnType2LogType{"disabled", "portforwarded", "relayed",
+                                                  "disabled", "disabled"};
+
+namespace {
+
+constexpr const char* kInternalPortKey = "INTERNAL_HTTP_PORT";
+constexpr const char* kLocalStatusKey = "LOCAL_SETCOMMSTATUSURL";
+constexpr const char* kLocalAddressKey = "LOCAL_SETLOCALIPURL";
+constexpr const char* kRemoteStatusKey = "REMOTE_SETCOMMSTATUSURL";
+
+constexpr const char* kLocalSuccess = "success";
+constexpr const char* kCentralSuccess = "Success";
+
+constexpr unsigned kLocalUpdatePause = 1;  // seconds the local back end is given to write
+constexpr const char* kTouchDynamicConfig = "touch /tmp/dynamicconfig.ini";
+
+constexpr const char* kDiskStateCommand = "hdparm -C /dev/sda";
+constexpr const char* kDiskAsleep = "standby";
+constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
+constexpr int kMostIdleMinutes = 1;
+constexpr int kMakersRouter = 5;            // a device type; it has no count of idle minutes
+constexpr std::size_t kShortLineSize = 80;  // bytes, terminator included
+
+// Of the library's event format.
+constexpr int kEventLevel = 3;
+constexpr int kTextValue = 3;
+
+std::string property(const char* key) {
+    return GlobalConfig::getInstance()->getProperty(key);
+}
+
+int internalPort() {
+    return leadingInt(property(kInternalPortKey));
+}
+
+void judgeLocalStatusAnswer(const std::string& url, const std::string& answer) {
+    if (!contains(answer, kLocalSuccess)) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateLocalCommStatus - failure response received from localhost for url: [%s]\n",
+            url.c_str());
+        logLine(LOG_ERR, "Response: [%s].\n", scrubSecrets(answer).c_str());
+        return;
+    }
+    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Successful update status.\n\n");
+}
+
+bool tellBackEndLocalIp(const std::string& localIp) {
+    const std::string url =
+        fillTemplate(kLocalAddressKey, property(kLocalAddressKey), {internalPort(), localIp});
+    logLine(LOG_INFO, "TavikClient::updateRemoteCommStatus - local config using url:  %s\n",
+            url.c_str());
+    if (fetchLocal(url)) return true;
+    logLine(
+        LOG_ERR,
+        "TavikClient::updateRemoteCommStatus - failed to get response from local server for url:  %s\n",
+        url.c_str());
+    return false;
+}
+
+// The event library is a C one: its end marker is a C cast.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wold-style-cast"
+void emitEvent(const char* state, const char* type) {
+    __qvlog_kvp(kEventLevel, "cloudConnectivity", "state", kTextValue, state, "type", kTextValue,
+                type, __QVLOG_END);
+}
+#pragma GCC diagnostic pop
+
+bool reportsStandby(std::FILE* output) {
+    std::array<char, kShortLineSize> line{};
+    while (std::fgets(line.data(), line.size(), output) != nullptr) {
+        if (contains(line.data(), kDiskAsleep)) return true;
+    }
+    return false;
+}
+
+int firstNumber(std::FILE* file) {
+    std::array<char, kShortLineSize> line{};
+    return std::fgets(line.data(), line.size(), file) == nullptr ? 0 : leadingInt(line.data());
+}
+
+// 1 when the disk has been idle for so long that it may be asleep by now, 0 when not.
+int checkIdleMinutes() {
+    const FileHandle file{std::fopen(kIdleMinutesFile, "re")};
+    if (!file) {
+        logLine(LOG_ERR,
+                "TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.\n");
+        return 1;
+    }
+    logLine(LOG_INFO, "TavikClient::checkHddStandByMode - checking sleep count.\n");
+    if (firstNumber(file.get()) > kMostIdleMinutes) {
+        logLine(LOG_INFO,
+                "TavikClient::checkHddStandByMode - sleep count > 1, port testing SKIP.\n");
+        return 1;
+    }
+    return 0;
+}
+
+// The word for a status, or null.
+const char* wordFor(const std::map<std::string, std::string>& words, const std::string& status) {
+    const auto found = words.find(status);
+    return found == words.end() ? nullptr : found->second.c_str();
+}
+
+}  // namespace
+
+void TavikClient::updateLocalCommStatus(const std::string& status) try {
+    if (!lastLocalCommStatus.empty() && lastLocalCommStatus == status) return;
+    // Remembered before it is sent: a failed update waits for the next change of status.
+    lastLocalCommStatus = status;
+    const std::string url =
+        fillTemplate(kLocalStatusKey, property(kLocalStatusKey), {internalPort(), status});
+    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - URL : [%s].\n", url.c_str());
+    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].\n",
+            status.c_str());
+    const auto answer = fetchLocal(url);
+    sleep(kLocalUpdatePause);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateLocalCommStatus - failed to get response from localhost for url:  [%s]\n",
+            url.c_str());
+        return;
+    }
+    if (std::system(kTouchDynamicConfig) != -1) {
+        logLine(LOG_INFO,
+                "TavikClient::updateLocalCommStatus - enforced touch to /tmp/dynamicconfig.ini.\n");
+    }
+    judgeLocalStatusAnswer(url, answer->text);
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::updateLocalCommStatus - Throw exception error. **\n");
+}
+
+bool TavikClient::updateRemoteCommStatus(const std::string& localIp) try {
+    if (getDeviceID().empty()) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateRemoteCommStatus - failed to get Device ID from DynamicConfig\n");
+        return false;
+    }
+    if (getDeviceAuth().empty()) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateRemoteCommStatus - failed to get Device Auth Code from DynamicConfig\n");
+        return false;
+    }
+    return tellServerLocalIp(localIp) && tellBackEndLocalIp(localIp);
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::updateRemoteCommStatus - Throw exception error. **\n");
+    return false;
+}
+
+// True when the server answered; what it said is only logged.
+bool TavikClient::tellServerLocalIp(const std::string& localIp) {
+    const MaskedUrl url =
+        fillMaskedTemplate(kRemoteStatusKey, getRestUrl(property(kRemoteStatusKey), HTTPS),
+                           {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL},
+                            SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}, localIp});
+    logLine(LOG_INFO,
+            "TavikClient::updateRemoteCommStatus - updating central server using url:  %s\n",
+            url.logged.c_str());
+    const auto answer = fetchCentral(url);
+    if (!answer) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateRemoteCommStatus - httpGet failed to get response from central server for url %s.\n",
+            url.logged.c_str());
+        return false;
+    }
+    const std::string logged = scrubSecrets(answer->text);
+    logLine(LOG_NOTICE,
+            "TavikClient::updateRemoteCommStatus - httpGet got %s. %d bytes from central server.\n",
+            logged.c_str(), answer->size);
+    if (!contains(answer->text, kCentralSuccess)) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::updateRemoteCommStatus - failure response received from central server for url:  %s\n",
+            url.logged.c_str());
+        logLine(LOG_ERR, "TavikClient::updateRemoteCommStatus - Response: [%s].\n", logged.c_str());
+    }
+    return true;
+}
+
+void TavikClient::sendAnalytics(const std::string& status,
+                                ConnectionType type,
+                                ConnectionSubType subType) try {
+    logLine(
+        LOG_INFO,
+        "TavikClient::sendAnalytics - COMMUNICATION status:[%s]  connectionType:[%d]  connectionSubType:[%d]\n",
+        status.c_str(), static_cast<int>(type), static_cast<int>(subType));
+    const char* logState = wordFor(Status2LogState, status);
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = %s\n", status.c_str(),
+            logState == nullptr ? "NOT_FOUND" : logState);
+    if (logState == nullptr) logState = "failed";
+
+    const char* logType = wordFor(Status2LogType, status);
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = %s\n", status.c_str(),
+            logType == nullptr ? "NOT_FOUND" : logType);
+    if (logType == nullptr) logType = "disabled";
+
+    // A failure or an attempt counts for the kind of connection that failed or is tried.
+    const auto kind = static_cast<std::size_t>(type);
+    if ((status == "failed" || status == "connecting") && kind < ConnType2LogType.size()) {
+        logType = ConnType2LogType[kind];
+    }
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - logState:[%s]  logType:[%s]\n", logState,
+            logType);
+    emitEvent(logState, logType);
+    lastConnectionSubType = subType;
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::sendAnalytics - Throw exception error. **\n");
+}
+
+int TavikClient::checkHddStandByMode() try {
+    PipeHandle output{popen(kDiskStateCommand, "re")};
+    if (!output) {
+        logLine(
+            LOG_ERR,
+            "TavikClient::checkHddStandByMode - port test not performed - unable to check drive status, popen() returned NULL.\n");
+        return 1;
+    }
+    if (reportsStandby(output.get())) {
+        logLine(
+            LOG_INFO,
+            "TavikClient::checkHddStandByMode - drive is in standby, port test is suspended, port testing SKIP.\n");
+        return 1;
+    }
+    output.reset();
+    if (leadingInt(property("DEVICETYPE")) == kMakersRouter) return 0;
+    return checkIdleMinutes();
+} catch (...) {
+    logLine(LOG_ERR, "** TavikClient::checkHddStandByMode - Throw exception error. **\n");
+    return 1;
+}
+
+}  // namespace pelorus

@@ -5,8 +5,11 @@
 #include <array>
 #include <cstddef>
 #include <map>
+#include <optional>
 #include <string>
 
+#include "cloud/answer.h"
+#include "cloud/url_template.h"
 #include "common/connection_types.h"
 
 namespace pelorus {
@@ -141,8 +144,30 @@ public:
     int checkHddStandByMode();
 
 private:
+    struct PortTest;
+
     TavikClient();
     ~TavikClient();
+
+    bool deriveServerUrls();
+    std::optional<Answer> fetchCentral(const MaskedUrl& url);
+
+    void applySleepAnswer(const std::string& answer);
+    void readWaitTime(const std::string& answer, std::size_t action);
+
+    int portTestObstacle(bool checkHddSleep);
+    MaskedUrl portTestUrl(const std::string& externalIp, int port, HttpType type);
+    void attemptPortTest(PortTest& test);
+    void requestPortTest(PortTest& test);
+    void readRemoteAddress(PortTest& test);
+    void lookForDoubleNat(PortTest& test) const;
+
+    MaskedUrl forwardingUrl(const std::string& externalIp,
+                            const std::string& localIp,
+                            int externalHttpPort,
+                            int externalHttpsPort);
+
+    bool tellServerLocalIp(const std::string& localIp);
 
     bool serverPolled = false;
     int serverSleepTime = 0;  // seconds

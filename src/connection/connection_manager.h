@@ -117,34 +117,38 @@ private:
     ~ConnectionManager() = default;
 
     Router& router();
+    void noteConnectionType();
+    void clearMappedFlags();
     void unmapDevicePort(int internalPort, int externalPort);
+    int testHttpPort(std::string& requestedIp, int port, bool checkSleep, bool skipDoubleNatCheck);
 
-    // Stages of createDirectConnection(). Those that return a bool end the attempt with
-    // attempt.result when it is true.
+    // Stages of createDirectConnection().
     bool checkGateway(DirectAttempt& attempt);
     bool testPortsWithoutGateway(DirectAttempt& attempt);
     void readStatusFile(DirectAttempt& attempt);
-    void dropOutdatedMappings(DirectAttempt& attempt);
+    void dropOutdatedMappings(const DirectAttempt& attempt);
+    void unmapAllocatedPorts(const DirectAttempt& attempt);
+    void decideSleepCheck(DirectAttempt& attempt);
     bool retestMappedPorts(DirectAttempt& attempt);
-    bool searchIsDue(DirectAttempt& attempt);
+    bool searchIsDue(const DirectAttempt& attempt);
     bool searchPorts(DirectAttempt& attempt);
     ConnectionType publishMapping(const DirectAttempt& attempt);
     ConnectionType giveUpMapping(const DirectAttempt& attempt);
 
     // Stages of forwardPort().
     bool tryPredefinedPorts(ForwardSearch& search, int& result);
-    bool mapCandidate(ForwardSearch& search);
-    bool tryStartPort(ForwardSearch& search);
-    bool tryExtendedRange(ForwardSearch& search);
+    void mapCandidate(ForwardSearch& search);
+    void mapInExtendedRange(ForwardSearch& search);
+    bool mapDevicePort(const ForwardSearch& search, int& externalPort);
     bool testCandidate(ForwardSearch& search, int& result);
-    bool isBadPort(int port) const;
+    [[nodiscard]] bool isBadPort(int port) const;
 
     // Stages of manualPortForward().
-    bool readManualPorts(ManualAttempt& attempt) const;
     void leaveAutomaticForwarding();
-    void noticeManualChanges(ManualAttempt& attempt);
-    bool testManualPorts(ManualAttempt& attempt);
-    ConnectionType publishManualPorts(ManualAttempt& attempt);
+    void noticeManualChanges(ManualAttempt& attempt) const;
+    void testManualPorts(ManualAttempt& attempt);
+    void publishManualPorts(ManualAttempt& attempt);
+    ConnectionType endManualAttempt(const ManualAttempt& attempt) const;
 
     // Stages of createRelayConnection() and killConnection().
     ConnectionType startRelay();
@@ -153,9 +157,9 @@ private:
 
     // Stages of checkDNS().
     bool buildOwnNames(DeviceNames& names);
-    bool namesAgree(const DeviceNames& names) const;
     bool namesLeadHere(const DeviceNames& names, ConnectionType type);
-    void noteConnectionType();
+    void fetchExternalIp(std::string& ip);
+    void fetchRelayIp(std::string& ip);
 
     std::unique_ptr<Router> pRouter;
     int allocatedHttpPort = 0;   // external; 0: none

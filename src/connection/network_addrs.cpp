@@ -1,1 +1,132 @@
-// pending
+#include "connection/network_addrs.h"
+
+#include <unistd.h>
+
+#include <ctime>
+
+#include "cloud/tavik_client.h"
+#include "common/log.h"
+#include "common/termination.h"
+
+namespace pelorus {
+
+NetworkAddrs::NetworkAddrs() {
+    interval.SetIntervalDuration(kDefaultInterval);
+}
+
+NetworkAddrs* NetworkAddrs::getInstance() {
+    static NetworkAddrs instance;
+    return &instance;
+}
+
+void NetworkAddrs::init() {
+    externalIP.clear();
+    localIP.clear();
+    clearIPChanged();
+    logLine(
+        LOG_INFO,
+        "NetworkAddrs::init - cleared local and external IP addresses.  Interval duration: %d\n",
+        static_cast<int>(interval.GetIntervalDuration()));
+}
+
+void NetworkAddrs::SetIntervalDuration(int seconds) {
+    interval.SetIntervalDuration(seconds);
+}
+
+void NetworkAddrs::setNetworkAddrs(const std::string& externalIp, const std::string& localIp) {
+    clearIPChanged();
+    externalIP = externalIp;
+    localIP = localIp;
+    interval.StartTheInterval();
+    logLine(
+        LOG_INFO,
+        "NetworkAddrs::setNetworkAddrs - external IP [%s], local IP [%s], interval start time [%ld], interval duration [%d] \n",
+        externalIP.c_str(), localIP.c_str(), interval.GetIntervalStartTime(),
+        static_cast<int>(interval.GetIntervalDuration()));
+}
+
+int NetworkAddrs::discoverNetworkAddrs() {
+    if (externalIP.empty() && localIP.empty()) {
+        logLine(LOG_INFO,
+                "NetworkAddrs::discoverNetworkAddrs - both externalIP and localIP are empty\n");
+        return 0;
+    }
+    if (!pRouter) pRouter = std::make_unique<Router>();
+    pRouter->discover();
+    const std::string discoveredLocal = pRouter->getLocalIp();
+    std::string discoveredExternal;
+    if (!findExternalIp(discoveredExternal)) return 0;
+
+    externalIPChanged = externalIP != discoveredExternal;
+    internalIPChanged = localIP != discoveredLocal;
+    logLine(
+        LOG_INFO,
+        "NetworkAddrs::discoverNetworkAddrs - externalIPChanged [%d], external IP [%s], discovered external IP [%s], internalIPChanged [%d], internal IP [%s], discovered internal IP [%s]\n",
+        externalIPChanged, externalIP.c_str(), discoveredExternal.c_str(), internalIPChanged,
+        localIP.c_str(), discoveredLocal.c_str());
+    return 1;
+}
+
+// From the gateway, or else from the server as often as the interval allows.
+bool NetworkAddrs::findExternalIp(std::string& discovered) {
+    if (pRouter->isInitialized()) {
+        discovered = pRouter->getExternalIp();
+        logLine(
+            LOG_INFO,
+            "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [1], discovered external IP [%s]\n",
+            discovered.c_str());
+        return true;
+    }
+    if (!interval.hasExpired()) {
+        logLine(LOG_INFO, "NetworkAddrs::discoverNetworkAddrs - interval not expired.\n");
+        return false;
+    }
+    logLine(
+        LOG_INFO,
+        "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [0], interval expired.  Interval start time [%ld], interval duration [%d], current time [%ld]\n",
+        interval.GetIntervalStartTime(), static_cast<int>(interval.GetIntervalDuration()),
+        static_cast<long>(time(nullptr)));
+    if (getMyIP(discovered) != 1) {
+        logLine(LOG_INFO, "NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
+        return false;
+    }
+    interval.StartTheInterval();
+    logLine(
+        LOG_INFO,
+        "NetworkAddrs::discoverNetworkAddrs - discovered external IP [%s], reset interval start time [%ld]\n",
+        discovered.c_str(), interval.GetIntervalStartTime());
+    return true;
+}
+
+bool NetworkAddrs::haveNetworkAddrsChanged() const {
+    return externalIPChanged || internalIPChanged;
+}
+
+void NetworkAddrs::clearIPChanged() {
+    externalIPChanged = false;
+    internalIPChanged = false;
+}
+
+int NetworkAddrs::getMyIP(std::string& out) {
+    auto* client = TavikClient::getInstance();
+    std::string ip;
+    int waitSeconds = 0;
+    bool found = client->getMyIP(ip, waitSeconds);
+    while (!found && waitSeconds > 0 && !terminationRequested()) {
+        logLine(LOG_INFO, "NetworkAddrs::getMyIP - wait %d seconds\n", waitSeconds);
+        sleep(static_cast<unsigned>(waitSeconds));
+        // The server's answer is kept for a cycle; without this, that answer would be asked.
+        client->resetServerSleepTime();
+        if (terminationRequested()) break;
+        found = client->getMyIP(ip, waitSeconds);
+    }
+    if (!found) {
+        logLine(LOG_INFO, "NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
+        return 0;
+    }
+    out = ip;
+    logLine(LOG_INFO, "NetworkAddrs::getMyIP - external IP address %s\n", out.c_str());
+    return 1;
+}
+
+}  // namespace pelorus

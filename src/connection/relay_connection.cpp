@@ -1,1 +1,129 @@
-// pending
+#include "cloud/tavik_client.h"
+#include "common/log.h"
+#include "common/text.h"
+#include "config/global_config.h"
+#include "connection/connection_manager.h"
+#include "connection/mapping_names.h"
+#include "relay/vpn_manager.h"
+
+namespace pelorus {
+
+namespace {
+
+void reportAnalytics(const char* status) {
+    TavikClient::getInstance()->sendAnalytics(status, RELAYED, SUBTYPE_NONE);
+}
+
+}  // namespace
+
+ConnectionType ConnectionManager::createRelayConnection() {
+    if (httpPortMapped && httpsPortMapped) return PORTFORWARDED;
+    auto* client = TavikClient::getInstance();
+    ConnectionType result = FAILED;
+    if (VPNManager::getInstance()->isVPNRunning()) {
+        client->updateLocalCommStatus("relayed");
+        result = RELAYED;
+        logLine(LOG_INFO,
+                "ConnectionManager::createRelayConnection() - openVPN process is running.\n");
+        setForceConnect(false);
+    } else if (client->serverRequestedSleep()) {
+        logLine(
+            LOG_INFO,
+            "ConnectionManager::createRelayConnection() - server requested sleep, therefore openVPN will not be started, and this relay connection creation attempt will return failure.\n");
+        return FAILED;
+    } else {
+        result = startRelay();
+    }
+    if (router().hasLocalIpChanged()) {
+        client->updateRemoteCommStatus(router().getLocalIp());
+        logLine(
+            LOG_NOTICE,
+            "ConnectionManager::createRelayConnection() - local IP address has changed! Updating server with new address.\n");
+    }
+    if (result == RELAYED) lastManualPortForward = false;
+    return result;
+}
+
+// Withdraws the direct path from the server and starts the tunnel. Mappings on the gateway stay.
+ConnectionType ConnectionManager::startRelay() {
+    auto* client = TavikClient::getInstance();
+    logLine(LOG_INFO, "ConnectionManager::createRelayConnection() - creating VPN connection.\n");
+    reportAnalytics("connecting");
+    const int internalHttpPort = leadingInt(setting("INTERNAL_HTTP_PORT"));
+    if (client->deleteServerMapping(internalHttpPort, router().getLocalIp())) {
+        logLine(
+            LOG_INFO,
+            "ConnectionManager::createRelayConnection() - deleted port mappings from server.\n");
+    } else {
+        logLine(
+            LOG_ERR,
+            "ConnectionManager:createRelayConnection() - failed to delete port mapping info.\n");
+    }
+    allocatedHttpPort = 0;
+    allocatedHttpsPort = 0;
+    logLine(
+        LOG_INFO,
+        "ConnectionManager::createRelayConnection() - attempting to open VPN relay connection.\n");
+    if (!VPNManager::getInstance()->openVPNConnection()) {
+        reportAnalytics("failed");
+        client->updateLocalCommStatus("failed");
+        logLine(LOG_ERR,
+                "ConnectionManager::createRelayConnection() - failed to create VPN connection.\n");
+        return FAILED;
+    }
+    reportAnalytics("relayed");
+    client->updateLocalCommStatus("relayed");
+    setForceConnect(false);
+    return RELAYED;
+}
+
+void ConnectionManager::killConnection(ConnectionType type) {
+    if (type == PORTFORWARDED) {
+        removeMappings();
+    } else if (type == RELAYED) {
+        VPNManager::getInstance()->closeVPNConnection();
+    }
+}
+
+void ConnectionManager::removeMappings() {
+    if (!pRouter) {
+        if (deviceType != kMakersRouter && !router().discover()) return;
+        if (router().hasLocalIpChanged()) {
+            TavikClient::getInstance()->updateRemoteCommStatus(router().getLocalIp());
+            logLine(
+                LOG_INFO,
+                "ConnectionManager::killConnection() - local IP address has changed! Updating server with new address\n");
+        }
+    }
+    if (router().isInitialized() && deviceType != kMakersRouter) {
+        logLine(LOG_INFO, "ConnectionManager::killConnection() - unmapping all ports\n");
+        router().unmapAllPorts(kTcp, kHttpDescription);
+        router().unmapAllPorts(kTcp, kHttpsDescription);
+    } else {
+        // Also where no gateway was found: without the router's script this does nothing.
+        router().unmapAllPortBrenvik(kTcp);
+    }
+    allocatedHttpsPort = 0;
+    allocatedHttpPort = 0;
+    withdrawMappingRecord();
+}
+
+void ConnectionManager::withdrawMappingRecord() {
+    const std::string port = setting("INTERNAL_HTTP_PORT");
+    if (port.empty()) {
+        logLine(
+            LOG_ERR,
+            "ConnectionManager::killConnection() - failed to get internal port number from dynamicconfig.ini.\n");
+        return;
+    }
+    if (TavikClient::getInstance()->deleteServerMapping(leadingInt(port), router().getLocalIp())) {
+        logLine(
+            LOG_NOTICE,
+            "ConnectionManager::killConnection() - successfully deleted port mappings on central server.\n");
+    } else {
+        logLine(LOG_ERR,
+                "ConnectionManager::killConnection() - failed to delete port mapping info.\n");
+    }
+}
+
+}  // namespace pelorus

@@ -1,1 +1,9 @@
-// pending
+#include "daemon/version.h"
+
+namespace pelorus {
+
+const char* GetPelorusVersion() {
+    return "1.7.0-54";
+}
+
+}  // namespace pelorus

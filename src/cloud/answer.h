@@ -9,8 +9,8 @@ namespace pelorus {
 
 /// The body of an answer. Answers are read as C strings: what follows a NUL byte is not seen.
 struct Answer {
-    /// Copies @p size received bytes; a null @p data or a negative @p size is an empty body.
-    Answer(const char* data, int size);
+    /// Copies what was received; a null @p data or a negative count is an empty body.
+    Answer(const char* data, int bytes);
 
     std::string text;
     int size;  ///< bytes received, those behind a NUL included

@@ -254,6 +254,7 @@ void TavikClient::ReplaceStringInPlace(std::string& subject,
     replaceAll(subject, search, replace);
 }
 
+// NOLINTNEXTLINE(performance-unnecessary-value-param): the interface takes a copy
 bool TavikClient::validateIpAddress(std::string address) const {
     in_addr parsed{};
     const bool isText = std::strlen(address.c_str()) == address.size();

@@ -16,22 +16,22 @@ constexpr const char* kNoAddress = "NULL";  // withdraws a record
 constexpr const char* kLocalSuccess = "success";
 
 // What the local back end is told; its objections are logged and do not count.
-bool updateLocalRecord(const std::string& url) {
+bool updateLocalRecord(const MaskedUrl& url) {
     logLine(LOG_INFO, "TavikClient::updateServerMapping - update local config url: %s\n",
-            url.c_str());
-    const auto answer = fetchLocal(url);
+            url.logged.c_str());
+    const auto answer = fetchLocal(url.request);
     if (!answer) {
         logLine(
             LOG_ERR,
             "TavikClient::updateServerMapping - failed to get response from localhost for url: [%s].\n",
-            url.c_str());
+            url.logged.c_str());
         return false;
     }
     if (!contains(answer->text, kLocalSuccess)) {
         logLine(
             LOG_ERR,
             "TavikClient::updateServerMapping - failure response received from localhost for url: [%s].\n",
-            url.c_str());
+            url.logged.c_str());
         logLine(LOG_ERR, "Response: %s", scrubSecrets(answer->text).c_str());
     }
     return true;
@@ -104,9 +104,9 @@ bool TavikClient::updateServerMapping(const std::string& externalIp,
     logLine(LOG_NOTICE, "TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
             scrubSecrets(answer->text).c_str(), answer->size);
     // The local back end expects the internal HTTP port in the last place too.
-    return updateLocalRecord(fillTemplate(kLocalSetKey, property(kLocalSetKey),
-                                          {internalHttpPort, externalIp, externalHttpPort,
-                                           externalHttpsPort, localIp, internalHttpPort}));
+    return updateLocalRecord(fillMaskedTemplate(kLocalSetKey, property(kLocalSetKey),
+                                                {internalHttpPort, externalIp, externalHttpPort,
+                                                 externalHttpsPort, localIp, internalHttpPort}));
 } catch (...) {
     logLine(LOG_ERR, "** TavikClient::updateServerMapping - Throw exception error. **\n");
     return false;

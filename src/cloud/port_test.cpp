@@ -185,11 +185,11 @@ void TavikClient::attemptPortTest(PortTest& test) try {
     if (test.passed) {
         logLine(LOG_INFO,
                 "TavikClient::testPort - port test succeeded for requested external IP: [%s]\n",
-                test.externalIp.c_str());
+                scrubSecrets(test.externalIp).c_str());
         return;
     }
     logLine(LOG_INFO, "TavikClient::testPort - port test failed for requested external IP: [%s]\n",
-            test.externalIp.c_str());
+            scrubSecrets(test.externalIp).c_str());
     lookForDoubleNat(test);
     if (test.doubleNat) return;
     // The pause follows the last attempt too.
@@ -242,7 +242,7 @@ void TavikClient::lookForDoubleNat(PortTest& test) const {
     logLine(
         LOG_INFO,
         "TavikClient::testPort - Requested external IP: [%s] / Respond remote external IP: [%s].\n",
-        test.externalIp.c_str(), scrubSecrets(remote).c_str());
+        scrubSecrets(test.externalIp).c_str(), scrubSecrets(remote).c_str());
     if (validateIpAddress(remote) && remote != test.externalIp) {
         logLine(
             LOG_ERR,

@@ -114,10 +114,28 @@ int checkIdleMinutes() {
     return 0;
 }
 
-// The word for a status, or null.
-const char* wordFor(const std::map<std::string, std::string>& words, const std::string& status) {
-    const auto found = words.find(status);
-    return found == words.end() ? nullptr : found->second.c_str();
+std::string logStateOf(const std::string& status) {
+    const auto found = Status2LogState.find(status);
+    if (found == Status2LogState.end()) {
+        logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = NOT_FOUND\n",
+                status.c_str());
+        return "failed";
+    }
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = %s\n", status.c_str(),
+            found->second.c_str());
+    return found->second;
+}
+
+std::string logTypeOf(const std::string& status) {
+    const auto found = Status2LogType.find(status);
+    if (found == Status2LogType.end()) {
+        logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = NOT_FOUND\n",
+                status.c_str());
+        return "disabled";
+    }
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = %s\n", status.c_str(),
+            found->second.c_str());
+    return found->second;
 }
 
 }  // namespace
@@ -206,24 +224,16 @@ void TavikClient::sendAnalytics(const std::string& status,
         LOG_INFO,
         "TavikClient::sendAnalytics - COMMUNICATION status:[%s]  connectionType:[%d]  connectionSubType:[%d]\n",
         status.c_str(), static_cast<int>(type), static_cast<int>(subType));
-    const char* logState = wordFor(Status2LogState, status);
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = %s\n", status.c_str(),
-            logState == nullptr ? "NOT_FOUND" : logState);
-    if (logState == nullptr) logState = "failed";
-
-    const char* logType = wordFor(Status2LogType, status);
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = %s\n", status.c_str(),
-            logType == nullptr ? "NOT_FOUND" : logType);
-    if (logType == nullptr) logType = "disabled";
-
+    const std::string logState = logStateOf(status);
+    std::string logType = logTypeOf(status);
     // A failure or an attempt counts for the kind of connection that failed or is tried.
     const auto kind = static_cast<std::size_t>(type);
     if ((status == "failed" || status == "connecting") && kind < ConnType2LogType.size()) {
         logType = ConnType2LogType[kind];
     }
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - logState:[%s]  logType:[%s]\n", logState,
-            logType);
-    emitEvent(logState, logType);
+    logLine(LOG_INFO, "TavikClient::sendAnalytics - logState:[%s]  logType:[%s]\n",
+            logState.c_str(), logType.c_str());
+    emitEvent(logState.c_str(), logType.c_str());
     lastConnectionSubType = subType;
 } catch (...) {
     logLine(LOG_ERR, "** TavikClient::sendAnalytics - Throw exception error. **\n");

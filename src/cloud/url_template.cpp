@@ -4,6 +4,7 @@
 #include <optional>
 
 #include "common/log.h"
+#include "config/scrub.h"
 
 namespace pelorus {
 
@@ -24,7 +25,8 @@ std::optional<std::string> argumentText(const TemplateArgument& argument,
     if (const auto* secret = std::get_if<SecretArgument>(&argument)) {
         return secrets == Secrets::REAL ? secret->value : secret->mask;
     }
-    return std::get<std::string>(argument);
+    const auto& text = std::get<std::string>(argument);
+    return secrets == Secrets::REAL ? text : scrubSecrets(text);
 }
 
 std::optional<std::string> format(const std::string& urlTemplate,
@@ -54,7 +56,7 @@ std::optional<std::string> format(const std::string& urlTemplate,
 void reportBadTemplate(const std::string& key) {
     logLine(
         LOG_ERR,
-        "TavikClient::fillTemplate - URL template of %s asks for more or other values than it is given, no URL built.\n",
+        "fillTemplate - URL template of %s asks for more or other values than it is given, no URL built.\n",
         key.c_str());
 }
 

@@ -35,8 +35,8 @@ struct MaskedUrl {
     std::string logged;   ///< with masks in their place
 };
 
-/// As fillTemplate, for a request that carries secrets; a bad template is reported once and leaves
-/// both texts empty.
+/// As fillTemplate, for a request that carries secrets or text from outside, which could hold one
+/// and is scrubbed. A bad template is reported once and leaves both texts empty.
 [[nodiscard]] MaskedUrl fillMaskedTemplate(const std::string& key,
                                            const std::string& urlTemplate,
                                            std::initializer_list<TemplateArgument> arguments);

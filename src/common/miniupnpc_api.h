@@ -62,6 +62,7 @@ inline int getValidIgd(
 }
 
 /// Asks the gateway for the mapping of one external port; 0 when there is one.
+// NOLINTNEXTLINE(readability-function-size): as many parameters as the library has
 inline int getSpecificPortMappingEntry(const char* controlUrl,
                                        const char* serviceType,
                                        const char* externalPort,

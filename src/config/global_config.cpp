@@ -30,16 +30,27 @@ struct Setting {
     std::string_view value;
 };
 
+bool isBlank(char c) {
+    return c == ' ' || c == '\t';
+}
+
+// What may stand around a value without belonging to it.
+bool isFrame(char c) {
+    return isBlank(c) || c == '"';
+}
+
 // Splits one line. The key is empty when the line holds no setting.
 Setting parseLine(std::string_view line) {
     const std::size_t split = line.find('=', 1);
     if (split == std::string_view::npos) return {};
-    const std::size_t keyStart = line.find_first_not_of(" \t");
-    const std::string_view key = line.substr(keyStart, split - keyStart);
+    std::string_view key = line.substr(0, split);
+    while (!key.empty() && isBlank(key.front())) key.remove_prefix(1);
 
     std::string_view value = line.substr(split + 1);
-    value.remove_prefix(std::min(value.find_first_not_of(" \t\""), value.size()));
-    value = value.substr(0, value.find_last_not_of(" \t\"\n") + 1);
+    while (!value.empty() && isFrame(value.front())) value.remove_prefix(1);
+    while (!value.empty() && (isFrame(value.back()) || value.back() == '\n')) {
+        value.remove_suffix(1);
+    }
     return {key, value};
 }
 
@@ -202,10 +213,13 @@ bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::
 
 bool GlobalConfig::loadConfigSettings(std::FILE* file) {
     std::array<char, kLineSize> line{};
+    std::string key;  // one block for all lines: the map copies a key only when it is new
     while (std::fgets(line.data(), line.size(), file) != nullptr) {
         const Setting setting = parseLine(line.data());
         if (setting.key.empty()) continue;
-        properties[std::string{setting.key}] = setting.value;
+        key = setting.key;
+        const auto [place, isNew] = properties.try_emplace(key, setting.value);
+        if (!isNew) place->second = setting.value;
     }
     return true;
 }

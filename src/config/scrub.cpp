@@ -2,13 +2,36 @@
 
 #include <algorithm>
 #include <array>
+#include <cctype>
 #include <utility>
 
 #include "common/masks.h"
-#include "common/text.h"
 #include "config/global_config.h"
 
 namespace pelorus {
+
+namespace {
+
+bool sameLetter(unsigned char left, unsigned char right) {
+    return std::tolower(left) == std::tolower(right);
+}
+
+// A secret is part of host names, which come back from DNS in any case. A file with CRLF line
+// ends gives it a carriage return that nobody repeats.
+void hide(std::string& text, std::string secret, const std::string& mask) {
+    while (!secret.empty() && secret.back() == '\r') secret.pop_back();
+    if (secret.empty()) return;
+    auto from = text.begin();
+    while (true) {
+        from = std::search(from, text.end(), secret.begin(), secret.end(), sameLetter);
+        if (from == text.end()) return;
+        const auto at = from - text.begin();
+        text.replace(static_cast<std::size_t>(at), secret.size(), mask);
+        from = text.begin() + at + static_cast<std::ptrdiff_t>(mask.size());
+    }
+}
+
+}  // namespace
 
 std::string scrubSecrets(std::string text) {
     auto* config = GlobalConfig::getInstance();
@@ -21,7 +44,7 @@ std::string scrubSecrets(std::string text) {
     std::stable_sort(secrets.begin(), secrets.end(), [](const auto& left, const auto& right) {
         return left.first.size() > right.first.size();
     });
-    for (const auto& [secret, mask] : secrets) replaceAll(text, secret, mask);
+    for (const auto& [secret, mask] : secrets) hide(text, secret, mask);
     return text;
 }
 

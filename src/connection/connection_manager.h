@@ -148,7 +148,7 @@ private:
     void noticeManualChanges(ManualAttempt& attempt) const;
     void testManualPorts(ManualAttempt& attempt);
     void publishManualPorts(ManualAttempt& attempt);
-    ConnectionType endManualAttempt(const ManualAttempt& attempt) const;
+    [[nodiscard]] ConnectionType endManualAttempt(const ManualAttempt& attempt) const;
 
     // Stages of createRelayConnection() and killConnection().
     ConnectionType startRelay();

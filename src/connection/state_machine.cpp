@@ -10,10 +10,10 @@ namespace pelorus {
 
 namespace {
 
-constexpr long kShortestPortTestInterval = 240;       // seconds
-constexpr long kLongestPortTestInterval = 960;        // seconds
-constexpr long kPortTestIntervalStep = 120;           // seconds
-constexpr long kDefaultDnsCheckInterval = 24 * 3600;  // seconds
+constexpr long kShortestPortTestInterval = 240;        // seconds
+constexpr long kLongestPortTestInterval = 960;         // seconds
+constexpr long kPortTestIntervalStep = 120;            // seconds
+constexpr long kDefaultDnsCheckInterval = 24L * 3600;  // seconds
 constexpr int kUnchangedCyclesPerStep = 3;
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include "daemon/command_line.h"
 
+#include <array>
 #include <cstdio>
 #include <cstring>
 
@@ -10,60 +11,35 @@ namespace pelorus {
 
 namespace {
 
-constexpr int kShortestFrequency = 30;  // seconds
-constexpr int kLongestFrequency = 900;  // seconds
-constexpr int kLeastSeverity = 0;
-constexpr int kMostSeverity = 7;
+constexpr int kLeastFrequency = 30;  // seconds
+constexpr int kMostFrequency = 900;  // seconds
+constexpr int kMostSeverity = 7;     // LOG_DEBUG
 
-// The arguments from left to right.
-class Arguments {
-public:
-    Arguments(int argc, const char* const* argv) : count(argc), texts(argv) {}
-
-    [[nodiscard]] bool atEnd() const { return index >= count; }
-    [[nodiscard]] const char* current() const { return texts[index]; }
-    void advance() { ++index; }
-
-    [[nodiscard]] bool isOption(const char* shortForm, const char* longForm) const {
-        return std::strcmp(current(), shortForm) == 0 || std::strcmp(current(), longForm) == 0;
-    }
-    // Moves on to the option's value. Null when the option is the last argument.
-    const char* value() {
-        if (index + 1 >= count) return nullptr;
-        advance();
-        return current();
-    }
-
-private:
-    int count;
-    const char* const* texts;
-    int index = 1;
-};
+// The readers of the options' values. A null value means that the option came last.
 
 void readFrequency(const char* value, Options& options) {
+    int seconds = 0;
     options.frequency = Options::kDefaultFrequency;
-    int frequency = 0;
     if (value == nullptr) {
         std::fprintf(stderr, "Run frequency is missing. A default of %d secs will be used.\n",
                      Options::kDefaultFrequency);
-    } else if (!scanInt(value, frequency) || frequency < kShortestFrequency ||
-               frequency > kLongestFrequency) {
+    } else if (!scanInt(value, seconds) || seconds < kLeastFrequency || seconds > kMostFrequency) {
         std::fprintf(
             stderr,
             "Run frequency is %s. It must be between %d and %d seconds. A default of %d secs will be used.\n",
-            value, kShortestFrequency, kLongestFrequency, Options::kDefaultFrequency);
+            value, kLeastFrequency, kMostFrequency, Options::kDefaultFrequency);
     } else {
-        options.frequency = frequency;
+        options.frequency = seconds;
     }
 }
 
 void readSeverity(const char* value, Options& options) {
-    options.severity = Options::kDefaultSeverity;
     int severity = 0;
+    options.severity = Options::kDefaultSeverity;
     if (value == nullptr) {
         std::fprintf(stderr, "Severity level is missing. A default of %d will be used.\n",
                      Options::kDefaultSeverity);
-    } else if (!scanInt(value, severity) || severity < kLeastSeverity || severity > kMostSeverity) {
+    } else if (!scanInt(value, severity) || severity < 0 || severity > kMostSeverity) {
         std::fprintf(stderr, "Invalid syslog severity %s. Default %d shall be used.\n", value,
                      Options::kDefaultSeverity);
     } else {
@@ -71,72 +47,87 @@ void readSeverity(const char* value, Options& options) {
     }
 }
 
+void readLog(const char* value, Options& options) {
+    options.log = true;
+    readSeverity(value, options);
+}
+
+void readLogToConsole(const char* value, Options& options) {
+    options.logToConsole = true;
+    readSeverity(value, options);
+}
+
+void readUnmapAll(const char* /*value*/, Options& options) {
+    options.unmapAll = true;
+}
+
 void readDnsCheckInterval(const char* value, Options& options) {
+    long seconds = 0;
     options.dnsCheckInterval = Options::kDefaultDnsCheckInterval;
-    long interval = 0;
     if (value == nullptr) {
         std::fprintf(stderr, "DNS check interval is missing. A default of %ld secs will be used.\n",
                      Options::kDefaultDnsCheckInterval);
-    } else if (!scanLong(value, interval) || interval <= 0) {
+    } else if (!scanLong(value, seconds) || seconds <= 0) {
         std::fprintf(
             stderr,
             "DNS check interval is %s which is not valid.  A default of %ld secs will be used.\n",
             value, Options::kDefaultDnsCheckInterval);
     } else {
-        options.dnsCheckInterval = interval;
+        options.dnsCheckInterval = seconds;
     }
 }
 
 void readPortMapLifetime(const char* value, Options& options) {
-    unsigned lifetime = 0;
+    unsigned seconds = 0;
     if (value == nullptr) {
-        std::fprintf(stderr, "NAT-PMP port mapping lifetime is missing.\n");
-    } else if (!scanUnsigned(value, lifetime) || lifetime == 0) {
+        std::fputs("NAT-PMP port mapping lifetime is missing.\n", stderr);
+    } else if (!scanUnsigned(value, seconds) || seconds == 0) {
         std::fprintf(stderr, "NAT-PMP port mapping lifetime is %s which is not valid.\n", value);
     } else {
-        options.portMapLifetime = lifetime;
+        options.portMapLifetime = seconds;
     }
 }
 
 void readPublicIpCheckInterval(const char* value, Options& options) {
-    int interval = 0;
+    int seconds = 0;
     if (value == nullptr) {
-        std::fprintf(stderr, "Manual port forward public IP check interval is missing.\n");
-    } else if (!scanInt(value, interval) || interval <= 0) {
+        std::fputs("Manual port forward public IP check interval is missing.\n", stderr);
+    } else if (!scanInt(value, seconds) || seconds <= 0) {
         std::fprintf(stderr,
                      "Manual port forward public IP check interval is %s which is not valid.\n",
                      value);
     } else {
-        options.publicIpCheckInterval = interval;
+        options.publicIpCheckInterval = seconds;
     }
 }
 
-// False when the argument is no option.
-bool readOption(Arguments& arguments, Options& options) {
-    if (arguments.isOption("-f", "-check_frequency")) {
-        readFrequency(arguments.value(), options);
-    } else if (arguments.isOption("-l", "-enable_log")) {
-        options.log = true;
-        readSeverity(arguments.value(), options);
-    } else if (arguments.isOption("-lc", "-enable_log_console")) {
-        options.logToConsole = true;
-        readSeverity(arguments.value(), options);
-    } else if (arguments.isOption("-u", "-unmapall")) {
-        options.unmapAll = true;
-    } else if (arguments.isOption("-d", "-dnscheckinterval")) {
-        readDnsCheckInterval(arguments.value(), options);
-    } else if (arguments.isOption("-t", "-portmaplifetime")) {
-        readPortMapLifetime(arguments.value(), options);
-    } else if (arguments.isOption("-p", "-publicipcheckinterval")) {
-        readPublicIpCheckInterval(arguments.value(), options);
-    } else {
-        return false;
+struct Option {
+    const char* shortName;
+    const char* longName;
+    bool takesValue;
+    void (*read)(const char* value, Options& options);
+};
+
+constexpr std::array<Option, 7> kOptions{{
+    {"-f", "-check_frequency", true, readFrequency},
+    {"-l", "-enable_log", true, readLog},
+    {"-lc", "-enable_log_console", true, readLogToConsole},
+    {"-u", "-unmapall", false, readUnmapAll},
+    {"-d", "-dnscheckinterval", true, readDnsCheckInterval},
+    {"-t", "-portmaplifetime", true, readPortMapLifetime},
+    {"-p", "-publicipcheckinterval", true, readPublicIpCheckInterval},
+}};
+
+const Option* findOption(const char* name) {
+    for (const Option& option : kOptions) {
+        if (std::strcmp(name, option.shortName) == 0) return &option;
+        if (std::strcmp(name, option.longName) == 0) return &option;
     }
-    return true;
+    return nullptr;
 }
 
-// -v is known only here, where an unknown argument would be. Returns the exit status.
-int endWith(const char* argument) {
+// Answers an argument that is no option of the daemon; returns the exit status.
+int answerOther(const char* argument) {
     if (std::strcmp(argument, "-v") == 0) {
         std::printf("Version: %s\n", GetPelorusVersion());
         return 0;
@@ -151,8 +142,12 @@ int endWith(const char* argument) {
 }  // namespace
 
 std::optional<int> parseCommandLine(int argc, const char* const* argv, Options& options) {
-    for (Arguments arguments(argc, argv); !arguments.atEnd(); arguments.advance()) {
-        if (!readOption(arguments, options)) return endWith(arguments.current());
+    for (int index = 1; index < argc; ++index) {
+        const Option* option = findOption(argv[index]);
+        if (option == nullptr) return answerOther(argv[index]);
+        const char* value = nullptr;
+        if (option->takesValue && index + 1 < argc) value = argv[++index];
+        option->read(value, options);
     }
     return std::nullopt;
 }

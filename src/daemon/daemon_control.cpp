@@ -5,6 +5,8 @@
 
 #include <algorithm>
 #include <csignal>
+#include <ctime>
+#include <string>
 
 #include "cloud/tavik_client.h"
 #include "common/log.h"
@@ -18,12 +20,13 @@ namespace pelorus {
 
 namespace {
 
-constexpr int kShortestPeriod = 30;  // seconds
-constexpr int kLongestPeriod = 900;  // seconds
+constexpr int kLeastSleepTime = 30;  // seconds
+constexpr int kMostSleepTime = 900;  // seconds
 
 }  // namespace
 
 DaemonControl* DaemonControl::getInstance() {
+    // Initialised at compile time: a signal handler may be the first to ask for it.
     static DaemonControl instance;
     return &instance;
 }
@@ -31,40 +34,37 @@ DaemonControl* DaemonControl::getInstance() {
 void DaemonControl::run() {
     lastConnectionType = NONE;
     startClean();
-    // Both flags false would spin here; enabling and disabling never leave that state behind.
+    // With both switches off this spins; the operations that set them never leave it so.
     while (remoteAccessEnabled || !stopRequested) {
         if (remoteAccessEnabled) runCycle();
     }
     shutDown();
 }
 
-// Brings down what an earlier run left, so that an enabled start begins with nothing.
 void DaemonControl::startClean() {
-    auto* manager = ConnectionManager::getInstance();
     const std::string status = setting("COMMUNICATION_STATUS");
     if (status.empty() || status == "disabled") {
         logLine(LOG_NOTICE, "DaemonControl::run - Update local comm mode.\n");
         TavikClient::getInstance()->updateLocalCommStatus("connecting");
     }
     if (remoteAccessEnabled) {
+        // An earlier run may have ended without removing its mappings or its tunnel.
         logLine(LOG_NOTICE, "DaemonControl::run - Kill direct connection comm mode.\n");
-        manager->killConnection(PORTFORWARDED);
+        ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
         VPNManager::getInstance()->cleanupVPNConnection();
     }
+    logLine(LOG_INFO, "DaemonControl::run - nslookup check interval %ld\n",
+            ConnectionManager::getInstance()->getDNSCheckInterval());
     unsigned upnp = 0;
     unsigned natpmp = 0;
-    logLine(LOG_INFO, "DaemonControl::run - nslookup check interval %ld\n",
-            manager->getDNSCheckInterval());
-    manager->getReqPortMappingLifetime(upnp, natpmp);
+    ConnectionManager::getInstance()->getReqPortMappingLifetime(upnp, natpmp);
     logLine(LOG_INFO, "DaemonControl::run - UPnP lifetime %u, NAT-PMP lifetime %u\n", upnp, natpmp);
 }
 
 void DaemonControl::runCycle() {
-    auto* manager = ConnectionManager::getInstance();
-    auto* client = TavikClient::getInstance();
-    manager->checkConnection(lastConnectionType);
-    lastConnectionType = manager->createConnection();
-    const int serverSleepTime = client->getServerSleepTime();
+    ConnectionManager::getInstance()->checkConnection(lastConnectionType);
+    lastConnectionType = ConnectionManager::getInstance()->createConnection();
+    const int serverSleepTime = TavikClient::getInstance()->getServerSleepTime();
     if (sleepTime >= serverSleepTime) {
         logLine(LOG_INFO, "DaemonControl::run - sleep %d secs.\n", sleepTime);
         pause(sleepTime);
@@ -73,16 +73,16 @@ void DaemonControl::runCycle() {
                 serverSleepTime);
         pause(serverSleepTime);
     }
-    client->resetServerSleepTime();
+    TavikClient::getInstance()->resetServerSleepTime();
 }
 
-// Sleeps unless a termination signal came, be it while the cycle ran or at the last instant: the
-// signals are let in by the wait alone.
 void DaemonControl::pause(int seconds) const {
-    const SignalBlock untilWaiting{SIGINT, SIGTERM, SIGQUIT};
+    // Held back from before the look at the switch until ppoll waits: a signal that came during
+    // the cycle, or comes in between, ends the pause instead of being slept over.
+    const SignalBlock held{SIGINT, SIGTERM, SIGQUIT};
     if (!remoteAccessEnabled) return;
     const timespec length{seconds, 0};
-    ppoll(nullptr, 0, &length, &untilWaiting.previousMask());
+    static_cast<void>(ppoll(nullptr, 0, &length, &held.previousMask()));
 }
 
 void DaemonControl::shutDown() {
@@ -92,12 +92,13 @@ void DaemonControl::shutDown() {
     ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
     ConnectionManager::getInstance()->killConnection(RELAYED);
     logLine(LOG_INFO, "DaemonControl::run - Remote access disabled.\n");
-    // The handler has put that signal back to its default action: this ends the process.
-    if (terminationRequested()) kill(getpid(), sigConnKilled);
+    // sigTrap gave the signal its default action back, so whoever waits for this process sees
+    // that it ended by that signal.
+    if (terminationRequested()) static_cast<void>(kill(getpid(), sigConnKilled));
 }
 
 void DaemonControl::setSleepTime(int seconds) {
-    sleepTime = std::clamp(seconds, kShortestPeriod, kLongestPeriod);
+    sleepTime = std::clamp(seconds, kLeastSleepTime, kMostSleepTime);
 }
 
 void DaemonControl::enableRemoteAccess() {

@@ -1,5 +1,6 @@
 #include "daemon/signals.h"
 
+#include <cerrno>
 #include <csignal>
 #include <initializer_list>
 
@@ -11,27 +12,27 @@ namespace pelorus {
 
 namespace {
 
-void terminate(int sig, const char* message) {
-    logLine(LOG_ERR, "%s", message);
+void leaveBySignal(int sig) {
     DaemonControl::getInstance()->disableRemoteAccess();
     DaemonControl::getInstance()->stop();
-    signal(sig, SIG_DFL);
+    static_cast<void>(std::signal(sig, SIG_DFL));
     sigConnKilled = sig;
     logLine(LOG_INFO, "sigTrap - sigConnKilled is set to incoming signal.\n");
 }
 
-}  // namespace
-
-void sigTrap(int sig) {
+void handle(int sig) {
     switch (sig) {
         case SIGINT:
-            terminate(sig, "sigTrap - Received SIGINT signal.\n");
+            logLine(LOG_ERR, "sigTrap - Received SIGINT signal.\n");
+            leaveBySignal(sig);
             break;
         case SIGQUIT:
-            terminate(sig, "sigTrap - Received SIGQUIT signal.\n");
+            logLine(LOG_ERR, "sigTrap - Received SIGQUIT signal.\n");
+            leaveBySignal(sig);
             break;
         case SIGTERM:
-            terminate(sig, "sigTrap - Received SIGTERM signal.\n");
+            logLine(LOG_ERR, "sigTrap - Received SIGTERM signal.\n");
+            leaveBySignal(sig);
             break;
         case _SIGENABLEREMOTEACCESS:
             DaemonControl::getInstance()->enableRemoteAccess();
@@ -47,9 +48,17 @@ void sigTrap(int sig) {
     }
 }
 
+}  // namespace
+
+void sigTrap(int sig) {
+    const int interruptedErrno = errno;
+    handle(sig);
+    errno = interruptedErrno;
+}
+
 bool installSignalHandlers() {
     for (const int sig : {SIGINT, SIGTERM, SIGQUIT}) {
-        if (signal(sig, sigTrap) == SIG_ERR) return false;
+        if (std::signal(sig, sigTrap) == SIG_ERR) return false;
     }
     return true;
 }

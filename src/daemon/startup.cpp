@@ -6,8 +6,9 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <optional>
+#include <string>
 
-#include "common/handles.h"
 #include "common/log.h"
 #include "common/termination.h"
 #include "config/global_config.h"
@@ -25,22 +26,37 @@ namespace {
 constexpr const char* kPidFile = "/tmp/tavik_cm_pid";
 constexpr const char* kStaticConfigVariable = "TAVIK_STATIC_CONFIG";
 constexpr const char* kDefaultStaticConfig = "/var/www/rest-api/config/globalconfig.ini";
-constexpr mode_t kFileMask = 077;
+constexpr mode_t kUmask = 077;
+constexpr mode_t kPidFileMode = 0666;  // before the umask
 
-// Without a log option syslog is left as the C library has it.
+void trapTerminationSignals() {
+    if (installSignalHandlers()) return;
+    // Names SIGINT whichever signal it was; scripts look for this text.
+    std::perror("main - failed to install SIGINT handler function.\n");
+    std::exit(EXIT_FAILURE);
+}
+
+Options readCommandLine(int argc, char** argv) {
+    Options options;
+    const std::optional<int> status = parseCommandLine(argc, argv, options);
+    if (status) std::exit(*status);
+    return options;
+}
+
+// Without a log option the defaults of the C library stay in force.
 void openLog(const Options& options) {
     if (!options.log && !options.logToConsole) return;
-    setlogmask(LOG_UPTO(options.severity));
+    setlogmask((1 << (options.severity + 1)) - 1);
     openlog("Pelorus", options.logToConsole ? LOG_CONS : 0, LOG_LOCAL0);
     logLine(LOG_ALERT, "main - syslog severity level set to %d.\n", options.severity);
 }
 
-// Goes on in a child that leads a session of its own, and returns the session's id.
-pid_t daemonize() {
+// Goes on in the child; returns its session id.
+pid_t becomeDaemon() {
     const pid_t child = fork();
     if (child < 0) std::exit(EXIT_FAILURE);
     if (child > 0) std::exit(EXIT_SUCCESS);
-    umask(kFileMask);
+    umask(kUmask);
     const pid_t session = setsid();
     if (session < 0 || chdir("/") != 0) std::exit(EXIT_FAILURE);
     return session;
@@ -53,21 +69,26 @@ void logBanner(pid_t session) {
             "pelorus", GetPelorusVersion(), getpid(), session);
 }
 
-// /tmp is everybody's: a link planted there must not lead the write elsewhere.
+// The folder is everybody's: a link planted there must not redirect the write.
 void writePidFile() {
     const int file =
-        open(kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, S_IRUSR | S_IWUSR);
+        open(kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, kPidFileMode);
     if (file < 0) return;
-    const FileHandle stream{fdopen(file, "w")};
-    if (stream) static_cast<void>(std::fprintf(stream.get(), "%d", getpid()));
+    static_cast<void>(dprintf(file, "%d", getpid()));
+    static_cast<void>(close(file));
 }
 
 bool loadConfiguration() {
     const char* path = std::getenv(kStaticConfigVariable);
-    return GlobalConfig::getInstance()->loadConfig(path == nullptr ? kDefaultStaticConfig : path);
+    if (GlobalConfig::getInstance()->loadConfig(path != nullptr ? path : kDefaultStaticConfig)) {
+        return true;
+    }
+    logLine(LOG_ERR, "main - config file failed to load.\n");
+    return false;
 }
 
-void chooseInitialState(const Options& options) {
+// A start that leaves remote access off runs no cycle: the main loop only tears down.
+void switchRemoteAccess(const Options& options) {
     if (!options.unmapAll && setting("ENABLEREMOTEACCESS") == "1") {
         DaemonControl::getInstance()->enableRemoteAccess();
         // A signal that came before must not be undone; one that comes later disables by itself.
@@ -77,7 +98,7 @@ void chooseInitialState(const Options& options) {
     }
 }
 
-void handOverTunables(const Options& options) {
+void handOver(const Options& options) {
     DaemonControl::getInstance()->setSleepTime(options.frequency);
     ConnectionManager::getInstance()->setDNSCheckInterval(options.dnsCheckInterval);
     if (options.portMapLifetime) {
@@ -90,33 +111,24 @@ void handOverTunables(const Options& options) {
 }
 
 [[noreturn]] void endProcess(int status) {
-    close(STDIN_FILENO);
-    close(STDOUT_FILENO);
-    close(STDERR_FILENO);
+    for (const int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+        static_cast<void>(close(stream));
+    }
     std::exit(status);
 }
 
 }  // namespace
 
 void runPelorus(int argc, char** argv) {
-    DaemonControl::getInstance();  // made before the signal handler can ask for it
-    if (!installSignalHandlers()) {
-        // One text for all three signals.
-        std::perror("main - failed to install SIGINT handler function.\n");
-        std::exit(EXIT_FAILURE);
-    }
-    Options options;
-    if (const auto status = parseCommandLine(argc, argv, options)) std::exit(*status);
+    trapTerminationSignals();
+    const Options options = readCommandLine(argc, argv);
     openLog(options);
-    const pid_t session = daemonize();
+    const pid_t session = becomeDaemon();
     logBanner(session);
     writePidFile();
-    if (!loadConfiguration()) {
-        logLine(LOG_ERR, "main - config file failed to load.\n");
-        endProcess(EXIT_FAILURE);
-    }
-    chooseInitialState(options);
-    handOverTunables(options);
+    if (!loadConfiguration()) endProcess(EXIT_FAILURE);
+    switchRemoteAccess(options);
+    handOver(options);
     DaemonControl::getInstance()->run();
     endProcess(EXIT_SUCCESS);
 }

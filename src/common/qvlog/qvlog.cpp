@@ -9,7 +9,6 @@ namespace {
 constexpr int kTextValue = 3;
 }
 
-// NOLINTNEXTLINE(bugprone-reserved-identifier): the library's own name for its entry point
 void __qvlog_kvp(int /*level*/, const char* event, ...) {
     std::string line = event;
     va_list pairs;

@@ -3,6 +3,7 @@
 #ifndef QVLOG_H
 #define QVLOG_H
 
+/* NOLINTBEGIN(bugprone-reserved-identifier): the names are the library's own */
 /* Ends the list of key, kind and value. */
 #define __QVLOG_END ((const char*)0)
 
@@ -14,6 +15,7 @@ extern "C" {
  * __QVLOG_END. The only value kind this stand-in knows is 3, a C string; a pair of another kind
  * ends the line there. */
 void __qvlog_kvp(int level, const char* event, ...);
+/* NOLINTEND(bugprone-reserved-identifier) */
 
 #ifdef __cplusplus
 }

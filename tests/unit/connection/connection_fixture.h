@@ -1,0 +1,180 @@
+// The fixture of the connection room: the real classes of all rooms below it, between a fake
+// gateway, a fake web and a tunnel whose start command writes its output.
+#ifndef PELORUS_UNIT_CONNECTION_FIXTURE_H
+#define PELORUS_UNIT_CONNECTION_FIXTURE_H
+
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "cloud/tavik_client.h"
+#include "connection/connection_manager.h"
+#include "connection/network_addrs.h"
+#include "relay/vpn_manager.h"
+#include "support/fake_files.h"
+#include "support/fake_gateway.h"
+#include "support/fake_web.h"
+#include "support/fixture.h"
+
+namespace pelorus {
+
+using support::expectLogged;
+using support::expectLoggedInOrder;
+using support::expectNotLogged;
+using support::FakeGateway;
+using support::FakeWeb;
+using support::Texts;
+
+inline constexpr const char* kLanIp = "192.168.77.10";
+inline constexpr const char* kWanIp = "44.128.0.20";
+inline constexpr const char* kRelayIp = "44.128.0.1";
+inline const std::string kPassed =
+    "<s>Success</s><remote_external_ip>44.128.0.20</remote_external_ip>"
+    "<req_device_id>a</req_device_id><resp_device_id>a</resp_device_id>";
+inline const std::string kNotReached =
+    "<s>Failure</s><remote_external_ip>44.128.0.20</remote_external_ip>";
+inline const std::string kOtherNat =
+    "<s>Failure</s><remote_external_ip>44.128.9.9</remote_external_ip>";
+
+/// Names a case of a table by its row.
+struct RowName {
+    template <typename Row>
+    std::string operator()(const ::testing::TestParamInfo<Row>& row) const {
+        return row.param.name;
+    }
+};
+
+class ConnectionTest : public support::PelorusTest {
+protected:
+    ConnectionTest() {
+        web.reset();
+        gateway.reset();
+        files.reset();
+        web.answer("/setstatus", "success");
+        web.answer("/setforward", "success");
+        web.answer("/delforward", "success");
+        web.answer("/setlanip", "success");
+        web.answer("/remote_access_status/", "<action>proceed</action>");
+        web.answer("/forward?", "Success");
+        web.answer("/lanip?", "Success");
+        web.answer("/test?", kPassed);
+        diskIsAwake();
+        givenConfig({{"SERVER_BASE_URL", "https://cloud.kavra.example"},
+                     {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"},
+                     {"REMOTE_SETFORWARDURL", "/forward?%s&%s&%s&%d&%d&%s"},
+                     {"REMOTE_SETCOMMSTATUSURL", "/lanip?%s&%s&%s"},
+                     {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/setforward?%s&%d&%d&%s&%d"},
+                     {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/delforward?%d"},
+                     {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/setstatus?%s"},
+                     {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/setlanip?%s"},
+                     {"OPENVPN_CONFIG_PATH", folder},
+                     {"OPENVPN_AUTH_FILE", path("auth.txt")},
+                     {"STARTCMD", "start-client"},
+                     {"STARTCMD_OUTFILE", path("client.out")},
+                     {"LOG_SUCCESS_TEXT", "Completed"},
+                     {"OPENVPN_PID_FILE", path("client.pid")}},
+                    {{"INTERNAL_HTTP_PORT", "80"}, {"INTERNAL_HTTPS_PORT", "443"}});
+    }
+
+    void TearDown() override {
+        web.checkBalance();
+        gateway.checkReleased();
+        PelorusTest::TearDown();
+    }
+
+    ConnectionManager& manager() { return *ConnectionManager::getInstance(); }
+
+    void diskIsAwake() {
+        commands.answer("hdparm", "drive state is:  active/idle\n");
+        files.redirect(support::kIdleMinutesFile, writeFile("minutes", "0\n"));
+    }
+    void diskIsAsleep() { commands.answer("hdparm", "drive state is:  standby\n"); }
+    /// The tunnel comes up when it is started.
+    void relayWorks() {
+        support::FakeCommands::Answer start;
+        start.action = [this](const std::string&) {
+            writeFile("client.out", std::string{"Peer Connection Initiated with [AF_INET]"} +
+                                        kRelayIp + ":1194\nCompleted\n");
+        };
+        commands.answer("start-client", start);
+    }
+
+    /// One pass of the main loop, without the check of the public names.
+    ConnectionType cycle(long pause = 120) {
+        const ConnectionType type = manager().createConnection();
+        clock.advance(pause);
+        TavikClient::getInstance()->resetServerSleepTime();
+        return type;
+    }
+    /// Starts as the main loop does, reaches PORTFORWARDED (through 9091 and 9444 when nothing
+    /// stands against it) and forgets what was asked and logged.
+    void givenForwardedPorts() {
+        manager().killConnection(PORTFORWARDED);
+        ASSERT_EQ(cycle(), PORTFORWARDED);
+        setConfig("COMMUNICATION_STATUS", "portforwarded");
+        forget();
+    }
+    void forget() {
+        web.clear();
+        gateway.clear();
+        commands.clear();
+        log.clear();
+    }
+
+    /// The external ports that lead to this device, in order.
+    std::vector<int> mappedPorts() const {
+        std::vector<int> ports;
+        for (const auto& mapping : gateway.mappings()) {
+            if (mapping.client == kLanIp) ports.push_back(mapping.externalPort);
+        }
+        return ports;
+    }
+    /// The ports the server was asked to test, in order.
+    std::vector<int> testedPorts() const {
+        std::vector<int> ports;
+        for (const auto& url : web.urls()) {
+            const auto at = url.find("&port=");
+            if (at != std::string::npos) ports.push_back(std::stoi(url.substr(at + 6)));
+        }
+        return ports;
+    }
+    /// The status words told to the local back end, in order.
+    Texts statusWords() const { return tails("/setstatus?"); }
+    /// The mapping records sent to the server: external address, LAN address, ports.
+    Texts records() const {
+        Texts found = tails(std::string{"/forward?"} + support::kDeviceId + "&");
+        for (auto& text : found) text = text.substr(0, text.rfind('&'));
+        return found;
+    }
+    /// The analytics events, as "state/type".
+    Texts events() const {
+        Texts found;
+        for (const auto& text : log.texts()) {
+            const std::string start = "cloudConnectivity state=";
+            if (text.rfind(start, 0) != 0) continue;
+            std::string event = text.substr(start.size());
+            event.replace(event.find(" type="), 6, "/");
+            found.push_back(event);
+        }
+        return found;
+    }
+
+    FakeWeb& web = FakeWeb::get();
+    FakeGateway& gateway = FakeGateway::get();
+    support::FakeFiles& files = support::FakeFiles::get();
+
+private:
+    Texts tails(const std::string& part) const {
+        Texts found;
+        for (const auto& url : web.urls()) {
+            const auto at = url.find(part);
+            if (at != std::string::npos) found.push_back(url.substr(at + part.size()));
+        }
+        return found;
+    }
+};
+
+}  // namespace pelorus
+
+#endif

@@ -2,9 +2,10 @@
 
 from __future__ import annotations
 
-import subprocess
 from dataclasses import dataclass
 from pathlib import Path
+
+from lab.support import run_tool
 
 
 @dataclass(frozen=True)
@@ -13,10 +14,6 @@ class KeyPair:
 
     certificate: Path
     key: Path
-
-
-def _openssl(*arguments: str) -> None:
-    subprocess.run(["openssl", *arguments], check=True, capture_output=True)
 
 
 def _new_key(*arguments: str) -> tuple[str, ...]:
@@ -31,7 +28,7 @@ class Authority:
         self._folder = folder
         folder.mkdir(parents=True, exist_ok=True)
         self._own = KeyPair(folder / "ca.crt", folder / "ca.key")
-        _openssl(*_new_key("-subj", f"/CN={name}", "-keyout", str(self._own.key),
+        run_tool("openssl", *_new_key("-subj", f"/CN={name}", "-keyout", str(self._own.key),
                            "-out", str(self._own.certificate),
                            "-addext", "keyUsage=critical,keyCertSign,cRLSign"))
 
@@ -43,7 +40,7 @@ class Authority:
     def sign(self, host_name: str) -> KeyPair:
         """A server certificate for one name."""
         pair = KeyPair(self._folder / f"{host_name}.crt", self._folder / f"{host_name}.key")
-        _openssl(*_new_key("-subj", f"/CN={host_name}", "-keyout", str(pair.key),
+        run_tool("openssl", *_new_key("-subj", f"/CN={host_name}", "-keyout", str(pair.key),
                            "-out", str(pair.certificate), "-CA", str(self._own.certificate),
                            "-CAkey", str(self._own.key),
                            "-addext", f"subjectAltName=DNS:{host_name}",

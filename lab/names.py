@@ -9,8 +9,9 @@ import threading
 from pathlib import Path
 
 from lab import network
+from lab.account import DOMAIN
 from lab.server import Server
-from lab.waiting import wait_until
+from lab.support import wait_until
 
 _TYPE_A, _CLASS_INTERNET = 1, 1
 
@@ -25,9 +26,9 @@ class Names:
         self._table: dict[str, str] = {}
         self._lock = threading.Lock()
         self.server = Server("dnsmasq", network.INTERNET, [
-            "dnsmasq", "--keep-in-foreground", "--conf-file=/dev/null", "--user=root",
-            "--group=root", "--no-resolv", "--no-hosts", "--bind-interfaces", "--local-ttl=0",
-            f"--listen-address={network.SERVICE_ADDRESS}", "--log-facility=-", "--log-queries",
+            "dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--no-resolv", "--no-hosts",
+            "--bind-interfaces", f"--listen-address={network.SERVICE_ADDRESS}", "--local-ttl=0",
+            f"--local={DOMAIN.replace('.', '/', 1)}/", "--log-queries", "--log-facility=-",
             f"--addn-hosts={self._hosts}", f"--pid-file={folder}/pid"], folder / "log")
 
     def start(self) -> None:
@@ -60,11 +61,12 @@ class Names:
         with asking:
             asking.settimeout(0.5)
             try:
-                asking.sendto(query, (network.SERVICE_ADDRESS, 53))
+                asking.connect((network.SERVICE_ADDRESS, 53))
+                asking.send(query)
                 reply = asking.recv(512)
             except OSError:
                 return None
-        # Every record of so short an answer is a 12-byte head with a compressed name and an address.
+        # Each record is 16 bytes: its head, the name compressed to a pointer, and the address.
         count = struct.unpack(">H", reply[6:8])[0]
         body = reply[len(query):]
         return [socket.inet_ntoa(body[16 * i + 12:16 * i + 16]) for i in range(count)]

@@ -9,6 +9,8 @@ from collections.abc import Iterator
 from contextlib import contextmanager
 from pathlib import Path
 
+from lab.support import run_tool
+
 _CLONE_NEWNET = 0x40000000
 _libc = ctypes.CDLL(None, use_errno=True)
 
@@ -19,7 +21,7 @@ GATEWAY_WAN_ADDRESS, SERVICE_ADDRESS, RELAY_ADDRESS = "44.128.0.20", "44.128.0.1
 
 def ip(*arguments: str) -> None:
     """Run one `ip` command that must succeed."""
-    subprocess.run(["ip", *arguments], check=True)
+    run_tool("ip", *arguments)
 
 
 def command(host: str, *argv: str) -> list[str]:
@@ -53,7 +55,8 @@ def raise_home_network() -> None:
         ip("netns", "add", host)
         ip("-n", host, "link", "set", "lo", "up")
     _cable((DEVICE, "eth0", f"{DEVICE_ADDRESS}/24"), (GATEWAY, "lan", f"{GATEWAY_LAN_ADDRESS}/24"))
-    _cable((GATEWAY, "wan", f"{GATEWAY_WAN_ADDRESS}/24"), (INTERNET, "net", f"{SERVICE_ADDRESS}/24"))
+    _cable((GATEWAY, "wan", f"{GATEWAY_WAN_ADDRESS}/24"),
+           (INTERNET, "net", f"{SERVICE_ADDRESS}/24"))
     ip("-n", INTERNET, "address", "add", f"{RELAY_ADDRESS}/24", "dev", "net")
     ip("-n", DEVICE, "route", "add", "default", "via", GATEWAY_LAN_ADDRESS)
     ip("-n", GATEWAY, "route", "add", "default", "via", SERVICE_ADDRESS)

@@ -7,12 +7,17 @@ the namespaces with their mounts, so nothing has to be cleaned up by hand.
 
 from __future__ import annotations
 
+import functools
 import os
 import signal
 import stat
 import subprocess
 import sys
+from collections.abc import Iterator
+from contextlib import contextmanager, nullcontext
 from pathlib import Path
+
+from lab.support import run_tool
 
 FORBIDDEN = 77
 PROJECT = Path(__file__).resolve().parent.parent
@@ -21,6 +26,7 @@ PYTHON = "/usr/bin/python3"
 # unshare outlives a killed parent unless it is told not to; its child then dies with it.
 _UNSHARE = ["setpriv", "--pdeathsig", "KILL", "unshare", "--user", "--map-root-user", "--net",
             "--mount", "--pid", "--uts", "--fork", "--mount-proc", "--kill-child"]
+_PROBE = "mount -t tmpfs probe /run && ip netns add probe && nft add table inet probe"
 _INSIDE = "PELORUS_LAB_INSIDE"
 _PID_PIPE = "PELORUS_LAB_PID_PIPE"
 _PRIVATE = ("/tmp", "/run", "/dev", "/mnt", "/etc")
@@ -38,10 +44,12 @@ def is_inside() -> bool:
     return _INSIDE in os.environ
 
 
+@functools.cache
 def why_forbidden() -> str | None:
     """None where this machine lets us make namespaces, else the reason in one line."""
     try:
-        probe = subprocess.run([*_UNSHARE, "true"], capture_output=True, text=True, check=False)
+        probe = subprocess.run([*_UNSHARE, "sh", "-c", _PROBE], capture_output=True, text=True,
+                               check=False)
     except FileNotFoundError as missing:
         return f"{missing.filename} is not installed"
     if probe.returncode == 0:
@@ -66,14 +74,12 @@ def run(module: str, arguments: list[str], timeout: float | None = None,
         stderr=subprocess.STDOUT if capture else None)
     os.close(read_end)
     _tell_pid(process, write_end)
-    restore = {} if capture else _end_with(process)
     try:
-        text, _ = process.communicate(timeout=timeout)
+        with nullcontext() if capture else _ending_with(process):
+            text, _ = process.communicate(timeout=timeout)
     finally:
         process.kill()
         process.wait()
-        for number, handler in restore.items():
-            signal.signal(number, handler)
     return subprocess.CompletedProcess(process.args, process.returncode, text, "")
 
 
@@ -94,29 +100,27 @@ def _tell_pid(process: subprocess.Popen[str], write_end: int) -> None:
                 return
 
 
-def _end_with(process: subprocess.Popen[str]) -> dict[int, object]:
-    """Make the signals that end this process end the sandbox; returns the handlers replaced."""
-    interrupts = 0
+@contextmanager
+def _ending_with(process: subprocess.Popen[str]) -> Iterator[None]:
+    """Let the signals that end this process end the sandbox first."""
+    received: list[int] = []
 
-    def on_interrupt(_number: int, _frame: object) -> None:
-        nonlocal interrupts
-        interrupts += 1
-        if interrupts > 1:
+    def on_signal(number: int, _frame: object) -> None:
+        received.append(number)
+        if number != signal.SIGINT or received.count(number) > 1:
             process.kill()
 
-    def on_end(number: int, _frame: object) -> None:
-        process.kill()
-        process.wait()
-        signal.signal(number, signal.SIG_DFL)
-        os.kill(os.getpid(), number)
-
-    return {signal.SIGINT: signal.signal(signal.SIGINT, on_interrupt),
-            signal.SIGTERM: signal.signal(signal.SIGTERM, on_end),
-            signal.SIGHUP: signal.signal(signal.SIGHUP, on_end)}
+    numbers = (signal.SIGINT, signal.SIGTERM, signal.SIGHUP)
+    before = {number: signal.signal(number, on_signal) for number in numbers}
+    yield
+    for number, handler in before.items():
+        signal.signal(number, handler)
+    if received and received[-1] != signal.SIGINT:
+        os.kill(os.getpid(), received[-1])
 
 
 def _mount(*arguments: str) -> None:
-    subprocess.run(["mount", *arguments], check=True)
+    run_tool("mount", *arguments)
 
 
 def _hold(paths: list[Path]) -> list[tuple[int, Path]]:
@@ -164,8 +168,8 @@ def _private_etc() -> None:
             Path("/etc", entry.name).symlink_to(entry)
     for name, text in own.items():
         Path("/etc", name).write_text(text)
-    for name in ("ssl", "netns"):
-        Path("/etc", name).mkdir()
+    Path("/etc/ssl").mkdir()
+    Path("/etc/ssl/openssl.cnf").symlink_to(host / "ssl/openssl.cnf")
 
 
 def _furnish() -> None:

@@ -7,7 +7,10 @@ from collections.abc import Callable
 from pathlib import Path
 
 from lab import network
-from lab.waiting import LabError, last_lines, wait_until
+from lab.support import LabError, last_lines, wait_until
+
+# The log socket is the device's; a server elsewhere must not be heard on it.
+_NO_SYSLOG = ("sh", "-c", 'mount --bind /dev/null /dev/log && exec "$@"', "sh")
 
 
 class Server:
@@ -24,15 +27,23 @@ class Server:
         """Start the process and return once `answers` holds; fail with its last words if never."""
         self.log.parent.mkdir(parents=True, exist_ok=True)
         with self.log.open("ab") as log:
-            self._process = subprocess.Popen(network.command(self._host, *self._argv),
+            self._process = subprocess.Popen(network.command(self._host, *_NO_SYSLOG,
+                                                             *self._argv),
                                              stdin=subprocess.DEVNULL, stdout=log, stderr=log)
         try:
             wait_until(lambda: self._ended() or answers(), f"{self.name} to answer", seconds)
         except LabError as late:
-            raise LabError(f"{late}\n{self.name}, end of its log:\n{last_lines(self.log)}") from None
+            raise LabError(f"{late}\n{self.name}, end of its log:\n"
+                           f"{last_lines(self.log)}") from None
         if self._ended():
             raise LabError(f"{self.name} ended with status {self._process.returncode} "
                            f"before it answered; end of its log:\n{last_lines(self.log)}")
+
+    def stop(self) -> None:
+        """End the process as its operator would and wait for it."""
+        assert self._process is not None
+        self._process.terminate()
+        self._process.wait(10)
 
     def send_signal(self, number: int) -> None:
         """Pass a signal to the running process."""

@@ -14,6 +14,7 @@ from urllib.parse import parse_qs, urlsplit
 
 from lab import network
 from lab.certificates import KeyPair
+from lab.support import wait_until
 
 
 @dataclass(frozen=True)
@@ -135,6 +136,12 @@ def fetch_from_here(url: str, trust: str | None = None, name: str | None = None,
             return response.read().decode(errors="replace")
     except (OSError, http.client.HTTPException):
         return None
+
+
+def expect_answer(server: str, host: str, url: str, trust: str | None = None,
+                  name: str | None = None) -> None:
+    """Return once `server` answers a client on `host`; fail naming it if it never does."""
+    wait_until(lambda: fetch(host, url, trust, name, 1), f"{server} to answer {url}", 10)
 
 
 def _port(scheme: str) -> int:

@@ -1,7 +1,8 @@
-"""Waiting for a state, and what is said when it never comes."""
+"""What every part of the lab uses: waiting for a state, running a tool, failing with evidence."""
 
 from __future__ import annotations
 
+import subprocess
 import time
 from collections.abc import Callable
 from pathlib import Path
@@ -25,6 +26,13 @@ def wait_until(condition: Callable[[], Seen], what: str, seconds: float,
         if time.monotonic() > deadline:
             raise LabError(f"waited {seconds:g} s in vain for {what}; last seen: {seen!r}")
         time.sleep(pause)
+
+
+def run_tool(*argv: str, text: str = "") -> None:
+    """Run a short command that must succeed, with `text` on its standard input."""
+    done = subprocess.run(argv, input=text, capture_output=True, text=True, check=False)
+    if done.returncode != 0:
+        raise LabError(f"{' '.join(argv)} failed: {done.stderr.strip() or done.stdout.strip()}")
 
 
 def last_lines(path: Path, count: int = 15) -> str:

@@ -1,0 +1,76 @@
+"""The daemon under test as a running process on the device."""
+
+from __future__ import annotations
+
+import glob
+import os
+import signal
+import subprocess
+from pathlib import Path
+
+from lab import device, network, sandbox
+from lab.support import LabError, wait_until
+
+PID_FILE = Path("/tmp/tavik_cm_pid")
+OUTPUT = device.HOME / "pelorus.out"
+
+
+class Daemon:
+    """One run of the daemon, from its start to the wait status it leaves."""
+
+    def __init__(self, options: tuple[str, ...], clock: int) -> None:
+        """Start it and return when it has detached; `clock` makes its time run that much faster.
+
+        It becomes a child of the sandbox's first process, which is the one that runs this code.
+        """
+        PID_FILE.unlink(missing_ok=True)
+        environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
+                       *_fast_clock(clock)]
+        argv = network.command(network.DEVICE, "env", "-i", *environment,
+                               str(sandbox.binary()), *options)
+        with OUTPUT.open("ab") as output:
+            started = subprocess.run(argv, stdin=subprocess.DEVNULL, stdout=output, stderr=output,
+                                     check=False)
+        if started.returncode != 0:
+            raise LabError(f"{argv[-1 - len(options)]} ended with status {started.returncode}: "
+                           f"{OUTPUT.read_text()}")
+        self.pid = int(wait_until(lambda: PID_FILE.exists() and PID_FILE.read_text(),
+                                  f"{PID_FILE}", 5))
+        self._status: int | None = None
+
+    def ended(self) -> str:
+        """How the daemon ended ("SIGTERM", "exit 0"); empty while it runs."""
+        if self._status is None:
+            pid, status = os.waitpid(self.pid, os.WNOHANG)
+            if pid == 0:
+                return ""
+            self._status = status
+        if os.WIFSIGNALED(self._status):
+            return signal.Signals(os.WTERMSIG(self._status)).name
+        return f"exit {os.WEXITSTATUS(self._status)}"
+
+    def stop(self, number: int = signal.SIGTERM, seconds: float = 60) -> str:
+        """Send a signal and return how the daemon ended."""
+        os.kill(self.pid, number)
+        return wait_until(self.ended, f"the daemon to end after signal {number}", seconds)
+
+
+def running(program: str) -> list[int]:
+    """Pids of the live processes that run a program of this name."""
+    found = []
+    for entry in Path("/proc").iterdir():
+        try:
+            if entry.name.isdigit() and Path(os.readlink(entry / "exe")).name == program:
+                found.append(int(entry.name))
+        except OSError:
+            continue  # gone, or only waiting to be reaped
+    return found
+
+
+def _fast_clock(factor: int) -> list[str]:
+    if factor == 1:
+        return []
+    libraries = glob.glob("/usr/lib/*/faketime/libfaketimeMT.so.1")
+    if not libraries:
+        raise LabError("libfaketime is not installed")
+    return [f"LD_PRELOAD={libraries[0]}", f"FAKETIME=+0 x{factor}"]

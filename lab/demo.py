@@ -1,0 +1,124 @@
+"""The main job on one machine: a device behind a real home router becomes reachable."""
+
+from __future__ import annotations
+
+import argparse
+import os
+import signal
+import subprocess
+import sys
+
+from lab import network, sandbox, web
+from lab.device import HOME
+from lab.gateway import GatewaySetup
+from lab.scenario import Lab, Situation
+from lab.support import LabError
+from lab.timeline import Timeline
+
+_PATIENCE = 55
+_INTERRUPTED = 130
+
+
+def main() -> int:
+    """Outside: build the daemon and open a sandbox for the demo. Inside: play it."""
+    parser = argparse.ArgumentParser(prog="scripts/demo", description=__doc__)
+    parser.add_argument("--stay", action="store_true",
+                        help="keep the lab up until Ctrl-C, to look around in it")
+    arguments = parser.parse_args()
+    if sandbox.is_inside():
+        return _play(arguments.stay)
+    reason = sandbox.why_forbidden()
+    if reason:
+        print(f"demo: this machine does not let us make network namespaces ({reason})")
+        return sandbox.FORBIDDEN
+    if "PELORUS" not in os.environ and not _build():
+        return 1
+    status = sandbox.run("lab.demo", sys.argv[1:]).returncode
+    return status if status >= 0 else 128 - status
+
+
+def _build() -> bool:
+    """Build the release preset; its output is shown only when it fails."""
+    print("building pelorus (release)", flush=True)
+    for argv in (["cmake", "--preset", "release"], ["cmake", "--build", "--preset", "release"]):
+        done = subprocess.run(argv, cwd=sandbox.PROJECT, stdout=subprocess.PIPE,
+                              stderr=subprocess.STDOUT, text=True, check=False)
+        if done.returncode != 0:
+            print(f"{done.stdout}\ndemo: {' '.join(argv)} failed", file=sys.stderr)
+            return False
+    return True
+
+
+def _play(stay: bool) -> int:
+    signal.signal(signal.SIGINT, signal.default_int_handler)
+    try:
+        _reach_the_device()
+        if stay:
+            _look_around()
+    except LabError as failure:
+        print(f"\nFAILED: {failure}")
+        return 1
+    except KeyboardInterrupt:
+        print("\ninterrupted, the lab is gone")
+        return _INTERRUPTED
+    return 0
+
+
+def _reach_the_device() -> None:
+    timeline = Timeline()
+    timeline.listen(lambda event: print(event, flush=True))
+    lab = Lab(Situation(gateway=GatewaySetup(upnp=True, natpmp=True)), timeline)
+    timeline.add("lab", "device, gateway, central service and name server answer")
+    try:
+        lab.start_daemon("-l", "7", "-f", "30")
+        lab.wait_for(lambda: lab.device.status == "portforwarded",
+                     "the device to be port forwarded", _PATIENCE)
+        _close(lab)
+    except LabError:
+        print(lab.report())
+        raise
+
+
+def _close(lab: Lab) -> None:
+    """Show the result from every side; fail unless the service really reached the device."""
+    record = lab.central.record
+    if record is None or not any(test.passed(lab.account) for test in lab.central.port_tests):
+        raise LabError("the status says portforwarded, but the central service did not get through")
+    urls = [f"http://{record.external_ip}:{record.http_port}/",
+            f"https://{record.external_ip}:{record.https_port}/"]
+    print(f"\nstatus          {lab.device.status}")
+    for url in urls:
+        page = web.fetch(network.INTERNET, url)
+        if page is None:
+            raise LabError(f"nothing answers at {url}")
+        print(f"external URL    {url}  says \"{page}\"")
+    for mapping in lab.gateway.mappings():
+        print(f"gateway rule    {mapping}")
+    print(f"central record  {record.external_ip}, HTTP {record.http_port}, "
+          f"HTTPS {record.https_port}, device at {record.local_ip}")
+    for name in lab.account.names:
+        print(f"public name     {name} -> {lab.names.resolve(name)}")
+
+
+def _look_around() -> None:
+    """Say how to get into the lab, and keep it up until Ctrl-C."""
+    enter = (f"nsenter --preserve-credentials -U -m -n -p -u -t {sandbox.pid_outside()} "
+             "ip netns exec")
+    print(f"""
+The lab stays up until Ctrl-C. From another terminal, as the same user:
+  a shell on the device   {enter} {network.DEVICE} sh
+  the device's log        {enter} {network.DEVICE} tail -f {HOME}/messages
+  the gateway's rules     {enter} {network.GATEWAY} nft list ruleset
+  the view from outside   {enter} {network.INTERNET} sh""", flush=True)
+    try:
+        while True:
+            signal.pause()
+    except KeyboardInterrupt:
+        print("\nthe lab is gone")
+
+
+if __name__ == "__main__":
+    try:
+        sys.exit(main())
+    except KeyboardInterrupt:
+        sys.exit(_INTERRUPTED)

@@ -1,0 +1,174 @@
+"""The storage device around the daemon: configuration, web server, local back end, disk."""
+
+from __future__ import annotations
+
+import threading
+from collections.abc import Mapping
+from pathlib import Path
+
+from lab import network, web
+from lab.account import SERVICE_HOST, Account
+from lab.central import IDENTITY_PATH
+from lab.certificates import Authority
+from lab.messages import Messages
+from lab.relay import CLIENT, OFFER
+from lab.timeline import Timeline
+from lab.web import Reply, Request, WebServer
+
+HOME = Path("/run/device")
+STATIC_FILE = HOME / "globalconfig.ini"
+DYNAMIC_FILE = HOME / "config/dynamicconfig.ini"
+DYNAMIC_COPY = Path("/tmp/dynamicconfig.ini")
+SLEEP_COUNT = Path("/tmp/minutes_since_disk_access")
+PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
+
+_TUNNEL = HOME / "openvpn"
+_HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {HOME}/drive_state)\"\n"
+
+# The tunnel's other end lives in real time, so the client must too when the device's clock is fast.
+_STATIC = {
+    "DYNAMIC_CONFIG": str(DYNAMIC_FILE.parent),
+    "DYNAMIC_CONFIG_TMP": str(DYNAMIC_COPY),
+    "DEVICETYPE": "1",
+    "ENABLEREMOTEACCESS": "1",
+    "SERVER_BASE_URL": f"https://{SERVICE_HOST}",
+    "REMOTE_TESTPORTURL":
+        "/api/1.0/rest/port_test/%s?external_ip=%s&port=%d&protocol=%s&auth=%s",
+    "REMOTE_SETFORWARDURL": "/api/1.0/rest/port_forward/%s?external_ip=%s&local_ip=%s"
+                            "&http_port=%d&https_port=%d&auth=%s",
+    "REMOTE_SETCOMMSTATUSURL": "/api/1.0/rest/comm_status/%s?auth=%s&local_ip=%s",
+    "LOCAL_SETFORWARDURL": "http://127.0.0.1:%d/local/port_forward?external_ip=%s&http_port=%d"
+                           "&https_port=%d&local_ip=%s&internal_port=%d",
+    "LOCAL_DELFORWARDURL": "http://127.0.0.1:%d/local/port_forward_delete?internal_port=%d",
+    "LOCAL_SETCOMMSTATUSURL": "http://127.0.0.1:%d/local/comm_status?status=%s",
+    "LOCAL_SETLOCALIPURL": "http://127.0.0.1:%d/local/local_ip?address=%s",
+    "OPENVPN_CONFIG_PATH": str(_TUNNEL),
+    "OPENVPN_AUTH_FILE": str(_TUNNEL / "auth.txt"),
+    "OPENVPN_PID_FILE": str(_TUNNEL / "openvpn.pid"),
+    "UPDATE_CONF_WITH_SERVER_CMD": "cp relay_servers.offered relay_servers.conf",
+    "STARTCMD": "env -u LD_PRELOAD openvpn --config client.conf --writepid openvpn.pid"
+                " > openvpn.out 2>&1 &",
+    "STARTCMD_OUTFILE": str(_TUNNEL / "openvpn.out"),
+    "LOG_SUCCESS_TEXT": "Initialization Sequence Completed",
+}
+
+
+class Device:
+    """What the daemon finds on its machine, and what its machine shows to others."""
+
+    def __init__(self, account: Account, authority: Authority, timeline: Timeline) -> None:
+        self.messages = Messages(HOME / "messages")
+        self.local_requests: list[Request] = []
+        self._account = account
+        self._authority = authority
+        self._timeline = timeline
+        self._lock = threading.Lock()
+
+    def start(self, static: Mapping[str, str], dynamic: Mapping[str, str]) -> None:
+        """Write the configuration (the arguments win over the usual values) and serve pages."""
+        self._write_system_files()
+        self._write_tunnel_files()
+        _write_settings(STATIC_FILE, {**_STATIC, **static})
+        _write_settings(DYNAMIC_FILE, {
+            "DEVICEID": self._account.device_id, "DEVICEAUTH": self._account.auth,
+            "SUBDOMAIN": self._account.subdomain, "COMMUNICATION_STATUS": "disabled",
+            "INTERNAL_HTTP_PORT": "80", "INTERNAL_HTTPS_PORT": "443", **dynamic})
+        self._serve()
+
+    @property
+    def status(self) -> str:
+        """The communication status as the device's dynamic configuration has it."""
+        return self.setting("COMMUNICATION_STATUS")
+
+    def setting(self, key: str) -> str:
+        """A value of the dynamic configuration, empty when absent."""
+        return _read_settings(DYNAMIC_FILE).get(key, "")
+
+    def change(self, **settings: str) -> None:
+        """Write settings the way other programs on the device do: both files, at once."""
+        with self._lock:
+            for path in (DYNAMIC_FILE, DYNAMIC_COPY):
+                if path.exists():
+                    _write_settings(path, {**_read_settings(path), **settings})
+
+    def statuses_told(self) -> list[str]:
+        """The status words the local back end was told, in order."""
+        return [request.argument("status") for request in self.local_requests
+                if request.path == "/local/comm_status"]
+
+    def tunnel_output(self) -> Path:
+        """The tunnel client's own output."""
+        return _TUNNEL / "openvpn.out"
+
+    def _write_system_files(self) -> None:
+        (HOME / "bin").mkdir(parents=True)
+        DYNAMIC_FILE.parent.mkdir()
+        hdparm = HOME / "bin/hdparm"
+        hdparm.write_text(_HDPARM)
+        hdparm.chmod(0o755)
+        (HOME / "drive_state").write_text("active/idle")
+        SLEEP_COUNT.write_text("0\n")
+        network.host_file(network.DEVICE, "resolv.conf", f"nameserver {network.SERVICE_ADDRESS}\n")
+        network.host_file(network.DEVICE, "ssl/certs/ca-certificates.crt",
+                          self._authority.certificate.read_text())
+
+    def _write_tunnel_files(self) -> None:
+        _TUNNEL.mkdir()
+        (_TUNNEL / "client.conf").write_text(CLIENT)
+        (_TUNNEL / "authority.crt").write_text(self._authority.certificate.read_text())
+        (_TUNNEL / "relay_servers.offered").write_text(OFFER)
+
+    def _serve(self) -> None:
+        """The web server on both internal ports, with a certificate only the device knows."""
+        own = Authority(HOME / "ssl", self._account.host_name).sign(self._account.host_name)
+        ports = {"http": int(self.setting("INTERNAL_HTTP_PORT")),
+                 "https": int(self.setting("INTERNAL_HTTPS_PORT"))}
+        for scheme, port in ports.items():
+            WebServer(network.DEVICE, "0.0.0.0", port, self._answer,
+                      own if scheme == "https" else None)
+            web.expect_answer(f"device ({scheme})", network.DEVICE,
+                              f"{scheme}://127.0.0.1:{port}/")
+
+    def _answer(self, request: Request) -> Reply:
+        if request.path == IDENTITY_PATH:
+            return Reply(f"<device_id>{self._account.device_id}</device_id>".encode())
+        if not request.path.startswith("/local/"):
+            return Reply(f"welcome to {self._account.host_name}, over {request.scheme}".encode())
+        if request.peer != "127.0.0.1":
+            return Reply(b"forbidden", 403)
+        return self._local_back_end(request)
+
+    def _local_back_end(self, request: Request) -> Reply:
+        """Write what the daemon tells into the device's configuration."""
+        with self._lock:
+            self.local_requests.append(request)
+        operation = request.path.removeprefix("/local/")
+        if operation == "comm_status":
+            self.change(COMMUNICATION_STATUS=request.argument("status"))
+            self._timeline.add("device", f"status: {request.argument('status')}")
+        elif operation == "port_forward":
+            self.change(EXTERNAL_IP=request.argument("external_ip"),
+                        EXTERNAL_HTTP_PORT=request.argument("http_port"),
+                        EXTERNAL_HTTPS_PORT=request.argument("https_port"),
+                        LOCAL_IP=request.argument("local_ip"))
+        elif operation == "port_forward_delete":
+            self.change(EXTERNAL_IP="", EXTERNAL_HTTP_PORT="0", EXTERNAL_HTTPS_PORT="0")
+        elif operation == "local_ip":
+            self.change(LOCAL_IP=request.argument("address"))
+        else:
+            return Reply(b"<result>failure</result>", 404)
+        return Reply(b"<result>success</result>")
+
+
+def _read_settings(path: Path) -> dict[str, str]:
+    lines = path.read_text(errors="surrogateescape").splitlines()
+    return dict(line.split("=", 1) for line in lines if "=" in line)
+
+
+def _write_settings(path: Path, settings: Mapping[str, str]) -> None:
+    """Replace the file in one step, so that the daemon never reads half of it."""
+    new = path.with_suffix(".new")
+    new.write_text("".join(f"{key}={value}\n" for key, value in settings.items()),
+                   errors="surrogateescape")
+    new.chmod(0o666)
+    new.replace(path)

@@ -1,0 +1,97 @@
+"""The relay: an openvpn server that lets the device in by its credentials."""
+
+from __future__ import annotations
+
+import socket
+from pathlib import Path
+
+from lab import network
+from lab.account import Account
+from lab.certificates import Authority
+from lab.server import Server
+
+_NAME = "relay.kavra.example"
+_SERVER = """
+local {address}
+port 1194
+proto udp
+dev tun
+topology subnet
+server 10.77.0.0 255.255.255.0
+ca {authority}
+cert {certificate}
+key {key}
+dh none
+verify-client-cert none
+script-security 2
+auth-user-pass-verify {folder}/check via-file
+username-as-common-name
+tmp-dir {folder}
+management {folder}/management unix
+verb 3
+"""
+# openvpn hands over a file of two lines, user name and password.
+_CHECK = """#!/bin/sh
+exec cmp -s "$1" {folder}/credentials
+"""
+CLIENT = f"""client
+dev tun
+proto udp
+nobind
+config relay_servers.conf
+ca authority.crt
+verify-x509-name {_NAME} name
+remote-cert-tls server
+auth-user-pass auth.txt
+auth-nocache
+auth-retry none
+verb 3
+"""
+OFFER = f"remote {network.RELAY_ADDRESS} 1194\n"
+
+
+class Relay:
+    """The openvpn server on the internet side."""
+
+    def __init__(self, folder: Path, account: Account, authority: Authority) -> None:
+        self._folder = folder
+        self._account = account
+        self._authority = authority
+        self.server = Server("openvpn relay", network.INTERNET,
+                             ["openvpn", "--config", str(folder / "server.conf")], folder / "log")
+
+    def start(self) -> None:
+        """Start the server; its management console must answer and its tunnel device stand."""
+        self._folder.mkdir(parents=True)
+        identity = self._authority.sign(_NAME)
+        (self._folder / "server.conf").write_text(_SERVER.format(
+            address=network.RELAY_ADDRESS, folder=self._folder, key=identity.key,
+            certificate=identity.certificate, authority=self._authority.certificate))
+        (self._folder / "credentials").write_text(
+            f"{self._account.device_id}\n{self._account.auth}\n")
+        check = self._folder / "check"
+        check.write_text(_CHECK.format(folder=self._folder))
+        check.chmod(0o755)
+        self.server.start(lambda: "Initialization Sequence Completed" in self.server.log.read_text()
+                          and self._status())
+
+    def client_address(self) -> str:
+        """The address inside the tunnel of the connected device; empty when there is none."""
+        for line in self._status().splitlines():
+            fields = line.split(",")
+            if fields[0] == "CLIENT_LIST" and fields[1] == self._account.device_id:
+                return fields[3]
+        return ""
+
+    def _status(self) -> str:
+        """What the management console says about the clients; empty when it does not answer."""
+        console = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
+        with console:
+            console.settimeout(2)
+            try:
+                console.connect(str(self._folder / "management"))
+                console.sendall(b"status 2\n")
+                with console.makefile() as answer:
+                    return "".join(iter(answer.readline, "END\n"))
+            except OSError:
+                return ""

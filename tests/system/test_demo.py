@@ -1,0 +1,89 @@
+"""The demo as its user meets it: what it says, how it ends, and that it leaves nothing behind."""
+
+from __future__ import annotations
+
+import os
+import re
+import signal
+import subprocess
+from pathlib import Path
+
+import pytest
+
+from lab import sandbox
+from lab.support import wait_until
+
+pytestmark = pytest.mark.outside
+
+DAEMON_FILES = (Path("/tmp/tavik_cm_pid"), Path("/tmp/dynamicconfig.ini"))
+
+
+def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Popen[str]:
+    """The demo in a session of its own, as in a terminal, with a daemon that is built already."""
+    environment = dict(os.environ, PELORUS=str(binary))
+    return subprocess.Popen([sandbox.PYTHON, "-m", "lab.demo", *options], env=environment,
+                            cwd=sandbox.PROJECT, stdout=subprocess.PIPE, text=True,
+                            stderr=subprocess.STDOUT, start_new_session=True)
+
+
+def traces() -> tuple[list[str], list[bool]]:
+    """The machine's mounts, and whether the daemon's files are there."""
+    mounts = sorted(Path("/proc/self/mountinfo").read_text().splitlines())
+    return mounts, [file.exists() for file in DAEMON_FILES]
+
+
+def processes_in(pid_namespace: str) -> list[str]:
+    """Live processes of one sandbox, seen from outside."""
+    found = []
+    for entry in Path("/proc").iterdir():
+        try:
+            if entry.name.isdigit() and os.readlink(entry / "ns/pid") == pid_namespace:
+                found.append(entry.name)
+        except OSError:
+            continue  # ended meanwhile
+    return found
+
+
+def test_demo_shows_the_way_and_ends_well():
+    before = traces()
+    demo = start_demo()
+    text, _ = demo.communicate(timeout=90)
+    assert demo.returncode == 0, text
+    steps = ["gateway found through UPnP", "external address: 44.128.0.20",
+             "forwards TCP 9091 -> 192.168.77.10:80", "the device answers", "port test passed",
+             "mapping published: 44.128.0.20 HTTP 9091, HTTPS 9444", "status: portforwarded",
+             "status          portforwarded", "external URL    http://44.128.0.20:9091/",
+             "gateway rule    TCP 9444 -> 192.168.77.10:443", "central record  44.128.0.20"]
+    places = [text.find(step) for step in steps]
+    assert -1 not in places and places == sorted(places), text
+    assert traces() == before
+
+
+def test_demo_fails_with_a_daemon_that_does_nothing():
+    demo = start_demo(binary=Path("/bin/true"))
+    text, _ = demo.communicate(timeout=60)
+    assert demo.returncode == 1, text
+    assert "FAILED: waited" in text
+
+
+@pytest.mark.parametrize("end", [signal.SIGINT, signal.SIGTERM, signal.SIGKILL],
+                         ids=["Ctrl-C", "kill", "kill-9"])
+def test_lab_that_stays_up_leaves_no_trace_after(end):
+    before = traces()
+    demo = start_demo("--stay")
+    said: list[str] = []
+    for line in demo.stdout:
+        said.append(line)
+        if "the view from outside" in line:
+            break
+    assert "the view from outside" in said[-1], "".join(said)
+    first = re.search(r"-t (\d+) ", said[-1])[1]
+    namespace = os.readlink(f"/proc/{first}/ns/pid")
+    assert len(processes_in(namespace)) >= 4
+    if end == signal.SIGINT:
+        os.killpg(demo.pid, end)
+    else:
+        demo.send_signal(end)
+    assert demo.wait(15) == (0 if end == signal.SIGINT else -end)
+    wait_until(lambda: not processes_in(namespace), "every process of the lab to end", 10)
+    assert traces() == before

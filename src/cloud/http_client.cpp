@@ -156,16 +156,16 @@ void TavikClient::cleanup() {
 }
 
 std::string TavikClient::getDeviceID() const {
-    return GlobalConfig::getInstance()->getProperty("DEVICEID");
+    return setting("DEVICEID");
 }
 
 std::string TavikClient::getDeviceAuth() const {
-    return GlobalConfig::getInstance()->getProperty("DEVICEAUTH");
+    return setting("DEVICEAUTH");
 }
 
 // Only the host part of the setting counts: both schemes are offered whatever it names.
 bool TavikClient::deriveServerUrls() {
-    const std::string base = GlobalConfig::getInstance()->getProperty("SERVER_BASE_URL");
+    const std::string base = setting("SERVER_BASE_URL");
     const std::size_t slash = base.find('/');
     if (slash != std::string::npos) {
         const std::size_t host = slash + 2;
@@ -174,7 +174,7 @@ bool TavikClient::deriveServerUrls() {
     if (base.empty() || serverHost.empty()) {
         logLine(LOG_ERR,
                 "TavikClient::getRestUrl - Invalid base server url %s. Return input urn.\n",
-                base.c_str());
+                scrubSecrets(base).c_str());
         return false;
     }
     baseServerUrl = "http://" + serverHost;

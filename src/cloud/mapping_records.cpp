@@ -57,10 +57,6 @@ bool deleteLocalRecord(const std::string& url) {
     return true;
 }
 
-std::string property(const char* key) {
-    return GlobalConfig::getInstance()->getProperty(key);
-}
-
 }  // namespace
 
 MaskedUrl TavikClient::forwardingUrl(const std::string& externalIp,
@@ -68,7 +64,7 @@ MaskedUrl TavikClient::forwardingUrl(const std::string& externalIp,
                                      int externalHttpPort,
                                      int externalHttpsPort) {
     return fillMaskedTemplate(
-        kRemoteKey, getRestUrl(property(kRemoteKey), HTTPS),
+        kRemoteKey, getRestUrl(setting(kRemoteKey), HTTPS),
         {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL}, externalIp, localIp, externalHttpPort,
          externalHttpsPort, SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}});
 }
@@ -104,7 +100,7 @@ bool TavikClient::updateServerMapping(const std::string& externalIp,
     logLine(LOG_NOTICE, "TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
             scrubSecrets(answer->text).c_str(), answer->size);
     // The local back end expects the internal HTTP port in the last place too.
-    return updateLocalRecord(fillMaskedTemplate(kLocalSetKey, property(kLocalSetKey),
+    return updateLocalRecord(fillMaskedTemplate(kLocalSetKey, setting(kLocalSetKey),
                                                 {internalHttpPort, externalIp, externalHttpPort,
                                                  externalHttpsPort, localIp, internalHttpPort}));
 } catch (...) {
@@ -138,7 +134,7 @@ bool TavikClient::deleteServerMapping(int internalHttpPort, const std::string& l
     }
     logLine(LOG_NOTICE, "TavikClient::deleteServerMapping - httpGet got %s, %d bytes.\n",
             scrubSecrets(answer->text).c_str(), answer->size);
-    return deleteLocalRecord(fillTemplate(kLocalDeleteKey, property(kLocalDeleteKey),
+    return deleteLocalRecord(fillTemplate(kLocalDeleteKey, setting(kLocalDeleteKey),
                                           {internalHttpPort, internalHttpPort}));
 } catch (...) {
     logLine(LOG_ERR, "** TavikClient::deleteServerMapping - Throw exception error. **\n");

@@ -170,7 +170,7 @@ int TavikClient::portTestObstacle(bool checkHddSleep) {
 
 // The request itself goes over HTTPS whatever protocol is tested.
 MaskedUrl TavikClient::portTestUrl(const std::string& externalIp, int port, HttpType type) {
-    const std::string path = GlobalConfig::getInstance()->getProperty(kTestPortKey);
+    const std::string path = setting(kTestPortKey);
     MaskedUrl url = fillMaskedTemplate(
         kTestPortKey, getRestUrl(path, HTTPS),
         {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL}, externalIp, port,

@@ -9,6 +9,7 @@
 #include "common/handles.h"
 #include "common/log.h"
 #include "common/masks.h"
+#include "common/signal_block.h"
 #include "common/text.h"
 #include "config/global_config.h"
 #include "config/scrub.h"
@@ -35,19 +36,14 @@ constexpr const char* kDiskStateCommand = "hdparm -C /dev/sda";
 constexpr const char* kDiskAsleep = "standby";
 constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 constexpr int kMostIdleMinutes = 1;
-constexpr int kMakersRouter = 5;            // a device type; it has no count of idle minutes
 constexpr std::size_t kShortLineSize = 80;  // bytes, terminator included
 
 // Of the library's event format.
 constexpr int kEventLevel = 3;
 constexpr int kTextValue = 3;
 
-std::string property(const char* key) {
-    return GlobalConfig::getInstance()->getProperty(key);
-}
-
 int internalPort() {
-    return leadingInt(property(kInternalPortKey));
+    return leadingInt(setting(kInternalPortKey));
 }
 
 void judgeLocalStatusAnswer(const std::string& url, const std::string& answer) {
@@ -64,7 +60,7 @@ void judgeLocalStatusAnswer(const std::string& url, const std::string& answer) {
 
 bool tellBackEndLocalIp(const std::string& localIp) {
     const std::string url =
-        fillTemplate(kLocalAddressKey, property(kLocalAddressKey), {internalPort(), localIp});
+        fillTemplate(kLocalAddressKey, setting(kLocalAddressKey), {internalPort(), localIp});
     logLine(LOG_INFO, "TavikClient::updateRemoteCommStatus - local config using url:  %s\n",
             url.c_str());
     if (fetchLocal(url)) return true;
@@ -75,14 +71,12 @@ bool tellBackEndLocalIp(const std::string& localIp) {
     return false;
 }
 
-// The event library is a C one: its end marker is a C cast.
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wold-style-cast"
 void emitEvent(const char* state, const char* type) {
+    // The library holds the log's lock too: a termination signal's own lines must not meet it.
+    const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
     __qvlog_kvp(kEventLevel, "cloudConnectivity", "state", kTextValue, state, "type", kTextValue,
                 type, __QVLOG_END);
 }
-#pragma GCC diagnostic pop
 
 bool reportsStandby(std::FILE* output) {
     std::array<char, kShortLineSize> line{};
@@ -99,7 +93,7 @@ int firstNumber(std::FILE* file) {
 
 // 1 when the disk has been idle for so long that it may be asleep by now, 0 when not.
 int checkIdleMinutes() {
-    const FileHandle file{std::fopen(kIdleMinutesFile, "re")};
+    const FileHandle file = openFile(kIdleMinutesFile, "re");
     if (!file) {
         logLine(LOG_ERR,
                 "TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.\n");
@@ -145,7 +139,7 @@ void TavikClient::updateLocalCommStatus(const std::string& status) try {
     // Remembered before it is sent: a failed update waits for the next change of status.
     lastLocalCommStatus = status;
     const std::string url =
-        fillTemplate(kLocalStatusKey, property(kLocalStatusKey), {internalPort(), status});
+        fillTemplate(kLocalStatusKey, setting(kLocalStatusKey), {internalPort(), status});
     logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - URL : [%s].\n", url.c_str());
     logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].\n",
             status.c_str());
@@ -189,7 +183,7 @@ bool TavikClient::updateRemoteCommStatus(const std::string& localIp) try {
 // True when the server answered; what it said is only logged.
 bool TavikClient::tellServerLocalIp(const std::string& localIp) {
     const MaskedUrl url =
-        fillMaskedTemplate(kRemoteStatusKey, getRestUrl(property(kRemoteStatusKey), HTTPS),
+        fillMaskedTemplate(kRemoteStatusKey, getRestUrl(setting(kRemoteStatusKey), HTTPS),
                            {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL},
                             SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}, localIp});
     logLine(LOG_INFO,
@@ -254,7 +248,7 @@ int TavikClient::checkHddStandByMode() try {
         return 1;
     }
     output.reset();
-    if (leadingInt(property("DEVICETYPE")) == kMakersRouter) return 0;
+    if (leadingInt(setting("DEVICETYPE")) == kMakersRouter) return 0;
     return checkIdleMinutes();
 } catch (...) {
     logLine(LOG_ERR, "** TavikClient::checkHddStandByMode - Throw exception error. **\n");

@@ -33,6 +33,10 @@ enum PortTestResult : int {
     PASS_TEST = 3,  ///< the server reached this device on the port
 };
 
+/// DEVICETYPE of a device that is itself the maker's router: it has helper scripts in place of a
+/// gateway and no count of idle minutes for its disk.
+inline constexpr int kMakersRouter = 5;
+
 }  // namespace pelorus
 
 #endif

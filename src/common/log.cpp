@@ -11,7 +11,10 @@ namespace pelorus {
 
 namespace {
 
-void vlogLine(std::size_t size, int priority, const char* format, va_list args) {
+__attribute__((format(printf, 3, 0))) void vlogLine(std::size_t size,
+                                                    int priority,
+                                                    const char* format,
+                                                    va_list args) {
     std::array<char, kLogLineSize> line{};
     const std::size_t room = std::min(size, line.size());
     if (std::vsnprintf(line.data(), room, format, args) < 0) return;

@@ -167,7 +167,8 @@ void ConnectionManager::readStatusFile(DirectAttempt& attempt) {
 }
 
 // Mappings made for another address, or on a port that is no longer allowed, are removed. The
-// first attempt comes here too and asks the gateway to remove external port 0: it refuses.
+// first attempt comes here too, with external port 0: a UPnP gateway refuses that, a NAT-PMP one
+// removes whatever an earlier run left for the internal port.
 void ConnectionManager::dropOutdatedMappings(const DirectAttempt& attempt) {
     if (!router().hasExternalIpChanged() && !router().hasLocalIpChanged() &&
         !(attempt.defaultPortsOnly && allocatedHttpPort != kHttpStartPort)) {

@@ -192,13 +192,13 @@ bool ConnectionManager::namesLeadHere(const DeviceNames& names, ConnectionType t
         logLine(
             LOG_ERR,
             "ConnectionManager::checkDNS - DNS check failed for 4-level device domain name, DNS IP address is %s, local value of IP address is %s\n",
-            names.fourLevelIp.c_str(), ip.c_str());
+            names.fourLevelIp.c_str(), scrubSecrets(ip).c_str());
         return false;
     }
     logLine(
         LOG_INFO,
         "ConnectionManager::checkDNS - DNS matches local value for device domain names, IP address is %s\n",
-        ip.c_str());
+        scrubSecrets(ip).c_str());
     return true;
 }
 
@@ -244,7 +244,7 @@ void ConnectionManager::fetchExternalIp(std::string& ip) {
     logLine(
         LOG_INFO,
         "ConnectionManager::fetchLocalDeviceDomainIPAddr - auto/manual portforward external router IP = %s\n",
-        ip.c_str());
+        scrubSecrets(ip).c_str());
 }
 
 void ConnectionManager::fetchRelayIp(std::string& ip) {

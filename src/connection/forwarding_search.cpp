@@ -10,6 +10,7 @@ namespace pelorus {
 namespace {
 
 constexpr int kSearchCycles = 3;
+constexpr int kCyclesBeforeExceeded = 2;
 constexpr int kExtendedRangePorts = 99;
 constexpr std::size_t kMostBadPorts = 99;
 constexpr int kEnforcedRelay = FAILED;  // where a port is expected; see forwardPort()
@@ -158,7 +159,7 @@ bool ConnectionManager::testCandidate(ForwardSearch& search, int& result) {
 
     unmapDevicePort(search.internalPort, search.candidatePort);
     // Counts one ahead: "exceeded" is also said before the last cycle.
-    if (search.retries + 1 > 2) {
+    if (search.retries + 1 > kCyclesBeforeExceeded) {
         logLine(LOG_INFO, "ConnectionManager::forwardPort - Port test failed, retries exceeded.\n");
     } else {
         logLine(LOG_INFO,

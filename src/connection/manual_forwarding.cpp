@@ -2,6 +2,7 @@
 #include "common/log.h"
 #include "common/text.h"
 #include "config/global_config.h"
+#include "config/scrub.h"
 #include "connection/connection_manager.h"
 #include "connection/mapping_names.h"
 #include "connection/network_addrs.h"
@@ -135,7 +136,7 @@ void ConnectionManager::noticeManualChanges(ManualAttempt& attempt) const {
     logLine(
         LOG_INFO,
         "ConnectionManager::manualPortForward - detected change to external IP [%s] or local IP [%s]\n",
-        addresses->getExternalIp().c_str(), addresses->getLocalIp().c_str());
+        scrubSecrets(addresses->getExternalIp()).c_str(), addresses->getLocalIp().c_str());
 }
 
 void ConnectionManager::testManualPorts(ManualAttempt& attempt) {

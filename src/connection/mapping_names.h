@@ -8,9 +8,6 @@ inline constexpr const char* kTcp = "TCP";
 inline constexpr const char* kHttpDescription = "Kavra";
 inline constexpr const char* kHttpsDescription = "KavraSSL";
 
-/// DEVICETYPE of a device that is itself the maker's router.
-inline constexpr int kMakersRouter = 5;
-
 }  // namespace pelorus
 
 #endif

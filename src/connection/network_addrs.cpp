@@ -1,12 +1,12 @@
 #include "connection/network_addrs.h"
 
-#include <unistd.h>
-
 #include <ctime>
 
 #include "cloud/tavik_client.h"
 #include "common/log.h"
+#include "common/pause.h"
 #include "common/termination.h"
+#include "config/scrub.h"
 
 namespace pelorus {
 
@@ -41,7 +41,7 @@ void NetworkAddrs::setNetworkAddrs(const std::string& externalIp, const std::str
     logLine(
         LOG_INFO,
         "NetworkAddrs::setNetworkAddrs - external IP [%s], local IP [%s], interval start time [%ld], interval duration [%d] \n",
-        externalIP.c_str(), localIP.c_str(), interval.GetIntervalStartTime(),
+        scrubSecrets(externalIP).c_str(), localIP.c_str(), interval.GetIntervalStartTime(),
         static_cast<int>(interval.GetIntervalDuration()));
 }
 
@@ -62,8 +62,9 @@ int NetworkAddrs::discoverNetworkAddrs() {
     logLine(
         LOG_INFO,
         "NetworkAddrs::discoverNetworkAddrs - externalIPChanged [%d], external IP [%s], discovered external IP [%s], internalIPChanged [%d], internal IP [%s], discovered internal IP [%s]\n",
-        externalIPChanged, externalIP.c_str(), discoveredExternal.c_str(), internalIPChanged,
-        localIP.c_str(), discoveredLocal.c_str());
+        externalIPChanged, scrubSecrets(externalIP).c_str(),
+        scrubSecrets(discoveredExternal).c_str(), internalIPChanged, localIP.c_str(),
+        discoveredLocal.c_str());
     return 1;
 }
 
@@ -74,7 +75,7 @@ bool NetworkAddrs::findExternalIp(std::string& discovered) {
         logLine(
             LOG_INFO,
             "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [1], discovered external IP [%s]\n",
-            discovered.c_str());
+            scrubSecrets(discovered).c_str());
         return true;
     }
     if (!interval.hasExpired()) {
@@ -114,10 +115,11 @@ int NetworkAddrs::getMyIP(std::string& out) {
     bool found = client->getMyIP(ip, waitSeconds);
     while (!found && waitSeconds > 0 && !terminationRequested()) {
         logLine(LOG_INFO, "NetworkAddrs::getMyIP - wait %d seconds\n", waitSeconds);
-        sleep(static_cast<unsigned>(waitSeconds));
+        pauseUnlessTerminated(waitSeconds);
         // The server's answer is kept for a cycle; without this, that answer would be asked.
         client->resetServerSleepTime();
         if (terminationRequested()) break;
+        waitSeconds = 0;
         found = client->getMyIP(ip, waitSeconds);
     }
     if (!found) {

@@ -1,16 +1,14 @@
 #include "daemon/daemon_control.h"
 
-#include <poll.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <csignal>
-#include <ctime>
 #include <string>
 
 #include "cloud/tavik_client.h"
 #include "common/log.h"
-#include "common/signal_block.h"
+#include "common/pause.h"
 #include "common/termination.h"
 #include "config/global_config.h"
 #include "connection/connection_manager.h"
@@ -67,22 +65,13 @@ void DaemonControl::runCycle() {
     const int serverSleepTime = TavikClient::getInstance()->getServerSleepTime();
     if (sleepTime >= serverSleepTime) {
         logLine(LOG_INFO, "DaemonControl::run - sleep %d secs.\n", sleepTime);
-        pause(sleepTime);
+        pauseUnlessTerminated(sleepTime);
     } else {
         logLine(LOG_INFO, "DaemonControl::run - retry connection after %d secs.\n",
                 serverSleepTime);
-        pause(serverSleepTime);
+        pauseUnlessTerminated(serverSleepTime);
     }
     TavikClient::getInstance()->resetServerSleepTime();
-}
-
-void DaemonControl::pause(int seconds) const {
-    // Held back from before the look at the switch until ppoll waits: a signal that came during
-    // the cycle, or comes in between, ends the pause instead of being slept over.
-    const SignalBlock held{SIGINT, SIGTERM, SIGQUIT};
-    if (!remoteAccessEnabled) return;
-    const timespec length{seconds, 0};
-    static_cast<void>(ppoll(nullptr, 0, &length, &held.previousMask()));
 }
 
 void DaemonControl::shutDown() {

@@ -35,7 +35,6 @@ private:
 
     void startClean();
     void runCycle();
-    void pause(int seconds) const;
     void shutDown();
 
     std::atomic<bool> remoteAccessEnabled{false};

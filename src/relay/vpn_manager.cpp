@@ -3,7 +3,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -32,6 +31,7 @@ constexpr std::size_t kOutputLineSize = 1024;  // bytes
 constexpr std::size_t kPidLineSize = 81;       // bytes: 80 characters and the terminator
 constexpr std::size_t kStopPidLineSize = 128;  // bytes
 constexpr std::size_t kLinkTargetSize = 512;   // bytes
+constexpr int kAddressParts = 4;
 constexpr const char* kPeerText = "Peer Connection Initiated with [AF_INET]";
 
 int runShell(const std::string& command) {
@@ -42,7 +42,7 @@ int runShell(const std::string& command) {
 class WorkingDirectory {
 public:
     explicit WorkingDirectory(const std::string& path) {
-        if (getcwd(saved.data(), saved.size()) == nullptr) saved.front() = '\0';
+        if (getcwd(saved.data(), saved.size()) == nullptr) saved = {"/"};
         change(path.c_str());
     }
     ~WorkingDirectory() { change(saved.data()); }
@@ -302,12 +302,16 @@ namespace {
 
 // The dotted address at the start of @p text. False when four numbers cannot be read.
 bool readAddress(const char* text, std::string& address) {
-    std::array<int, 4> part{};
-    // NOLINTNEXTLINE(cert-err34-c): the count of conversions and the signs are checked
-    if (std::sscanf(text, "%d.%d.%d.%d", &part[0], &part[1], &part[2], &part[3]) != 4) return false;
-    if (std::any_of(part.begin(), part.end(), [](int number) { return number < 0; })) return false;
-    address = std::to_string(part[0]) + "." + std::to_string(part[1]) + "." +
-              std::to_string(part[2]) + "." + std::to_string(part[3]);
+    std::string dotted;
+    for (int part = 0; part < kAddressParts; ++part) {
+        if (part > 0 && *text++ != '.') return false;
+        int number = 0;
+        if (!scanInt(text, number) || number < 0) return false;
+        dotted += (part > 0 ? "." : "") + std::to_string(number);
+        text += std::strspn(text, " \t\n\v\f\r+-");
+        text += std::strspn(text, "0123456789");
+    }
+    address = dotted;
     return true;
 }
 

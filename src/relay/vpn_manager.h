@@ -33,8 +33,8 @@ public:
     /// The tunnel has no health check of its own: always true.
     [[nodiscard]] bool isVPNHealthy() const { return true; }
 
-    /// The relay's IPv4 address from the client's output; the last one when there are several.
-    /// False, and @p ip untouched, when there is none.
+    /// The relay's IPv4 address from the client's output; the last one when there are several. Pass
+    /// @p ip empty: the result is whether it holds an address at the end.
     bool fetchOpenVPN_IPAddr(std::string& ip);
 
     /// Whether @p line, a line of the pid file, names a live openvpn process; its trimmed text is

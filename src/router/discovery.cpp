@@ -40,11 +40,6 @@ struct UrlsFreer {
 /// What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
 using UrlContents = std::unique_ptr<UPNPUrls, UrlsFreer>;
 
-Interfaces localInterfaces() {
-    ifaddrs* list = nullptr;
-    return Interfaces(getifaddrs(&list) == 0 ? list : nullptr);
-}
-
 /// A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
 bool leadsToLan(const ifaddrs& entry) {
     constexpr unsigned kUnfit = IFF_LOOPBACK | IFF_POINTOPOINT | IFF_NOARP;
@@ -164,11 +159,12 @@ void Router::forgetSeenChanges() {
 }
 
 void Router::initLocalIp() {
-    const Interfaces interfaces = localInterfaces();
-    if (!interfaces) {
+    ifaddrs* list = nullptr;
+    if (getifaddrs(&list) != 0) {
         logLine(LOG_ERR, "Router::initLocalIP() - failed to get local NIC info.\n");
         return;
     }
+    const Interfaces interfaces(list);
     std::string ipv4;
     std::string ipv6;
     for (const ifaddrs* entry = interfaces.get(); entry != nullptr; entry = entry->ifa_next) {

@@ -107,7 +107,8 @@ public:
     // --- the maker's own router ------------------------------------------------------------
 
     /// Reads WAN and LAN address from the router's script. 0 when there is no WAN address,
-    /// positive otherwise. An empty answer does not clear what was known.
+    /// positive otherwise. An empty answer, or one that is no address, does not clear what was
+    /// known.
     int initIpAddrBrenvik();
     /// 1 when the port is mapped to this device, newly or already; 0 when someone else holds it,
     /// the port is below 1 or the script could not be run.

@@ -65,6 +65,11 @@ int FakeCommands::count(const std::string& part) const {
                       [&](const std::string& command) { return holds(command, part); }));
 }
 
+bool FakeCommands::isReal(const std::string& command) const {
+    return std::any_of(realParts.begin(), realParts.end(),
+                       [&](const std::string& part) { return holds(command, part); });
+}
+
 FakeCommands::Answer FakeCommands::take(const std::string& command) {
     const auto fits = [&](const auto& rule) { return holds(command, rule.first); };
     const auto next = std::find_if(once.begin(), once.end(), fits);
@@ -80,7 +85,7 @@ FakeCommands::Answer FakeCommands::take(const std::string& command) {
 int FakeCommands::runSystem(const char* command) {
     checkSignalMask(command);
     commands.emplace_back(command);
-    if (real) return __real_system(command);
+    if (isReal(command)) return __real_system(command);
     const Answer answer = take(command);
     if (answer.fails) return -1;
     if (answer.action) answer.action(command);
@@ -91,7 +96,7 @@ std::FILE* FakeCommands::openPipe(const char* command, const char* mode) {
     checkSignalMask(command);
     EXPECT_STREQ(mode, "re") << "pipe of: " << command;
     commands.emplace_back(command);
-    if (real) return __real_popen(command, mode);
+    if (isReal(command)) return __real_popen(command, mode);
     const Answer answer = take(command);
     if (answer.fails) {
         errno = EMFILE;
@@ -110,7 +115,7 @@ std::FILE* FakeCommands::openPipe(const char* command, const char* mode) {
 int FakeCommands::closePipe(std::FILE* pipe) {
     const auto found = openPipes.find(pipe);
     if (found == openPipes.end()) {
-        if (real) return __real_pclose(pipe);
+        if (!realParts.empty()) return __real_pclose(pipe);
         ADD_FAILURE() << "pclose of something that popen did not give";
         return -1;
     }
@@ -129,7 +134,7 @@ void FakeCommands::reset() {
     rules.clear();
     once.clear();
     openPipes.clear();
-    real = false;
+    realParts.clear();
 }
 
 }  // namespace pelorus::support

@@ -41,8 +41,8 @@ public:
     /// Forgets the lines, not the answers.
     void clear() { commands.clear(); }
 
-    /// Lets the real shell do it from now on.
-    void runForReal() { real = true; }
+    /// Lets the real shell run the commands that hold @p part; nothing else answers them then.
+    void runForReal(const std::string& part = "") { realParts.push_back(part); }
 
     /// Fails the test when a pipe was not closed with pclose.
     void checkClosed() const;
@@ -54,13 +54,14 @@ public:
 
 private:
     FakeCommands() = default;
+    [[nodiscard]] bool isReal(const std::string& command) const;
     Answer take(const std::string& command);
 
     std::vector<std::string> commands;
     std::vector<std::pair<std::string, Answer>> rules;
     std::vector<std::pair<std::string, Answer>> once;
     std::map<std::FILE*, int> openPipes;  // with the exit status
-    bool real = false;
+    std::vector<std::string> realParts;
 };
 
 }  // namespace pelorus::support

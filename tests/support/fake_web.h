@@ -19,7 +19,8 @@
 
 #include <cstddef>
 #include <functional>
-#include <set>
+#include <map>
+#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -110,8 +111,7 @@ private:
     std::vector<std::pair<std::string, Answer>> once;
     std::vector<Request> asked;
     Transfer transfer;
-    std::set<CURL*> handles;
-    std::size_t nextHandle = 0;
+    std::map<CURL*, std::unique_ptr<char>> handles;
     bool handlesFail = false;
     bool globalInitFails = false;
     int globalInitCount = 0;

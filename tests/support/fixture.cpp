@@ -8,6 +8,7 @@
 #include <stdexcept>
 
 #include "config/global_config.h"
+#include "support/fake_process.h"
 
 namespace pelorus::support {
 
@@ -34,6 +35,7 @@ void resetSeams() {
     VirtualClock::get().reset();
     FakeCommands::get().reset();
     FakeNet::get().reset();
+    FakeProcess::get().reset();
 }
 
 }  // namespace

@@ -81,6 +81,14 @@ private:
     std::size_t descriptorsAtStart;
 };
 
+/// Names a case of a table by the name of its row.
+struct RowName {
+    template <typename Row>
+    std::string operator()(const ::testing::TestParamInfo<Row>& row) const {
+        return row.param.name;
+    }
+};
+
 /// Descriptors this process has open, without the one used to look.
 [[nodiscard]] std::size_t openDescriptors();
 

@@ -110,6 +110,14 @@ TEST_F(ManualForwardingTest, ChangedExternalAddressIsPublished) {
         "ConnectionManager::manualPortForward - detected change to external IP [44.128.0.20] or local IP [192.168.77.10]\n");
 }
 
+// The server may send anything as an address; the fixture looks for secrets in all lines.
+TEST_F(ManualForwardingTest, AddressThatHoldsTheDeviceIdStaysOutOfTheLog) {
+    web.answer("/test?", kPassed + "<external_ip>" + support::kDeviceId + "</external_ip>");
+    givenManualForwarding();
+    EXPECT_EQ(cycle(), PORTFORWARDED);
+    EXPECT_EQ(log.countPart("detected change to external IP [*ID_REMOVED*]"), 1) << log.dump();
+}
+
 TEST_F(ManualForwardingTest, ClosedPortFailsAndIsReported) {
     web.answer("/test?", kNotReached);
     EXPECT_EQ(manager().createDirectConnection(), FAILED);

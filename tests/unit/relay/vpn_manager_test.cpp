@@ -363,6 +363,8 @@ INSTANTIATE_TEST_SUITE_P(
             "Peer Connection Initiated with [AF_INET]44.128.0.1:1194\nPeer Connection Initiated with [AF_INET]device-7350142%s\n",
             "44.128.0.1", 1},
         RelayOutput{"NegativeNumber", "Peer Connection Initiated with [AF_INET]44.-1.0.2\n", "", 1},
+        RelayOutput{"NumberThatFitsNoInteger",
+                    "Peer Connection Initiated with [AF_INET]4294967297.1.1.1\n", "", 1},
         RelayOutput{"ThreeNumbers", "Peer Connection Initiated with [AF_INET]44.128.0\n", "", 1},
         RelayOutput{"OtherFamily", "Peer Connection Initiated with [AF_INET6]::1\n", "", 0},
         RelayOutput{"Empty", "", "", 0}),

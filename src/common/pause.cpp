@@ -1,0 +1,20 @@
+#include "common/pause.h"
+
+#include <poll.h>
+
+#include <csignal>
+#include <ctime>
+
+#include "common/signal_block.h"
+#include "common/termination.h"
+
+namespace pelorus {
+
+void pauseUnlessTerminated(int seconds) {
+    const SignalBlock held{SIGINT, SIGTERM, SIGQUIT};
+    if (terminationRequested()) return;
+    const timespec length{seconds, 0};
+    static_cast<void>(ppoll(nullptr, 0, &length, &held.previousMask()));
+}
+
+}  // namespace pelorus

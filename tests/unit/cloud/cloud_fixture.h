@@ -1,0 +1,76 @@
+// The fixture of the cloud room: a configured client in front of the fake web.
+#ifndef PELORUS_UNIT_CLOUD_FIXTURE_H
+#define PELORUS_UNIT_CLOUD_FIXTURE_H
+
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include "cloud/tavik_client.h"
+#include "support/fake_files.h"
+#include "support/fake_web.h"
+#include "support/fixture.h"
+
+namespace pelorus {
+
+using support::expectLogged;
+using support::expectLoggedInOrder;
+using support::expectLogIs;
+using support::expectNotLogged;
+using support::FakeWeb;
+using Urls = std::vector<std::string>;
+
+/// What the rows of a table begin with: a name that reads as a sentence.
+struct Case {
+    const char* name;
+};
+
+inline std::ostream& operator<<(std::ostream& out, const Case& row) {
+    return out << row.name;
+}
+
+struct CaseName {
+    template <typename Row>
+    std::string operator()(const ::testing::TestParamInfo<Row>& row) const {
+        return row.param.name;
+    }
+};
+
+class CloudTest : public support::PelorusTest {
+protected:
+    CloudTest() {
+        web.reset();
+        files.reset();
+    }
+
+    void TearDown() override {
+        web.checkBalance();
+        PelorusTest::TearDown();
+    }
+
+    /// The client over a full configuration, its server URLs derived; log and requests are empty.
+    TavikClient& givenClient() {
+        givenConfig(
+            {{"SERVER_BASE_URL", "https://web.kavra.example"},
+             {"INTERNAL_HTTP_PORT", "80"},
+             {"REMOTE_TESTPORTURL", "/test?id=%s&ip=%s&port=%d&type=%s&auth=%s"},
+             {"REMOTE_SETFORWARDURL", "/set?id=%s&ip=%s&lan=%s&p=%d&ps=%d&auth=%s"},
+             {"REMOTE_SETCOMMSTATUSURL", "/status?id=%s&auth=%s&lan=%s"},
+             {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/set?ip=%s&p=%d&ps=%d&lan=%s&i=%d"},
+             {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/del?i=%d"},
+             {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/status?is=%s"},
+             {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/ip?lan=%s"}});
+        TavikClient* client = TavikClient::getInstance();
+        static_cast<void>(client->getRestUrl("", HTTP));
+        log.clear();
+        web.clear();
+        return *client;
+    }
+
+    FakeWeb& web = FakeWeb::get();
+    support::FakeFiles& files = support::FakeFiles::get();
+};
+
+}  // namespace pelorus
+
+#endif

@@ -178,9 +178,11 @@ bool TavikClient::deriveServerUrls() {
         return false;
     }
     baseServerUrl = "http://" + serverHost;
-    logLine(LOG_INFO, "TavikClient::getRestUrl - baseServerUrl %s.\n", baseServerUrl.c_str());
+    logLine(LOG_INFO, "TavikClient::getRestUrl - baseServerUrl %s.\n",
+            scrubSecrets(baseServerUrl).c_str());
     baseSSLServerUrl = "https://" + serverHost;
-    logLine(LOG_INFO, "TavikClient::getRestUrl - baseSSLServerUrl %s.\n", baseSSLServerUrl.c_str());
+    logLine(LOG_INFO, "TavikClient::getRestUrl - baseSSLServerUrl %s.\n",
+            scrubSecrets(baseSSLServerUrl).c_str());
     return true;
 }
 
@@ -197,7 +199,7 @@ std::string TavikClient::getRestUrl(const std::string& urn, HttpType type) {
                 "TavikClient::getRestUrl - Invalid http type %d. Use only the input urn.\n",
                 static_cast<int>(type));
     }
-    std::string logged = url;
+    std::string logged = scrubSecrets(url);
     replaceAll(logged, "%", "_");
     logLine(LOG_INFO, "TavikClient::getRestUrl - restURL %s.\n", logged.c_str());
     return url;

@@ -43,14 +43,14 @@ bool deleteLocalRecord(const std::string& url) {
         logLine(
             LOG_ERR,
             "TavikClient::deleteServerMapping - failed to get response from localhost for url: [%s]\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
         return false;
     }
     if (!contains(answer->text, kLocalSuccess)) {
         logLine(
             LOG_ERR,
             "TavikClient::deleteServerMapping - failure response received from localhost for url: [%s]\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
         logLine(LOG_ERR, "Response: [%s]\n", scrubSecrets(answer->text).c_str());
         return false;
     }

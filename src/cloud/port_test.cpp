@@ -267,14 +267,14 @@ bool TavikClient::getMyIP(std::string& ip, int& waitSeconds) try {
     waitSeconds = 0;
     const std::string url =
         fillTemplate("the public address path", getRestUrl(kMyIpPath, HTTP), {});
-    logLine(LOG_INFO, "TavikClient::getMyIP - get my IP url: %s\n", url.c_str());
+    logLine(LOG_INFO, "TavikClient::getMyIP - get my IP url: %s\n", scrubSecrets(url).c_str());
     int size = 0;
     const MallocHandle<char> data{httpGet(url.c_str(), size)};
     if (!data) {
         logLine(
             LOG_ERR,
             "TavikClient::getMyIP - httpGet failed to get response from central server for url %s.\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
         return false;
     }
     // As it came: an address with so much as a line feed behind it is not accepted.

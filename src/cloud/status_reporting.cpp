@@ -51,7 +51,7 @@ void judgeLocalStatusAnswer(const std::string& url, const std::string& answer) {
         logLine(
             LOG_ERR,
             "TavikClient::updateLocalCommStatus - failure response received from localhost for url: [%s]\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
         logLine(LOG_ERR, "Response: [%s].\n", scrubSecrets(answer).c_str());
         return;
     }
@@ -62,12 +62,12 @@ bool tellBackEndLocalIp(const std::string& localIp) {
     const std::string url =
         fillTemplate(kLocalAddressKey, setting(kLocalAddressKey), {internalPort(), localIp});
     logLine(LOG_INFO, "TavikClient::updateRemoteCommStatus - local config using url:  %s\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
     if (fetchLocal(url)) return true;
     logLine(
         LOG_ERR,
         "TavikClient::updateRemoteCommStatus - failed to get response from local server for url:  %s\n",
-        url.c_str());
+        scrubSecrets(url).c_str());
     return false;
 }
 
@@ -140,7 +140,8 @@ void TavikClient::updateLocalCommStatus(const std::string& status) try {
     lastLocalCommStatus = status;
     const std::string url =
         fillTemplate(kLocalStatusKey, setting(kLocalStatusKey), {internalPort(), status});
-    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - URL : [%s].\n", url.c_str());
+    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - URL : [%s].\n",
+            scrubSecrets(url).c_str());
     logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].\n",
             status.c_str());
     const auto answer = fetchLocal(url);
@@ -149,7 +150,7 @@ void TavikClient::updateLocalCommStatus(const std::string& status) try {
         logLine(
             LOG_ERR,
             "TavikClient::updateLocalCommStatus - failed to get response from localhost for url:  [%s]\n",
-            url.c_str());
+            scrubSecrets(url).c_str());
         return;
     }
     if (std::system(kTouchDynamicConfig) != -1) {

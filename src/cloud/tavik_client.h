@@ -31,7 +31,7 @@ extern std::map<std::string, std::string> Status2LogType;
 extern const std::array<const char*, 5> ConnType2LogType;
 
 /// The client of the central service and of the local web back end. Requests are synchronous: to
-/// the central server at most 30 seconds each. Failures are logged here; no operation throws.
+/// the central server at most 30 seconds each. Failures are logged here and told by the result.
 class TavikClient {
 public:
     /// The process-wide client. The first call reads the credentials and sets up libcurl; when the

@@ -25,8 +25,7 @@ std::optional<std::string> argumentText(const TemplateArgument& argument,
     if (const auto* secret = std::get_if<SecretArgument>(&argument)) {
         return secrets == Secrets::REAL ? secret->value : secret->mask;
     }
-    const auto& text = std::get<std::string>(argument);
-    return secrets == Secrets::REAL ? text : scrubSecrets(text);
+    return std::get<std::string>(argument);
 }
 
 std::optional<std::string> format(const std::string& urlTemplate,
@@ -49,6 +48,8 @@ std::optional<std::string> format(const std::string& urlTemplate,
         if (!text) return std::nullopt;
         url += *text;
     }
+    // The template and the texts come from configuration and from the server.
+    if (secrets == Secrets::MASKED) url = scrubSecrets(url);
     url.resize(std::min(url.size(), kUrlBufferSize - 1));
     return url;
 }

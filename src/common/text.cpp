@@ -38,9 +38,11 @@ bool scanInt(const char* text, int& value) {
 }
 
 bool scanUnsigned(const char* text, unsigned& value) {
-    long number = 0;
-    if (!scanLong(text, number)) return false;
-    constexpr auto kMost = static_cast<long>(std::numeric_limits<unsigned>::max());
+    char* end = nullptr;
+    errno = 0;
+    const long long number = std::strtoll(text, &end, 10);
+    if (end == text || errno == ERANGE) return false;
+    constexpr auto kMost = static_cast<long long>(std::numeric_limits<unsigned>::max());
     if (number < -kMost || number > kMost) return false;
     value = static_cast<unsigned>(number);
     return true;

@@ -1,8 +1,8 @@
 #include "config/global_config.h"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cstdlib>
 #include <cstring>
@@ -182,6 +182,9 @@ bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copy
             kConfigLogSize, LOG_ERR,
             "GlobalConfig::loadConfig() - failed to write temporary dynamic config file: %s\n",
             copyPath.c_str());
+        // A copy that was cut short would be taken for the whole from now on.
+        static_cast<void>(unlink(copyPath.c_str()));
+        return false;
     }
     return true;
 }
@@ -232,6 +235,11 @@ const std::string& GlobalConfig::getProperty(const std::string& key) {
     return found == properties.end() ? absent : found->second;
 }
 
+std::string GlobalConfig::knownProperty(const std::string& key) const {
+    const auto found = properties.find(key);
+    return found == properties.end() ? std::string{} : found->second;
+}
+
 void GlobalConfig::reloadChangedCopy() {
     const auto found = properties.find(kTmpPathKey);
     if (found == properties.end() || !namesACopy(found->second)) return;
@@ -256,10 +264,7 @@ std::string& GlobalConfig::setProperty(const std::string& key,
                                        const std::string& value,
                                        bool writeThrough) {
     if (properties.empty()) loadConfig(configPath);
-    if (writeThrough) {
-        const auto found = properties.find(key);
-        writeToStaticFile(key, found == properties.end() ? std::string{} : found->second, value);
-    }
+    if (writeThrough) writeToStaticFile(key, knownProperty(key), value);
     return properties[key] = value;
 }
 
@@ -291,7 +296,11 @@ void GlobalConfig::writeToStaticFile(const std::string& key,
                    configPath.c_str());
         return;
     }
-    static_cast<void>(std::fputs(text.c_str(), file.get()));
+    if (std::fputs(text.c_str(), file.get()) == EOF || std::fflush(file.get()) != 0) {
+        logLineCut(kConfigLogSize, LOG_ERR,
+                   "GlobalConfig::setProperty() - failed to update config file: %s\n",
+                   configPath.c_str());
+    }
 }
 
 void GlobalConfig::deleteProperty(const std::string& key) {

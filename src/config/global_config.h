@@ -31,9 +31,13 @@ public:
     bool loadConfigSettings(std::FILE* file);
 
     /// The value of @p key, or an empty text when it is absent. Costs one stat of the temporary
-    /// copy. The reference stays valid for the life of the process, but its text may change with
-    /// the next call: copy what must last.
+    /// copy. The reference stays valid until the key is deleted, but its text may change with the
+    /// next call: copy what must last.
     const std::string& getProperty(const std::string& key);
+
+    /// The value of @p key as last read, without a look at the files: for what must not log or
+    /// reload, such as the scrubbing of a log line.
+    [[nodiscard]] std::string knownProperty(const std::string& key) const;
 
     /// Sets @p key in memory and, with @p writeThrough, in the static file as well (never in the
     /// dynamic one). A failed write is logged and does not keep the value from being set in

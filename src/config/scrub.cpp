@@ -34,11 +34,11 @@ void hide(std::string& text, std::string secret, const std::string& mask) {
 }  // namespace
 
 std::string scrubSecrets(std::string text) {
-    auto* config = GlobalConfig::getInstance();
+    const auto* config = GlobalConfig::getInstance();
     std::array<std::pair<std::string, const char*>, 3> secrets{{
-        {config->getProperty("DEVICEID"), STRIPPED_DEVID_VAL},
-        {config->getProperty("DEVICEAUTH"), STRIPPED_DEVAUTH_VAL},
-        {config->getProperty("SUBDOMAIN"), STRIPPED_SUBDOMAIN_VAL},
+        {config->knownProperty("DEVICEID"), STRIPPED_DEVID_VAL},
+        {config->knownProperty("DEVICEAUTH"), STRIPPED_DEVAUTH_VAL},
+        {config->knownProperty("SUBDOMAIN"), STRIPPED_SUBDOMAIN_VAL},
     }};
     // The longest first: a secret that holds another one would otherwise leave its rest behind.
     std::stable_sort(secrets.begin(), secrets.end(), [](const auto& left, const auto& right) {

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "common/log.h"
+#include "common/signal_block.h"
 #include "common/termination.h"
 #include "config/global_config.h"
 #include "connection/connection_manager.h"
@@ -46,6 +47,8 @@ Options readCommandLine(int argc, char** argv) {
 // Without a log option the defaults of the C library stay in force.
 void openLog(const Options& options) {
     if (!options.log && !options.logToConsole) return;
+    // Both take the lock that the signal handler's own lines need.
+    const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
     setlogmask((1 << (options.severity + 1)) - 1);
     openlog("Pelorus", options.logToConsole ? LOG_CONS : 0, LOG_LOCAL0);
     logLine(LOG_ALERT, "main - syslog severity level set to %d.\n", options.severity);

@@ -234,14 +234,14 @@ bool Router::findExternalIp() {
         logLine(
             LOG_INFO,
             "Router::upnp_discover - failed to get External IP address, ipStatus: %d, value received: %s \n",
-            status, address.text());
+            status, scrubSecrets(address.text()).c_str());
         return false;
     }
     if (takeExternalIp(address.text())) {
         logLine(LOG_NOTICE, "Router::upnp_discover - Router's external IP address has changed!\n");
     }
     logLine(LOG_INFO, "Router::upnp_discover - Router's external IP address: %s \n",
-            address.text());
+            scrubSecrets(address.text()).c_str());
     initialized = true;
     return true;
 }

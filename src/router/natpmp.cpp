@@ -53,6 +53,9 @@ bool CMnatpmp::init() {
     if (initialized) {
         closeOnExec(natpmp.s);
     } else {
+        // The library opens its socket first and keeps it when it then finds no gateway.
+        if (natpmp.s > 0) static_cast<void>(closenatpmp(&natpmp));
+        natpmp = {};
         logLine(LOG_ERR, "CMnatpmp::init  initnatpmp failed %d\n", status);
     }
     return initialized;

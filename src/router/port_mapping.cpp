@@ -20,6 +20,8 @@ constexpr int kNoPort = -1;
 
 // A mapping's index is a 16-bit number. A gateway that answers beyond it will answer for ever.
 constexpr int kLastMappingIndex = 65535;
+// One that lies or stalls may not hold the daemon, least of all at its end.
+constexpr long kLongestEnumeration = 60;  // seconds
 
 bool isKnownProtocol(const std::string& protocol) {
     return protocol == "TCP" || protocol == "UDP";
@@ -61,7 +63,8 @@ template <typename Visitor>
 bool enumerateMappings(const std::string& controlUrl,
                        const std::string& serviceType,
                        Visitor visit) {
-    for (int index = 0; index <= kLastMappingIndex; ++index) {
+    const std::time_t end = std::time(nullptr) + kLongestEnumeration;
+    for (int index = 0; index <= kLastMappingIndex && std::time(nullptr) <= end; ++index) {
         MappingReply entry;
         const int status = miniupnpc::call(
             UPNP_GetGenericPortMappingEntry, controlUrl.c_str(), serviceType.c_str(),
@@ -137,9 +140,9 @@ bool Router::heldByAnother(int internalPort, int externalPort, const std::string
         logLine(
             LOG_INFO,
             "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d], intClient[%s], intPort[%s], desc[%s], enabled[%s], leaseDuration[%s]\n",
-            status, entry.internalClient.text(), entry.internalPort.text(),
+            status, scrubSecrets(entry.internalClient.text()).c_str(), entry.internalPort.text(),
             scrubSecrets(entry.description.text()).c_str(), entry.enabled.text(),
-            entry.duration.text());
+            scrubSecrets(entry.duration.text()).c_str());
     } else {
         logLine(LOG_INFO,
                 "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
@@ -155,7 +158,7 @@ bool Router::heldByAnother(int internalPort, int externalPort, const std::string
     }
     if (!namesOneHost(client)) return false;
     logLine(LOG_INFO, "Router::mapPort() - internal port: %d is already mapped to another IP: %s\n",
-            internalPort, client.c_str());
+            internalPort, scrubSecrets(client).c_str());
     return true;
 }
 

@@ -1,0 +1,1 @@
+"""How fast and how small Pelorus is; `bench/run` shows it."""

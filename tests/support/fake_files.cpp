@@ -24,13 +24,8 @@ void FakeFiles::redirect(const std::string& path, const std::string& target) {
     targets[path] = target;
 }
 
-void FakeFiles::remove(const std::string& path) {
-    targets[path].clear();
-}
-
 void FakeFiles::reset() {
-    targets.clear();
-    remove(kIdleMinutesFile);
+    targets = {{kIdleMinutesFile, ""}};
 }
 
 std::FILE* FakeFiles::open(const char* path, const char* mode) {

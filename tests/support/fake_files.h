@@ -20,8 +20,6 @@ public:
 
     /// Opens @p target (see PelorusTest::path and writeFile) in place of @p path.
     void redirect(const std::string& path, const std::string& target);
-    /// Makes @p path a missing file.
-    void remove(const std::string& path);
     void reset();
 
     std::FILE* open(const char* path, const char* mode);

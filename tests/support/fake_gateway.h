@@ -1,15 +1,6 @@
 // The home gateway of a test: the UPnP calls of miniupnpc, libnatpmp and select end here, in one
 // mapping table, and nothing is sent.
 //
-//   FakeGateway& gateway = FakeGateway::get();
-//   gateway.reset();                                // in the constructor of the fixture
-//   gateway.add({9091, "192.168.77.7", 8080});      // another host has this port
-//   gateway.refusePort(9092);
-//   ... call the real class ...
-//   EXPECT_EQ(gateway.calls("map "), (Texts{"map TCP 9093 -> 192.168.77.10:80 Kavra"}));
-//   EXPECT_EQ(gateway.mappings(), (std::vector<FakeGateway::Mapping>{...}));
-//   gateway.checkReleased();                        // in TearDown
-//
 // At first the gateway speaks UPnP, not NAT-PMP, is connected and has an empty table. No
 // answer takes time. Every call leaves one line, in order:
 //
@@ -90,7 +81,7 @@ public:
     /// Off: requests are refused at once, as where nothing listens.
     void speakNatpmp(bool on) { natpmp = on; }
     /// NAT-PMP requests get no answer at all.
-    void keepSilent(bool on = true) { silent = on; }
+    void keepSilent() { silent = true; }
     /// The address both protocols tell, at first 44.128.0.20.
     void setExternalIp(const std::string& address) { externalIp = address; }
     /// Lets the question for the external address fail with @p status (UPnP).
@@ -110,14 +101,14 @@ public:
     void acceptPort(int port) { refused.erase(port); }
     void refuseAllPorts(bool on = true) { refuseAll = on; }
     /// Fails removals and keeps the mapping.
-    void refuseRemovals(bool on = true) { keepMappings = on; }
+    void refuseRemovals() { keepMappings = true; }
     /// Answers every question for one mapping with @p reply, whatever the table says.
     void lieAboutEntry(const Reply& reply) { specificLie = reply; }
     /// Answers every index of the table with @p reply, so that a status of 0 never ends.
     void lieAboutTable(const Reply& reply) { genericLie = reply; }
     /// NAT-PMP: grants differ from what was asked.
     void grant(const Grant& what) { granted = what; }
-    /// Lets one library call fail with @p status and errno @p error; 0 lets it work again.
+    /// Lets one library call fail with @p status and errno @p error.
     void failNatpmp(Natpmp call, int status, int error = 0) { failures[call] = {status, error}; }
 
     // --- what was asked ------------------------------------------------------------------
@@ -133,8 +124,6 @@ public:
 
     /// Fails the test when a device list or URLs were not released.
     void checkReleased() const;
-    /// NAT-PMP clients that were opened and not closed; one stays open for each living Router.
-    [[nodiscard]] int openClients() const { return clients; }
     void reset();
 
     // --- the far end of the calls --------------------------------------------------------

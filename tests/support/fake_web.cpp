@@ -142,16 +142,16 @@ void FakeWeb::closeHandle(CURL* handle) {
 
 CURLcode FakeWeb::setNumber(CURL* handle, CURLoption option, long value) {
     checkHandle(handle);
-    transfer.options.push_back({option, std::to_string(value)});
+    transfer.options.emplace_back(option, std::to_string(value));
     return CURLE_OK;
 }
 
 CURLcode FakeWeb::setPointer(CURL* handle, CURLoption option, void* value) {
     checkHandle(handle);
-    transfer.options.push_back({option, ""});
+    transfer.options.emplace_back(option, "");
     if (option == CURLOPT_URL) {
         transfer.url = static_cast<const char*>(value);
-        transfer.options.back().value = transfer.url;
+        transfer.options.back().second = transfer.url;
     }
     if (option == CURLOPT_WRITEDATA) transfer.context = value;
     return CURLE_OK;
@@ -159,7 +159,7 @@ CURLcode FakeWeb::setPointer(CURL* handle, CURLoption option, void* value) {
 
 CURLcode FakeWeb::setWriter(CURL* handle, CURLoption option, curl_write_callback writer) {
     checkHandle(handle);
-    transfer.options.push_back({option, ""});
+    transfer.options.emplace_back(option, "");
     if (option == CURLOPT_WRITEFUNCTION) transfer.writer = writer;
     return CURLE_OK;
 }

@@ -1,15 +1,6 @@
 // The web of a test: libcurl's easy interface (the central server) and miniwget (the local web
 // back end) end here and nothing is sent.
 //
-//   FakeWeb& web = FakeWeb::get();
-//   web.reset();                                              // in the constructor of the fixture
-//   web.answer("/remote_access_status/", "<action>proceed</action>");
-//   web.answerOnce("/porttest", FakeWeb::noAnswer());         // first time nothing ...
-//   web.answerOnce("/porttest", "<x>Success</x>");            // ... then this
-//   ... call the real class ...
-//   EXPECT_EQ(web.urls(), (std::vector<std::string>{"https://...", "http://127.0.0.1/..."}));
-//   web.checkBalance();                                       // in TearDown
-//
 // Fails the test by itself: a transfer before curl_global_init, a handle that is not an open one,
 // miniwget while SIGPIPE could end the process.
 #ifndef PELORUS_SUPPORT_FAKE_WEB_H
@@ -43,10 +34,8 @@ public:
         Side side;
         std::string url;  ///< as it goes over the wire
     };
-    struct Option {
-        CURLoption option;
-        std::string value;  ///< numbers in decimal, texts as they are, empty for pointers
-    };
+    /// Numbers in decimal, texts as they are, empty for pointers.
+    using Options = std::vector<std::pair<CURLoption, std::string>>;
 
     static FakeWeb& get();
     /// A server that cannot be reached.
@@ -63,7 +52,6 @@ public:
 
     /// Everything that was asked, central and local, in order. Empty URLs, which both libraries
     /// refuse, are not among them.
-    [[nodiscard]] const std::vector<Request>& requests() const { return asked; }
     [[nodiscard]] std::vector<std::string> urls() const;
     [[nodiscard]] std::vector<std::string> urls(Side side) const;
     /// How many of them hold @p part.
@@ -72,12 +60,11 @@ public:
     void clear() { asked.clear(); }
 
     /// The options of the last transfer, in the order in which they were set.
-    [[nodiscard]] const std::vector<Option>& options() const { return transfer.options; }
+    [[nodiscard]] const Options& options() const { return transfer.options; }
     /// Lets curl_easy_init or curl_global_init fail from now on.
-    void failHandles(bool fail = true) { handlesFail = fail; }
-    void failGlobalInit(bool fail = true) { globalInitFails = fail; }
+    void failHandles() { handlesFail = true; }
+    void failGlobalInit() { globalInitFails = true; }
     [[nodiscard]] int globalInits() const { return globalInitCount; }
-    [[nodiscard]] int globalCleanups() const { return globalCleanupCount; }
 
     /// Fails the test when an easy handle was not cleaned up.
     void checkBalance() const;
@@ -96,7 +83,7 @@ public:
 
 private:
     struct Transfer {
-        std::vector<Option> options;
+        Options options;
         std::string url;
         curl_write_callback writer = nullptr;
         void* context = nullptr;

@@ -2,7 +2,6 @@
 #ifndef PELORUS_UNIT_CLOUD_FIXTURE_H
 #define PELORUS_UNIT_CLOUD_FIXTURE_H
 
-#include <ostream>
 #include <string>
 #include <vector>
 
@@ -14,27 +13,8 @@
 namespace pelorus {
 
 using support::expectLogged;
-using support::expectLoggedInOrder;
-using support::expectLogIs;
-using support::expectNotLogged;
 using support::FakeWeb;
 using Urls = std::vector<std::string>;
-
-/// What the rows of a table begin with: a name that reads as a sentence.
-struct Case {
-    const char* name;
-};
-
-inline std::ostream& operator<<(std::ostream& out, const Case& row) {
-    return out << row.name;
-}
-
-struct CaseName {
-    template <typename Row>
-    std::string operator()(const ::testing::TestParamInfo<Row>& row) const {
-        return row.param.name;
-    }
-};
 
 class CloudTest : public support::PelorusTest {
 protected:
@@ -48,7 +28,6 @@ protected:
         PelorusTest::TearDown();
     }
 
-    /// The client over a full configuration, its server URLs derived; log and requests are empty.
     TavikClient& givenClient() {
         givenConfig(
             {{"SERVER_BASE_URL", "https://web.kavra.example"},

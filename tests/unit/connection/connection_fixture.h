@@ -24,6 +24,7 @@ using support::expectLoggedInOrder;
 using support::expectNotLogged;
 using support::FakeGateway;
 using support::FakeWeb;
+using support::RowName;
 using support::Texts;
 
 inline constexpr const char* kLanIp = "192.168.77.10";
@@ -36,14 +37,6 @@ inline const std::string kNotReached =
     "<s>Failure</s><remote_external_ip>44.128.0.20</remote_external_ip>";
 inline const std::string kOtherNat =
     "<s>Failure</s><remote_external_ip>44.128.9.9</remote_external_ip>";
-
-/// Names a case of a table by its row.
-struct RowName {
-    template <typename Row>
-    std::string operator()(const ::testing::TestParamInfo<Row>& row) const {
-        return row.param.name;
-    }
-};
 
 class ConnectionTest : public support::PelorusTest {
 protected:

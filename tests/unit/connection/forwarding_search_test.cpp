@@ -19,12 +19,6 @@ protected:
     std::string ip;
 };
 
-TEST_F(ForwardingSearchTest, HttpsIsMappedWithoutATest) {
-    givenGateway();
-    EXPECT_EQ(search(HTTPS), 9444);
-    EXPECT_TRUE(web.urls().empty());
-}
-
 TEST_F(ForwardingSearchTest, PortOfAnotherHostIsLeftAloneAndTheNextTaken) {
     givenGateway();
     gateway.add({9091, "192.168.77.66", 80, "theirs"});

@@ -118,21 +118,11 @@ TEST_F(StateMachineTest, WrongNamesTearEverythingDownAndForceATestInTheSameCycle
         {"ConnectionManager::checkConnection - nslookup failed or does not match local value, kill existing connections.\n",
          "ConnectionManager::killConnection() - unmapping all ports\n",
          "VPNManager::closeVPNConnection() - openVPN process is not running, so return true.\n",
-         "ConnectionManager::setForceConnect = 1\n"},
-        {});
+         "ConnectionManager::setForceConnect = 1\n"});
     forget();
     EXPECT_EQ(manager().createConnection(), PORTFORWARDED);
     EXPECT_EQ(testedPorts(), (std::vector<int>{9091}));
     EXPECT_EQ(commands.count("hdparm"), 0);  // forced: the disk is not asked
-}
-
-TEST_F(StateMachineTest, EveryTypeHasItsWord) {
-    const std::vector<std::string> words{"disabled", "portforwarded", "relayed", "connecting",
-                                         "failed"};
-    for (int type = NONE; type <= FAILED; ++type) {
-        EXPECT_EQ(ConnectionManager::convertEnumConnectionType(static_cast<ConnectionType>(type)),
-                  words[static_cast<std::size_t>(type)]);
-    }
 }
 
 }  // namespace

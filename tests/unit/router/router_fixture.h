@@ -8,12 +8,15 @@
 
 namespace pelorus {
 
+using support::expectLogged;
+using support::FakeGateway;
+using support::RowName;
+using support::Texts;
+using Mapping = FakeGateway::Mapping;
+using Mappings = std::vector<Mapping>;
+
 class RouterTest : public support::PelorusTest {
 protected:
-    using Mapping = support::FakeGateway::Mapping;
-    using Mappings = std::vector<Mapping>;
-    using Texts = support::Texts;
-
     RouterTest() { gateway.reset(); }
 
     void SetUp() override { givenConfig(); }
@@ -22,7 +25,6 @@ protected:
         PelorusTest::TearDown();
     }
 
-    /// Discovers through the protocol that is on; the log and the calls start afresh.
     void discovered() {
         ASSERT_TRUE(router.discover()) << log.dump();
         log.clear();
@@ -34,7 +36,7 @@ protected:
         discovered();
     }
 
-    support::FakeGateway& gateway = support::FakeGateway::get();
+    FakeGateway& gateway = FakeGateway::get();
     Router router;
 };
 

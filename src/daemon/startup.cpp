@@ -72,10 +72,11 @@ void logBanner(pid_t session) {
             "pelorus", GetPelorusVersion(), getpid(), session);
 }
 
-// The folder is everybody's: a link planted there must not redirect the write.
+// The folder is everybody's: a link planted there must not redirect the write, nor a FIFO hold
+// the start until somebody reads it.
 void writePidFile() {
-    const int file =
-        open(kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, kPidFileMode);
+    const int file = open(
+        kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPidFileMode);
     if (file < 0) return;
     static_cast<void>(dprintf(file, "%d", getpid()));
     static_cast<void>(close(file));

@@ -2,8 +2,6 @@
 #ifndef PELORUS_FUZZ_WORLD_H
 #define PELORUS_FUZZ_WORLD_H
 
-#include <gtest/gtest.h>
-
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -12,18 +10,15 @@
 #include <string>
 
 #include "config/global_config.h"
-#include "support/fake_commands.h"
-#include "support/fake_net.h"
-#include "support/log_capture.h"
-#include "support/virtual_clock.h"
+#include "support/fixture.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);
 
 namespace pelorus::fuzz {
 
-inline constexpr const char* kDeviceId = "device-7350142";
-inline constexpr const char* kDeviceAuth = "auth-91c2f0aa";
-inline constexpr const char* kSubdomain = "homecloud-smith";
+using support::kDeviceAuth;
+using support::kDeviceId;
+using support::kSubdomain;
 
 inline std::string asText(const std::uint8_t* data, std::size_t size) {
     return {data, data + size};
@@ -59,7 +54,6 @@ inline void begin(const std::map<std::string, std::string>& settings) {
 
 /// The standing checks of every input.
 inline void finish() {
-    support::LogCapture::get().checkSecrets();
     support::FakeCommands::get().checkClosed();
     support::FakeNet::get().checkReleased();
 }

@@ -15,12 +15,15 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
 
     auto* client = TavikClient::getInstance();
     client->resetServerSleepTime();
-    std::string address = "44.128.0.20";
-    std::string remote;
-    bool relay = false;
-    const int result = client->testPort(address, 9091, HTTP, false, false, &relay, false, remote);
-    fuzz::require(result >= SKIP_TEST && result <= PASS_TEST, "a result of a port test");
-    fuzz::require(result == PASS_TEST || remote.empty(), "an address only with a passed test");
+    for (std::string address : {"44.128.0.20", ""}) {
+        std::string remote;
+        bool relay = false;
+        const int result =
+            client->testPort(address, 9091, HTTP, false, false, &relay, false, remote);
+        fuzz::require(result >= SKIP_TEST && result <= PASS_TEST, "a result of a port test");
+        fuzz::require(!relay || result == FAIL_TEST, "a second NAT fails the test");
+        fuzz::require(remote.empty() || client->validateIpAddress(remote), "the address seen");
+    }
     fuzz::require(client->getServerSleepTime() >= 120, "the least pause");
 
     std::string own;

@@ -20,10 +20,9 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     fuzz::require(!refused || (url.request.empty() && url.logged.empty()), "refused is empty");
     fuzz::require(refused || urlTemplate.empty() || !url.request.empty() || urlTemplate[0] == '%',
                   "a template gives a URL");
-    const std::string given = urlTemplate + text;
     for (const std::string secret : {fuzz::kDeviceId, fuzz::kDeviceAuth}) {
-        fuzz::require(given.find(secret[0]) != std::string::npos ||
-                          url.logged.find(secret) == std::string::npos,
+        const bool mayComeFromTemplate = urlTemplate.find_first_of(secret) != std::string::npos;
+        fuzz::require(mayComeFromTemplate || url.logged.find(secret) == std::string::npos,
                       "no secret in the logged URL");
     }
     fuzz::finish();

@@ -19,34 +19,30 @@ public:
     struct Answer {
         std::string output{};  ///< what a popen reader reads
         int exitStatus = 0;
-        bool fails = false;  ///< system returns -1, popen null
-        /// Runs as the command, e.g. makes a file; gets the command line.
-        std::function<void(const std::string&)> action{};
+        bool fails = false;                                ///< system returns -1, popen null
+        std::function<void(const std::string&)> action{};  ///< runs as the command
     };
 
     static FakeCommands& get();
 
     /// Answers every command that holds @p part. A later rule goes before an earlier one.
     void answer(const std::string& part, Answer answer);
-    /// Shorthand for output and exit status.
     void answer(const std::string& part, const std::string& output, int exitStatus = 0);
-    /// Answers the next command that holds @p part, once, before any standing rule. Several for
-    /// one part are used in the order in which they were given.
+    /// Answers the next command that holds @p part, before any standing rule; several for one
+    /// part in the order in which they were given.
     void answerOnce(const std::string& part, Answer answer);
+    /// Lets the real shell run the system calls that hold @p part.
+    void runForReal(const std::string& part) { realParts.push_back(part); }
 
-    /// All command lines so far, in order.
     [[nodiscard]] const std::vector<std::string>& lines() const { return commands; }
-    /// How many of them hold @p part.
+    /// How many command lines hold @p part.
     [[nodiscard]] int count(const std::string& part) const;
     /// Forgets the lines, not the answers.
     void clear() { commands.clear(); }
 
-    /// Lets the real shell run the commands that hold @p part; nothing else answers them then.
-    void runForReal(const std::string& part = "") { realParts.push_back(part); }
-
     /// Fails the test when a pipe was not closed with pclose.
     void checkClosed() const;
-    void reset();
+    void reset() { *this = FakeCommands{}; }
 
     int runSystem(const char* command);
     std::FILE* openPipe(const char* command, const char* mode);
@@ -54,8 +50,7 @@ public:
 
 private:
     FakeCommands() = default;
-    [[nodiscard]] bool isReal(const std::string& command) const;
-    Answer take(const std::string& command);
+    Answer take(const char* command);
 
     std::vector<std::string> commands;
     std::vector<std::pair<std::string, Answer>> rules;

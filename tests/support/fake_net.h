@@ -10,6 +10,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace pelorus::support {
@@ -25,46 +26,40 @@ public:
 
     static FakeNet& get();
 
-    /// The entries of getifaddrs, in order. At first: lo and eth0 with 192.168.77.10.
+    /// The entries of getifaddrs, in order.
     void setInterfaces(std::vector<Interface> list) { interfaces = std::move(list); }
     void failInterfaces(bool fail = true) { interfacesFail = fail; }
-
-    /// The answer of gethostname. At first "nas".
+    /// The answer of gethostname.
     void setHostname(const std::string& name) { hostname = name; }
-    void failHostname(bool fail = true) { hostnameFails = fail; }
-
-    /// The addresses of a name, IPv4 and IPv6, in the order of the answer. A name nobody set is
-    /// not known (EAI_NONAME). As in libc a lookup without a socket type lists each address three
-    /// times.
-    void setName(const std::string& name, const std::vector<std::string>& addresses);
+    void failHostname() { hostnameFails = true; }
+    /// The addresses of a name, in the order of the answer. A name nobody set is not known. As in
+    /// libc a lookup without a socket type lists each address three times.
+    void setName(const std::string& name, const std::vector<std::string>& addresses) {
+        names[name] = addresses;
+    }
     /// The names that were looked up so far.
     [[nodiscard]] const std::vector<std::string>& lookups() const { return asked; }
 
     /// Fails the test when a list was not released.
     void checkReleased() const;
-    void reset();
+    void reset() { *this = FakeNet{}; }
 
     int takeInterfaces(ifaddrs** list);
-    void releaseInterfaces(ifaddrs* list);
-    int lookUp(const char* name, const char* service, const addrinfo* hints, addrinfo** list);
-    void releaseAddresses(addrinfo* list);
+    int lookUp(const char* name, const addrinfo* hints, addrinfo** list);
+    void release(void* list);
     int takeHostname(char* name, std::size_t size) const;
 
 private:
-    struct InterfaceList;
-    struct AddressList;
+    FakeNet() = default;
 
-    FakeNet();
-    ~FakeNet();
-
-    std::vector<Interface> interfaces;
+    std::vector<Interface> interfaces{{"lo", "127.0.0.1", IFF_UP | IFF_RUNNING | IFF_LOOPBACK},
+                                      {"eth0", "192.168.77.10"}};
     bool interfacesFail = false;
-    std::string hostname;
+    std::string hostname = "nas";
     bool hostnameFails = false;
     std::map<std::string, std::vector<std::string>> names;
     std::vector<std::string> asked;
-    std::map<ifaddrs*, std::unique_ptr<InterfaceList>> interfaceLists;
-    std::map<addrinfo*, std::unique_ptr<AddressList>> addressLists;
+    std::map<void*, std::shared_ptr<void>> lists;  // by their first entry
 };
 
 }  // namespace pelorus::support

@@ -7,6 +7,26 @@
 #include <csignal>
 #include <cstdarg>
 
+namespace pelorus::support {
+
+FakeProcess& FakeProcess::get() {
+    static FakeProcess instance;
+    return instance;
+}
+
+}  // namespace pelorus::support
+
+using pelorus::support::FakeProcess;
+
+namespace {
+
+bool fails(const char* call) {
+    errno = EPERM;
+    return FakeProcess::get().failing.count(call) != 0;
+}
+
+}  // namespace
+
 // NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 pid_t __real_fork();
@@ -14,88 +34,34 @@ pid_t __real_setsid();
 int __real_chdir(const char* path);
 int __real_open(const char* path, int flags, ...);
 int __real_kill(pid_t pid, int signal);
-pid_t __wrap_fork();
-pid_t __wrap_setsid();
-int __wrap_chdir(const char* path);
-int __wrap_open(const char* path, int flags, ...);
-int __wrap_kill(pid_t pid, int signal);
-}
-// NOLINTEND(bugprone-reserved-identifier)
 
-namespace pelorus::support {
-
-namespace {
-
-int failWith(int error) {
-    errno = error;
-    return -1;
-}
-
-}  // namespace
-
-FakeProcess& FakeProcess::get() {
-    static FakeProcess instance;
-    return instance;
-}
-
-void FakeProcess::redirectOpen(const std::string& path, const std::string& target) {
-    targets[path] = target;
-}
-
-pid_t FakeProcess::doFork() const {
-    return forkFails ? failWith(EAGAIN) : __real_fork();
-}
-
-pid_t FakeProcess::doSetsid() const {
-    return setsidFails ? failWith(EPERM) : __real_setsid();
-}
-
-int FakeProcess::doChdir(const char* path) const {
-    return chdirFails ? failWith(EACCES) : __real_chdir(path);
-}
-
-int FakeProcess::doOpen(const char* path, int flags, mode_t mode) {
-    const auto found = targets.find(path);
-    if (found == targets.end()) return __real_open(path, flags, mode);
-    opened.push_back({path, flags});
-    return __real_open(found->second.c_str(), flags, mode);
-}
-
-int FakeProcess::doKill(pid_t pid, int signal) {
-    if (pid != getpid()) return __real_kill(pid, signal);
-    kills.push_back(signal);
-    return realKills ? __real_kill(pid, signal) : 0;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeProcess;
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 pid_t __wrap_fork() {
-    return FakeProcess::get().doFork();
+    return fails("fork") ? -1 : __real_fork();
 }
 
 pid_t __wrap_setsid() {
-    return FakeProcess::get().doSetsid();
+    return fails("setsid") ? -1 : __real_setsid();
 }
 
 int __wrap_chdir(const char* path) {
-    return FakeProcess::get().doChdir(path);
+    return fails("chdir") ? -1 : __real_chdir(path);
 }
 
 int __wrap_open(const char* path, int flags, ...) {
-    mode_t mode = 0;
-    if ((flags & O_CREAT) != 0) {
-        va_list args;
-        va_start(args, flags);
-        mode = va_arg(args, mode_t);
-        va_end(args);
-    }
-    return FakeProcess::get().doOpen(path, flags, mode);
+    va_list args;
+    va_start(args, flags);
+    const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
+    va_end(args);
+    const auto& targets = FakeProcess::get().targets;
+    const auto found = targets.find(path);
+    return __real_open(found == targets.end() ? path : found->second.c_str(), flags, mode);
 }
 
 int __wrap_kill(pid_t pid, int signal) {
-    return FakeProcess::get().doKill(pid, signal);
+    FakeProcess& process = FakeProcess::get();
+    if (pid != getpid()) return __real_kill(pid, signal);
+    process.selfKills.push_back(signal);
+    return process.killForReal ? __real_kill(pid, signal) : 0;
+}
 }
 // NOLINTEND(bugprone-reserved-identifier)

@@ -8,7 +8,6 @@
 #include <stdexcept>
 
 #include "config/global_config.h"
-#include "support/fake_process.h"
 
 namespace pelorus::support {
 
@@ -22,43 +21,22 @@ std::string makeFolder() {
     return name;
 }
 
-std::string asLines(const std::map<std::string, std::string>& settings) {
-    std::string lines;
-    for (const auto& [key, value] : settings) {
-        lines.append(key).append("=").append(value).append("\n");
-    }
-    return lines;
-}
-
-void resetSeams() {
-    LogCapture::get().reset();
-    VirtualClock::get().reset();
-    FakeCommands::get().reset();
-    FakeNet::get().reset();
-    FakeProcess::get().reset();
+std::ptrdiff_t openDescriptors() {
+    return std::distance(fs::directory_iterator{"/proc/self/fd"}, fs::directory_iterator{});
 }
 
 }  // namespace
 
-std::size_t openDescriptors() {
-    const fs::directory_iterator all{"/proc/self/fd"};
-    return static_cast<std::size_t>(std::distance(begin(all), end(all))) - 1;
-}
-
 PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescriptors()} {
-    resetSeams();
     pthread_sigmask(SIG_SETMASK, nullptr, &maskAtStart);
 }
 
 PelorusTest::~PelorusTest() {
-    for (const std::string& key : configured) GlobalConfig::getInstance()->deleteProperty(key);
-    resetSeams();
     std::error_code ignored;
     fs::remove_all(folder, ignored);
 }
 
 void PelorusTest::TearDown() {
-    log.checkSecrets();
     commands.checkClosed();
     net.checkReleased();
     EXPECT_EQ(openDescriptors(), descriptorsAtStart) << "descriptors now and at the start";
@@ -81,9 +59,14 @@ std::string PelorusTest::readFile(const std::string& file) {
     return content.str();
 }
 
-void PelorusTest::noteSetting(const std::string& key, const std::string& value) {
-    configured.insert(key);
-    if (key == "DEVICEID" || key == "DEVICEAUTH" || key == "SUBDOMAIN") log.addSecret(value);
+// Registers the secrets among them.
+std::string PelorusTest::asLines(const Settings& settings) {
+    std::string lines;
+    for (const auto& [key, value] : settings) {
+        lines.append(key).append("=").append(value).append("\n");
+        if (key == "DEVICEID" || key == "DEVICEAUTH" || key == "SUBDOMAIN") log.addSecret(value);
+    }
+    return lines;
 }
 
 void PelorusTest::givenConfig(const Settings& settings, const Settings& dynamicSettings) {
@@ -96,8 +79,6 @@ void PelorusTest::givenConfig(const Settings& settings, const Settings& dynamicS
     for (const auto& [key, value] : identity) {
         if (fixed.count(key) == 0) changing.emplace(key, value);
     }
-    for (const auto& [key, value] : fixed) noteSetting(key, value);
-    for (const auto& [key, value] : changing) noteSetting(key, value);
     writeFile("dynamicconfig.ini", asLines(changing));
     ASSERT_TRUE(GlobalConfig::getInstance()->loadConfig(writeFile("static.ini", asLines(fixed))))
         << log.dump();
@@ -105,12 +86,8 @@ void PelorusTest::givenConfig(const Settings& settings, const Settings& dynamicS
 }
 
 void PelorusTest::setConfig(const std::string& key, const std::string& value) {
-    noteSetting(key, value);
+    static_cast<void>(asLines({{key, value}}));
     GlobalConfig::getInstance()->setProperty(key, value, false);
-}
-
-void PelorusTest::forgetConfig(const std::string& key) {
-    GlobalConfig::getInstance()->deleteProperty(key);
 }
 
 }  // namespace pelorus::support

@@ -1,24 +1,17 @@
-// The base of every test fixture.
+// The base of every test fixture. The seams of libc are always in place: no test reaches the
+// shell, the network, the system log or the real clock. Other seams (fake_*.h) are linked into a
+// binary when one of its tests uses them.
 //
-//   class TimerTest : public pelorus::support::PelorusTest {};
-//   TEST_F(TimerTest, KeepsItsStart) {
-//       givenConfig({{"INTERNAL_HTTP_PORT", "80"}});      // files in folder, loaded, log cleared
-//       setConfig("MANUAL_PORT_FORWARD", "TRUE");         // one value, in memory
-//       commands.answer("hdparm", "drive state is: active/idle\n");
-//       clock.duringPause(1, [&] { clock.raiseSignal(SIGTERM); });
-//       net.setName("nas.kavra.example", {"44.128.0.20"});
-//       ... call the real class ...
-//       EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5}));
-//       expectLogged(LOG_INFO, "...\n");                  // see log_capture.h for more
-//   }
+//   givenConfig({{"INTERNAL_HTTP_PORT", "80"}});
+//   commands.answer("hdparm", "drive state is: active/idle\n");
+//   net.setName("nas.kavra.example", {"44.128.0.20"});
+//   ... call the real class ...
+//   EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5}));
+//   expectLogged(LOG_INFO, "...\n");
 //
-// The seams of libc are always in place: no test reaches the shell, the network, the system log
-// or the real clock. Other seams (fake_*.h) are linked into a binary when one of its tests uses
-// them.
-//
-// Checked at the end of each test without being asked: no configured secret in any log line;
-// pipes, address lists, descriptors and the signal mask as they were. Each fake tells further
-// standing checks in its header.
+// Every test fails without being asked when a configured secret is in a log line, and when pipes,
+// address lists, descriptors or the signal mask are not as they were. The fakes tell further
+// standing checks in their headers.
 #ifndef PELORUS_SUPPORT_FIXTURE_H
 #define PELORUS_SUPPORT_FIXTURE_H
 
@@ -26,7 +19,6 @@
 
 #include <csignal>
 #include <map>
-#include <set>
 #include <string>
 
 #include "support/fake_commands.h"
@@ -59,13 +51,11 @@ protected:
     [[nodiscard]] static std::string readFile(const std::string& file);
 
     /// Writes static.ini and dynamicconfig.ini, loads both and clears the log. The device has
-    /// the identity above unless @p dynamicSettings or @p settings say otherwise; a value may be
-    /// empty. The dynamic file is read directly, without a temporary copy.
+    /// the identity above unless the settings say otherwise; a value may be empty. The dynamic
+    /// file is read directly, without a temporary copy.
     void givenConfig(const Settings& settings = {}, const Settings& dynamicSettings = {});
     /// Changes one value in memory, and the secrets with it.
     void setConfig(const std::string& key, const std::string& value);
-    /// Makes one key unknown again.
-    void forgetConfig(const std::string& key);
 
     const std::string folder;
     LogCapture& log = LogCapture::get();
@@ -74,11 +64,10 @@ protected:
     FakeNet& net = FakeNet::get();
 
 private:
-    void noteSetting(const std::string& key, const std::string& value);
+    std::string asLines(const Settings& settings);
 
-    std::set<std::string> configured;
     sigset_t maskAtStart{};
-    std::size_t descriptorsAtStart;
+    std::ptrdiff_t descriptorsAtStart;
 };
 
 /// Names a case of a table by the name of its row.
@@ -88,9 +77,6 @@ struct RowName {
         return row.param.name;
     }
 };
-
-/// Descriptors this process has open, without the one used to look.
-[[nodiscard]] std::size_t openDescriptors();
 
 }  // namespace pelorus::support
 

@@ -19,59 +19,37 @@ struct LogLine {
 bool operator==(const LogLine& left, const LogLine& right);
 void PrintTo(const LogLine& line, std::ostream* out);
 
-/// Pairs of (ECMAScript regular expression, replacement) for what differs between runs.
-using Tokens = std::vector<std::pair<std::string, std::string>>;
-
-/// All lines of the test so far. A line that is sent while another one is being sent is a
-/// failure: with the real log it would wait for a lock for ever.
+/// A line that holds a secret fails the test. So does one that is sent while another is being
+/// sent: with the real log it would wait for a lock for ever.
 class LogCapture {
 public:
-    struct Opened {
-        std::string ident;
-        int option;
-        int facility;
-    };
-
     static LogCapture& get();
 
+    /// Since the last clear().
     [[nodiscard]] const std::vector<LogLine>& lines() const { return captured; }
-    /// The texts alone, after replacing @p tokens.
-    [[nodiscard]] std::vector<std::string> texts(const Tokens& tokens = {}) const;
-    /// How often exactly this line came.
+    [[nodiscard]] std::vector<std::string> texts() const;
+    /// How often exactly this line came, and how many lines hold @p part.
     [[nodiscard]] int count(int priority, const std::string& text) const;
-    /// How many lines hold @p part.
     [[nodiscard]] int countPart(const std::string& part) const;
-    /// All lines, readable, for failure messages.
+    /// All lines, for failure messages.
     [[nodiscard]] std::string dump() const;
+    /// "level MASK" and "openlog IDENT OPTION FACILITY", in the order of the calls.
+    [[nodiscard]] const std::vector<std::string>& setup() const { return setupCalls; }
 
-    [[nodiscard]] const std::vector<Opened>& openlogCalls() const { return opened; }
-    [[nodiscard]] const std::vector<int>& setlogmaskCalls() const { return masks; }
-
-    /// Forgets the lines; those of the next part of a test are then alone.
     void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
     void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
-
-    /// A text that must be in no line, from the beginning of the test on (cleared lines
-    /// included). The fixture registers what it configures and checks at the end of each test.
     void addSecret(const std::string& secret);
-    /// Fails the test when a registered secret is or was in a line.
-    void checkSecrets() const;
+    void reset() { *this = LogCapture{}; }
 
-    /// Back to the state at the start of a process.
-    void reset();
-
-    void take(int priority, const char* text);
-    void takeOpen(const char* ident, int option, int facility);
-    int takeMask(int mask);
+    void take(const LogLine& line);
+    void takeSetup(const std::string& call) { setupCalls.push_back(call); }
 
 private:
     LogCapture() = default;
 
     std::vector<LogLine> captured;
-    std::vector<std::string> everything;
-    std::vector<Opened> opened;
-    std::vector<int> masks;
+    std::vector<std::string> setupCalls;
     std::vector<std::string> secrets;
     std::function<void(const LogLine&)> hook;
     int depth = 0;
@@ -82,35 +60,9 @@ void expectLogged(int priority, const std::string& text);
 /// Fails when a line holds @p part.
 void expectNotLogged(const std::string& part);
 /// Fails unless these lines came in this order, others possibly between them.
-void expectLoggedInOrder(const std::vector<std::string>& texts, const Tokens& tokens = {});
-/// Fails unless the lines since the last clear() are exactly these.
-void expectLogIs(const std::vector<LogLine>& lines, const Tokens& tokens = {});
-
-/// At the end of the scope: fails unless the line came within it.
-class ExpectLogged {
-public:
-    ExpectLogged(int priority, std::string text);
-    ~ExpectLogged();
-    ExpectLogged(const ExpectLogged&) = delete;
-    ExpectLogged& operator=(const ExpectLogged&) = delete;
-
-private:
-    LogLine wanted;
-    int before;
-};
-
-/// At the end of the scope: fails when a line that holds the part came within it.
-class ExpectNotLogged {
-public:
-    explicit ExpectNotLogged(std::string part);
-    ~ExpectNotLogged();
-    ExpectNotLogged(const ExpectNotLogged&) = delete;
-    ExpectNotLogged& operator=(const ExpectNotLogged&) = delete;
-
-private:
-    std::string unwanted;
-    int before;
-};
+void expectLoggedInOrder(const std::vector<std::string>& texts);
+/// Fails unless the lines are exactly these.
+void expectLogIs(const std::vector<LogLine>& lines);
 
 }  // namespace pelorus::support
 

@@ -10,43 +10,28 @@
 namespace pelorus::support {
 namespace {
 
-class SignalBlockTest : public PelorusTest {
-protected:
-    SignalBlockTest() { static_cast<void>(std::signal(SIGTERM, count)); }
-    ~SignalBlockTest() override { static_cast<void>(std::signal(SIGTERM, SIG_DFL)); }
-    SignalBlockTest(const SignalBlockTest&) = delete;
-    SignalBlockTest& operator=(const SignalBlockTest&) = delete;
+using SignalBlockTest = PelorusTest;
 
-    static bool isBlocked(int signal) {
-        sigset_t mask;
-        pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-        return sigismember(&mask, signal) == 1;
-    }
-    static bool isPending(int signal) {
-        sigset_t pending;
-        sigpending(&pending);
-        return sigismember(&pending, signal) == 1;
-    }
-    // Writes to a peer that is gone.
-    static int writeToClosedPipe() {
-        std::array<int, 2> ends{};
-        EXPECT_EQ(pipe(ends.data()), 0);
-        close(ends[0]);
-        const ssize_t written = write(ends[1], "x", 1);
-        const int error = written < 0 ? errno : 0;
-        close(ends[1]);
-        return error;
-    }
+bool isPending(int signal) {
+    sigset_t pending;
+    sigpending(&pending);
+    return sigismember(&pending, signal) == 1;
+}
 
-    static volatile std::sig_atomic_t delivered;
+// Writes to a peer that is gone.
+int writeToClosedPipe() {
+    std::array<int, 2> ends{};
+    EXPECT_EQ(pipe(ends.data()), 0);
+    close(ends[0]);
+    const int error = write(ends[1], "x", 1) < 0 ? errno : 0;
+    close(ends[1]);
+    return error;
+}
 
-private:
-    static void count(int /*signal*/) { delivered = delivered + 1; }
-};
-
-volatile std::sig_atomic_t SignalBlockTest::delivered = 0;
+volatile std::sig_atomic_t delivered = 0;
 
 TEST_F(SignalBlockTest, ASignalIsDeliveredWhenTheOutermostScopeEnds) {
+    std::signal(SIGTERM, [](int) { delivered = delivered + 1; });
     {
         const SignalBlock outer{SIGTERM};
         {
@@ -55,12 +40,12 @@ TEST_F(SignalBlockTest, ASignalIsDeliveredWhenTheOutermostScopeEnds) {
             EXPECT_EQ(sigismember(&inner.previousMask(), SIGINT), 0);
             raise(SIGTERM);
         }
-        EXPECT_FALSE(isBlocked(SIGINT));
         EXPECT_EQ(delivered, 0);
     }
     EXPECT_EQ(delivered, 1);
 }
 
+// The fixture looks whether the mask is as it was.
 TEST_F(SignalBlockTest, ABrokenPipeOnlyFailsTheWrite) {
     {
         const BrokenPipeGuard outer;
@@ -68,7 +53,6 @@ TEST_F(SignalBlockTest, ABrokenPipeOnlyFailsTheWrite) {
         EXPECT_EQ(writeToClosedPipe(), EPIPE);
     }
     EXPECT_FALSE(isPending(SIGPIPE));
-    EXPECT_FALSE(isBlocked(SIGPIPE));
 }
 
 TEST_F(SignalBlockTest, ABrokenPipeOfTheCallerStaysHisOwn) {
@@ -79,8 +63,7 @@ TEST_F(SignalBlockTest, ABrokenPipeOfTheCallerStaysHisOwn) {
         EXPECT_EQ(writeToClosedPipe(), EPIPE);
     }
     EXPECT_TRUE(isPending(SIGPIPE));
-    static_cast<void>(std::signal(SIGPIPE, SIG_IGN));  // takes it off the queue
-    static_cast<void>(std::signal(SIGPIPE, SIG_DFL));
+    std::signal(SIGPIPE, SIG_IGN);  // takes it off the queue
 }
 
 }  // namespace

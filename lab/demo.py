@@ -7,6 +7,7 @@ import os
 import signal
 import subprocess
 import sys
+import time
 
 from lab import network, sandbox, web
 from lab.device import HOME
@@ -104,15 +105,15 @@ def _look_around() -> None:
     """Say how to get into the lab, and keep it up until Ctrl-C."""
     enter = (f"nsenter --preserve-credentials -U -m -n -p -u -t {sandbox.pid_outside()} "
              "ip netns exec")
-    print(f"""
+    try:
+        print(f"""
 The lab stays up until Ctrl-C. From another terminal, as the same user:
   a shell on the device   {enter} {network.DEVICE} sh
   the device's log        {enter} {network.DEVICE} tail -f {HOME}/messages
   the gateway's rules     {enter} {network.GATEWAY} nft list ruleset
   the view from outside   {enter} {network.INTERNET} sh""", flush=True)
-    try:
         while True:
-            signal.pause()
+            time.sleep(1)  # bounded: a signal in the moment before a wait does not end it
     except KeyboardInterrupt:
         print("\nthe lab is gone")
 

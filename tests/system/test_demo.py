@@ -19,7 +19,7 @@ DAEMON_FILES = (Path("/tmp/tavik_cm_pid"), Path("/tmp/dynamicconfig.ini"))
 
 
 def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Popen[str]:
-    """The demo as a terminal runs it, in a process group of its own, with a daemon that is built already."""
+    """The demo as a terminal runs it: a process group of its own, the daemon already built."""
     environment = dict(os.environ, PELORUS=str(binary))
     return subprocess.Popen([sandbox.PYTHON, "-m", "lab.demo", *options], env=environment,
                             cwd=sandbox.PROJECT, stdout=subprocess.PIPE, text=True,

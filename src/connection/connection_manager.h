@@ -61,7 +61,7 @@ public:
     /// Stretches the time between port tests by two minutes, up to sixteen.
     void increasePortTestInterval();
 
-    // --- the stages of an attempt, public for their own tests ------------------------------------
+    // --- the stages of an attempt, each usable on its own -----------------------------------------
 
     /// Makes or keeps a direct connection. PORTFORWARDED, FAILED, or the connection type of
     /// before when nothing was due.

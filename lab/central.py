@@ -8,9 +8,10 @@ device's public names there. A test can make it slow, mute or wrong.
 from __future__ import annotations
 
 import re
+import reprlib
 import threading
 import time
-from dataclasses import dataclass
+from dataclasses import dataclass, replace
 
 from lab import network, web
 from lab.account import SERVICE_HOST, Account
@@ -23,7 +24,7 @@ MY_IP, WAIT, PORT_TEST, PORT_FORWARD, COMM_STATUS = (
     "myip", "remote_access_status", "port_test", "port_forward", "comm_status")
 IDENTITY_PATH = "/api/1.0/rest/device"
 _READY_PATH = "/ready"
-_CONNECT_BACK_SECONDS = 5
+_CONNECT_BACK_SECONDS = 0.75
 
 
 @dataclass(frozen=True)
@@ -52,11 +53,29 @@ class PortTest:
 
 @dataclass(frozen=True)
 class Fault:
-    """How an operation misbehaves: other words, after a pause, or no answer at all."""
+    """How an operation misbehaves: other words, after a pause, or no answer at all.
+
+    `drop` closes the connection, `reset` tears it down. With `times` the operation is right again
+    after that many requests.
+    """
 
     body: str | None = None
     delay: float = 0
     drop: bool = False
+    reset: bool = False
+    times: int = 0
+
+    def __str__(self) -> str:
+        pause = f" after {self.delay:g} s" if self.delay else ""
+        often = f", {self.times} x" if self.times else ""
+        return f"{self._ending()}{pause}{often}"
+
+    def _ending(self) -> str:
+        if self.reset:
+            return "resets the connection"
+        if self.drop:
+            return "hangs up"
+        return "answers" if self.body is None else f"answers {reprlib.repr(self.body)}"
 
 
 class CentralService:
@@ -83,8 +102,9 @@ class CentralService:
 
     def start(self) -> None:
         """Listen on HTTP and HTTPS; a client at home must get an answer from both."""
+        is_back = bool(self._servers)
         self._names.set({SERVICE_HOST: network.SERVICE_ADDRESS})
-        self._names.set(dict.fromkeys(self._account.names, network.RELAY_ADDRESS))
+        self._point_names()
         self._servers = [
             WebServer(network.INTERNET, network.SERVICE_ADDRESS, 80, self._answer),
             WebServer(network.INTERNET, network.SERVICE_ADDRESS, 443, self._answer,
@@ -93,9 +113,12 @@ class CentralService:
             web.expect_answer(f"central service ({scheme})", network.DEVICE,
                               f"{scheme}://{network.SERVICE_ADDRESS}{_READY_PATH}",
                               trust=str(self._authority.certificate), name=SERVICE_HOST)
+        if is_back:
+            self._timeline.add("central", "is back")
 
     def stop(self) -> None:
         """Go away: connections are refused until `start`."""
+        self._timeline.add("central", "goes away")
         for server in self._servers:
             server.close()
 
@@ -105,10 +128,12 @@ class CentralService:
             self._faults.pop(operation, None)
             if fault:
                 self._faults[operation] = fault
+        self._timeline.add("central", f"{operation} from now on: {fault or 'as it should be'}")
 
     def show_certificate_of(self, name: str) -> None:
         """Prove to be `name` on HTTPS from now on; a wrong one makes devices hang up."""
         self._servers[1].show_certificate(self._authority.sign(name))
+        self._timeline.add("central", f"shows the certificate of {name} from now on")
 
     def requests_for(self, operation: str) -> list[Request]:
         """The requests for one operation, in order."""
@@ -127,11 +152,11 @@ class CentralService:
             return Reply(b"ready")
         with self._lock:
             self.requests.append(request)
-            fault = self._faults.get(_operation(request))
+            fault = self._next_fault(_operation(request))
         if fault:
             time.sleep(fault.delay)
-            if fault.drop:
-                return Reply(None)
+            if fault.drop or fault.reset:
+                return Reply(None, reset=fault.reset)
             if fault.body is not None:
                 return Reply(fault.body.encode())
         operation = self._operations.get(_operation(request))
@@ -144,6 +169,15 @@ class CentralService:
             return Reply(b"<status>failure</status>", 401)
         return Reply(operation(request).encode())
 
+    def _next_fault(self, operation: str) -> Fault | None:
+        """The fault for one more request; the last of a counted one ends it."""
+        fault = self._faults.get(operation)
+        if fault and fault.times == 1:
+            del self._faults[operation]
+        elif fault and fault.times:
+            self._faults[operation] = replace(fault, times=fault.times - 1)
+        return fault
+
     def _may(self, request: Request) -> bool:
         known = (self._account.device_id, self._account.auth)
         return (request.path.rsplit("/", 1)[-1], request.argument("auth")) == known
@@ -153,6 +187,7 @@ class CentralService:
 
     def _permission(self, _request: Request) -> str:
         if self.wait_seconds > 0:
+            self._timeline.add("central", f"asks the device to wait {self.wait_seconds} s")
             return f"<action>wait</action><wait_time>{self.wait_seconds}</wait_time>"
         return "<action>proceed</action>"
 
@@ -175,16 +210,21 @@ class CentralService:
         if external_ip == "NULL":
             self.record = None
             self.withdrawals += 1
-            self._names.set(dict.fromkeys(self._account.names, network.RELAY_ADDRESS))
+            self._point_names()
             self._timeline.add("central", "mapping withdrawn, names point to the relay")
         else:
             self.record = Record(external_ip, request.argument("local_ip"),
                                  int(request.argument("http_port")),
                                  int(request.argument("https_port")))
-            self._names.set(dict.fromkeys(self._account.names, external_ip))
+            self._point_names()
             self._timeline.add("central", f"mapping published: {external_ip} HTTP "
                                f"{self.record.http_port}, HTTPS {self.record.https_port}")
         return "<status>Success</status>"
+
+    def _point_names(self) -> None:
+        """Send clients to the device where it is published, else to the relay."""
+        address = self.record.external_ip if self.record else network.RELAY_ADDRESS
+        self._names.set(dict.fromkeys(self._account.names, address))
 
     def _comm_status(self, request: Request) -> str:
         self.local_ip = request.argument("local_ip")

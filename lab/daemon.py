@@ -2,13 +2,13 @@
 
 from __future__ import annotations
 
-import glob
 import os
 import signal
 import subprocess
 from pathlib import Path
 
 from lab import device, network, sandbox
+from lab.clock import fast_pauses
 from lab.support import LabError, wait_until
 
 PID_FILE = Path("/tmp/tavik_cm_pid")
@@ -18,14 +18,15 @@ OUTPUT = device.HOME / "pelorus.out"
 class Daemon:
     """One run of the daemon, from its start to the wait status it leaves."""
 
-    def __init__(self, options: tuple[str, ...], clock: int) -> None:
+    def __init__(self, options: tuple[str, ...], clock: int, hasty: bool) -> None:
         """Start it and return when it has detached; `clock` makes its time run that much faster.
 
-        It becomes a child of the sandbox's first process, which is the one that runs this code.
+        The time limit of its transfers is real time, unless it is `hasty`. It becomes a child of
+        the sandbox's first process, which is the one that runs this code.
         """
         PID_FILE.unlink(missing_ok=True)
         environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
-                       *_fast_clock(clock)]
+                       *fast_pauses(clock, hasty)]
         argv = network.command(network.DEVICE, "env", "-i", *environment,
                                str(sandbox.binary()), *options)
         with OUTPUT.open("ab") as output:
@@ -65,12 +66,3 @@ def running(program: str) -> list[int]:
         except OSError:
             continue  # gone, or only waiting to be reaped
     return found
-
-
-def _fast_clock(factor: int) -> list[str]:
-    if factor == 1:
-        return []
-    libraries = glob.glob("/usr/lib/*/faketime/libfaketimeMT.so.1")
-    if not libraries:
-        raise LabError("libfaketime is not installed")
-    return [f"LD_PRELOAD={libraries[0]}", f"FAKETIME=+0 x{factor}"]

@@ -22,8 +22,10 @@ DYNAMIC_COPY = Path("/tmp/dynamicconfig.ini")
 SLEEP_COUNT = Path("/tmp/minutes_since_disk_access")
 PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 
+_LAN_PORT = "eth0"
 _TUNNEL = HOME / "openvpn"
-_HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {HOME}/drive_state)\"\n"
+_DRIVE_STATE = HOME / "drive_state"
+_HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {_DRIVE_STATE})\"\n"
 
 # The tunnel's other end lives in real time, so the client must too when the device's clock is fast.
 _STATIC = {
@@ -59,6 +61,7 @@ class Device:
     def __init__(self, account: Account, authority: Authority, timeline: Timeline) -> None:
         self.messages = Messages(HOME / "messages")
         self.local_requests: list[Request] = []
+        self._servers: list[WebServer] = []
         self._account = account
         self._authority = authority
         self._timeline = timeline
@@ -73,7 +76,23 @@ class Device:
             "DEVICEID": self._account.device_id, "DEVICEAUTH": self._account.auth,
             "SUBDOMAIN": self._account.subdomain, "COMMUNICATION_STATUS": "disabled",
             "INTERNAL_HTTP_PORT": "80", "INTERNAL_HTTPS_PORT": "443", **dynamic})
-        self._serve()
+        self.serve_on(int(self.setting("INTERNAL_HTTP_PORT")),
+                      int(self.setting("INTERNAL_HTTPS_PORT")))
+
+    def serve_on(self, http_port: int, https_port: int) -> None:
+        """Serve on these two ports and no longer elsewhere; only the device knows its certificate.
+
+        The configuration is left to whoever moves the web server.
+        """
+        for server in self._servers:
+            server.close()
+        own = Authority(HOME / "ssl", self._account.host_name).sign(self._account.host_name)
+        self._servers = [
+            WebServer(network.DEVICE, "0.0.0.0", http_port, self._answer),
+            WebServer(network.DEVICE, "0.0.0.0", https_port, self._answer, own)]
+        for server in self._servers:
+            web.expect_answer(f"device ({server.scheme})", network.DEVICE,
+                              f"{server.scheme}://127.0.0.1:{server.server_port}/")
 
     @property
     def status(self) -> str:
@@ -86,10 +105,32 @@ class Device:
 
     def change(self, **settings: str) -> None:
         """Write settings the way other programs on the device do: both files, at once."""
-        with self._lock:
-            for path in (DYNAMIC_FILE, DYNAMIC_COPY):
-                if path.exists():
-                    _write_settings(path, {**_read_settings(path), **settings})
+        self._change(**settings)
+        told = ", ".join(f"{key}={value}" for key, value in settings.items())
+        self._timeline.add("device", f"settings now: {told}")
+
+    def move_to(self, address: str) -> None:
+        """Get another address on the LAN, as from a DHCP server that forgot the old one."""
+        network.ip("-n", network.DEVICE, "-4", "address", "flush", "dev", _LAN_PORT)
+        network.ip("-n", network.DEVICE, "address", "add", f"{address}/24", "dev", _LAN_PORT)
+        network.ip("-n", network.DEVICE, "route", "add", "default", "via",
+                   network.GATEWAY_LAN_ADDRESS)
+        self._timeline.add("device", f"has the LAN address {address} from now on")
+
+    def disk_sleeps(self) -> None:
+        """Let the disk be in standby."""
+        _DRIVE_STATE.write_text("standby")
+        self._timeline.add("device", "the disk goes to sleep")
+
+    def disk_wakes(self) -> None:
+        """Let the disk turn again."""
+        _DRIVE_STATE.write_text("active/idle")
+        self._timeline.add("device", "the disk wakes up")
+
+    def minutes_since_disk_access(self, count: int) -> None:
+        """Let the disk be unused for so long, which the device's own watcher counts."""
+        SLEEP_COUNT.write_text(f"{count}\n")
+        self._timeline.add("device", f"the disk is unused for {count} minutes")
 
     def statuses_told(self) -> list[str]:
         """The status words the local back end was told, in order."""
@@ -100,13 +141,19 @@ class Device:
         """The tunnel client's own output."""
         return _TUNNEL / "openvpn.out"
 
+    def _change(self, **settings: str) -> None:
+        with self._lock:
+            for path in (DYNAMIC_FILE, DYNAMIC_COPY):
+                if path.exists():
+                    _write_settings(path, {**_read_settings(path), **settings})
+
     def _write_system_files(self) -> None:
         (HOME / "bin").mkdir(parents=True)
         DYNAMIC_FILE.parent.mkdir()
         hdparm = HOME / "bin/hdparm"
         hdparm.write_text(_HDPARM)
         hdparm.chmod(0o755)
-        (HOME / "drive_state").write_text("active/idle")
+        _DRIVE_STATE.write_text("active/idle")
         SLEEP_COUNT.write_text("0\n")
         network.host_file(network.DEVICE, "resolv.conf", f"nameserver {network.SERVICE_ADDRESS}\n")
         network.host_file(network.DEVICE, "ssl/certs/ca-certificates.crt",
@@ -117,17 +164,6 @@ class Device:
         (_TUNNEL / "client.conf").write_text(CLIENT)
         (_TUNNEL / "authority.crt").write_text(self._authority.certificate.read_text())
         (_TUNNEL / "relay_servers.offered").write_text(OFFER)
-
-    def _serve(self) -> None:
-        """The web server on both internal ports, with a certificate only the device knows."""
-        own = Authority(HOME / "ssl", self._account.host_name).sign(self._account.host_name)
-        ports = {"http": int(self.setting("INTERNAL_HTTP_PORT")),
-                 "https": int(self.setting("INTERNAL_HTTPS_PORT"))}
-        for scheme, port in ports.items():
-            WebServer(network.DEVICE, "0.0.0.0", port, self._answer,
-                      own if scheme == "https" else None)
-            web.expect_answer(f"device ({scheme})", network.DEVICE,
-                              f"{scheme}://127.0.0.1:{port}/")
 
     def _answer(self, request: Request) -> Reply:
         if request.path == IDENTITY_PATH:
@@ -144,17 +180,17 @@ class Device:
             self.local_requests.append(request)
         operation = request.path.removeprefix("/local/")
         if operation == "comm_status":
-            self.change(COMMUNICATION_STATUS=request.argument("status"))
+            self._change(COMMUNICATION_STATUS=request.argument("status"))
             self._timeline.add("device", f"status: {request.argument('status')}")
         elif operation == "port_forward":
-            self.change(EXTERNAL_IP=request.argument("external_ip"),
-                        EXTERNAL_HTTP_PORT=request.argument("http_port"),
-                        EXTERNAL_HTTPS_PORT=request.argument("https_port"),
-                        LOCAL_IP=request.argument("local_ip"))
+            self._change(EXTERNAL_IP=request.argument("external_ip"),
+                         EXTERNAL_HTTP_PORT=request.argument("http_port"),
+                         EXTERNAL_HTTPS_PORT=request.argument("https_port"),
+                         LOCAL_IP=request.argument("local_ip"))
         elif operation == "port_forward_delete":
-            self.change(EXTERNAL_IP="", EXTERNAL_HTTP_PORT="0", EXTERNAL_HTTPS_PORT="0")
+            self._change(EXTERNAL_IP="", EXTERNAL_HTTP_PORT="0", EXTERNAL_HTTPS_PORT="0")
         elif operation == "local_ip":
-            self.change(LOCAL_IP=request.argument("address"))
+            self._change(LOCAL_IP=request.argument("address"))
         else:
             return Reply(b"<result>failure</result>", 404)
         return Reply(b"<result>success</result>")

@@ -2,176 +2,288 @@
 
 from __future__ import annotations
 
-import json
+import re
 import socket
-import subprocess
 import threading
 from dataclasses import dataclass
 from pathlib import Path
 
-from lab import network, web
+from lab import natpmp, network, packet_filter, web
+from lab.natpmp import Grant, NatPmp
+from lab.packet_filter import BY_HAND, Mapping
 from lab.server import Server
-from lab.support import run_tool
+from lab.support import LabError, wait_until
 from lab.timeline import Timeline
 
 EVERY_PORT = ("allow 1-65535 0.0.0.0/0 1-65535",)
 NO_PORT = ("deny 0-65535 0.0.0.0/0 0-65535",)
+STOCK_PERMISSIONS = ("allow 1024-65535 192.168.77.0/24 1024-65535", *NO_PORT)
 
+_FIRST_HTTP_PORT = 5001
 _SEARCH = ("M-SEARCH * HTTP/1.1\r\nHOST: 239.255.255.250:1900\r\n"
            "MAN: \"ssdp:discover\"\r\nMX: 1\r\n"
            "ST: urn:schemas-upnp-org:device:InternetGatewayDevice:1\r\n\r\n").encode()
 _PUBLIC_ADDRESS_REQUEST = b"\0\0"
-_PROTOCOL_BIT = 72
-_MAPPING_CHAIN = "prerouting_miniupnpd"
-
-# Closed towards the internet except for what a mapping opens.
-_RULES = """
-table inet gate {
-    chain miniupnpd { }
-    chain forward {
-        type filter hook forward priority 0; policy drop;
-        ct state established,related accept
-        iifname "lan" accept
-        jump miniupnpd
-    }
-    chain input {
-        type filter hook input priority 0; policy accept;
-        iifname "wan" ct state new drop
-    }
-    chain prerouting_miniupnpd { }
-    chain postrouting_miniupnpd { }
-    chain prerouting {
-        type nat hook prerouting priority -100;
-        jump prerouting_miniupnpd
-    }
-    chain postrouting {
-        type nat hook postrouting priority 100;
-        jump postrouting_miniupnpd
-        oifname "wan" masquerade
-    }
-}
-"""
+# A line of `upnpc -l`: number, protocol, mapping, description, remote host, lease.
+_LISTED = re.compile(r"^ *\d+ (TCP|UDP) +(\d+)->([\d.]+):(\d+) +'(.*)' '.*' (\d+)$",
+                     re.MULTILINE)
 
 
 @dataclass(frozen=True)
 class GatewaySetup:
-    """What a home router offers; with neither protocol it only masquerades."""
+    """What a home router offers; with neither protocol it only masquerades.
+
+    `secure` lets clients map to themselves only. With `grant`, NAT-PMP is spoken by the lab's own
+    server, which grants that.
+    """
 
     upnp: bool = True
     natpmp: bool = False
     permissions: tuple[str, ...] = EVERY_PORT
+    secure: bool = True
+    grant: Grant | None = None
 
     @property
-    def speaks(self) -> bool:
-        """True when there is a protocol to ask the router with."""
-        return self.upnp or self.natpmp
+    def needs_miniupnpd(self) -> bool:
+        """True when miniupnpd speaks one of the protocols."""
+        return self.upnp or (self.natpmp and not self.grant)
 
     def __str__(self) -> str:
         protocols = [name for name, on in (("UPnP", self.upnp), ("NAT-PMP", self.natpmp)) if on]
-        return f"{' and '.join(protocols) or 'no protocol'} ({', '.join(self.permissions)})"
+        rules = "as it pleases" if self.grant else ", ".join(self.permissions)
+        return f"{' and '.join(protocols) or 'no protocol'} ({rules})"
 
 
-@dataclass(frozen=True, order=True)
-class Mapping:
-    """One forwarding as the router's packet filter holds it."""
+@dataclass(frozen=True)
+class Listed:
+    """A mapping as the router tells it through UPnP; `lease` is what is left, in seconds."""
 
-    protocol: str
-    external_port: int
-    internal_address: str
-    internal_port: int
-
-    def __str__(self) -> str:
-        return (f"{self.protocol} {self.external_port} -> "
-                f"{self.internal_address}:{self.internal_port}")
+    mapping: Mapping
+    description: str
+    lease: int
 
 
 class Gateway:
-    """The router and its real state."""
+    """The router and its real state. Its leases are in device time, `clock` times ours."""
 
-    def __init__(self, folder: Path, setup: GatewaySetup, timeline: Timeline) -> None:
+    def __init__(self, folder: Path, setup: GatewaySetup, timeline: Timeline,
+                 clock: int = 1) -> None:
         folder.mkdir(parents=True)
+        self.lan_address = network.GATEWAY_LAN_ADDRESS
+        self.wan_address = network.GATEWAY_WAN_ADDRESS
         self._folder = folder
+        self._leases = folder / "leases"
         self._setup = setup
         self._timeline = timeline
+        self._clock = clock
+        self._http_port = _FIRST_HTTP_PORT
+        self._natpmp: NatPmp | None = None
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
-                              "-P", str(folder / "pid")], folder / "log")
+                              "-P", str(folder / "pid")], folder / "log", clock)
+
+    @property
+    def setup(self) -> GatewaySetup:
+        """What the router offers now."""
+        return self._setup
+
+    @property
+    def description_url(self) -> str:
+        """Where the router describes itself to UPnP clients."""
+        return f"http://{self.lan_address}:{self._http_port}/rootDesc.xml"
 
     def start(self) -> None:
         """Route and masquerade; offer the protocols of the setup and wait for their answers."""
-        threading.Thread(target=self._watch, daemon=True).start()
+        threading.Thread(target=packet_filter.watch, args=(self._tell_change,),
+                         daemon=True).start()
         with network.inside(network.GATEWAY):
             Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
-        run_tool(*network.command(network.GATEWAY, "nft", "-f", "-"), text=_RULES)
+        packet_filter.load()
         self._serve()
 
     def become(self, setup: GatewaySetup) -> None:
-        """Offer something else from now on, as after a change in the router's settings."""
-        if self._setup.speaks:
-            self.server.stop()
+        """Offer something else from now on, as after a change in the router's settings.
+
+        What is forwarded stays. miniupnpd comes back at another TCP port, and it ends leases from
+        before only when it looks for one that it gave since.
+        """
+        self._stop()
         self._setup = setup
         self._serve()
         self._timeline.add("gateway", f"now offers {setup}")
 
+    def reboot(self, lan_address: str | None = None) -> None:
+        """Forget every mapping and come back, if wanted under another LAN address.
+
+        The hosts at home then get their default route anew. What the user typed in stays.
+        """
+        self._stop()
+        packet_filter.flush(packet_filter.ASKED_FOR)
+        self._leases.unlink(missing_ok=True)
+        if lan_address:
+            self._take_lan_address(lan_address)
+        self._serve()
+        self._timeline.add("gateway", f"rebooted, is at {self.lan_address}, every mapping is lost")
+
+    def fall_silent(self) -> None:
+        """Answer nobody at home any more until `become` or `reboot`; what is forwarded stays."""
+        packet_filter.change("add rule inet lab silence meta l4proto { tcp, udp } drop\n")
+        self._stop()
+        self._timeline.add("gateway", "no longer answers the mapping protocols")
+
+    def lose(self, *external_ports: int) -> None:
+        """Drop the forwardings of these ports, or all, without telling anybody.
+
+        miniupnpd looks at its rules again only after a change of its own, or when it starts; so it
+        is started anew, and at the same place.
+        """
+        lost = [mapping for mapping in self.mappings()
+                if not external_ports or mapping.external_port in external_ports]
+        if not lost:
+            raise LabError(f"the gateway forwards none of {external_ports or 'any port'}")
+        self._timeline.add("gateway", f"loses {', '.join(map(str, lost))}")
+        running = self.server.running
+        if running:
+            self.server.stop()
+        for mapping in lost:
+            packet_filter.remove(mapping)
+        self._forget_leases(lost)
+        if running:
+            self.server.start(self._answers)
+
+    def move_to(self, wan_address: str) -> None:
+        """Get another address from the internet provider."""
+        self.take_wan_address(wan_address, network.SERVICE_ADDRESS)
+        self._timeline.add("gateway", f"has the internet address {wan_address} now")
+
+    def take_wan_address(self, address: str, router: str) -> None:
+        """Be at another address on the WAN side, with another next router.
+
+        miniupnpd tells the interface's present address, and its rules name the interface only, so
+        every mapping holds for the new address at once.
+        """
+        network.ip_batch(f"address del {self.wan_address}/24 dev wan",
+                         f"address add {address}/24 dev wan",
+                         f"route replace default via {router}", host=network.GATEWAY)
+        network.ip_batch(f"neighbour flush to {self.wan_address} dev net", host=network.INTERNET)
+        self.wan_address = address
+
+    def block(self, external_port: int) -> None:
+        """Let nothing from the internet through to this port; the mapping stays listed."""
+        packet_filter.change(f"add element inet lab blocked {{ {external_port} }}\n")
+        self._timeline.add("gateway", f"external port {external_port} is blocked")
+
+    def unblock(self, external_port: int) -> None:
+        """Let the internet through to this port again."""
+        packet_filter.change(f"delete element inet lab blocked {{ {external_port} }}\n")
+        self._timeline.add("gateway", f"external port {external_port} is open again")
+
+    def forward_by_hand(self, external_port: int, internal_port: int,
+                        address: str = network.DEVICE_ADDRESS) -> None:
+        """Forward a TCP port because the user typed it into the router's own pages."""
+        mapping = Mapping("TCP", external_port, address, internal_port)
+        packet_filter.forward(mapping, BY_HAND)
+        self._timeline.add("gateway", f"the user forwards {mapping}")
+
+    def stop_forwarding_by_hand(self) -> None:
+        """Forget what the user typed in."""
+        packet_filter.flush(BY_HAND)
+        self._timeline.add("gateway", "the user removes the forwardings made by hand")
+
+    def by_hand(self) -> list[Mapping]:
+        """The forwardings that the user typed in, read from the packet filter."""
+        return packet_filter.mappings(BY_HAND)
+
     def mappings(self) -> list[Mapping]:
-        """The forwardings in force, read from the packet filter."""
-        rules = network.output(network.GATEWAY, "nft", "-j", "list", "chain", "inet", "gate",
-                               _MAPPING_CHAIN)
-        entries = json.loads(rules)["nftables"]
-        return sorted(_mapping(entry["rule"]["expr"]) for entry in entries if "rule" in entry)
+        """The forwardings that clients asked for, read from the packet filter."""
+        return packet_filter.mappings()
+
+    def listing(self) -> list[Listed]:
+        """What the router itself tells a UPnP client about its mappings."""
+        told = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
+        if "Found valid IGD" not in told:
+            raise LabError(f"the gateway does not list its mappings: {told}")
+        return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
+                for protocol, external, address, internal, words, lease in _LISTED.findall(told)]
+
+    def requests(self) -> int:
+        """How often the device asked; the questions of the lab and the neighbour do not count."""
+        return self.upnp_requests() + self.natpmp_requests()
+
+    def upnp_requests(self) -> int:
+        """The device's connections to the router's UPnP service (one for each HTTP request)."""
+        return packet_filter.counted("upnp")
+
+    def natpmp_requests(self) -> int:
+        """The device's NAT-PMP datagrams."""
+        return packet_filter.counted("natpmp")
 
     def _serve(self) -> None:
-        if self._setup.speaks:
+        packet_filter.change("flush chain inet lab silence\n")
+        if self._setup.natpmp and self._setup.grant:
+            self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
+            self._natpmp.start(self.lan_address)
+        if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())
             self.server.start(self._answers)
+        elif self._natpmp:
+            wait_until(self._answers, "the lab's NAT-PMP server to answer", 5)
+
+    def _stop(self) -> None:
+        """End the mapping protocols; the rules in force stay in force."""
+        if self.server.running:
+            self.server.stop()
+            self._http_port += 1
+        if self._natpmp:
+            self._natpmp.stop()
+            self._natpmp = None
+
+    def _forget_leases(self, lost: list[Mapping]) -> None:
+        """Take mappings out of the file from which miniupnpd makes them again when it starts."""
+        if self._leases.exists():
+            gone = tuple(f"{mapping.protocol}:{mapping.external_port}:" for mapping in lost)
+            kept = [line for line in self._leases.read_text().splitlines(keepends=True)
+                    if not line.startswith(gone)]
+            self._leases.write_text("".join(kept))
 
     def _configuration(self) -> str:
         yes_no = {True: "yes", False: "no"}
         return "\n".join([
-            "ext_ifname=wan", f"ext_ip={network.GATEWAY_WAN_ADDRESS}", "listening_ip=lan",
+            "ext_ifname=wan", "listening_ip=lan", f"port={self._http_port}",
             f"enable_upnp={yes_no[self._setup.upnp]}",
-            f"enable_natpmp={yes_no[self._setup.natpmp]}",
-            "force_igd_desc_v1=yes", "secure_mode=yes", "system_uptime=yes",
-            "uuid=6c0b7c7a-2f0e-4e5c-9f6b-7d2f8a1c4e77", f"lease_file={self._folder}/leases",
-            "upnp_table_name=gate", "upnp_nat_table_name=gate", "upnp_forward_chain=miniupnpd",
-            f"upnp_nat_chain={_MAPPING_CHAIN}",
+            f"enable_natpmp={yes_no[self._setup.natpmp and not self._setup.grant]}",
+            "force_igd_desc_v1=yes", f"secure_mode={yes_no[self._setup.secure]}",
+            "system_uptime=no", f"lease_file={self._leases}",
+            "uuid=6c0b7c7a-2f0e-4e5c-9f6b-7d2f8a1c4e77",
+            "upnp_table_name=gate", "upnp_nat_table_name=gate",
+            f"upnp_forward_chain={packet_filter.ASKED_FOR.admit}",
+            f"upnp_nat_chain={packet_filter.ASKED_FOR.redirect}",
             "upnp_nat_postrouting_chain=postrouting_miniupnpd", *self._setup.permissions, ""])
 
     def _answers(self) -> bool:
         """True when a client on the LAN gets through to every protocol on offer."""
         return ((not self._setup.upnp or _description_is_served())
-                and (not self._setup.natpmp or _public_address_is_told()))
+                and (not self._setup.natpmp or self._public_address_is_told()))
 
-    def _watch(self) -> None:
-        """Tell the timeline of every change of the mappings, whoever made it."""
+    def _public_address_is_told(self) -> bool:
+        answer = _udp_exchange(_PUBLIC_ADDRESS_REQUEST, self.lan_address, natpmp.PORT) or b""
+        return answer[1:4] == b"\x80\0\0" and answer[8:12] == socket.inet_aton(self.wan_address)
+
+    def _take_lan_address(self, address: str) -> None:
+        network.ip_batch(f"address del {self.lan_address}/24 dev lan",
+                         f"address add {address}/24 dev lan", host=network.GATEWAY)
+        for host in (network.DEVICE, network.NEIGHBOUR):
+            network.ip_batch(f"route replace default via {address}", host=host)
+        self.lan_address = address
+
+    def _tell_change(self, change: str, mapping: Mapping) -> None:
         words = {"add": "forwards", "delete": "no longer forwards"}
-        monitor = subprocess.Popen(
-            network.command(network.GATEWAY, "nft", "-j", "monitor", "rules"),
-            stdout=subprocess.PIPE, text=True)
-        for line in monitor.stdout:
-            for change, subject in json.loads(line).items():
-                rule = subject.get("rule", {})
-                if change in words and rule.get("chain") == _MAPPING_CHAIN:
-                    self._timeline.add("gateway", f"{words[change]} {_mapping(rule['expr'])}")
-
-
-def _mapping(expressions: list[dict]) -> Mapping:
-    """Read one rule that miniupnpd made; it matches the protocol as a byte of the IPv4 header."""
-    protocol, external_port, target = "", 0, {}
-    for expression in expressions:
-        match = expression.get("match", {})
-        payload = match.get("left", {}).get("payload", {})
-        if payload.get("field") == "dport":
-            external_port = match["right"]
-        elif (payload.get("base"), payload.get("offset")) == ("nh", _PROTOCOL_BIT):
-            protocol = {6: "TCP", 17: "UDP"}[match["right"]]
-        target = expression.get("dnat", target)
-    return Mapping(protocol, external_port, target["addr"], target["port"])
+        self._timeline.add("gateway", f"{words[change]} {mapping}")
 
 
 def _udp_exchange(message: bytes, address: str, port: int) -> bytes | None:
-    """One datagram from the device and what came back, if anything did."""
-    with network.inside(network.DEVICE):
+    """One datagram from the neighbour and what came back, if anything did."""
+    with network.inside(network.NEIGHBOUR):
         asking = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
     with asking:
         asking.settimeout(0.2)
@@ -187,11 +299,5 @@ def _description_is_served() -> bool:
     for line in (found or b"").decode(errors="replace").splitlines():
         name, _, location = line.partition(":")
         if name.upper() == "LOCATION":
-            return "WANIPConnection:1" in (web.fetch(network.DEVICE, location.strip()) or "")
+            return "WANIPConnection:1" in (web.fetch(network.NEIGHBOUR, location.strip()) or "")
     return False
-
-
-def _public_address_is_told() -> bool:
-    answer = _udp_exchange(_PUBLIC_ADDRESS_REQUEST, network.GATEWAY_LAN_ADDRESS, 5351) or b""
-    return answer[1:4] == b"\x80\0\0" and answer[8:12] == socket.inet_aton(
-        network.GATEWAY_WAN_ADDRESS)

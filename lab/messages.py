@@ -5,6 +5,7 @@ from __future__ import annotations
 import re
 import socket
 import threading
+import time
 from collections.abc import Callable
 from dataclasses import dataclass
 from pathlib import Path
@@ -16,12 +17,13 @@ _SEVERITIES = ("emerg", "alert", "crit", "err", "warning", "notice", "info", "de
 
 @dataclass(frozen=True)
 class Message:
-    """One line of the log; facility and severity are the syslog numbers."""
+    """One line of the log; facility and severity are the syslog numbers, `when` is monotonic."""
 
     facility: int
     severity: int
     ident: str
     text: str
+    when: float
 
     def __str__(self) -> str:
         return f"{_SEVERITIES[self.severity]:<7} {self.ident}: {self.text}"
@@ -63,9 +65,10 @@ class Messages:
                 parts = _DATAGRAM.match(datagram)
                 if parts:
                     priority = int(parts[1])
-                    message = Message(priority >> 3, priority & 7, parts[2], parts[3])
+                    message = Message(priority >> 3, priority & 7, parts[2], parts[3],
+                                      time.monotonic())
                 else:
-                    message = Message(0, 7, "(unreadable)", datagram)
+                    message = Message(0, 7, "(unreadable)", datagram, time.monotonic())
                 self.all.append(message)
                 file.write(f"{message}\n")
                 for listener in self._listeners:

@@ -6,12 +6,14 @@ import signal
 import socket
 import struct
 import threading
+from collections.abc import Iterable
 from pathlib import Path
 
 from lab import network
 from lab.account import DOMAIN
 from lab.server import Server
 from lab.support import wait_until
+from lab.timeline import Timeline
 
 _TYPE_A, _CLASS_INTERNET = 1, 1
 
@@ -19,11 +21,13 @@ _TYPE_A, _CLASS_INTERNET = 1, 1
 class Names:
     """Names and their addresses as every host of the lab resolves them."""
 
-    def __init__(self, folder: Path) -> None:
+    def __init__(self, folder: Path, timeline: Timeline) -> None:
         folder.mkdir(parents=True)
         self._hosts = folder / "hosts"
         self._hosts.write_text("")
+        self._timeline = timeline
         self._table: dict[str, str] = {}
+        self._pins: dict[str, str | None] = {}
         self._lock = threading.Lock()
         self.server = Server("dnsmasq", network.INTERNET, [
             "dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--no-resolv", "--no-hosts",
@@ -36,20 +40,41 @@ class Names:
         self.server.start(lambda: self._ask("nobody.example") is not None)
 
     def set(self, table: dict[str, str]) -> None:
-        """Add or change names, and return once the server answers with the new addresses."""
+        """Add or change names, and return once the server answers so; a pinned name stays."""
         with self._lock:
             self._table.update(table)
-            self._hosts.write_text("".join(f"{address} {name}\n"
-                                           for name, address in self._table.items()))
-            self.server.send_signal(signal.SIGHUP)
-            for name, address in table.items():
-                wait_until(lambda name=name, address=address: self._ask(name) == [address],
-                           f"dnsmasq to know {name}", 5, pause=0.01)
+            self._publish(table)
+
+    def pin(self, name: str, address: str | None) -> None:
+        """Answer for a name with this address, with None not at all, whatever else is set."""
+        with self._lock:
+            self._pins[name] = address
+            self._publish([name])
+        self._timeline.add("names", f"{name} is {address or 'unknown'} from now on, whatever the "
+                                    "service sets")
+
+    def unpin(self, name: str) -> None:
+        """Answer for a name again as it was last set."""
+        with self._lock:
+            del self._pins[name]
+            self._publish([name])
+        self._timeline.add("names", f"{name} is again what the service sets")
 
     def resolve(self, name: str, host: str = network.DEVICE) -> str:
         """The address a program on `host` gets for a name; empty when there is none."""
         answer = network.output(host, "getent", "ahostsv4", name).split()
         return answer[0] if answer else ""
+
+    def _publish(self, names: Iterable[str]) -> None:
+        """Give the server its table, and return once it answers for these names accordingly."""
+        table = {**self._table, **self._pins}
+        self._hosts.write_text("".join(f"{address} {name}\n"
+                                       for name, address in table.items() if address))
+        self.server.send_signal(signal.SIGHUP)
+        for name in names:
+            wanted = [table[name]] if table.get(name) else []
+            wait_until(lambda name=name, wanted=wanted: self._ask(name) == wanted,
+                       f"dnsmasq to answer {wanted} for {name}", 5, pause=0.01)
 
     def _ask(self, name: str) -> list[str] | None:
         """One DNS query from the internet side; None when nothing answers."""

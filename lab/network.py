@@ -14,14 +14,31 @@ from lab.support import run_tool
 _CLONE_NEWNET = 0x40000000
 _libc = ctypes.CDLL(None, use_errno=True)
 
-DEVICE, GATEWAY, INTERNET = "device", "gateway", "internet"
-DEVICE_ADDRESS, GATEWAY_LAN_ADDRESS = "192.168.77.10", "192.168.77.1"
+DEVICE, NEIGHBOUR, GATEWAY, INTERNET = "device", "neighbour", "gateway", "internet"
+DEVICE_ADDRESS, NEIGHBOUR_ADDRESS = "192.168.77.10", "192.168.77.20"
+GATEWAY_LAN_ADDRESS = "192.168.77.1"
 GATEWAY_WAN_ADDRESS, SERVICE_ADDRESS, RELAY_ADDRESS = "44.128.0.20", "44.128.0.1", "44.128.0.2"
+
+# Switches that pass everything on at once. A hardware address of their own keeps the hosts' ARP
+# tables right when a cable is plugged in or out.
+_SWITCH = "link add {} address {} type bridge stp_state 0 forward_delay 0 mcast_snooping 0"
+_SWITCHES = {
+    GATEWAY: (_SWITCH.format("lan", "02:00:00:00:77:01"),
+              f"address add {GATEWAY_LAN_ADDRESS}/24 dev lan", "link set lan up"),
+    INTERNET: (_SWITCH.format("net", "02:00:00:00:80:01"),
+               f"address add {SERVICE_ADDRESS}/24 dev net",
+               f"address add {RELAY_ADDRESS}/24 dev net", "link set net up"),
+}
 
 
 def ip(*arguments: str) -> None:
     """Run one `ip` command that must succeed."""
     run_tool("ip", *arguments)
+
+
+def ip_batch(*commands: str, host: str | None = None) -> None:
+    """Run `ip` commands that must succeed, on a host if one is named."""
+    run_tool("ip", *(("-n", host) if host else ()), "-batch", "-", text="\n".join(commands) + "\n")
 
 
 def command(host: str, *argv: str) -> list[str]:
@@ -49,17 +66,45 @@ def inside(host: str) -> Iterator[None]:
         os.close(there)
 
 
-def raise_home_network() -> None:
-    """Make the device, its gateway and the internet, with addresses and default routes."""
-    for host in (DEVICE, GATEWAY, INTERNET):
-        ip("netns", "add", host)
-        ip("-n", host, "link", "set", "lo", "up")
-    _cable((DEVICE, "eth0", f"{DEVICE_ADDRESS}/24"), (GATEWAY, "lan", f"{GATEWAY_LAN_ADDRESS}/24"))
-    _cable((GATEWAY, "wan", f"{GATEWAY_WAN_ADDRESS}/24"),
-           (INTERNET, "net", f"{SERVICE_ADDRESS}/24"))
-    ip("-n", INTERNET, "address", "add", f"{RELAY_ADDRESS}/24", "dev", "net")
-    ip("-n", DEVICE, "route", "add", "default", "via", GATEWAY_LAN_ADDRESS)
-    ip("-n", GATEWAY, "route", "add", "default", "via", SERVICE_ADDRESS)
+def raise_home_network(own_router: bool = False) -> None:
+    """Make the hosts at home, the gateway and the internet, with addresses and default routes.
+
+    With `own_router` the device is the router of its home: it has the gateway's internet address
+    and the LAN on its other side. The gateway is there, but its way to the internet is unplugged.
+    """
+    hosts = (DEVICE, NEIGHBOUR, GATEWAY, INTERNET)
+    ip_batch(*(f"netns add {host}" for host in hosts))
+    for host in hosts:
+        ip_batch("link set lo up", *_SWITCHES.get(host, ()), host=host)
+    lan_port = "lan" if own_router else "eth0"
+    plug(DEVICE, lan_port, GATEWAY, "lan")
+    plug(NEIGHBOUR, "eth0", GATEWAY, "lan")
+    plug(GATEWAY, "wan", INTERNET, "net")
+    ip_batch(f"address add {DEVICE_ADDRESS}/24 dev {lan_port}", host=DEVICE)
+    if own_router:
+        ip_batch(f"link set {cable_end(GATEWAY, 'wan')} down", host=INTERNET)
+        plug(DEVICE, "wan", INTERNET, "net")
+        ip_batch(f"address add {GATEWAY_WAN_ADDRESS}/24 dev wan",
+                 f"route add default via {SERVICE_ADDRESS}", host=DEVICE)
+    else:
+        ip_batch(f"route add default via {GATEWAY_LAN_ADDRESS}", host=DEVICE)
+    ip_batch(f"address add {NEIGHBOUR_ADDRESS}/24 dev eth0",
+             f"route add default via {GATEWAY_LAN_ADDRESS}", host=NEIGHBOUR)
+    ip_batch(f"address add {GATEWAY_WAN_ADDRESS}/24 dev wan",
+             f"route add default via {SERVICE_ADDRESS}", host=GATEWAY)
+
+
+def plug(host: str, port: str, switch_host: str, switch: str) -> None:
+    """Lay a cable from a new port of a host to a switch on another host."""
+    end = cable_end(host, port)
+    ip_batch(f"link add {port} netns {host} type veth peer name {end} netns {switch_host}")
+    ip_batch(f"link set {end} master {switch} up", host=switch_host)
+    ip_batch(f"link set {port} up", host=host)
+
+
+def cable_end(host: str, port: str) -> str:
+    """The name of a cable's end at the switch."""
+    return f"{host}-{port}"
 
 
 def host_file(host: str, name: str, text: str) -> None:
@@ -67,15 +112,6 @@ def host_file(host: str, name: str, text: str) -> None:
     path = Path("/etc/netns", host, name)
     path.parent.mkdir(parents=True, exist_ok=True)
     path.write_text(text)
-
-
-def _cable(*ends: tuple[str, str, str]) -> None:
-    (left, left_port, _), (right, right_port, _) = ends
-    ip("link", "add", left_port, "netns", left, "type", "veth",
-       "peer", "name", right_port, "netns", right)
-    for host, port, address in ends:
-        ip("-n", host, "address", "add", address, "dev", port)
-        ip("-n", host, "link", "set", port, "up")
 
 
 def _set_namespace(descriptor: int) -> None:

@@ -11,6 +11,7 @@ from lab.certificates import Authority
 from lab.server import Server
 
 _NAME = "relay.kavra.example"
+# Both ends notice within seconds when the other is gone.
 _SERVER = """
 local {address}
 port 1194
@@ -26,6 +27,7 @@ verify-client-cert none
 script-security 2
 auth-user-pass-verify {folder}/check via-file
 username-as-common-name
+keepalive 1 5
 tmp-dir {folder}
 management {folder}/management unix
 verb 3
@@ -34,6 +36,8 @@ verb 3
 _CHECK = """#!/bin/sh
 exec cmp -s "$1" {folder}/credentials
 """
+_READY = "Initialization Sequence Completed"
+_LET_IN = "MULTI_sva: pool returned"
 CLIENT = f"""client
 dev tun
 proto udp
@@ -62,6 +66,16 @@ class Relay:
 
     def start(self) -> None:
         """Start the server; its management console must answer and its tunnel device stand."""
+        if not self._folder.exists():
+            self._write_files()
+        before = self._told(_READY)
+        self.server.start(lambda: self._told(_READY) > before and self._status())
+
+    def connections(self) -> int:
+        """How often a client was let in since the first start, the same one again included."""
+        return self._told(_LET_IN)
+
+    def _write_files(self) -> None:
         self._folder.mkdir(parents=True)
         identity = self._authority.sign(_NAME)
         (self._folder / "server.conf").write_text(_SERVER.format(
@@ -72,8 +86,11 @@ class Relay:
         check = self._folder / "check"
         check.write_text(_CHECK.format(folder=self._folder))
         check.chmod(0o755)
-        self.server.start(lambda: "Initialization Sequence Completed" in self.server.log.read_text()
-                          and self._status())
+
+    def _told(self, words: str) -> int:
+        """How often the server's log has these words."""
+        log = self.server.log
+        return log.read_text(errors="replace").count(words) if log.exists() else 0
 
     def client_address(self) -> str:
         """The address inside the tunnel of the connected device; empty when there is none."""

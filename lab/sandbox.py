@@ -57,10 +57,11 @@ def why_forbidden() -> str | None:
     return (probe.stderr.strip().splitlines() or ["unshare failed without a word"])[-1]
 
 
-def run(module: str, arguments: list[str], timeout: float | None = None,
-        capture: bool = False) -> subprocess.CompletedProcess[str]:
+def run(module: str, arguments: list[str], timeout: float | None = None, capture: bool = False,
+        keep_open: tuple[int, ...] = ()) -> subprocess.CompletedProcess[str]:
     """Run `python -m module arguments` as process 1 of a new sandbox and wait for its end.
 
+    It finds the descriptors of `keep_open` under the same numbers: files of the machine outside.
     Ctrl-C reaches the module through the terminal and is left to it; a SIGTERM or SIGHUP for the
     caller, a second Ctrl-C and the timeout end the sandbox at once.
     """
@@ -70,7 +71,7 @@ def run(module: str, arguments: list[str], timeout: float | None = None,
     output = subprocess.PIPE if capture else None
     process = subprocess.Popen(
         [*_UNSHARE, PYTHON, "-m", "lab.sandbox", module, *arguments], env=environment,
-        cwd=PROJECT, pass_fds=[read_end], stdout=output, text=True,
+        cwd=PROJECT, pass_fds=[read_end, *keep_open], stdout=output, text=True,
         stderr=subprocess.STDOUT if capture else None)
     os.close(read_end)
     _tell_pid(process, write_end)
@@ -164,10 +165,11 @@ def _private_etc() -> None:
     own = {"hosts": "127.0.0.1 localhost\n", "resolv.conf": "",
            "nsswitch.conf": "passwd: files\ngroup: files\nhosts: files dns\n"}
     for entry in host.iterdir():
-        if entry.name not in own and entry.name not in ("ssl", "netns"):
+        if entry.name not in own and entry.name not in ("ssl", "netns", "scripts"):
             Path("/etc", entry.name).symlink_to(entry)
     for name, text in own.items():
         Path("/etc", name).write_text(text)
+    Path("/etc/scripts").mkdir()
     Path("/etc/ssl").mkdir()
     Path("/etc/ssl/openssl.cnf").symlink_to(host / "ssl/openssl.cnf")
 

@@ -2,6 +2,7 @@
 
 from __future__ import annotations
 
+import signal
 import socket
 from collections.abc import Callable, Mapping
 from dataclasses import dataclass, field
@@ -15,6 +16,9 @@ from lab.daemon import Daemon
 from lab.device import Device
 from lab.gateway import Gateway, GatewaySetup
 from lab.names import Names
+from lab.neighbour import Neighbour
+from lab.own_router import OwnRouter
+from lab.provider import Provider
 from lab.relay import Relay
 from lab.support import LabError, Seen, last_lines, wait_until
 from lab.timeline import Timeline
@@ -28,7 +32,8 @@ class Situation:
     """What is special about a run; everything else is as usual.
 
     `static` and `dynamic` are settings of the device's two files; `clock` makes the device's time
-    run faster by that factor.
+    run faster by that factor, and `hasty` the time limit of its transfers with it. With
+    `own_router` the device is itself the router of its home.
     """
 
     gateway: GatewaySetup = GatewaySetup()
@@ -36,6 +41,8 @@ class Situation:
     static: Mapping[str, str] = field(default_factory=dict)
     dynamic: Mapping[str, str] = field(default_factory=dict)
     clock: int = 1
+    hasty: bool = False
+    own_router: bool = False
 
 
 class Lab:
@@ -47,11 +54,15 @@ class Lab:
         self.account = Account()
         self.daemon: Daemon | None = None
         socket.sethostname(self.account.host_name)
-        network.raise_home_network()
+        network.raise_home_network(situation.own_router)
         authority = Authority(_FOLDER / "authority")
-        self.names = Names(_FOLDER / "names")
+        self.names = Names(_FOLDER / "names", timeline)
         self.central = CentralService(self.account, authority, self.names, timeline)
-        self.gateway = Gateway(_FOLDER / "gateway", situation.gateway, timeline)
+        self.gateway = Gateway(_FOLDER / "gateway", situation.gateway, timeline,
+                               situation.clock)
+        self.neighbour = Neighbour(self.gateway, timeline)
+        self.provider = Provider(self.gateway, timeline)
+        self.own_router = OwnRouter(timeline)
         self.relay = Relay(_FOLDER / "relay", self.account, authority)
         self.device = Device(self.account, authority, timeline)
         self.device.messages.listen(lambda message: timeline.read_log(message.text))
@@ -65,19 +76,25 @@ class Lab:
         self.central.start()
         if self.situation.relay:
             self.relay.start()
+        if self.situation.own_router:
+            self.own_router.start(network.GATEWAY_WAN_ADDRESS, network.DEVICE_ADDRESS)
         self.device.start(self.situation.static, self.situation.dynamic)
 
     def start_daemon(self, *options: str) -> Daemon:
         """Run the daemon on the device."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
-        self.daemon = Daemon(options, self.situation.clock)
+        self.daemon = Daemon(options, self.situation.clock, self.situation.hasty)
         return self.daemon
 
-    def stop_daemon(self) -> str:
-        """Send SIGTERM and return how the daemon ended."""
+    def step(self, heading: str) -> None:
+        """Begin the next part of the story; a failure report shows the device's log from here."""
+        self.timeline.step(heading)
+
+    def stop_daemon(self, number: int = signal.SIGTERM) -> str:
+        """Send a signal that ends the daemon and return how it ended."""
         assert self.daemon is not None
-        self.timeline.add("device", "pelorus gets SIGTERM")
-        how = self.daemon.stop()
+        self.timeline.add("device", f"pelorus gets {signal.Signals(number).name}")
+        how = self.daemon.stop(number)
         self.timeline.add("device", f"pelorus ended by {how}")
         return how
 
@@ -93,10 +110,12 @@ class Lab:
 
     def report(self) -> str:
         """Everything one needs to see when a run went wrong."""
+        log = [str(message) for message in self.device.messages.all
+               if message.when >= self.timeline.last_step]
         sections = {
             "timeline": str(self.timeline),
-            f"device log, last {_LOG_LINES} lines":
-                "\n".join(str(message) for message in self.device.messages.all[-_LOG_LINES:]),
+            f"device log of the last part, {min(len(log), _LOG_LINES)} of {len(log)} lines":
+                "\n".join(log[-_LOG_LINES:]),
             "daemon": f"{self.daemon.ended() or 'running' if self.daemon else 'not started'}, "
                       f"output:\n{last_lines(daemon.OUTPUT)}",
             "servers": "\n".join(server.state() for server in (

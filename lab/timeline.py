@@ -8,19 +8,78 @@ import time
 from collections.abc import Callable
 from dataclasses import dataclass
 
+STORY = "story"
+
 # What the device's log tells about things that no other part of the lab sees: a line, the words
-# for it, and for a state that is repeated in every cycle its subject, so that only news is told.
+# for it, and its subject where only news is to be told, because the line comes in every cycle or
+# for every port. A row without words ends the news of its subject: the next words are told again.
 _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject in (
+    (r"createConnection\(\) - Deviceid and DeviceAuth is empty",
+     "credentials are missing, the daemon idles", "credentials"),
+    (r"createDirectConnection - Current Status", None, "credentials"),
+
     (r"Router::upnp_discover - IGD found at: ([^,]+),", "gateway found through UPnP: {}", "UPnP"),
+    (r"Router::upnp_discover - Unconnected IGD found at: (\S+)",
+     "gateway without connection found through UPnP: {}", "UPnP"),
     (r"Router::upnp_discover - UPnP Discover failed", "no gateway answers UPnP", "UPnP"),
     (r"CMnatpmp::retrieveExternalIP  fetched", "gateway found through NAT-PMP", "NAT-PMP"),
+    (r"CMnatpmp::retrieveExternalIP  failed", "no gateway answers NAT-PMP", "NAT-PMP"),
     (r"Router's external IP address: (\S+)", "external address: {}", "address"),
+    (r"due to external or local IP change: \[([1-9]\d*)\]",
+     "mapping of port {} no longer fits and is dropped", None),
+    (r"Ports are still open, remaining", "ports are kept without the gateway", "gateway"),
+    (r"Router is initialized", None, "gateway"),
+
+    (r"Router::mapPort\(\) - fail", "gateway refuses a port", "refusal"),
+    (r"already mapped to another IP: (\S+)", "gateway maps a wanted port to {}", "other device"),
+    (r"Router::mapPort\(\) - success", None, "refusal"),
+    (r"Router::mapPort\(\) - success", None, "other device"),
+    (r"PORTFORWARDED (\w+): mapPort returncode\[1\], internalPort\[\d+\], new externalPort\[(\d+)",
+     "{} mapping renewed, port {}", None),
+    (r"PORTFORWARDED (\w+): mapPort returncode\[0\]", "{} mapping could not be renewed", None),
+
+    (r"pollServerForSleepTime - (?:missing action|malformed|received garbage)",
+     "answer to the question for permission is not understood", "permission"),
+    (r"central server gave permission to proceed|sleep time from server is", None, "permission"),
+    (r"testPort - hard disk is asleep", "port test skipped: the disk is asleep", "no test"),
+    (r"testPort - server has requested sleep", "port test skipped: the server asks to wait",
+     "no test"),
+    (r"(?:Ignore Port Test|Skip testing port) due to [Ii]nterval|Not time to do port test",
+     "port test skipped: it is not due yet", "no test"),
+    (r"testPort\[1-3\] - Port Test URL", None, "no test"),
+    (r"Running port test for manually forwarded", "manually forwarded ports are tested", None),
+    (r"bad value for manually configured (\w+) Port", "manual {} port is no port", "manual port"),
+    (r"manualPortForward - allocatedHttpPort", None, "manual port"),
     (r"testPort - port map check success", "port test passed", None),
     (r"testPort - port map check failed", "port test failed", None),
-    (r"Enforce connection as RELAY", "port test shows a second NAT", None),
+    (r"forwardPort - Port test failed", "candidate port is given up", None),
+    (r"Enforce connection as RELAY", "port test shows a second NAT", "second NAT"),
+    (r"testPort - port map check success", None, "second NAT"),
+
+    (r"(?:no|to get) response from central server", "central service does not answer", "central"),
+    (r"httpGet (?:got|Response)", None, "central"),
+    (r"response (?:received )?from local(?:host| server)", "web back end does not take it",
+     "back end"),
+    (r"Successful update status", None, "back end"),
+    (r"failed to update (?:mapping info|port mapping)", "mapping could not be published", None),
+
+    (r"relay servers and other settings", "tunnel client is started", None),
+    (r"openVPN will not be started", "tunnel waits, as the server asked", "tunnel"),
+    (r"openVPN initialization did not complete", "tunnel is not up yet", "tunnel"),
     (r"openVPN has started successfully", "tunnel is up", None),
-    (r"closeVPNConnection\(\) - attempting to", "tunnel is told to stop", None),
-    (r"checkDNS - DNS matches local value", "public names point to the right address", None),
+    (r"closeVPNConnection\(\) - attempting to stop", "tunnel is told to stop", None),
+    (r"closeVPNConnection\(\) - attempting to SIGKILL", "tunnel is killed", None),
+    (r"closeVPNConnection\(\) - (?:attempting|openVPN process is not)|relay servers and", None,
+     "tunnel"),
+    (r"failed to create VPN connection", "tunnel does not come up, the attempt ends", None),
+
+    (r"checkDNS - DNS matches local value .* address is (\S+)",
+     "public names point to the right address, {}", "names"),
+    (r"checkDNS - DNS check failed .* address is (\S+), local value .* is (\S+)",
+     "public names point to {} instead of {}", "names"),
+    (r"checkDNS - nslookup 3-level", "public names do not resolve to one address", "names"),
+    (r"checkDNS - failed to retrieve local value", "public names cannot be compared", "names"),
+    (r"kill existing connections", "names do not match: every connection is torn down", None),
 ))
 
 
@@ -33,7 +92,9 @@ class Event:
     what: str
 
     def __str__(self) -> str:
-        return f"{self.when:7.2f} s  {self.who:<8}  {self.what}"
+        if self.who == STORY:
+            return f"\n{self.when:7.2f} s  == {self.what}"
+        return f"{self.when:7.2f} s  {self.who:<9}  {self.what}"
 
 
 class Timeline:
@@ -41,10 +102,22 @@ class Timeline:
 
     def __init__(self) -> None:
         self._start = time.monotonic()
+        self._last_step = self._start
         self._lock = threading.Lock()
         self._events: list[Event] = []
         self._listeners: list[Callable[[Event], None]] = []
-        self._last_told: dict[str, str] = {}
+        self._last_told: dict[str, str | None] = {}
+
+    @property
+    def events(self) -> list[Event]:
+        """What has happened so far."""
+        with self._lock:
+            return list(self._events)
+
+    @property
+    def last_step(self) -> float:
+        """When the story's last step began (time.monotonic()), at first the lab's start."""
+        return self._last_step
 
     def listen(self, listener: Callable[[Event], None]) -> None:
         """Call `listener` with every event from now on."""
@@ -58,18 +131,22 @@ class Timeline:
             for listener in self._listeners:
                 listener(event)
 
+    def step(self, text: str) -> None:
+        """Head what happens from now on; say it before it is done."""
+        self._last_step = time.monotonic()
+        self.add(STORY, text)
+
     def read_log(self, line: str) -> None:
         """Note what a line of the device's log tells, unless it is no news."""
         for pattern, words, subject in _TOLD_BY_LOG:
             found = pattern.search(line)
             if not found:
                 continue
-            news = words.format(*found.groups())
-            if subject is None or self._last_told.get(subject) != news:
+            news = words and words.format(*found.groups())
+            if news and (subject is None or self._last_told.get(subject) != news):
                 self.add("device", news)
             if subject is not None:
                 self._last_told[subject] = news
 
     def __str__(self) -> str:
-        with self._lock:
-            return "\n".join(str(event) for event in self._events) or "(nothing happened)"
+        return "\n".join(map(str, self.events)) or "(nothing happened)"

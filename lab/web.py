@@ -5,6 +5,7 @@ from __future__ import annotations
 import http.client
 import socket
 import ssl
+import struct
 import threading
 import time
 from collections.abc import Callable
@@ -15,6 +16,10 @@ from urllib.parse import parse_qs, urlsplit
 from lab import network
 from lab.certificates import KeyPair
 from lab.support import wait_until
+
+
+# On, for no seconds: closing discards what is on its way and resets the connection.
+_NO_LINGERING = struct.pack("ii", 1, 0)
 
 
 @dataclass(frozen=True)
@@ -39,10 +44,14 @@ class Request:
 
 @dataclass(frozen=True)
 class Reply:
-    """What goes back; no body means that the connection closes without an answer."""
+    """What goes back; no body means that the connection ends without an answer.
+
+    It is then closed in good order, or with `reset` torn down at once.
+    """
 
     body: bytes | None
     status: int = 200
+    reset: bool = False
 
 
 Answer = Callable[[Request], Reply]
@@ -80,6 +89,10 @@ class WebServer(ThreadingHTTPServer):
                                                do_handshake_on_connect=False)
         return connection, peer
 
+    def shutdown_request(self, request: socket.socket) -> None:
+        """Close only: a connection that is to be reset must not say goodbye first."""
+        self.close_request(request)
+
     def handle_error(self, request: object, client_address: object) -> None:
         """A client that goes away or refuses our certificate is the client's affair."""
 
@@ -99,6 +112,8 @@ class _Handler(BaseHTTPRequestHandler):
     def do_GET(self) -> None:  # noqa: N802 (the name is the base class's)
         reply = self.server.reply_to(self.client_address[0], self.path)
         if reply.body is None:
+            if reply.reset:
+                self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, _NO_LINGERING)
             self.close_connection = True
             return
         self.send_response(reply.status)

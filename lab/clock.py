@@ -1,0 +1,45 @@
+"""Time that runs faster for a program than for the lab around it."""
+
+from __future__ import annotations
+
+import glob
+from pathlib import Path
+
+from lab import sandbox
+from lab.support import LabError, run_tool
+
+_PRELOAD = Path("/run/lab/preload.so")
+_REFUSED_SIGNAL = Path("/run/lab/refused_signal")
+
+
+def fast_clock(factor: int, ahead: float = 0) -> list[str]:
+    """Environment in which a program's time runs that much faster, from `ahead` seconds on."""
+    return _faketime(factor, ahead) if factor != 1 else []
+
+
+def fast_pauses(factor: int, hasty: bool) -> list[str]:
+    """`fast_clock` for a program that talks to real servers: its waits for them are no shorter
+    than they can stand.
+
+    The time limit of its transfers is real time, unless it is `hasty`: libcurl measures it by the
+    monotonic clock.
+    """
+    if factor == 1:
+        return []
+    if not _PRELOAD.exists():
+        run_tool("cc", "-shared", "-fPIC", f'-DREFUSED_SIGNAL="{_REFUSED_SIGNAL}"',
+                 "-o", str(_PRELOAD), str(sandbox.PROJECT / "lab/preload.c"))
+    return [*_faketime(factor, 0, str(_PRELOAD)),
+            f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}"]
+
+
+def refuse_signal(number: int) -> None:
+    """Let programs with fast pauses fail to send this signal from now on; 0 for none."""
+    _REFUSED_SIGNAL.write_text(f"{number}\n")
+
+
+def _faketime(factor: int, ahead: float, *before: str) -> list[str]:
+    libraries = glob.glob("/usr/lib/*/faketime/libfaketimeMT.so.1")
+    if not libraries:
+        raise LabError("libfaketime is not installed")
+    return [f"LD_PRELOAD={' '.join((*before, libraries[0]))}", f"FAKETIME=+{int(ahead)} x{factor}"]

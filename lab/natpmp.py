@@ -1,0 +1,149 @@
+"""A NAT-PMP gateway of the lab's own, for what no well-behaved router can be told to do."""
+
+from __future__ import annotations
+
+import socket
+import struct
+import threading
+import time
+from collections.abc import Callable
+from dataclasses import dataclass
+
+from lab import network, packet_filter
+from lab.packet_filter import Mapping
+
+PORT = 5351
+UNSUPPORTED_VERSION, NOT_AUTHORIZED, NETWORK_FAILURE, OUT_OF_RESOURCES, UNSUPPORTED_OPCODE = (
+    1, 2, 3, 4, 5)
+
+_PROTOCOLS = {1: "UDP", 2: "TCP"}
+_REPLY = 128
+_LOOK_SECONDS = 0.05
+
+
+def as_asked(port: int) -> int:
+    """Grant the external port that was asked for."""
+    return port
+
+
+@dataclass(frozen=True)
+class Grant:
+    """What the router makes of a request for a mapping.
+
+    `port` gives the external port that is granted for the one asked for; a port that somebody
+    else holds is passed over for the next free one. `lease` is the longest lease in seconds.
+    `refusal` is a result code with which every new mapping is refused.
+    """
+
+    port: Callable[[int], int] = as_asked
+    lease: int = 7200
+    refusal: int = 0
+
+
+class NatPmp:
+    """The server on the router's LAN side; its mappings are rules of the router."""
+
+    def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str]) -> None:
+        """Leases are in a time that runs `clock` times as fast as ours."""
+        self._grant = grant
+        self._clock = clock
+        self._public_address = public_address
+        self._born = time.monotonic()
+        self._ends: dict[Mapping, float] = {}
+        self._stopping = threading.Event()
+        self._thread = threading.Thread(target=self._serve, daemon=True)
+
+    def start(self, address: str) -> None:
+        """Answer on this address of the router from now on."""
+        with network.inside(network.GATEWAY):
+            self._socket = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+        self._socket.settimeout(_LOOK_SECONDS)
+        self._socket.bind((address, PORT))
+        self._thread.start()
+
+    def stop(self) -> None:
+        """Answer no more; what is forwarded stays forwarded."""
+        self._stopping.set()
+        self._thread.join()
+
+    def _serve(self) -> None:
+        with self._socket:
+            while not self._stopping.is_set():
+                self._expire()
+                try:
+                    request, client = self._socket.recvfrom(1500)
+                except TimeoutError:
+                    continue
+                answer = self._answer(request, client[0])
+                if answer:
+                    self._socket.sendto(answer, client)
+
+    def _expire(self) -> None:
+        for mapping in [mapping for mapping, end in self._ends.items() if end <= self._now()]:
+            self._close(mapping)
+
+    def _answer(self, request: bytes, client: str) -> bytes:
+        """The answer to a datagram; nothing for one that is no request."""
+        if len(request) < 2 or request[1] >= _REPLY:
+            return b""
+        version, operation = request[:2]
+        if version != 0:
+            return self._head(operation, UNSUPPORTED_VERSION)
+        if operation == 0:
+            return self._head(0) + socket.inet_aton(self._public_address())
+        if operation not in _PROTOCOLS or len(request) < 12:
+            return self._head(operation, UNSUPPORTED_OPCODE) + request[4:]
+        internal, external, lease = struct.unpack_from(">HHI", request, 4)
+        if lease == 0:
+            return self._unmap(operation, client, internal)
+        return self._map(operation, client, internal, external, lease)
+
+    def _map(self, operation: int, client: str, internal: int, external: int,
+             lease: int) -> bytes:
+        if self._grant.refusal:
+            return (self._head(operation, self._grant.refusal)
+                    + struct.pack(">HHI", internal, external, 0))
+        protocol, lease = _PROTOCOLS[operation], min(lease, self._grant.lease)
+        held = self._held(protocol, client, internal)
+        if held:
+            mapping = held[0]
+        else:
+            granted = self._free(protocol, external or internal)
+            mapping = Mapping(protocol, granted, client, internal)
+            packet_filter.forward(mapping)
+        self._ends[mapping] = self._now() + lease
+        return (self._head(operation)
+                + struct.pack(">HHI", internal, mapping.external_port, lease))
+
+    def _unmap(self, operation: int, client: str, internal: int) -> bytes:
+        """Close one mapping, or all of the client and protocol for internal port 0."""
+        for mapping in self._held(_PROTOCOLS[operation], client, internal):
+            self._close(mapping)
+        return self._head(operation) + struct.pack(">HHI", internal, 0, 0)
+
+    def _held(self, protocol: str, client: str, internal: int) -> list[Mapping]:
+        """The forwardings of a client's port, whoever made them; of every port for 0."""
+        return [mapping for mapping in packet_filter.mappings()
+                if (mapping.protocol, mapping.internal_address) == (protocol, client)
+                and internal in (0, mapping.internal_port)]
+
+    def _free(self, protocol: str, asked: int) -> int:
+        """The external port for a new mapping."""
+        taken = {mapping.external_port for mapping in packet_filter.mappings()
+                 if mapping.protocol == protocol}
+        port = self._grant.port(asked)
+        while port in taken:
+            port += 1
+        return port
+
+    def _close(self, mapping: Mapping) -> None:
+        self._ends.pop(mapping, None)
+        packet_filter.remove(mapping)
+
+    def _head(self, operation: int, result: int = 0) -> bytes:
+        epoch = int(self._now() - self._born * self._clock)
+        return struct.pack(">BBHI", 0, operation + _REPLY, result, epoch)
+
+    def _now(self) -> float:
+        """The client's time."""
+        return time.monotonic() * self._clock

@@ -1,0 +1,35 @@
+"""Another computer at home, which wants ports of the router for itself."""
+
+from __future__ import annotations
+
+from lab import network
+from lab.gateway import Gateway
+from lab.support import LabError
+from lab.timeline import Timeline
+
+_LEASE = 604800
+
+
+class Neighbour:
+    """The second client of the router's mapping protocols."""
+
+    def __init__(self, gateway: Gateway, timeline: Timeline) -> None:
+        self._gateway = gateway
+        self._timeline = timeline
+
+    def hold(self, external_port: int, internal_port: int) -> None:
+        """Take a TCP port of the router, and fail when it does not give exactly this one."""
+        if self._gateway.setup.upnp:
+            self._ask(f"external {self._gateway.wan_address}:{external_port} TCP is redirected",
+                      "upnpc", "-u", self._gateway.description_url, "-e", "neighbour", "-a",
+                      network.NEIGHBOUR_ADDRESS, str(internal_port), str(external_port), "tcp")
+        else:
+            self._ask(f"Mapped public port {external_port} protocol TCP", "natpmpc",
+                      "-g", self._gateway.lan_address, "-a", str(external_port),
+                      str(internal_port), "tcp", str(_LEASE))
+        self._timeline.add("neighbour", f"holds the gateway's TCP port {external_port}")
+
+    def _ask(self, success: str, *argv: str) -> None:
+        told = network.output(network.NEIGHBOUR, *argv)
+        if success not in told:
+            raise LabError(f"the gateway refused the neighbour ({' '.join(argv)}):\n{told}")

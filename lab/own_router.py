@@ -1,0 +1,155 @@
+"""A device that is itself the home's router, of the same maker: its scripts and their effect."""
+
+from __future__ import annotations
+
+import json
+import subprocess
+import threading
+from pathlib import Path
+
+from lab import network
+from lab.packet_filter import Mapping
+from lab.support import run_tool
+from lab.timeline import Timeline
+
+_FOLDER = Path("/run/own_router")
+_WAN_ADDRESS, _LAN_ADDRESS = _FOLDER / "wan", _FOLDER / "lan"
+_PREDEFINED, _ADDED, _CALLS = _FOLDER / "predefined", _FOLDER / "added", _FOLDER / "calls"
+
+# Closed towards the internet except for what a forward opens.
+_RULES = """
+table inet router {
+    map TCP { type inet_service : ipv4_addr . inet_service; }
+    map UDP { type inet_service : ipv4_addr . inet_service; }
+    chain input {
+        type filter hook input priority 0; policy accept;
+        iifname "wan" ct status dnat accept
+        iifname "wan" ct state new drop
+    }
+    chain prerouting {
+        type nat hook prerouting priority -100;
+        iifname "wan" dnat ip to tcp dport map @TCP
+        iifname "wan" dnat ip to udp dport map @UDP
+    }
+}
+"""
+
+_GET_IP = f"""#!/bin/sh
+# Prints an address of the router: getip.sh wan|lan
+echo "getip.sh $1" >>{_CALLS}
+cat "{_FOLDER}/$1"
+"""
+
+# An external port is forwarded once, and only what was added can be removed.
+_HELPER = f"""#!/bin/sh
+# The router's port forwards: tavik_helper.sh list
+#   tavik_helper.sh add PROTOCOL,PORT,LANADDRESS,INTERNALPORT,DESCRIPTION
+#   tavik_helper.sh remove PROTOCOL,PORT,LANADDRESS,INTERNALPORT
+exec 2>>{_FOLDER}/errors
+printf '%s\\n' "tavik_helper.sh${{1:+ $1}}${{2:+ $2}}" >>{_CALLS}
+IFS=, read -r protocol port address internal description <<END
+$2
+END
+case $1 in
+list)
+    cat {_PREDEFINED} {_ADDED} ;;
+add)
+    nft create element inet router "$protocol" "{{ $port : $address . $internal }}" &&
+        printf '%s\\n' "BRENVIK,$2" >>{_ADDED} ;;
+remove)
+    grep -q "^BRENVIK,$2," {_ADDED} &&
+        nft delete element inet router "$protocol" "{{ $port }}" &&
+        sed -i "/^BRENVIK,$2,/d" {_ADDED} ;;
+esac
+"""
+
+
+class OwnRouter:
+    """The router in the device; it lets nobody in from the internet but through its forwards."""
+
+    def __init__(self, timeline: Timeline) -> None:
+        self._timeline = timeline
+        self._wan_address = ""
+        self._lan_address = ""
+
+    def start(self, wan_address: str, lan_address: str) -> None:
+        """Install the scripts and close the device's internet side."""
+        self._wan_address, self._lan_address = wan_address, lan_address
+        _FOLDER.mkdir()
+        for file, text in ((_WAN_ADDRESS, f"{wan_address}\n"), (_LAN_ADDRESS, f"{lan_address}\n"),
+                           (_PREDEFINED, ""), (_ADDED, ""), (_CALLS, "")):
+            file.write_text(text)
+        _install("getip.sh", _GET_IP)
+        _install("tavik_helper.sh", _HELPER)
+        run_tool(*network.command(network.DEVICE, "nft", "-f", "-"), text=_RULES)
+        threading.Thread(target=self._watch, daemon=True).start()
+
+    def predefine(self, first: int, last: int, internal_port: int, owner: str = "BRENVIK",
+                  lan_address: str | None = None) -> None:
+        """Forward TCP ports on the router's own account; the scripts cannot take that away.
+
+        Without `lan_address` to the device itself; owner OTHER stands for another LAN device.
+        """
+        address = lan_address or self._lan_address
+        ports = str(first) if first == last else f"{first}-{last}"
+        elements = ", ".join(f"{port} : {address} . {internal_port}"
+                             for port in range(first, last + 1))
+        run_tool(*network.command(network.DEVICE, "nft", "create", "element", "inet", "router",
+                                  "TCP", f"{{ {elements} }}"))
+        with _PREDEFINED.open("a") as file:
+            file.write(f"{owner},TCP,{ports},{address},{internal_port},pre-defined\n")
+
+    def go_offline(self) -> None:
+        """Have no address on the internet side to tell."""
+        _WAN_ADDRESS.write_text("\n")
+        self._timeline.add("router", "has no internet address")
+
+    def go_online(self) -> None:
+        """Have the address on the internet side again."""
+        _WAN_ADDRESS.write_text(f"{self._wan_address}\n")
+        self._timeline.add("router", f"has the internet address {self._wan_address}")
+
+    def entries(self) -> list[str]:
+        """The lines that the router lists."""
+        return (_PREDEFINED.read_text() + _ADDED.read_text()).splitlines()
+
+    def mappings(self) -> list[Mapping]:
+        """The forwards in force, read from the packet filter."""
+        found: list[Mapping] = []
+        for protocol in ("TCP", "UDP"):
+            answer = network.output(network.DEVICE, "nft", "-j", "list", "map", "inet", "router",
+                                    protocol)
+            held = next(entry["map"] for entry in json.loads(answer)["nftables"] if "map" in entry)
+            found += [_mapping(protocol, element) for element in held.get("elem", [])]
+        return sorted(found)
+
+    def calls(self) -> list[str]:
+        """The scripts' names with their arguments, in the order in which they were run."""
+        return _CALLS.read_text().splitlines()
+
+    def _watch(self) -> None:
+        """Tell the timeline of every change of the forwards, whoever made it."""
+        words = {"add": "forwards", "create": "forwards", "delete": "no longer forwards"}
+        monitor = subprocess.Popen(
+            network.command(network.DEVICE, "nft", "-j", "monitor", "elements"),
+            stdout=subprocess.PIPE, text=True)
+        for line in monitor.stdout:
+            for change, subject in json.loads(line).items():
+                changed = subject.get("element", {})
+                if change in words and changed.get("table") == "router":
+                    for element in changed["elem"]["set"]:
+                        mapping = _mapping(changed["name"], element)
+                        self._timeline.add("router", f"{words[change]} {mapping}")
+
+
+def _mapping(protocol: str, element: list) -> Mapping:
+    """Read one element of a map; the filter gives it as [port, {"concat": [address, port]}]."""
+    external_port, target = element
+    return Mapping(protocol, external_port, *target["concat"])
+
+
+def _install(name: str, script: str) -> None:
+    """Put a script into the device's /etc/scripts, for which the lab's /etc needs a place."""
+    Path("/etc/scripts").mkdir(exist_ok=True)
+    network.host_file(network.DEVICE, f"scripts/{name}", script)
+    Path("/etc/netns", network.DEVICE, "scripts", name).chmod(0o755)

@@ -1,0 +1,69 @@
+"""The internet provider that puts its customers behind a NAT of its own."""
+
+from __future__ import annotations
+
+from pathlib import Path
+
+from lab import network
+from lab.gateway import Gateway
+from lab.support import run_tool
+from lab.timeline import Timeline
+
+HOST = "provider"
+ADDRESS, CUSTOMER_ADDRESS = "44.128.0.21", "44.128.1.20"
+_ROUTER_ADDRESS = "44.128.1.1"
+_CABLE = network.cable_end(network.GATEWAY, "wan")
+
+# Nobody on the internet reaches a customer who did not call first.
+_RULES = """
+table inet carrier {
+    chain forward {
+        type filter hook forward priority 0; policy drop;
+        ct state established,related accept
+        iifname != "net" accept
+    }
+    chain input {
+        type filter hook input priority 0; policy accept;
+        iifname "net" ct state new drop
+    }
+    chain postrouting {
+        type nat hook postrouting priority 100;
+        oifname "net" masquerade
+    }
+}
+"""
+
+
+class Provider:
+    """The box between the router and the internet, once it is inserted."""
+
+    def __init__(self, gateway: Gateway, timeline: Timeline) -> None:
+        self._gateway = gateway
+        self._timeline = timeline
+        self._direct_address = ""
+
+    def insert(self) -> None:
+        """Plug the router into the provider's box instead of the internet."""
+        network.ip_batch(f"netns add {HOST}")
+        network.plug(HOST, "net", network.INTERNET, "net")
+        network.ip_batch(f"address add {ADDRESS}/24 dev net",
+                         f"route add default via {network.SERVICE_ADDRESS}", host=HOST)
+        with network.inside(HOST):
+            Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
+        run_tool(*network.command(HOST, "nft", "-f", "-"), text=_RULES)
+        network.ip_batch(f"link set {_CABLE} nomaster netns {HOST}", host=network.INTERNET)
+        network.ip_batch(f"address add {_ROUTER_ADDRESS}/24 dev {_CABLE}",
+                         f"link set {_CABLE} up", host=HOST)
+        self._direct_address = self._gateway.wan_address
+        self._gateway.take_wan_address(CUSTOMER_ADDRESS, _ROUTER_ADDRESS)
+        self._timeline.add("provider",
+                           f"puts the gateway, now {CUSTOMER_ADDRESS}, behind {ADDRESS}")
+
+    def remove(self) -> None:
+        """Plug the router into the internet again, under its address of before."""
+        network.ip_batch(f"link set {_CABLE} netns {network.INTERNET}", "link delete net",
+                         host=HOST)
+        network.ip_batch(f"link set {_CABLE} master net up", host=network.INTERNET)
+        network.ip_batch(f"netns delete {HOST}")
+        self._gateway.take_wan_address(self._direct_address, network.SERVICE_ADDRESS)
+        self._timeline.add("provider", f"gives the gateway {self._direct_address} of its own")

@@ -1,0 +1,94 @@
+"""The picture of a timeline: everything is in it, to scale, readable, and nothing but drawing."""
+
+from __future__ import annotations
+
+import xml.etree.ElementTree as ElementTree
+
+import pytest
+
+from lab.picture import STATUS_COLOURS, svg
+from lab.timeline import Event, Timeline
+
+pytestmark = pytest.mark.outside
+
+SVG = "{http://www.w3.org/2000/svg}"
+Box = tuple[float, float]
+
+
+def drawn(events: list[Event]) -> ElementTree.Element:
+    return ElementTree.fromstring(svg("A day in the lab", events))
+
+
+def texts(picture: ElementTree.Element) -> list[str]:
+    return [element.text for element in picture.iter(f"{SVG}text")]
+
+
+def side_by_side(picture: ElementTree.Element, kind: str, **wanted: str) -> list[list[Box]]:
+    """The left and right ends of shapes of a kind, for each height at which some are."""
+    rows: dict[str, list[Box]] = {}
+    for shape in picture.iter(SVG + kind):
+        if all(shape.get(name.replace("_", "-")) == value for name, value in wanted.items()):
+            left = float(shape.get("x"))
+            width = float(shape.get("width", 7 * len(shape.text or "")))
+            rows.setdefault(shape.get("y"), []).append((left, left + width))
+    return [sorted(row) for row in rows.values()]
+
+
+def test_story_of_a_log_is_told_in_few_and_harmless_words():
+    timeline = Timeline()
+    timeline.step("the gateway has <no> port & says \x1b[31mso\udc80")
+    refusal = ("Router::mapPort() - fail - failed to map external port: {}, "
+               "to internal port: 80, status: 718")
+    for port in range(9091, 9391):
+        timeline.read_log(refusal.format(port))
+    timeline.read_log("Router::mapPort() - success - external port: 9391 has been mapped to "
+                      "internal port: 80  ")
+    timeline.read_log(refusal.format(9392))
+    timeline.add("relay", "a tunnel begins")
+    timeline.add("relay", "a tunnel begins")
+
+    told = [(event.who, event.what) for event in timeline.events]
+    assert told[1:] == [("device", "gateway refuses a port")] * 2 + [("relay",
+                                                                      "a tunnel begins")] * 2
+    picture = drawn(timeline.events)
+    assert {element.tag for element in picture.iter()} == {
+        f"{SVG}{shape}" for shape in ("svg", "rect", "line", "text")}
+    words = texts(picture)
+    heading = "the gateway has <no> port & says \ufffd[31mso\ufffd"
+    assert words.count(heading) == 2
+    assert sum(word.startswith("gateway refuses a port (2 times") for word in words) == 1
+    assert sum(word.startswith("a tunnel begins (2 times") for word in words) == 1
+
+
+def test_status_bars_are_to_scale_and_the_last_word_has_room():
+    told = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"), (80, "disabled")]
+    picture = drawn([Event(5, "lab", "is raised"), Event(81, "lab", "is gone"), *(
+        Event(when, "device", f"status: {word}") for when, word in told)])
+    bars = {word: row for word, colour in STATUS_COLOURS.items()
+            for row in side_by_side(picture, "rect", fill=colour, height="24")}
+    assert [len(bars[word]) for _, word in told] == [1] * 5 and "portforwarded" not in bars
+    ticks = {label: float(element.get("x")) for element in picture.iter(f"{SVG}text")
+             for label in [element.text] if element.get("text-anchor") == "middle"}
+    for word, seconds in (("connecting", 10), ("relayed", 40), ("failed", 70), ("disabled", 80)):
+        assert bars[word][0][0] == pytest.approx(ticks[str(seconds)], abs=0.1)
+    assert bars["relayed"][0][1] == pytest.approx(bars["failed"][0][0], abs=0.1)
+    assert {"connecting", "relayed", "disabled"} <= set(texts(picture))
+
+
+def test_crowded_moments_stay_apart_and_on_the_paper():
+    moments = [Event(60 + number ** 2 / 50, who, f"event {number} of {who}")
+               for number in range(40) for who in ("device", "gateway", "somebody")]
+    steps = [Event(60 + number / 5, "story", f"and then, as step {number}, it goes on and on")
+             for number in range(6)]
+    events = sorted(moments + steps, key=lambda event: event.when)
+    picture = drawn(events)
+    words = texts(picture)
+    assert all(event.what in words for event in events)
+    marks = side_by_side(picture, "rect", rx="9")
+    headings = side_by_side(picture, "text", font_size="13")
+    assert sum(map(len, headings)) == 6 and max(map(len, marks)) > 1
+    for row in marks + headings:
+        assert all(before[1] < after[0] for before, after in zip(row, row[1:]))
+        assert 0 < row[0][0] and row[-1][1] < 1200
+    assert max(float(text.get("y")) for text in picture.iter(f"{SVG}text")) < float(
+        picture.get("height"))

@@ -2,7 +2,9 @@
 
 #include <arpa/inet.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/select.h>
+#include <sys/socket.h>
 
 #include <array>
 #include <cerrno>
@@ -17,6 +19,8 @@ namespace pelorus {
 namespace {
 
 constexpr int kMaxReads = 3;
+constexpr int kMaxLateAnswers = 100;
+constexpr int kLateAnswerWait = 1000;  // milliseconds
 constexpr int kSelectDescriptors = FD_SETSIZE;
 
 /// The protocol's number for "TCP" or "UDP", 0 for anything else.
@@ -30,6 +34,19 @@ int protocolNumber(const std::string& protocol) {
 void closeOnExec(int socket) {
     const int flags = fcntl(socket, F_GETFD);
     if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));
+}
+
+// A gateway that is slow answers a request and each of its repetitions. What is not read then would
+// be taken for the answer to the next request, and every answer from then on for that to the next.
+void discardLateAnswers(const natpmp_t& client) {
+    int expected = client.try_number - 1;
+    std::array<char, sizeof(natpmpresp_t)> answer{};
+    for (int count = 0; count < kMaxLateAnswers; ++count) {
+        pollfd readable{client.s, POLLIN, 0};
+        if (poll(&readable, 1, expected > 0 ? kLateAnswerWait : 0) <= 0) return;
+        if (recv(client.s, answer.data(), answer.size(), MSG_DONTWAIT) < 0) return;
+        --expected;
+    }
 }
 
 void waitForAnswer(int socket, timeval timeout) {
@@ -92,6 +109,7 @@ bool CMnatpmp::retrieveExternalIP(std::string& ip) {
                 "CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
+    discardLateAnswers(natpmp);
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
@@ -153,6 +171,7 @@ bool CMnatpmp::exchangeMapping(int protocol,
                                int internalPort,
                                int& externalPort,
                                unsigned& lifetime) {
+    discardLateAnswers(natpmp);
     const int sent =
         sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
                                   static_cast<std::uint16_t>(externalPort), lifetime);

@@ -4,8 +4,10 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <miniupnpc/upnpcommands.h>
+#include <sys/socket.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstdint>
@@ -33,9 +35,21 @@ constexpr int kNoSuchIndex = 713;
 constexpr int kNoSuchEntry = 714;
 constexpr int kConflict = 718;
 
-// Stands for the socket of every NAT-PMP client. Open before any test begins, since clients may
-// live longer than the test that made them.
-const int socketStandIn = open("/dev/null", O_RDONLY);  // NOLINT(cert-err58-cpp): throws nothing
+// The first stands for the socket of every NAT-PMP client, the second is the gateway's. Open before
+// any test begins, since clients may live longer than the test that made them.
+const std::array<int, 2> sockets = [] {  // NOLINT(cert-err58-cpp): throws nothing
+    std::array<int, 2> pair{};
+    if (socketpair(AF_UNIX, SOCK_DGRAM, 0, pair.data()) != 0) pair = {-1, -1};
+    return pair;
+}();
+const int socketStandIn = sockets[0];
+const int gatewaySocket = sockets[1];
+
+void checkNothingUnread() {
+    char late = 0;
+    EXPECT_LT(recv(socketStandIn, &late, 1, MSG_DONTWAIT | MSG_PEEK), 0)
+        << "a late answer would be taken for that to this request";
+}
 
 void checkBrokenPipeBlocked() {
     sigset_t mask;
@@ -269,8 +283,13 @@ int FakeGateway::closeClient() {
     return fails(Natpmp::CLOSE, status) ? status : 0;
 }
 
+void FakeGateway::answerLate() {
+    EXPECT_EQ(send(gatewaySocket, "late", 4, 0), 4);
+}
+
 int FakeGateway::sendAddressRequest() {
     note("natpmp address");
+    checkNothingUnread();
     int status = 0;
     if (fails(Natpmp::SEND_ADDRESS, status)) return status;
     pending = Request{};
@@ -284,6 +303,7 @@ int FakeGateway::sendMappingRequest(int protocol,
                                     unsigned lifetime) {
     note("natpmp map " + protocolName(protocol) + " " + std::to_string(publicPort) + " -> " +
          std::to_string(privatePort) + " for " + std::to_string(lifetime) + " s");
+    checkNothingUnread();
     int status = 0;
     if (fails(Natpmp::SEND_MAPPING, status)) return status;
     pending = Request{protocol, privatePort, publicPort, lifetime};

@@ -82,6 +82,8 @@ public:
     void speakNatpmp(bool on) { natpmp = on; }
     /// NAT-PMP requests get no answer at all.
     void keepSilent() { silent = true; }
+    /// Sends an answer that no request waits for any more.
+    void answerLate();
     /// The address both protocols tell, at first 44.128.0.20.
     void setExternalIp(const std::string& address) { externalIp = address; }
     /// Lets the question for the external address fail with @p status (UPnP).

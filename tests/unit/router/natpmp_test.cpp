@@ -54,6 +54,17 @@ TEST_F(NatpmpTest, AGatewayThatKeepsSilentIsReadThreeTimes) {
     EXPECT_EQ(log.countPart("errno " + std::to_string(EAGAIN) + "\n"), 1);
 }
 
+TEST_F(NatpmpTest, AnswersThatComeTooLateAreNotTakenForThoseOfTheNextRequest) {
+    EXPECT_TRUE(client.retrieveExternalIP(ip));
+    gateway.answerLate();
+    gateway.answerLate();
+    EXPECT_TRUE(client.retrieveExternalIP(ip));
+    gateway.answerLate();
+    port = 9091;
+    EXPECT_TRUE(client.mapPort(80, port, "TCP", "", false));
+    EXPECT_EQ(port, 9091);
+}
+
 struct Failure {
     const char* name;
     std::vector<Call> calls;

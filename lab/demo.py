@@ -1,4 +1,8 @@
-"""The main job on one machine: a device behind a real home router becomes reachable."""
+"""Shows the daemon at work on one machine, in a lab of its own.
+
+Without a name: the main job at its real speed, a device behind a home router becomes reachable.
+With the name of a scenario: that story, with the device's clock sped up and everything checked.
+"""
 
 from __future__ import annotations
 
@@ -8,34 +12,60 @@ import signal
 import subprocess
 import sys
 import time
+import traceback
+from collections.abc import Callable
 
-from lab import network, sandbox, web
+from lab import network, picture, sandbox, web
 from lab.device import HOME
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
+from lab.scenarios import SCENARIOS
 from lab.support import LabError
 from lab.timeline import Timeline
 
 _PATIENCE = 55
 _INTERRUPTED = 130
+_PICTURE = "PELORUS_LAB_PICTURE"
+_MAIN_JOB = Situation(gateway=GatewaySetup(upnp=True, natpmp=True))
 
 
 def main() -> int:
     """Outside: build the daemon and open a sandbox for the demo. Inside: play it."""
-    parser = argparse.ArgumentParser(prog="scripts/demo", description=__doc__)
-    parser.add_argument("--stay", action="store_true",
-                        help="keep the lab up until Ctrl-C, to look around in it")
-    arguments = parser.parse_args()
+    arguments = _parse()
+    if arguments.list:
+        width = max(map(len, SCENARIOS))
+        for scenario in SCENARIOS.values():
+            print(f"{scenario.name:<{width}}  {scenario.title}")
+        return 0
     if sandbox.is_inside():
-        return _play(arguments.stay)
+        return _show(arguments.scenario, arguments.stay)
     reason = sandbox.why_forbidden()
     if reason:
         print(f"demo: this machine does not let us make network namespaces ({reason})")
         return sandbox.FORBIDDEN
     if "PELORUS" not in os.environ and not _build():
         return 1
-    status = sandbox.run("lab.demo", sys.argv[1:]).returncode
+    kept: tuple[int, ...] = ()
+    if arguments.svg:
+        kept = (os.open(arguments.svg, os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o666),)
+        os.environ[_PICTURE] = str(kept[0])
+    status = sandbox.run("lab.demo", sys.argv[1:], keep_open=kept).returncode
     return status if status >= 0 else 128 - status
+
+
+def _parse() -> argparse.Namespace:
+    parser = argparse.ArgumentParser(prog="scripts/demo", description=__doc__,
+                                     formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("scenario", nargs="?", metavar="SCENARIO",
+                        help="a name from --list")
+    parser.add_argument("--list", action="store_true", help="name the scenarios, one line each")
+    parser.add_argument("--svg", metavar="FILE", help="save the timeline as a picture")
+    parser.add_argument("--stay", action="store_true",
+                        help="keep the lab up until Ctrl-C, to look around in it")
+    arguments = parser.parse_args()
+    if arguments.scenario and arguments.scenario not in SCENARIOS:
+        parser.error(f"there is no scenario {arguments.scenario!r}; --list names them")
+    return arguments
 
 
 def _build() -> bool:
@@ -50,34 +80,54 @@ def _build() -> bool:
     return True
 
 
-def _play(stay: bool) -> int:
+def _show(name: str | None, stay: bool) -> int:
+    """Play in the sandbox, telling what happens as it happens."""
     signal.signal(signal.SIGINT, signal.default_int_handler)
+    timeline = Timeline()
+    timeline.listen(lambda event: print(event, flush=True))
+    title = SCENARIOS[name].title if name else "A device behind a home router becomes reachable"
+    print(f"{title}\n")
     try:
-        _reach_the_device()
+        _play(name, timeline)
         if stay:
             _look_around()
-    except LabError as failure:
-        print(f"\nFAILED: {failure}")
+    except (LabError, AssertionError) as failure:
+        print(f"\nFAILED: {failure or 'not as it must be:'}")
         return 1
     except KeyboardInterrupt:
         print("\ninterrupted, the lab is gone")
         return _INTERRUPTED
+    finally:
+        _save_picture(title, timeline)
     return 0
 
 
-def _reach_the_device() -> None:
-    timeline = Timeline()
-    timeline.listen(lambda event: print(event, flush=True))
-    lab = Lab(Situation(gateway=GatewaySetup(upnp=True, natpmp=True)), timeline)
+def _play(name: str | None, timeline: Timeline) -> None:
+    story: Callable[[Lab], None] = SCENARIOS[name].play if name else _reach_the_device
+    lab = Lab(SCENARIOS[name].situation if name else _MAIN_JOB, timeline)
     timeline.add("lab", "device, gateway, central service and name server answer")
     try:
-        lab.start_daemon("-l", "7", "-f", "30")
-        lab.wait_for(lambda: lab.device.status == "portforwarded",
-                     "the device to be port forwarded", _PATIENCE)
-        _close(lab)
-    except LabError:
+        story(lab)
+    except (LabError, AssertionError):
         print(lab.report())
+        print(f"\n{traceback.format_exc(limit=-2)}")
         raise
+    if name:
+        print("\neverything was as it must be")
+
+
+def _save_picture(title: str, timeline: Timeline) -> None:
+    """Write the story to the file of the machine outside that was opened for it."""
+    if _PICTURE in os.environ:
+        with os.fdopen(int(os.environ[_PICTURE]), "w") as file:
+            file.write(picture.svg(title, timeline.events))
+
+
+def _reach_the_device(lab: Lab) -> None:
+    lab.start_daemon("-l", "7", "-f", "30")
+    lab.wait_for(lambda: lab.device.status == "portforwarded",
+                 "the device to be port forwarded", _PATIENCE)
+    _close(lab)
 
 
 def _close(lab: Lab) -> None:

@@ -2,6 +2,7 @@
 
 from __future__ import annotations
 
+import os
 import threading
 from collections.abc import Mapping
 from pathlib import Path
@@ -202,9 +203,15 @@ def _read_settings(path: Path) -> dict[str, str]:
 
 
 def _write_settings(path: Path, settings: Mapping[str, str]) -> None:
-    """Replace the file in one step, so that the daemon never reads half of it."""
+    """Replace the file in one step, so that the daemon never reads half of it.
+
+    The daemon compares whole seconds: two changes must not look like one.
+    """
     new = path.with_suffix(".new")
     new.write_text("".join(f"{key}={value}\n" for key, value in settings.items()),
                    errors="surrogateescape")
     new.chmod(0o666)
+    if path.exists() and new.stat().st_mtime < int(path.stat().st_mtime) + 1:
+        later = int(path.stat().st_mtime) + 1
+        os.utime(new, (later, later))
     new.replace(path)

@@ -36,7 +36,8 @@ _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject
     (r"Router::mapPort\(\) - success", None, "other device"),
     (r"PORTFORWARDED (\w+): mapPort returncode\[1\], internalPort\[\d+\], new externalPort\[(\d+)",
      "{} mapping renewed, port {}", None),
-    (r"PORTFORWARDED (\w+): mapPort returncode\[0\]", "{} mapping could not be renewed", None),
+    (r"PORTFORWARDED (\w+): mapPort returncode\[0\], internalPort\[[1-9]",
+     "{} mapping could not be renewed", None),
 
     (r"pollServerForSleepTime - (?:missing action|malformed|received garbage)",
      "answer to the question for permission is not understood", "permission"),

@@ -10,6 +10,8 @@ import pytest
 
 sys.path.insert(0, str(Path(__file__).resolve().parents[2]))
 
+pytest.register_assert_rewrite("lab.checks", "lab.scenarios")
+
 from lab import sandbox  # noqa: E402
 from lab.scenario import Lab, Situation  # noqa: E402
 from lab.timeline import Timeline  # noqa: E402

@@ -1,0 +1,142 @@
+"""What scenarios look at again and again."""
+
+from __future__ import annotations
+
+import signal
+from collections.abc import Sequence
+
+from lab import daemon, network, web
+from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, PortTest, Record
+from lab.device import DYNAMIC_COPY, HOME
+from lab.gateway import Mapping
+from lab.scenario import Lab
+
+OPTIONS = ("-l", "7", "-f", "30")
+# A pause of two minutes takes two seconds.
+FAST = 60
+# The tunnel comes up in real time while the daemon counts ten fast seconds between its looks.
+RELAYED = 20
+# A tunnel that never starts is given up at the first look instead of after five minutes.
+NO_TUNNEL = {"STARTCMD": "true"}
+TUNNEL_PID_FILE = HOME / "openvpn/openvpn.pid"
+
+_LOCAL0 = 16
+_PATIENCE = 60
+
+BOTH_MAPPED = [Mapping("TCP", 9091, network.DEVICE_ADDRESS, 80),
+               Mapping("TCP", 9444, network.DEVICE_ADDRESS, 443)]
+PUBLISHED = Record(network.GATEWAY_WAN_ADDRESS, network.DEVICE_ADDRESS, 9091, 9444)
+PAGES = ["welcome to mynas, over http", "welcome to mynas, over https"]
+
+
+def wait_for_status(lab: Lab, status: str, seconds: float = _PATIENCE) -> None:
+    """Wait until the device's own configuration holds the status."""
+    lab.wait_for(lambda: lab.device.status == status, f"status {status}", seconds)
+
+
+def wait_for_log(lab: Lab, part: str, count: int = 1, seconds: float = _PATIENCE) -> None:
+    """Wait until the device's log has held a text this often."""
+    lab.wait_for(lambda: lab.device.messages.count(part) >= count, f"{count} x [{part}]", seconds)
+
+
+def wait_for_next_cycle(lab: Lab, cycles: int = 1) -> None:
+    """Wait until that many more cycles have run to their pause."""
+    pause = "DaemonControl::run - retry connection after "
+    wait_for_log(lab, pause, lab.device.messages.count(pause) + cycles)
+
+
+def pages_from_outside(http_port: int = 9091, https_port: int = 9444,
+                       address: str = network.GATEWAY_WAN_ADDRESS) -> list[str | None]:
+    """What a browser on the internet gets from the device through its external ports."""
+    return [web.fetch(network.INTERNET, url, seconds=0.5) for url in (
+        f"http://{address}:{http_port}/", f"https://{address}:{https_port}/")]
+
+
+def asked(lab: Lab, since: int = 0) -> list[str]:
+    """What the device asked the service for, in order, after the first `since` requests."""
+    return [request.path.split("/")[4] for request in lab.central.requests[since:]]
+
+
+def tunnel_client() -> int:
+    """The tunnel client's pid, of a process that really runs."""
+    client = int(TUNNEL_PID_FILE.read_text())
+    assert client in daemon.running("openvpn")
+    return client
+
+
+def page_through_the_tunnel(lab: Lab) -> str | None:
+    """The device's page as the relay gets it at the device's end of the tunnel."""
+    address = lab.relay.client_address()
+    return web.fetch(network.INTERNET, f"http://{address}/", seconds=2) if address else None
+
+
+def mapping_changes(lab: Lab) -> list[str]:
+    """What the gateway forwarded and ceased to forward, in order."""
+    return [event.what for event in lab.timeline.events
+            if event.who == "gateway" and "forwards TCP" in event.what]
+
+
+def assert_told_in_order(lab: Lab) -> None:
+    """The service hears: here I am, clean slate, may I, test my port, publish; each once."""
+    device_id, auth, _ = lab.account.secrets
+    forward = f"/api/1.0/rest/{PORT_FORWARD}/{device_id}?external_ip="
+    assert [(request.scheme, request.url) for request in lab.central.requests] == [
+        ("https", f"/api/1.0/rest/{COMM_STATUS}/{device_id}?auth={auth}&local_ip=192.168.77.10"),
+        ("https", f"{forward}NULL&local_ip=192.168.77.10&http_port=0&https_port=0&auth={auth}"),
+        ("http", f"/api/1.0/rest/{WAIT}/{device_id}"),
+        ("https", f"/api/1.0/rest/{PORT_TEST}/{device_id}?external_ip=44.128.0.20&port=9091"
+                  f"&protocol=HTTP&auth={auth}"),
+        ("https", f"{forward}44.128.0.20&local_ip=192.168.77.10&http_port=9091&https_port=9444"
+                  f"&auth={auth}")]
+    assert lab.central.port_tests == [PortTest("44.128.0.20", 9091, "HTTP", device_id)]
+    assert [request.url for request in lab.device.local_requests] == [
+        "/local/comm_status?status=connecting",
+        "/local/local_ip?address=192.168.77.10",
+        "/local/port_forward_delete?internal_port=80",
+        "/local/port_forward?external_ip=44.128.0.20&http_port=9091&https_port=9444"
+        "&local_ip=192.168.77.10&internal_port=80",
+        "/local/comm_status?status=portforwarded"]
+
+
+def assert_published(lab: Lab, http_port: int = 9091, https_port: int = 9444,
+                     others: Sequence[Mapping] = (), local_ip: str = network.DEVICE_ADDRESS,
+                     external_ip: str = network.GATEWAY_WAN_ADDRESS) -> None:
+    """Both ports are open at the gateway, beside those of `others`, and everybody knows them."""
+    internal = [int(lab.device.setting(f"INTERNAL_{kind}_PORT")) for kind in ("HTTP", "HTTPS")]
+    assert lab.gateway.mappings() == sorted([
+        *(Mapping("TCP", port, local_ip, inside)
+          for port, inside in zip((http_port, https_port), internal)), *others])
+    assert lab.central.record == Record(external_ip, local_ip, http_port, https_port)
+    assert lab.device.setting("EXTERNAL_HTTP_PORT") == str(http_port)
+    assert lab.device.setting("EXTERNAL_HTTPS_PORT") == str(https_port)
+    assert lab.device.setting("EXTERNAL_IP") == external_ip
+    assert lab.device.setting("LOCAL_IP") == local_ip
+    assert "COMMUNICATION_STATUS=portforwarded\n" in DYNAMIC_COPY.read_text(errors="replace")
+    assert [lab.names.resolve(name) for name in lab.account.names] == [external_ip] * 3
+
+
+def assert_stops_clean(lab: Lab, number: signal.Signals = signal.SIGTERM,
+                       left: Sequence[Mapping] = ()) -> None:
+    """One signal ends the daemon by that signal and takes everything down that it put up.
+
+    The mappings in `left` are not its own, or it does not know them any more.
+    """
+    withdrawals = lab.central.withdrawals
+    assert lab.stop_daemon(number) == number.name
+    assert lab.gateway.mappings() == list(left)
+    assert lab.central.record is None
+    assert lab.central.withdrawals == withdrawals + 1
+    assert lab.central.requests_for(PORT_FORWARD)[-1].argument("external_ip") == "NULL"
+    assert lab.device.status == "disabled"
+    assert lab.device.setting("EXTERNAL_HTTP_PORT") == "0"
+    assert daemon.running("pelorus") == []
+    assert_log_is_proper(lab)
+
+
+def assert_log_is_proper(lab: Lab) -> None:
+    """Every line is the daemon's and tells no secret."""
+    assert {(message.ident, message.facility) for message in lab.device.messages.all} == {
+        ("Pelorus", _LOCAL0)}
+    lines = lab.device.messages.texts()
+    for secret in lab.account.secrets:
+        assert not [line for line in lines if secret in line]

@@ -1,0 +1,297 @@
+"""A home router that maps ports: the device is reached directly."""
+
+from __future__ import annotations
+
+import signal
+from collections.abc import Sequence
+
+from lab.central import PORT_FORWARD, PORT_TEST, WAIT
+from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, asked, assert_published,
+                        assert_stops_clean, assert_told_in_order, page_through_the_tunnel,
+                        pages_from_outside, wait_for_log, wait_for_next_cycle, wait_for_status)
+from lab.gateway import STOCK_PERMISSIONS, GatewaySetup, Mapping
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+
+_TAKEN = "is already mapped to another IP: 192.168.77.20"
+_REFUSED = "Router::mapPort() - fail - failed to map external port: "
+_IGNORED = "Ignore Port Test due to Interval"
+_MAPPED_ANEW = "Resetting HTTP allocated ports due to external or local IP change: [9091]"
+_PASSED = "TavikClient::testPort - port map check success."
+
+# A pause takes three seconds, and a tunnel has seven to come up.
+_IMPATIENT = 40
+
+# Requests to a UPnP gateway. A discovery asks for its description, its state and twice for its
+# address. What an earlier run left is looked for by two names, in two passes through its list.
+_DISCOVERY = 4
+_PASSES = 4
+# An attempt asks who has a port, then for the port. While nothing is mapped it takes back two
+# mappings that are not there: after a failed search, before each port of the extended range, and
+# before the first search and every one that may use the default ports only.
+_MAP, _TAKE_BACK = 2, 2
+# A search goes three times through 9091 and the 99 ports from 9092 on. The last one counts as bad
+# when the first round has failed.
+_FIRST_SEARCH = 100 * _MAP + 99 * _TAKE_BACK + 2 * (99 * _MAP + 98 * _TAKE_BACK)
+_NEXT_SEARCH = 3 * (99 * _MAP + 98 * _TAKE_BACK)
+
+
+@scenario(Situation(clock=FAST))
+def upnp(lab: Lab) -> None:
+    """A UPnP gateway: both ports mapped, proven, published and reached from the internet."""
+    assert pages_from_outside() == [None, None]
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    assert_told_in_order(lab)
+    _assert_reached(lab)
+
+    lab.step("the next cycle checks the public names and changes nothing")
+    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value for device domain "
+                      "names, IP address is 44.128.0.20")
+    wait_for_next_cycle(lab)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert lab.gateway.mappings() == BOTH_MAPPED
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert pages_from_outside() == [None, None]
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
+def natpmp(lab: Lab) -> None:
+    """A gateway that speaks only NAT-PMP is used as well as one that speaks UPnP."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    assert_told_in_order(lab)
+    _assert_reached(lab)
+    assert lab.device.messages.count("Router::upnp_discover - UPnP Discover failed") > 0
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+
+
+@scenario(Situation(gateway=GatewaySetup(secure=False), clock=FAST))
+def ports_taken(lab: Lab) -> None:
+    """Another computer at home holds 9091, then 9444 too: the next ports are used, it keeps its."""
+    lab.neighbour.hold(9091, 80)
+    others = lab.gateway.mappings()
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    _assert_reached(lab, 9092, 9444, others)
+    assert_stops_clean(lab, left=others)
+
+    lab.step("it holds 9444 as well, and pelorus starts again")
+    lab.neighbour.hold(9444, 443)
+    others = lab.gateway.mappings()
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    _assert_reached(lab, 9092, 9445, others)
+    assert _tested(lab) == [9092, 9092]
+    assert lab.device.messages.count(_TAKEN) == 3
+    assert lab.device.messages.count(_REFUSED) == 0
+    assert_stops_clean(lab, left=others)
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
+def natpmp_port_taken(lab: Lab) -> None:
+    """Another computer holds 9091 of a NAT-PMP gateway: the port granted instead is published."""
+    lab.neighbour.hold(9091, 80)
+    others = lab.gateway.mappings()
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    _assert_reached(lab, 9092, 9444, others)
+    assert _tested(lab) == [9092]
+    # The gateway chose it: nothing was refused, and nothing had to be asked for a second time.
+    assert lab.device.messages.count("Router::mapPort() - ") == 2
+    assert_stops_clean(lab, left=others)
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
+def natpmp_answers_late(lab: Lab) -> None:
+    """A slow NAT-PMP gateway answers twice and too late: no answer is taken for another one."""
+    _start_direct(lab, "-t", "200")
+    requests = lab.gateway.natpmp_requests()
+
+    lab.step("the gateway hangs until it was asked a second time")
+    lab.gateway.server.send_signal(signal.SIGSTOP)
+    lab.wait_for(lambda: lab.gateway.natpmp_requests() >= requests + 2, "a repetition", 60)
+    lab.gateway.server.send_signal(signal.SIGCONT)
+
+    lab.step("the mappings are renewed as they are, under the same address")
+    renewals = lab.device.messages.count("mapPort returncode[1]")
+    wait_for_log(lab, "mapPort returncode[1]", renewals + 4)
+    assert lab.device.messages.count("does not match the response internal port") == 0
+    told = [text for text in lab.device.messages.texts() if "fetched external IP address" in text]
+    assert len(set(told)) == 1
+    _assert_reached(lab)
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(dynamic={"DEFAULT_PORTS_ONLY": "TRUE"}, relay=True, clock=_IMPATIENT))
+def default_ports_only(lab: Lab) -> None:
+    """Only 9091 may be used, but another computer holds it: no other is asked for, relayed."""
+    lab.neighbour.hold(9091, 80)
+    others = lab.gateway.mappings()
+    lab.start_daemon(*OPTIONS)
+    _wait_for_cycle(lab, 1)
+    assert lab.device.status == "relayed"
+    assert page_through_the_tunnel(lab) == PAGES[0]
+    # Each pass through the list sees the neighbour's entry, and then the end.
+    start = _DISCOVERY + 2 * _PASSES
+    attempt = _DISCOVERY + _TAKE_BACK + 3 + _TAKE_BACK
+    assert lab.device.messages.count(_TAKEN) == 3
+    assert lab.gateway.upnp_requests() == start + attempt
+
+    lab.step("the next cycle asks for the same port again")
+    _wait_for_cycle(lab, 2)
+    assert lab.device.messages.count(_TAKEN) == 6
+    assert lab.gateway.upnp_requests() == start + 2 * attempt
+    assert lab.gateway.mappings() == others
+    assert _tested(lab) == []
+    assert_stops_clean(lab, left=others)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+
+
+@scenario(Situation(clock=FAST))
+def port_filtered(lab: Lab) -> None:
+    """Port 9091 is filtered on its way from the internet: the second candidate is published."""
+    lab.gateway.block(9091)
+    lab.start_daemon(*OPTIONS)
+    _wait_for_told(lab, "connecting", "failed", "portforwarded")
+    _assert_reached(lab, 9092)
+    assert _tested(lab) == [9091] * 3 + [9092]
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(clock=2 * FAST))
+def forwarding_dies(lab: Lab) -> None:
+    """A port is listed but no longer forwarded: the next takes its place, it is not tried again."""
+    lab.start_daemon(*OPTIONS)
+    _wait_for_told(lab, "connecting", "portforwarded")
+    _assert_reached(lab)
+    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+
+    lab.step("nothing comes through port 9091 any more")
+    lab.gateway.block(9091)
+    _wait_for_told(lab, "connecting", "portforwarded", "failed", "portforwarded")
+    _assert_reached(lab, 9092)
+    assert sorted(listed.mapping for listed in lab.gateway.listing()) == lab.gateway.mappings()
+    # Three tests of the mapping, three more of the same port mapped anew, one of the next port.
+    assert _tested(lab)[1:] == [9091] * 6 + [9092]
+    assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 7, PORT_FORWARD]
+    assert [request.path for request in lab.device.local_requests[told:]] == [
+        "/local/comm_status", "/local/port_forward", "/local/comm_status"]
+
+    lab.step("port 9091 works again and 9092 does not; 9091 still counts as bad")
+    lab.gateway.unblock(9091)
+    lab.gateway.block(9092)
+    _wait_for_told(lab, "connecting", *["portforwarded", "failed"] * 2, "portforwarded")
+    _assert_reached(lab, 9093)
+    assert _tested(lab)[8:] == [9092] * 6 + [9093]
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(clock=FAST))
+def http_forwarding_lost(lab: Lab) -> None:
+    """The gateway loses the HTTP forwarding: the next port test notices, it is mapped again."""
+    _start_direct(lab)
+    requests, ignored = len(lab.central.requests), lab.device.messages.count(_IGNORED)
+
+    lab.step("a gateway that cleans up drops port 9091")
+    lab.gateway.lose(9091)
+    assert pages_from_outside() == [None, PAGES[1]]
+    _wait_for_told(lab, "connecting", "portforwarded", "failed", "portforwarded")
+    _assert_reached(lab)
+    # Two minutes from cycle to cycle, four from test to test.
+    assert lab.device.messages.count(_IGNORED) - ignored <= 2
+    assert _tested(lab) == [9091] * 5
+    assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 4, PORT_FORWARD]
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(clock=FAST))
+def https_forwarding_lost(lab: Lab) -> None:
+    """The gateway loses the HTTPS forwarding: nobody notices until the mappings are renewed."""
+    _start_direct(lab, "-t", "1200")
+    # With -t the start asks no gateway, so the second cycle still holds the address for changed.
+    assert lab.device.messages.count(_MAPPED_ANEW) == 1
+    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+
+    lab.step("a gateway that cleans up drops port 9444; the port test looks at HTTP only")
+    lab.gateway.lose(9444)
+    passed = lab.device.messages.count(_PASSED)
+    wait_for_log(lab, _PASSED, passed + 1)
+    assert lab.gateway.mappings() == BOTH_MAPPED[:1]
+    assert pages_from_outside() == [PAGES[0], None]
+
+    lab.step("half of the lease is over")
+    lab.wait_for(lambda: lab.gateway.mappings() == BOTH_MAPPED, "the renewal", 60)
+    _assert_reached(lab)
+    assert set(asked(lab, requests)) == {WAIT, PORT_TEST}
+    assert len(lab.device.local_requests) == told
+    # A renewal that has to make the mapping anew gives it no name by which the end would find it.
+    assert {listed.mapping: listed.description for listed in lab.gateway.listing()} == dict(
+        zip(BOTH_MAPPED, ("Kavra", "")))
+    assert_stops_clean(lab, left=BOTH_MAPPED[1:])
+
+
+@scenario(Situation(gateway=GatewaySetup(permissions=STOCK_PERMISSIONS), relay=True,
+                    clock=_IMPATIENT))
+def privileged_ports_refused(lab: Lab) -> None:
+    """A gateway forwards to no port below 1024: relayed; direct once the web server moves up."""
+    lab.start_daemon(*OPTIONS)
+    _wait_for_cycle(lab, 1)
+    assert lab.device.status == "relayed"
+    assert page_through_the_tunnel(lab) == PAGES[0]
+    start = _DISCOVERY + _PASSES
+    attempt = _DISCOVERY + _TAKE_BACK + _FIRST_SEARCH + _TAKE_BACK
+    assert lab.device.messages.count(_REFUSED) == 100 + 2 * 99
+    assert lab.gateway.upnp_requests() == start + attempt
+
+    lab.step("every cycle searches anew")
+    _wait_for_cycle(lab, 2)
+    next_attempt = _DISCOVERY + _NEXT_SEARCH + _TAKE_BACK
+    assert lab.device.messages.count(_REFUSED) == 100 + 5 * 99
+    assert lab.gateway.upnp_requests() == start + attempt + next_attempt
+    assert _tested(lab) == []
+
+    lab.step("the user moves the web server to ports 8080 and 8443")
+    lab.device.serve_on(8080, 8443)
+    lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
+    wait_for_status(lab, "portforwarded")
+    _assert_reached(lab)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded"]
+    assert_stops_clean(lab)
+
+
+def _start_direct(lab: Lab, *options: str) -> None:
+    """Start the daemon and let it be content with the direct path for a cycle.
+
+    Its pause has just begun then, so a gateway that is changed now is not asked meanwhile.
+    """
+    lab.start_daemon(*OPTIONS, *options)
+    wait_for_status(lab, "portforwarded")
+    _wait_for_cycle(lab, 2)
+    _assert_reached(lab)
+
+
+def _wait_for_cycle(lab: Lab, number: int) -> None:
+    """Wait until this cycle since the start has run to its pause."""
+    wait_for_log(lab, "DaemonControl::run - retry connection after ", number)
+
+
+def _wait_for_told(lab: Lab, *statuses: str) -> None:
+    """Wait until the local back end was told these status words and no other."""
+    lab.wait_for(lambda: lab.device.statuses_told() == list(statuses), " ".join(statuses), 60)
+    wait_for_status(lab, statuses[-1])
+
+
+def _tested(lab: Lab) -> list[int]:
+    """The ports to which the service has connected back, in order."""
+    return [test.port for test in lab.central.port_tests]
+
+
+def _assert_reached(lab: Lab, http_port: int = 9091, https_port: int = 9444,
+                    others: Sequence[Mapping] = ()) -> None:
+    """Both ports are published, and the device's pages come through them."""
+    assert_published(lab, http_port, https_port, others)
+    assert pages_from_outside(http_port, https_port) == PAGES

@@ -1,0 +1,205 @@
+"""How the daemon starts and ends: on command, by a signal at any moment, by a power cut."""
+
+from __future__ import annotations
+
+import os
+import random
+import resource
+import signal
+from collections.abc import Iterator
+
+from lab import daemon, network
+from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, Fault
+from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, TUNNEL_PID_FILE,
+                        asked, assert_log_is_proper, assert_published, assert_stops_clean,
+                        page_through_the_tunnel, pages_from_outside, tunnel_client, wait_for_log,
+                        wait_for_next_cycle, wait_for_status)
+from lab.gateway import GatewaySetup, Mapping
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+from lab.support import wait_until
+
+_SIGNALS = (signal.SIGTERM, signal.SIGINT, signal.SIGQUIT)
+_SILENT = GatewaySetup(upnp=False)
+_CYCLE = "createConnection() - checking status"
+_TUNNEL_NOT_UP = "openVPN initialization did not complete, waiting..."
+_LOOKS_AT_THE_TUNNEL = 4 * 7
+
+
+@scenario(Situation(clock=FAST))
+def unmap_all(lab: Lab) -> None:
+    """What a killed daemon left at the gateway and the service, `pelorus -u` takes down."""
+    neighbours = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 80)
+    lab.neighbour.hold(neighbours.external_port, neighbours.internal_port)
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+
+    lab.step("kill -9 leaves everything as it is")
+    _kill(lab)
+    assert lab.gateway.mappings() == [neighbours, *BOTH_MAPPED]
+    assert lab.central.record == PUBLISHED
+    assert lab.device.status == "portforwarded"
+    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+
+    lab.step("pelorus -u clears up and ends")
+    _clear_up(lab)
+    assert lab.gateway.mappings() == [neighbours]
+    assert lab.central.record is None
+    assert asked(lab, requests) == [COMM_STATUS, PORT_FORWARD]
+    assert [request.url for request in lab.device.local_requests[told:]] == [
+        "/local/comm_status?status=disabled",
+        "/local/local_ip?address=192.168.77.10",
+        "/local/port_forward_delete?internal_port=80"]
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def unmap_all_while_relayed(lab: Lab) -> None:
+    """A tunnel that outlived its daemon serves on until `pelorus -u` stops it."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "relayed")
+    client = tunnel_client()
+    _kill(lab)
+    assert page_through_the_tunnel(lab) == PAGES[0]
+
+    lab.step("pelorus -u clears up and ends")
+    _clear_up(lab)
+    wait_until(lambda: client not in daemon.running("openvpn"), "the tunnel's client to end", 20)
+    assert not TUNNEL_PID_FILE.exists()
+
+
+@scenario(Situation(gateway=_SILENT, clock=FAST))
+def stopped_in_discovery(lab: Lab) -> None:
+    """SIGTERM, SIGINT or SIGQUIT while a gateway is looked for: it ends, and nothing is tried."""
+    for time in _until_each_signal(lab, "while a gateway is looked for"):
+        wait_for_log(lab, "setting localIP to: [192.168.77.10]", time)
+    assert lab.central.port_tests == []
+    assert lab.device.statuses_told() == ["connecting", "disabled"] * len(_SIGNALS)
+
+
+@scenario(Situation(clock=FAST))
+def stopped_in_a_port_test(lab: Lab) -> None:
+    """SIGTERM, SIGINT or SIGQUIT in a slow port test: published after it, then withdrawn again."""
+    lab.central.misbehave(PORT_TEST, Fault(delay=1))
+    for time in _until_each_signal(lab, "while the service tests the port"):
+        lab.wait_for(lambda time=time: len(lab.central.requests_for(PORT_TEST)) == time,
+                     "the port test", 60)
+        assert lab.gateway.mappings() == BOTH_MAPPED[:1]
+    assert len(lab.central.port_tests) == len(_SIGNALS)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+                                          "disabled"] * len(_SIGNALS)
+
+
+# With a back end that does not take the ports the relay is tried while both are mapped.
+@scenario(Situation(static={"LOCAL_SETFORWARDURL": "http://127.0.0.1:1/",
+                            "STARTCMD": "touch openvpn.out"}, clock=2 * FAST))
+def stopped_in_the_relay_start(lab: Lab) -> None:
+    """SIGTERM, SIGINT or SIGQUIT while no tunnel comes up: it tries on for its five minutes."""
+    for time in _until_each_signal(lab, "while the tunnel does not come up"):
+        wait_for_log(lab, _TUNNEL_NOT_UP, (time - 1) * _LOOKS_AT_THE_TUNNEL + 1)
+        assert lab.gateway.mappings() == BOTH_MAPPED
+    assert lab.device.messages.count(_TUNNEL_NOT_UP) == len(_SIGNALS) * _LOOKS_AT_THE_TUNNEL
+    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
+
+
+@scenario(Situation(clock=FAST))
+def stopped_in_its_sleep(lab: Lab) -> None:
+    """SIGTERM, SIGINT or SIGQUIT between two cycles: it ends without another one."""
+    for _ in _until_each_signal(lab, "between two cycles"):
+        wait_for_next_cycle(lab)
+        assert_published(lab)
+    assert lab.device.messages.count(_CYCLE) == len(_SIGNALS)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+                                          "disabled"] * len(_SIGNALS)
+
+
+@scenario(Situation(dynamic={"COMMUNICATION_STATUS": "portforwarded"}, clock=FAST))
+def power_cut(lab: Lab) -> None:
+    """Cut off at any moment: the next start removes what was left, and the device is reachable."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_next_cycle(lab)
+    lines, chance = len(lab.device.messages.all), random.Random(9091)
+    for fifth in range(5):
+        cut = round((fifth + chance.random()) * lines / 5)
+        lab.step(f"power cut in the sleep, and again at line {cut} of {lines} after the next start")
+        _kill(lab)
+        assert pages_from_outside() == PAGES
+        end = len(lab.device.messages.all) + cut
+        lab.start_daemon(*OPTIONS)
+        wait_until(lambda end=end: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
+        _kill(lab)
+        left = lab.gateway.mappings()
+
+        lab.step(f"the power is back; left behind: {', '.join(map(str, left)) or 'no mapping'}")
+        lab.start_daemon(*OPTIONS)
+        wait_for_next_cycle(lab)
+        assert_published(lab)
+        cycles = lab.device.messages.count(_CYCLE)
+        changes = [*(f"no longer forwards {mapping}" for mapping in left),
+                   *(f"forwards {mapping}" for mapping in BOTH_MAPPED)]
+        wait_until(lambda changes=changes: _changes(lab)[-len(changes):] == changes,
+                   f"the gateway to tell {changes}", 5)
+        assert lab.device.messages.count(_CYCLE) == cycles
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def killed_while_relayed(lab: Lab) -> None:
+    """A killed daemon's tunnel is forgotten by the next, and fights its tunnel until stopped."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "relayed")
+    old = tunnel_client()
+    _kill(lab)
+    assert page_through_the_tunnel(lab) == PAGES[0]
+
+    lab.step("the next daemon starts a client of its own")
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, "openVPN has started successfully", 2)
+    new = tunnel_client()
+    assert new != old and old in daemon.running("openvpn")
+
+    # A relay has one tunnel for a device: who logs in throws the other out, who then comes back.
+    lab.step("the old client is thrown out and comes back")
+    lab.wait_for(lambda: lab.relay.connections() >= 3, "the old client to be back", 60)
+
+    # Ended by SIGTERM, it would remove the pid file, and the daemon would forget the new one too.
+    lab.step("the old client is stopped by hand, with kill -9")
+    os.kill(old, signal.SIGKILL)
+    wait_until(lambda: old not in daemon.running("openvpn"), "the old client to end", 20)
+    lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 60)
+    wait_for_next_cycle(lab)
+    assert tunnel_client() == new
+    assert_stops_clean(lab)
+    wait_until(lambda: new not in daemon.running("openvpn"), "the new client to end", 20)
+
+
+def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
+    """Start the daemon once for each signal, let the caller wait for the phase, and stop it.
+
+    One signal must do. It would be lost while a shell command of the daemon runs, for which the C
+    library ignores SIGINT and SIGQUIT; in none of the phases there is one.
+    """
+    # SIGQUIT would leave a core file in the machine's root folder.
+    resource.setrlimit(resource.RLIMIT_CORE, (0, 0))
+    for time, number in enumerate(_SIGNALS, 1):
+        lab.step(f"{number.name} {phase}")
+        lab.start_daemon(*OPTIONS)
+        yield time
+        assert_stops_clean(lab, number)
+
+
+def _kill(lab: Lab) -> None:
+    """End the daemon as a power cut does, but for the tunnel's client, which lives on."""
+    assert lab.stop_daemon(signal.SIGKILL) == "SIGKILL"
+
+
+def _clear_up(lab: Lab) -> None:
+    """Run `pelorus -u`, which ends by itself and leaves the device reported as disabled."""
+    assert wait_until(lab.start_daemon("-u", *OPTIONS).ended, "pelorus -u to end", 60) == "exit 0"
+    assert lab.device.status == "disabled"
+    assert daemon.running("pelorus") == []
+    assert_log_is_proper(lab)
+
+
+def _changes(lab: Lab) -> list[str]:
+    """What the gateway's packet filter told of its mappings, in order."""
+    return [event.what for event in lab.timeline.events if event.who == "gateway"]

@@ -1,0 +1,251 @@
+"""Ports that the user forwards by hand."""
+
+from __future__ import annotations
+
+from lab import network, provider
+from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
+from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
+                        assert_log_is_proper, assert_published, assert_stops_clean,
+                        pages_from_outside, wait_for_log, wait_for_status)
+from lab.gateway import GatewaySetup, Mapping
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+
+_SETTINGS = {"MANUAL_PORT_FORWARD": "TRUE", "MANUAL_EXTERNAL_HTTP_PORT": "8081",
+             "MANUAL_EXTERNAL_HTTPS_PORT": "8444"}
+_HERE, _ELSEWHERE = network.GATEWAY_WAN_ADDRESS, "44.128.0.30"
+_BY_HAND = [Mapping("TCP", 8081, network.DEVICE_ADDRESS, 80),
+            Mapping("TCP", 8444, network.DEVICE_ADDRESS, 443)]
+
+_NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
+_BEGIN, _END = "manualPortForward - allocatedHttpPort", "manualPortForward - localConnectionType"
+_DOUBLE_NAT = "Enforce connection as RELAY"
+
+_CLOCK, _INTERVAL = 100, 500
+
+
+@scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
+def manual_ports(lab: Lab) -> None:
+    """Ports forwarded by hand are proven and published; with a wrong port configured it fails."""
+    _forward_by_hand(lab)
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    device_id, auth, _ = lab.account.secrets
+    assert [request.url for request in lab.central.requests_for(PORT_TEST)] == [
+        f"/api/1.0/rest/{PORT_TEST}/{device_id}?external_ip=&port=8081&protocol=HTTP&auth={auth}"]
+    _assert_published_by_hand(lab)
+    wait_for_log(lab, f"setNetworkAddrs - external IP [{_HERE}], local IP [192.168.77.10]")
+    assert lab.device.messages.count("interval duration [720]") == 1
+
+    lab.step("the device's settings name an HTTP port that nobody forwards")
+    lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
+    wait_for_log(lab, _NOT_RELAYED)
+    assert lab.device.status == "failed"
+    assert _ports_tested(lab) == [8081, 8082, 8082, 8082]
+    assert lab.central.record is None
+
+    lab.step("as long as it is wrong, every cycle tests it, due or not, and whatever the disk does")
+    lab.device.disk_sleeps()
+    wait_for_log(lab, _NOT_RELAYED, 2)
+    assert _ports_tested(lab)[1:] == [8082] * 6
+    lab.device.disk_wakes()
+
+    lab.step("the settings are right again")
+    lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
+    wait_for_status(lab, "portforwarded")
+    _assert_published_by_hand(lab)
+    assert lab.device.messages.count(_DOUBLE_NAT) == 0
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+                                          "portforwarded", "disabled"]
+    assert lab.gateway.by_hand() == _BY_HAND
+
+
+@scenario(Situation(static=NO_TUNNEL, clock=FAST))
+def manual_ports_that_are_none(lab: Lab) -> None:
+    """A manual port that is no port stops everything; what was mapped before stays open."""
+    lab.gateway.forward_by_hand(65535, 80)
+    lab.gateway.forward_by_hand(1, 443)
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+
+    for http, https, kind in (("0", "1", "HTTP"), ("65536", "1", "HTTP"), ("http", "1", "HTTP"),
+                              ("65535", "", "HTTPS")):
+        lab.step(f"the user wants the ports '{http}' and '{https}'")
+        line = ("ConnectionManager::manualPortForward - bad value for manually configured "
+                f"{kind} Port.")
+        before = lab.device.messages.texts().count(line)
+        failures = lab.device.messages.count(_NOT_RELAYED)
+        lab.device.change(MANUAL_PORT_FORWARD="TRUE", MANUAL_EXTERNAL_HTTP_PORT=http,
+                          MANUAL_EXTERNAL_HTTPS_PORT=https)
+        wait_for_log(lab, _NOT_RELAYED, failures + 1)
+        assert lab.device.messages.texts().count(line) == before + 1
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
+    assert _ports_tested(lab) == [9091]
+    assert lab.central.record is None
+    # The relay withdraws the record but leaves the gateway alone.
+    assert lab.gateway.mappings() == BOTH_MAPPED
+
+    lab.step("both ports are valid, and the automatic ones go")
+    lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
+    wait_for_status(lab, "portforwarded")
+    assert lab.gateway.mappings() == []
+    assert _ports_tested(lab) == [9091, 65535]
+    assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 65535, 1)
+    assert pages_from_outside(65535, 1) == PAGES
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(clock=FAST))
+def manual_and_back(lab: Lab) -> None:
+    """Automatic ports, manual ones and back: the daemon removes only what it mapped itself."""
+    foreign = Mapping("TCP", 9092, network.NEIGHBOUR_ADDRESS, 80)
+    lab.neighbour.hold(9092, 80)
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, foreign])
+
+    lab.step("the user forwards ports by hand and tells the device")
+    _forward_by_hand(lab)
+    lab.device.change(**_SETTINGS)
+    _wait_until_told(lab, 8081)
+    assert lab.gateway.mappings() == [foreign]
+    _assert_published_by_hand(lab)
+
+    lab.step("back to automatic, and nothing changes")
+    lab.device.change(MANUAL_PORT_FORWARD="FALSE")
+    wait_for_log(lab, "createDirectConnection() - Ignore Port Test due to Interval 240.")
+    assert lab.gateway.mappings() == [foreign]
+    _assert_published_by_hand(lab)
+
+    lab.step("the user's ports are gone, and the next test of them makes the daemon map its own")
+    lab.gateway.stop_forwarding_by_hand()
+    _wait_until_told(lab, 9091)
+    wait_for_status(lab, "portforwarded")
+    assert _ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
+    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, foreign])
+    assert lab.central.record == PUBLISHED
+    assert pages_from_outside() == PAGES
+    assert [request.argument("http_port") for request in lab.central.requests_for(PORT_FORWARD)
+            ] == ["0", "9091", "8081", "9091"]
+
+    lab.step("the end leaves the neighbour its port")
+    assert lab.stop_daemon() == "SIGTERM"
+    assert lab.gateway.mappings() == [foreign]
+    assert lab.central.record is None
+    assert_log_is_proper(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+                                          "portforwarded", "disabled"]
+
+
+# Two discoveries in a cycle wait in vain: it lasts about 280 s.
+@scenario(Situation(gateway=GatewaySetup(upnp=False), dynamic=_SETTINGS, clock=_CLOCK))
+def manual_without_protocol(lab: Lab) -> None:
+    """No mapping protocol: the service is asked for the address now and then, a new one is told."""
+    _forward_by_hand(lab)
+    lab.start_daemon(*OPTIONS, "-p", f"{_INTERVAL}")
+    wait_for_status(lab, "portforwarded")
+    _assert_published_by_hand(lab)
+    told = list(lab.device.local_requests)
+
+    lab.step("once the interval has passed, the service is asked; the address is what it was")
+    wait_for_log(lab, f"NetworkAddrs::getMyIP - external IP address {_HERE}")
+    lab.wait_for(lambda: lab.device.messages.count(_BEGIN) == lab.device.messages.count(_END),
+                 "the attempt to end", 60)
+
+    lab.step("the provider gives another address: the ports pass their test there as well")
+    lab.gateway.move_to(_ELSEWHERE)
+    lab.wait_for(lambda: lab.central.port_tests[-1].address == _ELSEWHERE, "a test there", 60)
+    assert lab.device.local_requests == told
+
+    lab.step("the next question for the address is due, but the service wants it a minute later")
+    lab.central.wait_seconds = 60
+    wait_for_log(lab, "NetworkAddrs::getMyIP - wait 60 seconds")
+    lab.central.wait_seconds = 0
+    wait_for_log(lab, f"setNetworkAddrs - external IP [{_ELSEWHERE}]")
+    assert lab.device.messages.texts().count(
+        "ConnectionManager::manualPortForward - detected change to external IP "
+        f"[{_HERE}] or local IP [192.168.77.10]") == 1
+    assert lab.central.record == Record(_ELSEWHERE, network.DEVICE_ADDRESS, 8081, 8444)
+    _assert_asked_in_intervals(lab)
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.gateway.by_hand() == _BY_HAND
+
+
+@scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
+def manual_behind_second_nat(lab: Lab) -> None:
+    """A second NAT closes ports forwarded by hand: the test just fails, and passes without it."""
+    lab.provider.insert()
+    _forward_by_hand(lab)
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, _NOT_RELAYED)
+    assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
+    assert lab.device.statuses_told() == ["connecting", "failed"]
+    assert lab.device.messages.count(_DOUBLE_NAT) == 0
+
+    lab.step("the provider's box is gone")
+    lab.provider.remove()
+    wait_for_status(lab, "portforwarded")
+    assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP",
+                                                      lab.account.device_id)
+    _assert_published_by_hand(lab)
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(static=NO_TUNNEL, clock=FAST))
+def manual_after_second_nat(lab: Lab) -> None:
+    """A second NAT that the automatic test met rules out manual ports even when it is gone."""
+    lab.provider.insert()
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, _NOT_RELAYED)
+    assert lab.device.messages.count(_DOUBLE_NAT) == 1
+
+    lab.step("the second NAT goes away, and the user forwards ports by hand: they are not tested")
+    lab.provider.remove()
+    _forward_by_hand(lab)
+    lab.device.change(**_SETTINGS)
+    wait_for_log(lab, "relay mode is enforced, therefore don't manual forward ports.", 2)
+    assert _ports_tested(lab) == [9091]
+    assert lab.device.status == "failed"
+
+    lab.step("only an automatic attempt lifts that")
+    lab.device.change(MANUAL_PORT_FORWARD="FALSE")
+    wait_for_status(lab, "portforwarded")
+    assert_published(lab)
+    lab.device.change(MANUAL_PORT_FORWARD="TRUE")
+    _wait_until_told(lab, 8081)
+    _assert_published_by_hand(lab)
+    assert_stops_clean(lab)
+
+
+def _forward_by_hand(lab: Lab) -> None:
+    lab.gateway.forward_by_hand(8081, 80)
+    lab.gateway.forward_by_hand(8444, 443)
+
+
+def _wait_until_told(lab: Lab, http_port: int) -> None:
+    lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == str(http_port),
+                 f"the device to be told the port {http_port}", 60)
+
+
+def _assert_published_by_hand(lab: Lab) -> None:
+    """Everybody knows the user's ports, which lead to the device and are as the user made them."""
+    assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 8081, 8444)
+    assert lab.device.setting("EXTERNAL_IP") == _HERE
+    assert lab.device.setting("EXTERNAL_HTTP_PORT") == "8081"
+    assert lab.device.setting("EXTERNAL_HTTPS_PORT") == "8444"
+    assert lab.gateway.by_hand() == _BY_HAND
+    assert pages_from_outside(8081, 8444) == PAGES
+
+
+def _ports_tested(lab: Lab) -> list[int]:
+    return [test.port for test in lab.central.port_tests]
+
+
+def _assert_asked_in_intervals(lab: Lab) -> None:
+    """Twice, each time when the interval since the publication or the last question had passed."""
+    published, *_ = lab.central.requests_for(PORT_FORWARD)
+    first, second = lab.central.requests_for(MY_IP)
+    shortest = min(first.when - published.when, second.when - first.when)
+    assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts full seconds

@@ -1,0 +1,270 @@
+"""No direct way: the device is reached through the relay, and directly again when it can be."""
+
+from __future__ import annotations
+
+import os
+import signal
+
+from lab import daemon, network, packet_filter, provider
+from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault, PortTest
+from lab.checks import (BOTH_MAPPED, OPTIONS, PAGES, RELAYED, TUNNEL_PID_FILE, asked,
+                        assert_log_is_proper, assert_published, assert_stops_clean,
+                        page_through_the_tunnel, tunnel_client, wait_for_log, wait_for_next_cycle,
+                        wait_for_status)
+from lab.clock import refuse_signal
+from lab.gateway import NO_PORT, GatewaySetup
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+from lab.support import wait_until
+
+_FOLDER = TUNNEL_PID_FILE.parent
+_STARTS = _FOLDER / "starts"
+_NOT_UP = "openVPNConnection() - openVPN initialization did not complete, waiting..."
+_STOPS = "closeVPNConnection() - attempting to stop process with PID"
+_KILLS = "closeVPNConnection() - attempting to SIGKILL process with PID"
+_DOUBLE_NAT = "testPort - Enforce connection as RELAY (double-NAT detected"
+
+# The five minutes for which a tunnel is tried take seven seconds, a pause takes three.
+_IMPATIENT = 40
+_SILENT = GatewaySetup(upnp=False)
+# The usual start, counted.
+_COUNTED = {"STARTCMD": "echo start >> starts; env -u LD_PRELOAD openvpn --config client.conf"
+                        " --writepid openvpn.pid > openvpn.out 2>&1 &"}
+
+# The gateway goes on to call the address that it has on its port its own.
+_OTHER_EXIT = f"""
+table inet lab {{
+    chain other_exit {{
+        type nat hook postrouting priority 90;
+        oifname "wan" snat ip to {provider.ADDRESS}
+    }}
+}}
+"""
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def no_gateway_protocol(lab: Lab) -> None:
+    """A gateway that maps nothing: the device is reached through the relay."""
+    client = _start_relayed(lab)
+    assert (_FOLDER / "auth.txt").read_text() == "".join(
+        f"{line}\n" for line in lab.account.secrets[:2])
+    assert lab.central.record is None
+    assert asked(lab) == [WAIT, PORT_FORWARD, COMM_STATUS]
+    assert lab.central.withdrawals == 1
+    assert [lab.names.resolve(name) for name in lab.account.names] == [network.RELAY_ADDRESS] * 3
+
+    lab.step("the next cycle checks the public names and keeps the tunnel")
+    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value for device domain "
+                      f"names, IP address is {network.RELAY_ADDRESS}")
+    wait_for_next_cycle(lab)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (tunnel_client(), lab.relay.connections()) == (client, 1)
+
+    lab.step("the tunnel ends with the daemon")
+    assert_stops_clean(lab)
+    _wait_for_end(client)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+
+
+@scenario(Situation(gateway=GatewaySetup(permissions=NO_PORT), relay=True, clock=RELAYED))
+def gateway_gives_in(lab: Lab) -> None:
+    """A gateway refuses every port, then gives in: the relay goes once the direct path stands."""
+    client = _start_relayed(lab)
+    assert lab.gateway.mappings() == []
+    assert lab.central.requests_for(PORT_TEST) == []
+    before = len(lab.central.requests)
+
+    lab.step("the gateway allows ports; the service takes its time with the publication")
+    lab.central.misbehave(PORT_FORWARD, Fault(delay=3, times=1))
+    lab.gateway.become(GatewaySetup())
+    lab.wait_for(lambda: PORT_FORWARD in asked(lab, before), "the publication", 60)
+    assert page_through_the_tunnel(lab) == PAGES[0]
+    assert tunnel_client() == client
+    assert lab.central.record is None
+
+    lab.step("the direct path is published, the tunnel ends")
+    _wait_for_direct(lab, client)
+    assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
+    assert lab.device.messages.count(_STOPS) == 1
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, static=_COUNTED, clock=_IMPATIENT))
+def relay_down_at_first(lab: Lab) -> None:
+    """The relay does not answer: four starts, status failed, nothing left; later it is used."""
+    lab.relay.server.stop()
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "failed")
+    assert _STARTS.read_text().split() == ["start"] * 4
+    assert lab.device.messages.count(_NOT_UP) == 28
+    assert lab.device.messages.count(_STOPS) == 4
+    assert daemon.running("openvpn") == []
+
+    lab.step("the relay is back")
+    lab.relay.start()
+    client = _wait_for_relayed(lab)
+    assert_stops_clean(lab)
+    _wait_for_end(client)
+    assert lab.device.statuses_told() == ["connecting", "failed", "relayed", "disabled"]
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def tunnel_client_dies(lab: Lab) -> None:
+    """The tunnel's client is killed: the next cycle starts another."""
+    client = _start_relayed(lab)
+
+    lab.step("the client is killed; until the next cycle the status says relayed all the same")
+    os.kill(client, signal.SIGKILL)
+    _wait_for_end(client)
+    assert page_through_the_tunnel(lab) is None
+    assert lab.device.status == "relayed"
+
+    lab.step("the next cycle sees it and starts the tunnel anew")
+    wait_for_log(lab, f"isVPNRunning() - unlink stale openVPN pid file {TUNNEL_PID_FILE}")
+    wait_for_log(lab, "openVPNConnection() - openVPN has started successfully", 2)
+    lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 20)
+    assert lab.relay.connections() == 2
+    second = tunnel_client()
+    assert_stops_clean(lab)
+    _wait_for_end(second)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
+    """The tunnel's client cannot be told to end: after three tries it is killed."""
+    client = _start_relayed(lab)
+
+    lab.step("SIGTERM is refused, and a gateway appears")
+    refuse_signal(signal.SIGTERM)
+    lab.gateway.become(GatewaySetup())
+    _wait_for_direct(lab, client)
+    stops = [text for text in lab.device.messages.texts() if _STOPS in text or _KILLS in text]
+    assert [_STOPS in text for text in stops] == [True, True, True, False]
+    assert all(text.split("PID: ")[1].split()[0] == str(client) for text in stops)
+    assert lab.device.messages.count("failed to stop openVPN process with PID") == 3
+    refuse_signal(0)
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(gateway=_SILENT, relay=True, dynamic={"DEVICEAUTH": "not-its-own"},
+                    static=_COUNTED, clock=_IMPATIENT))
+def relay_refuses(lab: Lab) -> None:
+    """The relay refuses the device's credentials: status failed, nothing is left running."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "failed")
+    assert (_FOLDER / "auth.txt").read_text() == f"{lab.account.device_id}\nnot-its-own\n"
+    assert "AUTH_FAILED" in lab.device.tunnel_output().read_text()
+    assert _STARTS.read_text().split() == ["start"] * 4
+    assert lab.device.messages.count(_NOT_UP) == 28
+    assert lab.device.messages.count("not-its-own") == 0
+    assert len(daemon.running("openvpn")) == 1, "only the relay itself"
+    assert lab.stop_daemon() == "SIGTERM"
+    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"]
+    assert_log_is_proper(lab)
+
+
+@scenario(Situation(relay=True, clock=RELAYED))
+def second_nat(lab: Lab) -> None:
+    """A second NAT before the gateway: relayed after one port test, direct again without it."""
+    lab.provider.insert()
+    client = _start_relayed(lab)
+    assert lab.central.port_tests == [PortTest(provider.CUSTOMER_ADDRESS, 9091, "HTTP", "")]
+    assert asked(lab) == [COMM_STATUS, PORT_FORWARD, WAIT, PORT_TEST, PORT_FORWARD]
+    assert lab.device.messages.count(_DOUBLE_NAT) == 1
+    assert lab.gateway.mappings() == []
+
+    lab.step("the second NAT goes away")
+    lab.provider.remove()
+    _wait_for_direct(lab, client)
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+
+
+@scenario(Situation(relay=True, clock=_IMPATIENT))
+def second_nat_appears(lab: Lab) -> None:
+    """A second NAT appears while the device is reached directly: relayed in the next cycle."""
+    _start_direct(lab)
+    before = len(lab.central.requests)
+
+    lab.step("the gateway is put behind a second NAT")
+    lab.provider.insert()
+    client = _wait_for_relayed(lab)
+    assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
+    assert lab.central.port_tests[-1] == PortTest(provider.CUSTOMER_ADDRESS, 9091, "HTTP", "")
+    assert lab.central.record is None
+    assert lab.gateway.mappings() == []
+
+    lab.step("the second NAT goes away")
+    lab.provider.remove()
+    _wait_for_direct(lab, client)
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "relayed",
+                                          "portforwarded", "disabled"]
+
+
+@scenario(Situation(relay=True, clock=_IMPATIENT))
+def address_behind_the_gateways_back(lab: Lab) -> None:
+    """The service sees another address than the gateway tells: relayed, a mapping stays behind."""
+    _start_direct(lab)
+    before = len(lab.central.requests)
+
+    lab.step("the gateway's traffic leaves by another address, nothing comes in by its own")
+    network.ip_batch(f"address add {provider.ADDRESS}/24 dev wan", host=network.GATEWAY)
+    packet_filter.change(_OTHER_EXIT)
+    lab.gateway.block(9091)
+    client = _wait_for_relayed(lab)
+    assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
+    assert lab.device.messages.count(_DOUBLE_NAT) == 1
+    # The gateway still forwards, but nobody is told of the ports.
+    assert lab.gateway.mappings() == BOTH_MAPPED
+    assert lab.central.record is None
+
+    lab.step("the next cycle maps and tests the HTTP port anew, and takes only that one back")
+    wait_for_log(lab, "createConnection() - connection type 2 un-changed")
+    assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD, WAIT, PORT_TEST]
+    assert lab.gateway.mappings() == BOTH_MAPPED[1:]
+    assert tunnel_client() == client
+
+    lab.step("the gateway's own address is the one that counts again")
+    lab.gateway.unblock(9091)
+    packet_filter.change("delete chain inet lab other_exit\n")
+    _wait_for_direct(lab, client)
+    assert_stops_clean(lab)
+
+
+def _start_direct(lab: Lab) -> None:
+    """Start the daemon, and let it be content with the direct path for a cycle."""
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value")
+    wait_for_next_cycle(lab)
+    assert_published(lab)
+
+
+def _wait_for_direct(lab: Lab, client: int) -> None:
+    """Wait until the device is reached directly and the tunnel's client is gone."""
+    wait_for_status(lab, "portforwarded")
+    assert_published(lab)
+    _wait_for_end(client)
+
+
+def _start_relayed(lab: Lab) -> int:
+    """Start the daemon and wait until the device is relayed; the tunnel client's pid."""
+    lab.start_daemon(*OPTIONS)
+    return _wait_for_relayed(lab)
+
+
+def _wait_for_relayed(lab: Lab) -> int:
+    """Wait until a cycle first ends relayed and the page comes through; the client's pid."""
+    wait_for_status(lab, "relayed")
+    # The status comes before the cycle's last words.
+    wait_for_log(lab, "createConnection() - connection type changed to 2")
+    assert page_through_the_tunnel(lab) == PAGES[0]
+    return tunnel_client()
+
+
+def _wait_for_end(client: int) -> None:
+    """Wait until the tunnel's client is gone; told to end, it takes its time."""
+    wait_until(lambda: client not in daemon.running("openvpn"), "the tunnel's client to end", 20)

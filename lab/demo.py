@@ -18,6 +18,7 @@ from collections.abc import Callable
 from lab import network, picture, sandbox, web
 from lab.device import HOME
 from lab.gateway import GatewaySetup
+from lab.relay import TUNNEL_DEVICE
 from lab.scenario import Lab, Situation
 from lab.scenarios import SCENARIOS
 from lab.support import LabError
@@ -39,9 +40,9 @@ def main() -> int:
         return 0
     if sandbox.is_inside():
         return _show(arguments.scenario, arguments.stay)
-    reason = sandbox.why_forbidden()
-    if reason:
-        print(f"demo: this machine does not let us make network namespaces ({reason})")
+    obstacle = _obstacle(arguments.scenario)
+    if obstacle:
+        print(f"demo: {obstacle}")
         return sandbox.FORBIDDEN
     if "PELORUS" not in os.environ and not _build():
         return 1
@@ -66,6 +67,16 @@ def _parse() -> argparse.Namespace:
     if arguments.scenario and arguments.scenario not in SCENARIOS:
         parser.error(f"there is no scenario {arguments.scenario!r}; --list names them")
     return arguments
+
+
+def _obstacle(name: str | None) -> str:
+    """Why this machine cannot play it; empty when it can."""
+    reason = sandbox.why_forbidden()
+    if reason:
+        return f"this machine does not let us make network namespaces ({reason})"
+    if name and SCENARIOS[name].situation.relay and not TUNNEL_DEVICE.exists():
+        return f"{name} needs a tunnel, and there is no {TUNNEL_DEVICE}"
+    return ""
 
 
 def _build() -> bool:

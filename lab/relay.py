@@ -10,6 +10,8 @@ from lab.account import Account
 from lab.certificates import Authority
 from lab.server import Server
 
+TUNNEL_DEVICE = Path("/dev/net/tun")
+
 _NAME = "relay.kavra.example"
 # Both ends notice within seconds when the other is gone.
 _SERVER = """

@@ -121,8 +121,12 @@ class Lab:
             "servers": "\n".join(server.state() for server in (
                 self.names.server, self.gateway.server, self.relay.server)),
             "gateway forwards": "\n".join(map(str, self.gateway.mappings())),
+            "gateway forwards by hand": "\n".join(map(str, self.gateway.by_hand())),
             "central service": self.central.state(),
             "local back end": "\n".join(request.url for request in self.device.local_requests),
             "tunnel client": last_lines(self.device.tunnel_output()),
         }
+        if self.situation.own_router:
+            sections["the device's own router"] = "\n".join(
+                [*map(str, self.own_router.mappings()), *self.own_router.calls()])
         return "\n".join(f"--- {title}\n{text}" for title, text in sections.items())

@@ -7,10 +7,12 @@ import re
 import signal
 import subprocess
 from pathlib import Path
+from xml.etree import ElementTree
 
 import pytest
 
 from lab import sandbox
+from lab.scenarios import SCENARIOS
 from lab.support import wait_until
 
 pytestmark = pytest.mark.outside
@@ -57,6 +59,19 @@ def test_demo_shows_the_way_and_ends_well():
     places = [text.find(step) for step in steps]
     assert -1 not in places and places == sorted(places), text
     assert traces() == before
+
+
+def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path):
+    listed, _ = start_demo("--list").communicate(timeout=20)
+    assert [line.split()[0] for line in listed.splitlines()] == list(SCENARIOS)
+    picture = tmp_path / "ports-taken.svg"
+    demo = start_demo("ports-taken", "--svg", str(picture))
+    text, _ = demo.communicate(timeout=90)
+    assert demo.returncode == 0, text
+    assert "== it holds 9444 as well" in text and "everything was as it must be" in text
+    words = " ".join(ElementTree.parse(picture).getroot().itertext())
+    assert SCENARIOS["ports-taken"].title in words
+    assert "forwards TCP 9445 -> 192.168.77.10:443" in words
 
 
 def test_demo_fails_with_a_daemon_that_does_nothing():

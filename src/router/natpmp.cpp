@@ -38,13 +38,16 @@ void closeOnExec(int socket) {
 
 // A gateway that is slow answers a request and each of its repetitions. What is not read then would
 // be taken for the answer to the next request, and every answer from then on for that to the next.
+// Answers to repetitions are on their way once the request itself was answered, so they are waited
+// for; a gateway that answered nothing owes nothing.
 void discardLateAnswers(const natpmp_t& client) {
-    int expected = client.try_number - 1;
+    int expected = client.has_pending_request != 0 ? 0 : client.try_number - 1;
     std::array<char, sizeof(natpmpresp_t)> answer{};
     for (int count = 0; count < kMaxLateAnswers; ++count) {
         pollfd readable{client.s, POLLIN, 0};
-        if (poll(&readable, 1, expected > 0 ? kLateAnswerWait : 0) <= 0) return;
-        if (recv(client.s, answer.data(), answer.size(), MSG_DONTWAIT) < 0) return;
+        if (poll(&readable, 1, expected > 0 ? kLateAnswerWait : 0) == 0) return;
+        // A refusal that waits here is taken away like an answer.
+        static_cast<void>(recv(client.s, answer.data(), answer.size(), MSG_DONTWAIT));
         --expected;
     }
 }

@@ -4,6 +4,7 @@ from __future__ import annotations
 
 import signal
 from collections.abc import Sequence
+from itertools import takewhile
 
 from lab import daemon, network, web
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, PortTest, Record
@@ -22,6 +23,7 @@ TUNNEL_PID_FILE = HOME / "openvpn/openvpn.pid"
 
 _LOCAL0 = 16
 _PATIENCE = 60
+_PAUSE = "DaemonControl::run - retry connection after "
 
 BOTH_MAPPED = [Mapping("TCP", 9091, network.DEVICE_ADDRESS, 80),
                Mapping("TCP", 9444, network.DEVICE_ADDRESS, 443)]
@@ -39,10 +41,23 @@ def wait_for_log(lab: Lab, part: str, count: int = 1, seconds: float = _PATIENCE
     lab.wait_for(lambda: lab.device.messages.count(part) >= count, f"{count} x [{part}]", seconds)
 
 
+def wait_for_cycle(lab: Lab, number: int) -> None:
+    """Wait until this cycle has run to its pause, counted from the first start of the daemon."""
+    wait_for_log(lab, _PAUSE, number)
+
+
 def wait_for_next_cycle(lab: Lab, cycles: int = 1) -> None:
     """Wait until that many more cycles have run to their pause."""
-    pause = "DaemonControl::run - retry connection after "
-    wait_for_log(lab, pause, lab.device.messages.count(pause) + cycles)
+    wait_for_cycle(lab, lab.device.messages.count(_PAUSE) + cycles)
+
+
+def assert_told_by_the_next_cycle(lab: Lab, since: int, part: str) -> None:
+    """The device's log has a text after its first `since` lines, before a second cycle begins."""
+    wait_for_log(lab, part)
+    lines = lab.device.messages.texts()[since:]
+    assert any(part in line for line in lines)
+    before = takewhile(lambda line: part not in line, lines)
+    assert sum("createConnection() - checking status" in line for line in before) <= 1
 
 
 def pages_from_outside(http_port: int = 9091, https_port: int = 9444,
@@ -74,6 +89,11 @@ def mapping_changes(lab: Lab) -> list[str]:
     """What the gateway forwarded and ceased to forward, in order."""
     return [event.what for event in lab.timeline.events
             if event.who == "gateway" and "forwards TCP" in event.what]
+
+
+def wait_for_mapping_changes(lab: Lab, changes: Sequence[str], since: int = 0) -> None:
+    """Wait until the lab has heard of these changes, and no other, after the first `since`."""
+    lab.wait_for(lambda: mapping_changes(lab)[since:] == list(changes), f"{changes}", 10)
 
 
 def assert_told_in_order(lab: Lab) -> None:

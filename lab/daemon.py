@@ -5,6 +5,8 @@ from __future__ import annotations
 import os
 import signal
 import subprocess
+from collections.abc import Iterator
+from contextlib import contextmanager
 from pathlib import Path
 
 from lab import device, network, sandbox
@@ -36,7 +38,7 @@ class Daemon:
             raise LabError(f"{argv[-1 - len(options)]} ended with status {started.returncode}: "
                            f"{OUTPUT.read_text()}")
         self.pid = int(wait_until(lambda: PID_FILE.exists() and PID_FILE.read_text(),
-                                  f"{PID_FILE}", 5))
+                                  f"{PID_FILE}", 10))
         self._status: int | None = None
 
     def ended(self) -> str:
@@ -49,6 +51,18 @@ class Daemon:
         if os.WIFSIGNALED(self._status):
             return signal.Signals(os.WTERMSIG(self._status)).name
         return f"exit {os.WEXITSTATUS(self._status)}"
+
+    @contextmanager
+    def held(self) -> Iterator[None]:
+        """Let it stand still meanwhile: it sees a change as a whole, and what is looked at stays.
+
+        Its clock runs on: a pause that is over by then ends at once.
+        """
+        os.kill(self.pid, signal.SIGSTOP)
+        try:
+            yield
+        finally:
+            os.kill(self.pid, signal.SIGCONT)
 
     def stop(self, number: int = signal.SIGTERM, seconds: float = 60) -> str:
         """Send a signal and return how the daemon ended."""

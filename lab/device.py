@@ -2,8 +2,10 @@
 
 from __future__ import annotations
 
+import itertools
 import os
 import threading
+import time
 from collections.abc import Mapping
 from pathlib import Path
 
@@ -26,6 +28,8 @@ PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 _LAN_PORT = "eth0"
 _TUNNEL = HOME / "openvpn"
 _DRIVE_STATE = HOME / "drive_state"
+# File times for what the lab writes: a month ago, where no `touch` comes.
+_SECONDS = itertools.count(int(time.time()) - 30 * 24 * 3600)
 _HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {_DRIVE_STATE})\"\n"
 
 # The tunnel's other end lives in real time, so the client must too when the device's clock is fast.
@@ -144,7 +148,8 @@ class Device:
 
     def _change(self, **settings: str) -> None:
         with self._lock:
-            for path in (DYNAMIC_FILE, DYNAMIC_COPY):
+            # Last the one that `setting` reads: what it tells then stands in both.
+            for path in (DYNAMIC_COPY, DYNAMIC_FILE):
                 if path.exists():
                     _write_settings(path, {**_read_settings(path), **settings})
 
@@ -205,13 +210,13 @@ def _read_settings(path: Path) -> dict[str, str]:
 def _write_settings(path: Path, settings: Mapping[str, str]) -> None:
     """Replace the file in one step, so that the daemon never reads half of it.
 
-    The daemon compares whole seconds: two changes must not look like one.
+    The daemon takes a file for changed when the second of its time is another: each change gets
+    one of its own.
     """
     new = path.with_suffix(".new")
     new.write_text("".join(f"{key}={value}\n" for key, value in settings.items()),
                    errors="surrogateescape")
     new.chmod(0o666)
-    if path.exists() and new.stat().st_mtime < int(path.stat().st_mtime) + 1:
-        later = int(path.stat().st_mtime) + 1
-        os.utime(new, (later, later))
+    second = next(_SECONDS)
+    os.utime(new, (second, second))
     new.replace(path)

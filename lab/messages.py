@@ -3,6 +3,7 @@
 from __future__ import annotations
 
 import re
+import select
 import socket
 import threading
 import time
@@ -30,21 +31,31 @@ class Message:
 
 
 class Messages:
-    """Receives and keeps the log; `file` holds the same lines for a human reader."""
+    """Receives and keeps the log; `file` holds the same lines for a human reader.
+
+    Whoever asks gets every line that was sent before, however busy the receiving thread is.
+    """
 
     def __init__(self, file: Path) -> None:
         self.file = file
-        self.all: list[Message] = []
+        self._kept: list[Message] = []
         self._listeners: list[Callable[[Message], None]] = []
+        self._lock = threading.Lock()
+        self._receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
 
     def start(self) -> None:
         """Open the log socket of this machine's programs."""
-        receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        receiver.bind(_LOG_SOCKET)
+        self._receiver.bind(_LOG_SOCKET)
         Path(_LOG_SOCKET).chmod(0o666)
         self.file.parent.mkdir(parents=True, exist_ok=True)
         self.file.touch()
-        threading.Thread(target=self._receive, args=(receiver,), daemon=True).start()
+        threading.Thread(target=self._receive, daemon=True).start()
+
+    @property
+    def all(self) -> list[Message]:
+        """The lines so far, in order."""
+        self._take_waiting()
+        return list(self._kept)
 
     def listen(self, listener: Callable[[Message], None]) -> None:
         """Call `listener` with every message from now on."""
@@ -58,18 +69,30 @@ class Messages:
         """How many lines contain `part`."""
         return sum(part in text for text in self.texts())
 
-    def _receive(self, receiver: socket.socket) -> None:
-        with self.file.open("a", errors="replace", buffering=1) as file:
+    def _receive(self) -> None:
+        while True:
+            select.select([self._receiver], [], [])
+            self._take_waiting()
+
+    def _take_waiting(self) -> None:
+        """Keep the lines that wait in the socket."""
+        with self._lock, self.file.open("a", errors="replace") as file:
             while True:
-                datagram = receiver.recv(65536).rstrip(b"\n\0").decode(errors="replace")
-                parts = _DATAGRAM.match(datagram)
-                if parts:
-                    priority = int(parts[1])
-                    message = Message(priority >> 3, priority & 7, parts[2], parts[3],
-                                      time.monotonic())
-                else:
-                    message = Message(0, 7, "(unreadable)", datagram, time.monotonic())
-                self.all.append(message)
+                try:
+                    datagram = self._receiver.recv(65536, socket.MSG_DONTWAIT)
+                except BlockingIOError:
+                    return
+                message = _read(datagram.rstrip(b"\n\0").decode(errors="replace"))
+                self._kept.append(message)
                 file.write(f"{message}\n")
                 for listener in self._listeners:
                     listener(message)
+
+
+def _read(datagram: str) -> Message:
+    """The message in a datagram, which counts as received now."""
+    parts = _DATAGRAM.match(datagram)
+    if not parts:
+        return Message(0, 7, "(unreadable)", datagram, time.monotonic())
+    priority = int(parts[1])
+    return Message(priority >> 3, priority & 7, parts[2], parts[3], time.monotonic())

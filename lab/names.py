@@ -60,9 +60,9 @@ class Names:
             self._publish([name])
         self._timeline.add("names", f"{name} is again what the service sets")
 
-    def resolve(self, name: str, host: str = network.DEVICE) -> str:
-        """The address a program on `host` gets for a name; empty when there is none."""
-        answer = network.output(host, "getent", "ahostsv4", name).split()
+    def resolve(self, name: str) -> str:
+        """The address a program on the device gets for a name; empty when there is none."""
+        answer = network.output(network.DEVICE, "getent", "ahostsv4", name).split()
         return answer[0] if answer else ""
 
     def _publish(self, names: Iterable[str]) -> None:

@@ -13,17 +13,11 @@ from lab import network, packet_filter
 from lab.packet_filter import Mapping
 
 PORT = 5351
-UNSUPPORTED_VERSION, NOT_AUTHORIZED, NETWORK_FAILURE, OUT_OF_RESOURCES, UNSUPPORTED_OPCODE = (
-    1, 2, 3, 4, 5)
 
+_UNSUPPORTED_VERSION, _UNSUPPORTED_OPCODE = 1, 5
 _PROTOCOLS = {1: "UDP", 2: "TCP"}
 _REPLY = 128
 _LOOK_SECONDS = 0.05
-
-
-def as_asked(port: int) -> int:
-    """Grant the external port that was asked for."""
-    return port
 
 
 @dataclass(frozen=True)
@@ -32,12 +26,10 @@ class Grant:
 
     `port` gives the external port that is granted for the one asked for; a port that somebody
     else holds is passed over for the next free one. `lease` is the longest lease in seconds.
-    `refusal` is a result code with which every new mapping is refused.
     """
 
-    port: Callable[[int], int] = as_asked
-    lease: int = 7200
-    refusal: int = 0
+    port: Callable[[int], int]
+    lease: int
 
 
 class NatPmp:
@@ -88,11 +80,11 @@ class NatPmp:
             return b""
         version, operation = request[:2]
         if version != 0:
-            return self._head(operation, UNSUPPORTED_VERSION)
+            return self._head(operation, _UNSUPPORTED_VERSION)
         if operation == 0:
             return self._head(0) + socket.inet_aton(self._public_address())
         if operation not in _PROTOCOLS or len(request) < 12:
-            return self._head(operation, UNSUPPORTED_OPCODE) + request[4:]
+            return self._head(operation, _UNSUPPORTED_OPCODE) + request[4:]
         internal, external, lease = struct.unpack_from(">HHI", request, 4)
         if lease == 0:
             return self._unmap(operation, client, internal)
@@ -100,9 +92,6 @@ class NatPmp:
 
     def _map(self, operation: int, client: str, internal: int, external: int,
              lease: int) -> bytes:
-        if self._grant.refusal:
-            return (self._head(operation, self._grant.refusal)
-                    + struct.pack(">HHI", internal, external, 0))
         protocol, lease = _PROTOCOLS[operation], min(lease, self._grant.lease)
         held = self._held(protocol, client, internal)
         if held:

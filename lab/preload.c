@@ -1,10 +1,10 @@
 /* Loaded into the daemon and its shell commands before libfaketime.
  *
  * libfaketime makes pauses and the clock run faster. Waiting for the network is another matter: the
- * other side answers in real time however fast the device's clock runs. So poll and select wait a
- * part of what they are asked for, enough for hosts on one machine, whatever the clock's factor.
- * libnatpmp waits with select and counts its tries by gettimeofday: both must agree, or it asks
- * again before a busy machine has answered, and takes the answer for that of its next question.
+ * other side answers in real time however fast the device's clock runs. So poll waits a part of
+ * what it is asked for, enough for hosts on one machine, whatever the clock's factor.
+ * libnatpmp waits with select and counts its tries by gettimeofday. Both are real, or it asks again
+ * before a busy machine has answered, and takes the answer for that of its next question.
  *
  * kill refuses the signal whose number stands in REFUSED_SIGNAL, as a system under duress might.
  */
@@ -19,7 +19,7 @@
 #include <time.h>
 #include <unistd.h>
 
-enum { FASTER_POLL = 10, FASTER_SELECT = 3 };
+enum { FASTER_POLL = 10 };
 
 int poll(struct pollfd* fds, nfds_t count, int milliseconds) {
     long long nanoseconds = milliseconds * 1000000LL / FASTER_POLL;
@@ -29,11 +29,7 @@ int poll(struct pollfd* fds, nfds_t count, int milliseconds) {
 
 int select(int count, fd_set* in, fd_set* out, fd_set* other, struct timeval* timeout) {
     struct timespec limit = {0, 0};
-    if (timeout) {
-        long long nanoseconds =
-            (timeout->tv_sec * 1000000000LL + timeout->tv_usec * 1000LL) / FASTER_SELECT;
-        limit = (struct timespec){nanoseconds / 1000000000, nanoseconds % 1000000000};
-    }
+    if (timeout) limit = (struct timespec){timeout->tv_sec, timeout->tv_usec * 1000L};
     return (int)syscall(SYS_pselect6, count, in, out, other, timeout ? &limit : NULL, NULL);
 }
 
@@ -41,8 +37,7 @@ int gettimeofday(struct timeval* restrict now, void* restrict zone) {
     struct timespec real;
     (void)zone;
     syscall(SYS_clock_gettime, CLOCK_MONOTONIC, &real);
-    long long microseconds = (real.tv_sec * 1000000LL + real.tv_nsec / 1000) * FASTER_SELECT;
-    *now = (struct timeval){microseconds / 1000000, microseconds % 1000000};
+    *now = (struct timeval){real.tv_sec, real.tv_nsec / 1000};
     return 0;
 }
 

@@ -18,6 +18,7 @@ from lab.certificates import KeyPair
 from lab.support import wait_until
 
 
+_ANSWER_SECONDS = 10
 # On, for no seconds: closing discards what is on its way and resets the connection.
 _NO_LINGERING = struct.pack("ii", 1, 0)
 
@@ -130,7 +131,8 @@ def fetch(host: str, url: str, trust: str | None = None, name: str | None = None
           seconds: float = 5) -> str | None:
     """GET `url` as a client on `host`; None when no answer came.
 
-    With `trust` (a file of authorities) the server must prove to be `name`.
+    The host must take the connection within `seconds`. Its server may need longer to answer. With
+    `trust` (a file of authorities) the server must prove to be `name`.
     """
     with network.inside(host):
         return fetch_from_here(url, trust, name, seconds)
@@ -143,6 +145,7 @@ def fetch_from_here(url: str, trust: str | None = None, name: str | None = None,
     try:
         with socket.create_connection((parts.hostname, parts.port or _port(parts.scheme)),
                                       seconds) as plain:
+            plain.settimeout(_ANSWER_SECONDS)
             stream = _secured(plain, trust, name) if parts.scheme == "https" else plain
             target = f"{parts.path or '/'}{'?' + parts.query if parts.query else ''}"
             stream.sendall(f"GET {target} HTTP/1.0\r\nHost: {parts.netloc}\r\n\r\n".encode())

@@ -12,8 +12,8 @@ from lab import daemon, network
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, Fault
 from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, TUNNEL_PID_FILE,
                         asked, assert_log_is_proper, assert_published, assert_stops_clean,
-                        page_through_the_tunnel, pages_from_outside, tunnel_client, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+                        mapping_changes, page_through_the_tunnel, pages_from_outside, tunnel_client,
+                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup, Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -70,16 +70,18 @@ def unmap_all_while_relayed(lab: Lab) -> None:
 @scenario(Situation(gateway=_SILENT, clock=FAST))
 def stopped_in_discovery(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT while a gateway is looked for: it ends, and nothing is tried."""
+    # Refused at once, the search through NAT-PMP would take no time.
+    lab.gateway.fall_silent()
     for time in _until_each_signal(lab, "while a gateway is looked for"):
         wait_for_log(lab, "setting localIP to: [192.168.77.10]", time)
-    assert lab.central.port_tests == []
+    assert lab.device.messages.count(_CYCLE) == 0
     assert lab.device.statuses_told() == ["connecting", "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(clock=FAST))
 def stopped_in_a_port_test(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT in a slow port test: published after it, then withdrawn again."""
-    lab.central.misbehave(PORT_TEST, Fault(delay=1))
+    lab.central.misbehave(PORT_TEST, Fault(delay=2))
     for time in _until_each_signal(lab, "while the service tests the port"):
         lab.wait_for(lambda time=time: len(lab.central.requests_for(PORT_TEST)) == time,
                      "the port test", 60)
@@ -91,7 +93,7 @@ def stopped_in_a_port_test(lab: Lab) -> None:
 
 # With a back end that does not take the ports the relay is tried while both are mapped.
 @scenario(Situation(static={"LOCAL_SETFORWARDURL": "http://127.0.0.1:1/",
-                            "STARTCMD": "touch openvpn.out"}, clock=2 * FAST))
+                            "STARTCMD": "touch openvpn.out"}, clock=FAST))
 def stopped_in_the_relay_start(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT while no tunnel comes up: it tries on for its five minutes."""
     for time in _until_each_signal(lab, "while the tunnel does not come up"):
@@ -101,12 +103,27 @@ def stopped_in_the_relay_start(lab: Lab) -> None:
     assert lab.device.statuses_told() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
 
 
+@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+def stopped_as_the_tunnel_starts(lab: Lab) -> None:
+    """SIGTERM while the tunnel's client starts: relayed for a moment, then all is torn down."""
+    lab.start_daemon(*OPTIONS)
+    lab.wait_for(lab.device.tunnel_output().exists, "the client", 60)
+    lab.step("SIGTERM before the daemon knows that the tunnel is up")
+    assert_stops_clean(lab)
+    assert lab.relay.connections() == 1
+    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert not TUNNEL_PID_FILE.exists()
+    wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay itself to be left", 20)
+
+
 @scenario(Situation(clock=FAST))
 def stopped_in_its_sleep(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT between two cycles: it ends without another one."""
-    for _ in _until_each_signal(lab, "between two cycles"):
-        wait_for_next_cycle(lab)
-        assert_published(lab)
+    for time in _until_each_signal(lab, "between two cycles"):
+        wait_for_status(lab, "portforwarded")
+        with lab.daemon.held():
+            assert_published(lab)
+        wait_for_cycle(lab, time)
     assert lab.device.messages.count(_CYCLE) == len(_SIGNALS)
     assert lab.device.statuses_told() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
@@ -127,18 +144,18 @@ def power_cut(lab: Lab) -> None:
         lab.start_daemon(*OPTIONS)
         wait_until(lambda end=end: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
         _kill(lab)
+        # When the gateway has answered that, it has done what the daemon had asked for.
+        lab.gateway.listing()
         left = lab.gateway.mappings()
-
         lab.step(f"the power is back; left behind: {', '.join(map(str, left)) or 'no mapping'}")
         lab.start_daemon(*OPTIONS)
         wait_for_next_cycle(lab)
-        assert_published(lab)
-        cycles = lab.device.messages.count(_CYCLE)
-        changes = [*(f"no longer forwards {mapping}" for mapping in left),
-                   *(f"forwards {mapping}" for mapping in BOTH_MAPPED)]
-        wait_until(lambda changes=changes: _changes(lab)[-len(changes):] == changes,
-                   f"the gateway to tell {changes}", 5)
-        assert lab.device.messages.count(_CYCLE) == cycles
+        with lab.daemon.held():
+            assert_published(lab)
+            changes = [*(f"no longer forwards {mapping}" for mapping in left),
+                       *(f"forwards {mapping}" for mapping in BOTH_MAPPED)]
+            wait_until(lambda changes=changes: mapping_changes(lab)[-len(changes):] == changes,
+                       f"the gateway to tell {changes}", 5)
     assert_stops_clean(lab)
 
 
@@ -198,8 +215,3 @@ def _clear_up(lab: Lab) -> None:
     assert lab.device.status == "disabled"
     assert daemon.running("pelorus") == []
     assert_log_is_proper(lab)
-
-
-def _changes(lab: Lab) -> list[str]:
-    """What the gateway's packet filter told of its mappings, in order."""
-    return [event.what for event in lab.timeline.events if event.who == "gateway"]

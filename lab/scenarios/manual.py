@@ -4,9 +4,9 @@ from __future__ import annotations
 
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
-from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
-                        assert_log_is_proper, assert_published, assert_stops_clean,
-                        pages_from_outside, wait_for_log, wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED, assert_published,
+                        assert_stops_clean, assert_told_by_the_next_cycle, pages_from_outside,
+                        wait_for_log, wait_for_status)
 from lab.gateway import GatewaySetup, Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -20,6 +20,7 @@ _BY_HAND = [Mapping("TCP", 8081, network.DEVICE_ADDRESS, 80),
 _NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
 _BEGIN, _END = "manualPortForward - allocatedHttpPort", "manualPortForward - localConnectionType"
 _DOUBLE_NAT = "Enforce connection as RELAY"
+_IGNORED = "createDirectConnection() - Ignore Port Test due to Interval 240."
 
 _CLOCK, _INTERVAL = 100, 500
 
@@ -33,12 +34,13 @@ def manual_ports(lab: Lab) -> None:
     device_id, auth, _ = lab.account.secrets
     assert [request.url for request in lab.central.requests_for(PORT_TEST)] == [
         f"/api/1.0/rest/{PORT_TEST}/{device_id}?external_ip=&port=8081&protocol=HTTP&auth={auth}"]
-    _assert_published_by_hand(lab)
     wait_for_log(lab, f"setNetworkAddrs - external IP [{_HERE}], local IP [192.168.77.10]")
     assert lab.device.messages.count("interval duration [720]") == 1
+    with lab.daemon.held():
+        _assert_published_by_hand(lab)
 
-    lab.step("the device's settings name an HTTP port that nobody forwards")
-    lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
+        lab.step("the device's settings name an HTTP port that nobody forwards")
+        lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
     wait_for_log(lab, _NOT_RELAYED)
     assert lab.device.status == "failed"
     assert _ports_tested(lab) == [8081, 8082, 8082, 8082]
@@ -99,41 +101,48 @@ def manual_ports_that_are_none(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def manual_and_back(lab: Lab) -> None:
     """Automatic ports, manual ones and back: the daemon removes only what it mapped itself."""
-    foreign = Mapping("TCP", 9092, network.NEIGHBOUR_ADDRESS, 80)
+    others = [Mapping("TCP", 7000, network.DEVICE_ADDRESS, 80),
+              Mapping("TCP", 9092, network.NEIGHBOUR_ADDRESS, 80)]
+    # The first belongs to another program on the device.
+    network.output(network.DEVICE, "upnpc", "-u", lab.gateway.description_url, "-e", "camera",
+                   "-a", network.DEVICE_ADDRESS, "80", "7000", "tcp")
     lab.neighbour.hold(9092, 80)
     lab.start_daemon(*OPTIONS)
     wait_for_status(lab, "portforwarded")
-    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, foreign])
+    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
 
     lab.step("the user forwards ports by hand and tells the device")
-    _forward_by_hand(lab)
-    lab.device.change(**_SETTINGS)
+    with lab.daemon.held():
+        _forward_by_hand(lab)
+        lab.device.change(**_SETTINGS)
+        changed = len(lab.device.messages.all)
     _wait_until_told(lab, 8081)
-    assert lab.gateway.mappings() == [foreign]
-    _assert_published_by_hand(lab)
+    assert_told_by_the_next_cycle(lab, changed, _BEGIN)
+    with lab.daemon.held():
+        assert lab.gateway.mappings() == others
+        _assert_published_by_hand(lab)
 
-    lab.step("back to automatic, and nothing changes")
-    lab.device.change(MANUAL_PORT_FORWARD="FALSE")
-    wait_for_log(lab, "createDirectConnection() - Ignore Port Test due to Interval 240.")
-    assert lab.gateway.mappings() == [foreign]
-    _assert_published_by_hand(lab)
+        lab.step("back to automatic, and nothing changes")
+        lab.device.change(MANUAL_PORT_FORWARD="FALSE")
+        ignored = lab.device.messages.count(_IGNORED)
+    wait_for_log(lab, _IGNORED, ignored + 1)
+    with lab.daemon.held():
+        assert lab.gateway.mappings() == others
+        _assert_published_by_hand(lab)
 
-    lab.step("the user's ports are gone, and the next test of them makes the daemon map its own")
-    lab.gateway.stop_forwarding_by_hand()
+        lab.step("the user's ports are gone, and the next test makes the daemon map its own")
+        lab.gateway.stop_forwarding_by_hand()
     _wait_until_told(lab, 9091)
     wait_for_status(lab, "portforwarded")
     assert _ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
-    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, foreign])
+    assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
     assert lab.central.record == PUBLISHED
     assert pages_from_outside() == PAGES
     assert [request.argument("http_port") for request in lab.central.requests_for(PORT_FORWARD)
             ] == ["0", "9091", "8081", "9091"]
 
-    lab.step("the end leaves the neighbour its port")
-    assert lab.stop_daemon() == "SIGTERM"
-    assert lab.gateway.mappings() == [foreign]
-    assert lab.central.record is None
-    assert_log_is_proper(lab)
+    lab.step("the end leaves the others their ports")
+    assert_stops_clean(lab, left=others)
     assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
@@ -185,7 +194,8 @@ def manual_behind_second_nat(lab: Lab) -> None:
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
 
     lab.step("the provider's box is gone")
-    lab.provider.remove()
+    with lab.daemon.held():
+        lab.provider.remove()
     wait_for_status(lab, "portforwarded")
     assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP",
                                                       lab.account.device_id)
@@ -202,9 +212,10 @@ def manual_after_second_nat(lab: Lab) -> None:
     assert lab.device.messages.count(_DOUBLE_NAT) == 1
 
     lab.step("the second NAT goes away, and the user forwards ports by hand: they are not tested")
-    lab.provider.remove()
-    _forward_by_hand(lab)
-    lab.device.change(**_SETTINGS)
+    with lab.daemon.held():
+        lab.provider.remove()
+        _forward_by_hand(lab)
+        lab.device.change(**_SETTINGS)
     wait_for_log(lab, "relay mode is enforced, therefore don't manual forward ports.", 2)
     assert _ports_tested(lab) == [9091]
     assert lab.device.status == "failed"
@@ -247,5 +258,7 @@ def _assert_asked_in_intervals(lab: Lab) -> None:
     """Twice, each time when the interval since the publication or the last question had passed."""
     published, *_ = lab.central.requests_for(PORT_FORWARD)
     first, second = lab.central.requests_for(MY_IP)
+    assert {(asking.scheme, asking.url) for asking in (first, second)} == {
+        ("http", "/api/1.0/rest/myip")}
     shortest = min(first.when - published.when, second.when - first.when)
     assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts full seconds

@@ -6,9 +6,9 @@ import random
 
 from lab import daemon, network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
-from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_published,
-                        assert_stops_clean, pages_from_outside, tunnel_client, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_published, assert_stops_clean,
+                        assert_told_by_the_next_cycle, pages_from_outside, tunnel_client,
+                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.device import DYNAMIC_COPY, DYNAMIC_FILE
 from lab.gateway import NO_PORT, GatewaySetup, Mapping
 from lab.scenario import Lab, Situation
@@ -129,13 +129,17 @@ def credentials_missing(lab: Lab) -> None:
     assert lab.gateway.mappings() == []
 
     lab.step("the device is registered")
-    lab.device.change(DEVICEAUTH=lab.account.auth)
+    with lab.daemon.held():
+        lab.device.change(DEVICEAUTH=lab.account.auth)
+        changed = len(lab.device.messages.all)
     wait_for_status(lab, "portforwarded")
+    assert_told_by_the_next_cycle(lab, changed, "createDirectConnection() - success")
     # The service gets the local address with the record; it is told of it alone only at a start.
     assert asked(lab) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert lab.device.messages.count(_STARTED) == 1
     assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["disabled", "connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
@@ -143,13 +147,14 @@ def internal_ports_change(lab: Lab) -> None:
     """The device's web server moves to other ports; the gateway is led there by the next test."""
     lab.start_daemon(*OPTIONS)
     wait_for_status(lab, "portforwarded")
-    wait_for_next_cycle(lab)
+    wait_for_cycle(lab, 1)
     requests = len(lab.device.local_requests)
 
     lab.step("the web server moves from ports 80 and 443 to 8080 and 8443")
-    lab.device.serve_on(8080, 8443)
-    lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
-    assert pages_from_outside() == [None, None]
+    with lab.daemon.held():
+        lab.device.serve_on(8080, 8443)
+        lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
+        assert pages_from_outside() == [None, None]
 
     lab.step("the port test notices; port 9091 is still held by the old mapping, so 9092 is used")
     lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == "9092", "the new port", 60)
@@ -165,6 +170,37 @@ def internal_ports_change(lab: Lab) -> None:
     assert lab.central.record.http_port == 9092
     assert pages_from_outside(9092, 9444) == PAGES
     assert_stops_clean(lab)
+
+
+@scenario(Situation(clock=FAST))
+def default_ports_only_later(lab: Lab) -> None:
+    """Other ports than 9091 are forbidden while 9092 is used: closed at once, 9091 only later."""
+    lab.neighbour.hold(9091, 80)
+    others = lab.gateway.mappings()
+    lab.start_daemon(*OPTIONS)
+    wait_for_cycle(lab, 1)
+    assert_published(lab, 9092, others=others)
+    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+
+    lab.step("only the default ports are allowed, and 9091 is free: no search is due yet")
+    with lab.daemon.held():
+        lab.gateway.lose(9091)
+        lab.device.change(DEFAULT_PORTS_ONLY="TRUE")
+        changed = len(lab.device.messages.all)
+    assert_told_by_the_next_cycle(lab, changed, "Skip testing port due to interval")
+    # Clients are sent to closed ports until the search; nobody is told of it.
+    assert lab.gateway.mappings() == []
+    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert lab.central.record.http_port == 9092
+    assert lab.device.status == "portforwarded"
+
+    lab.step("the next search is due")
+    lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == "9091", "the new port", 60)
+    wait_for_next_cycle(lab)
+    assert_published(lab)
+    assert pages_from_outside() == PAGES
+    assert_stops_clean(lab)
+    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))

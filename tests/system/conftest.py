@@ -16,7 +16,7 @@ from lab import sandbox  # noqa: E402
 from lab.scenario import Lab, Situation  # noqa: E402
 from lab.timeline import Timeline  # noqa: E402
 
-_LAST_RESORT_SECONDS = 150
+_LAST_RESORT_SECONDS = 240
 _raised: list[Lab] = []
 
 

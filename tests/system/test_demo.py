@@ -99,6 +99,6 @@ def test_lab_that_stays_up_leaves_no_trace_after(end):
         os.killpg(demo.pid, end)
     else:
         demo.send_signal(end)
-    assert demo.wait(15) == (0 if end == signal.SIGINT else -end)
-    wait_until(lambda: not processes_in(namespace), "every process of the lab to end", 10)
+    assert demo.wait(60) == (0 if end == signal.SIGINT else -end)
+    wait_until(lambda: not processes_in(namespace), "every process of the lab to end", 60)
     assert traces() == before

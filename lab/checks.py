@@ -9,21 +9,31 @@ from itertools import takewhile
 from lab import daemon, network, web
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, PortTest, Record
 from lab.device import DYNAMIC_COPY, HOME
-from lab.gateway import Mapping
+from lab.gateway import GatewaySetup, Mapping
 from lab.scenario import Lab
+from lab.support import wait_until
 
 OPTIONS = ("-l", "7", "-f", "30")
 # A pause of two minutes takes two seconds.
 FAST = 60
 # The tunnel comes up in real time while the daemon counts ten fast seconds between its looks.
 RELAYED = 20
+# The five minutes for which a tunnel is tried take seven seconds, a pause takes three.
+IMPATIENT = 40
 # A tunnel that never starts is given up at the first look instead of after five minutes.
 NO_TUNNEL = {"STARTCMD": "true"}
 TUNNEL_PID_FILE = HOME / "openvpn/openvpn.pid"
 
+# A gateway that only masquerades.
+SILENT = GatewaySetup(upnp=False)
+
+# Lines of the device's log: a cycle's last, ports that are not tested, a tunnel that is given up.
+PAUSE = "DaemonControl::run - retry connection after "
+NOT_DUE = "createDirectConnection() - Ignore Port Test due to Interval"
+NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
+
 _LOCAL0 = 16
 _PATIENCE = 60
-_PAUSE = "DaemonControl::run - retry connection after "
 
 BOTH_MAPPED = [Mapping("TCP", 9091, network.DEVICE_ADDRESS, 80),
                Mapping("TCP", 9444, network.DEVICE_ADDRESS, 443)]
@@ -43,12 +53,25 @@ def wait_for_log(lab: Lab, part: str, count: int = 1, seconds: float = _PATIENCE
 
 def wait_for_cycle(lab: Lab, number: int) -> None:
     """Wait until this cycle has run to its pause, counted from the first start of the daemon."""
-    wait_for_log(lab, _PAUSE, number)
+    wait_for_log(lab, PAUSE, number)
+
+
+def start_direct(lab: Lab, *options: str) -> None:
+    """Start the daemon and let it be content with the direct path for a cycle.
+
+    Its pause has just begun then, so a gateway that is changed now is not asked meanwhile.
+    """
+    lab.start_daemon(*OPTIONS, *options)
+    wait_for_status(lab, "portforwarded")
+    with lab.daemon.held():
+        assert_published(lab)
+        assert pages_from_outside() == PAGES
+    wait_for_cycle(lab, 2)
 
 
 def wait_for_next_cycle(lab: Lab, cycles: int = 1) -> None:
     """Wait until that many more cycles have run to their pause."""
-    wait_for_cycle(lab, lab.device.messages.count(_PAUSE) + cycles)
+    wait_for_cycle(lab, lab.device.messages.count(PAUSE) + cycles)
 
 
 def assert_told_by_the_next_cycle(lab: Lab, since: int, part: str) -> None:
@@ -72,11 +95,22 @@ def asked(lab: Lab, since: int = 0) -> list[str]:
     return [request.path.split("/")[4] for request in lab.central.requests[since:]]
 
 
+def ports_tested(lab: Lab) -> list[int]:
+    """The ports to which the service has connected back, in order."""
+    return [test.port for test in lab.central.port_tests]
+
+
 def tunnel_client() -> int:
     """The tunnel client's pid, of a process that really runs."""
     client = int(TUNNEL_PID_FILE.read_text())
     assert client in daemon.running("openvpn")
     return client
+
+
+def wait_for_client_end(client: int) -> None:
+    """Wait until a tunnel client is gone; told to end, it takes its time."""
+    wait_until(lambda: client not in daemon.running("openvpn"), f"tunnel client {client} to end",
+               20)
 
 
 def page_through_the_tunnel(lab: Lab) -> str | None:

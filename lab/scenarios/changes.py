@@ -6,9 +6,9 @@ import re
 
 from lab import network
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT
-from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, asked, assert_published,
+from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PAUSE, SILENT, asked, assert_published,
                         assert_stops_clean, page_through_the_tunnel, pages_from_outside,
-                        wait_for_cycle, wait_for_log, wait_for_mapping_changes,
+                        start_direct, wait_for_cycle, wait_for_log, wait_for_mapping_changes,
                         wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
@@ -16,14 +16,13 @@ from lab.scenarios.registry import scenario
 
 _NEW_LAN_ADDRESS, _NEW_WAN_ADDRESS = "192.168.77.30", "44.128.0.30"
 _NAMES_MATCH = "ConnectionManager::checkDNS - DNS matches local value"
-_PAUSE = "DaemonControl::run - retry connection after "
 _SINCE_LAST_TEST = re.compile(r"createDirectConnection - Elapsed time (\d+), portTestInterval 240")
 
 
 @scenario(Situation(clock=FAST))
 def gateway_reboots(lab: Lab) -> None:
     """The gateway reboots and moves within the home: the next port test finds out and maps anew."""
-    _start(lab)
+    start_direct(lab)
     before = len(lab.central.requests)
 
     lab.step("the gateway forgets the mappings and comes back at another address and control port")
@@ -48,7 +47,7 @@ def gateway_reboots(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def internet_address_changes(lab: Lab) -> None:
     """The internet address changes: mapped, tested and published anew in the next cycle."""
-    _start(lab, "-d", "300")
+    start_direct(lab, "-d", "300")
     before = len(lab.central.requests)
 
     lab.step("the provider gives the gateway another address")
@@ -66,7 +65,7 @@ def internet_address_changes(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def internet_address_changes_before_check(lab: Lab) -> None:
     """The internet address changes and the names are checked first: torn down, up in that cycle."""
-    _start(lab, "-d", "60")
+    start_direct(lab, "-d", "60")
     before = len(lab.central.requests)
 
     lab.step("the provider gives the gateway another address")
@@ -85,7 +84,7 @@ def internet_address_changes_before_check(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def device_address_changes(lab: Lab) -> None:
     """The device gets another LAN address: it uses other ports, the old mappings stay behind."""
-    _start(lab)
+    start_direct(lab)
     _move_device(lab)
     # A gateway in secure mode lets nobody touch mappings to another address, not even to the
     # device's own former one. Whoever gets that address next is reached through the old ports.
@@ -100,14 +99,14 @@ def device_address_changes(lab: Lab) -> None:
 @scenario(Situation(gateway=GatewaySetup(secure=False), clock=FAST))
 def device_address_changes_trusting_gateway(lab: Lab) -> None:
     """At a gateway without secure mode the mappings follow the device to its new LAN address."""
-    _start(lab)
+    start_direct(lab)
     _move_device(lab)
     assert_published(lab, local_ip=_NEW_LAN_ADDRESS)
     assert pages_from_outside() == PAGES
     assert_stops_clean(lab)
 
 
-@scenario(Situation(gateway=GatewaySetup(upnp=False), relay=True, clock=FAST))
+@scenario(Situation(gateway=SILENT, relay=True, clock=FAST))
 def relayed_device_address_changes(lab: Lab) -> None:
     """A relayed device gets another LAN address: the service and the back end are told of it."""
     lab.start_daemon(*OPTIONS)
@@ -173,19 +172,6 @@ def gateway_falls_silent(lab: Lab) -> None:
                                           "portforwarded", "disabled"]
 
 
-def _start(lab: Lab, *options: str) -> None:
-    """Start the daemon, and let it be content with the direct path for a cycle.
-
-    Its pause has just begun then.
-    """
-    lab.start_daemon(*OPTIONS, *options)
-    wait_for_status(lab, "portforwarded")
-    assert_published(lab)
-    assert pages_from_outside() == PAGES
-    wait_for_cycle(lab, 2)
-    assert lab.device.messages.count(_NAMES_MATCH) > 0
-
-
 def _wait_for_new_internet_address(lab: Lab) -> None:
     """Wait until the device is published at the gateway's new address, through new mappings."""
     lab.wait_for(lambda: lab.central.record and lab.central.record.external_ip == _NEW_WAN_ADDRESS,
@@ -228,4 +214,4 @@ def _assert_in_one_cycle(lab: Lab, first: str, then: str) -> None:
     """The daemon did not pause between these two lines of its log."""
     lines = iter(lab.device.messages.texts())
     assert any(first in line for line in lines)
-    assert next(line for line in lines if then in line or line.startswith(_PAUSE)).count(then) == 1
+    assert next(line for line in lines if then in line or line.startswith(PAUSE)).count(then) == 1

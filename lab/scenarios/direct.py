@@ -7,22 +7,18 @@ from collections.abc import Sequence
 
 from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
-from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, asked, assert_published,
-                        assert_stops_clean, assert_told_in_order, page_through_the_tunnel,
-                        pages_from_outside, wait_for_cycle, wait_for_log, wait_for_next_cycle,
-                        wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NOT_DUE, OPTIONS, PAGES, asked,
+                        assert_published, assert_stops_clean, assert_told_in_order,
+                        page_through_the_tunnel, pages_from_outside, ports_tested, start_direct,
+                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.gateway import STOCK_PERMISSIONS, GatewaySetup, Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
 _TAKEN = "is already mapped to another IP: 192.168.77.20"
 _REFUSED = "Router::mapPort() - fail - failed to map external port: "
-_IGNORED = "Ignore Port Test due to Interval"
 _MAPPED_ANEW = "Resetting HTTP allocated ports due to external or local IP change: [9091]"
 _PASSED = "TavikClient::testPort - port map check success."
-
-# A pause takes three seconds, and a tunnel has seven to come up.
-_IMPATIENT = 40
 
 # Requests to a UPnP gateway. A discovery asks for its description, its state and twice for its
 # address. What an earlier run left is looked for by two names, in two passes through its list.
@@ -87,7 +83,7 @@ def ports_taken(lab: Lab) -> None:
     lab.start_daemon(*OPTIONS)
     wait_for_status(lab, "portforwarded")
     _assert_reached(lab, 9092, 9445, others)
-    assert _tested(lab) == [9092, 9092]
+    assert ports_tested(lab) == [9092, 9092]
     assert lab.device.messages.count(_TAKEN) == 3
     assert lab.device.messages.count(_REFUSED) == 0
     assert_stops_clean(lab, left=others)
@@ -101,7 +97,7 @@ def natpmp_port_taken(lab: Lab) -> None:
     lab.start_daemon(*OPTIONS)
     wait_for_status(lab, "portforwarded")
     _assert_reached(lab, 9092, 9444, others)
-    assert _tested(lab) == [9092]
+    assert ports_tested(lab) == [9092]
     # The gateway chose it: nothing was refused, and nothing had to be asked for a second time.
     assert lab.device.messages.count("Router::mapPort() - ") == 2
     assert_stops_clean(lab, left=others)
@@ -128,7 +124,7 @@ def natpmp_and_other_programs(lab: Lab) -> None:
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
 def natpmp_answers_late(lab: Lab) -> None:
     """A slow NAT-PMP gateway answers twice and too late: no answer is taken for another one."""
-    _start_direct(lab, "-t", "200")
+    start_direct(lab, "-t", "200")
     requests = lab.gateway.natpmp_requests()
 
     lab.step("the gateway hangs until it was asked a second time")
@@ -146,7 +142,7 @@ def natpmp_answers_late(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-@scenario(Situation(dynamic={"DEFAULT_PORTS_ONLY": "TRUE"}, relay=True, clock=_IMPATIENT))
+@scenario(Situation(dynamic={"DEFAULT_PORTS_ONLY": "TRUE"}, relay=True, clock=IMPATIENT))
 def default_ports_only(lab: Lab) -> None:
     """Only 9091 may be used, but another computer holds it: no other is asked for, relayed."""
     lab.neighbour.hold(9091, 80)
@@ -167,7 +163,7 @@ def default_ports_only(lab: Lab) -> None:
     assert lab.device.messages.count(_TAKEN) == 6
     assert lab.gateway.upnp_requests() == start + 2 * attempt
     assert lab.gateway.mappings() == others
-    assert _tested(lab) == []
+    assert ports_tested(lab) == []
     assert_stops_clean(lab, left=others)
     assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
 
@@ -178,7 +174,7 @@ def port_filtered(lab: Lab) -> None:
     lab.gateway.block(9091)
     lab.start_daemon(*OPTIONS)
     _wait_for_told(lab, "connecting", "failed", "portforwarded")
-    assert _tested(lab) == [9091] * 3 + [9092]
+    assert ports_tested(lab) == [9091] * 3 + [9092]
     _assert_reached(lab, 9092)
     assert_stops_clean(lab)
 
@@ -199,7 +195,7 @@ def forwarding_dies(lab: Lab) -> None:
         _assert_reached(lab, 9092)
         assert sorted(listed.mapping for listed in lab.gateway.listing()) == lab.gateway.mappings()
         # Three tests of the mapping, three more of the same port mapped anew, one of the next port.
-        assert _tested(lab)[1:] == [9091] * 6 + [9092]
+        assert ports_tested(lab)[1:] == [9091] * 6 + [9092]
         assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 7, PORT_FORWARD]
         assert [request.path for request in lab.device.local_requests[told:]] == [
             "/local/comm_status", "/local/port_forward", "/local/comm_status"]
@@ -208,7 +204,7 @@ def forwarding_dies(lab: Lab) -> None:
         lab.gateway.unblock(9091)
         lab.gateway.block(9092)
     _wait_for_told(lab, "connecting", *["portforwarded", "failed"] * 2, "portforwarded")
-    assert _tested(lab)[8:] == [9092] * 6 + [9093]
+    assert ports_tested(lab)[8:] == [9092] * 6 + [9093]
     _assert_reached(lab, 9093)
     assert_stops_clean(lab)
 
@@ -216,8 +212,8 @@ def forwarding_dies(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def http_forwarding_lost(lab: Lab) -> None:
     """The gateway loses the HTTP forwarding: the next port test notices, it is mapped again."""
-    _start_direct(lab)
-    requests, ignored = len(lab.central.requests), lab.device.messages.count(_IGNORED)
+    start_direct(lab)
+    requests, ignored = len(lab.central.requests), lab.device.messages.count(NOT_DUE)
     tests = len(lab.central.port_tests)
 
     lab.step("a gateway that cleans up drops port 9091")
@@ -226,8 +222,8 @@ def http_forwarding_lost(lab: Lab) -> None:
         assert pages_from_outside() == [None, PAGES[1]]
     _wait_for_told(lab, "connecting", "portforwarded", "failed", "portforwarded")
     # Two minutes from cycle to cycle, four from test to test.
-    assert lab.device.messages.count(_IGNORED) - ignored <= 2
-    assert _tested(lab)[tests:] == [9091] * 4
+    assert lab.device.messages.count(NOT_DUE) - ignored <= 2
+    assert ports_tested(lab)[tests:] == [9091] * 4
     assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 4, PORT_FORWARD]
     _assert_reached(lab)
     assert_stops_clean(lab)
@@ -236,7 +232,7 @@ def http_forwarding_lost(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def https_forwarding_lost(lab: Lab) -> None:
     """The gateway loses the HTTPS forwarding: nobody notices until the mappings are renewed."""
-    _start_direct(lab, "-t", "1200")
+    start_direct(lab, "-t", "1200")
     # With -t the start asks no gateway, so the second cycle still holds the address for changed.
     assert lab.device.messages.count(_MAPPED_ANEW) == 1
     requests, told = len(lab.central.requests), len(lab.device.local_requests)
@@ -261,7 +257,7 @@ def https_forwarding_lost(lab: Lab) -> None:
 
 
 @scenario(Situation(gateway=GatewaySetup(permissions=STOCK_PERMISSIONS), relay=True,
-                    clock=_IMPATIENT))
+                    clock=IMPATIENT))
 def privileged_ports_refused(lab: Lab) -> None:
     """A gateway forwards to no port below 1024: relayed; direct once the web server moves up."""
     lab.start_daemon(*OPTIONS)
@@ -280,7 +276,7 @@ def privileged_ports_refused(lab: Lab) -> None:
     with lab.daemon.held():
         assert lab.device.messages.count(_REFUSED) == 100 + 5 * 99
         assert lab.gateway.upnp_requests() == start + attempt + next_attempt
-        assert _tested(lab) == []
+        assert ports_tested(lab) == []
 
         lab.step("the user moves the web server to ports 8080 and 8443")
         lab.device.serve_on(8080, 8443)
@@ -291,27 +287,10 @@ def privileged_ports_refused(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-def _start_direct(lab: Lab, *options: str) -> None:
-    """Start the daemon and let it be content with the direct path for a cycle.
-
-    Its pause has just begun then, so a gateway that is changed now is not asked meanwhile.
-    """
-    lab.start_daemon(*OPTIONS, *options)
-    wait_for_status(lab, "portforwarded")
-    with lab.daemon.held():
-        _assert_reached(lab)
-    wait_for_cycle(lab, 2)
-
-
 def _wait_for_told(lab: Lab, *statuses: str) -> None:
     """Wait until the local back end was told these status words and no other."""
     lab.wait_for(lambda: lab.device.statuses_told() == list(statuses), " ".join(statuses), 60)
     wait_for_status(lab, statuses[-1])
-
-
-def _tested(lab: Lab) -> list[int]:
-    """The ports to which the service has connected back, in order."""
-    return [test.port for test in lab.central.port_tests]
 
 
 def _assert_reached(lab: Lab, http_port: int = 9091, https_port: int = 9444,

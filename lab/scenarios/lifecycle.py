@@ -10,17 +10,17 @@ from collections.abc import Iterator
 
 from lab import daemon, network
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, Fault
-from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, TUNNEL_PID_FILE,
-                        asked, assert_log_is_proper, assert_published, assert_stops_clean,
-                        mapping_changes, page_through_the_tunnel, pages_from_outside, tunnel_client,
-                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
-from lab.gateway import GatewaySetup, Mapping
+from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, SILENT,
+                        TUNNEL_PID_FILE, asked, assert_log_is_proper, assert_published,
+                        assert_stops_clean, mapping_changes, page_through_the_tunnel,
+                        pages_from_outside, tunnel_client, wait_for_client_end, wait_for_cycle,
+                        wait_for_log, wait_for_next_cycle, wait_for_status)
+from lab.gateway import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 from lab.support import wait_until
 
 _SIGNALS = (signal.SIGTERM, signal.SIGINT, signal.SIGQUIT)
-_SILENT = GatewaySetup(upnp=False)
 _CYCLE = "createConnection() - checking status"
 _TUNNEL_NOT_UP = "openVPN initialization did not complete, waiting..."
 _LOOKS_AT_THE_TUNNEL = 4 * 7
@@ -52,7 +52,7 @@ def unmap_all(lab: Lab) -> None:
         "/local/port_forward_delete?internal_port=80"]
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def unmap_all_while_relayed(lab: Lab) -> None:
     """A tunnel that outlived its daemon serves on until `pelorus -u` stops it."""
     lab.start_daemon(*OPTIONS)
@@ -63,11 +63,11 @@ def unmap_all_while_relayed(lab: Lab) -> None:
 
     lab.step("pelorus -u clears up and ends")
     _clear_up(lab)
-    wait_until(lambda: client not in daemon.running("openvpn"), "the tunnel's client to end", 20)
+    wait_for_client_end(client)
     assert not TUNNEL_PID_FILE.exists()
 
 
-@scenario(Situation(gateway=_SILENT, clock=FAST))
+@scenario(Situation(gateway=SILENT, clock=FAST))
 def stopped_in_discovery(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT while a gateway is looked for: it ends, and nothing is tried."""
     # Refused at once, the search through NAT-PMP would take no time.
@@ -103,7 +103,7 @@ def stopped_in_the_relay_start(lab: Lab) -> None:
     assert lab.device.statuses_told() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def stopped_as_the_tunnel_starts(lab: Lab) -> None:
     """SIGTERM while the tunnel's client starts: relayed for a moment, then all is torn down."""
     lab.start_daemon(*OPTIONS)
@@ -159,7 +159,7 @@ def power_cut(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def killed_while_relayed(lab: Lab) -> None:
     """A killed daemon's tunnel is forgotten by the next, and fights its tunnel until stopped."""
     lab.start_daemon(*OPTIONS)
@@ -181,12 +181,12 @@ def killed_while_relayed(lab: Lab) -> None:
     # Ended by SIGTERM, it would remove the pid file, and the daemon would forget the new one too.
     lab.step("the old client is stopped by hand, with kill -9")
     os.kill(old, signal.SIGKILL)
-    wait_until(lambda: old not in daemon.running("openvpn"), "the old client to end", 20)
+    wait_for_client_end(old)
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 60)
     wait_for_next_cycle(lab)
     assert tunnel_client() == new
     assert_stops_clean(lab)
-    wait_until(lambda: new not in daemon.running("openvpn"), "the new client to end", 20)
+    wait_for_client_end(new)
 
 
 def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:

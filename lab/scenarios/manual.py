@@ -4,10 +4,11 @@ from __future__ import annotations
 
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
-from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED, assert_published,
-                        assert_stops_clean, assert_told_by_the_next_cycle, pages_from_outside,
+from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES,
+                        PUBLISHED, SILENT, assert_published, assert_stops_clean,
+                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
                         wait_for_log, wait_for_status)
-from lab.gateway import GatewaySetup, Mapping
+from lab.gateway import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
@@ -17,10 +18,8 @@ _HERE, _ELSEWHERE = network.GATEWAY_WAN_ADDRESS, "44.128.0.30"
 _BY_HAND = [Mapping("TCP", 8081, network.DEVICE_ADDRESS, 80),
             Mapping("TCP", 8444, network.DEVICE_ADDRESS, 443)]
 
-_NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
 _BEGIN, _END = "manualPortForward - allocatedHttpPort", "manualPortForward - localConnectionType"
 _DOUBLE_NAT = "Enforce connection as RELAY"
-_IGNORED = "createDirectConnection() - Ignore Port Test due to Interval 240."
 
 _CLOCK, _INTERVAL = 100, 500
 
@@ -41,15 +40,15 @@ def manual_ports(lab: Lab) -> None:
 
         lab.step("the device's settings name an HTTP port that nobody forwards")
         lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     assert lab.device.status == "failed"
-    assert _ports_tested(lab) == [8081, 8082, 8082, 8082]
+    assert ports_tested(lab) == [8081, 8082, 8082, 8082]
     assert lab.central.record is None
 
     lab.step("as long as it is wrong, every cycle tests it, due or not, and whatever the disk does")
     lab.device.disk_sleeps()
-    wait_for_log(lab, _NOT_RELAYED, 2)
-    assert _ports_tested(lab)[1:] == [8082] * 6
+    wait_for_log(lab, NOT_RELAYED, 2)
+    assert ports_tested(lab)[1:] == [8082] * 6
     lab.device.disk_wakes()
 
     lab.step("the settings are right again")
@@ -77,13 +76,13 @@ def manual_ports_that_are_none(lab: Lab) -> None:
         line = ("ConnectionManager::manualPortForward - bad value for manually configured "
                 f"{kind} Port.")
         before = lab.device.messages.texts().count(line)
-        failures = lab.device.messages.count(_NOT_RELAYED)
+        failures = lab.device.messages.count(NOT_RELAYED)
         lab.device.change(MANUAL_PORT_FORWARD="TRUE", MANUAL_EXTERNAL_HTTP_PORT=http,
                           MANUAL_EXTERNAL_HTTPS_PORT=https)
-        wait_for_log(lab, _NOT_RELAYED, failures + 1)
+        wait_for_log(lab, NOT_RELAYED, failures + 1)
         assert lab.device.messages.texts().count(line) == before + 1
     assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
-    assert _ports_tested(lab) == [9091]
+    assert ports_tested(lab) == [9091]
     assert lab.central.record is None
     # The relay withdraws the record but leaves the gateway alone.
     assert lab.gateway.mappings() == BOTH_MAPPED
@@ -92,7 +91,7 @@ def manual_ports_that_are_none(lab: Lab) -> None:
     lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
     wait_for_status(lab, "portforwarded")
     assert lab.gateway.mappings() == []
-    assert _ports_tested(lab) == [9091, 65535]
+    assert ports_tested(lab) == [9091, 65535]
     assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 65535, 1)
     assert pages_from_outside(65535, 1) == PAGES
     assert_stops_clean(lab)
@@ -124,8 +123,8 @@ def manual_and_back(lab: Lab) -> None:
 
         lab.step("back to automatic, and nothing changes")
         lab.device.change(MANUAL_PORT_FORWARD="FALSE")
-        ignored = lab.device.messages.count(_IGNORED)
-    wait_for_log(lab, _IGNORED, ignored + 1)
+        ignored = lab.device.messages.count(NOT_DUE)
+    wait_for_log(lab, NOT_DUE, ignored + 1)
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
@@ -134,7 +133,7 @@ def manual_and_back(lab: Lab) -> None:
         lab.gateway.stop_forwarding_by_hand()
     _wait_until_told(lab, 9091)
     wait_for_status(lab, "portforwarded")
-    assert _ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
+    assert ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
     assert lab.central.record == PUBLISHED
     assert pages_from_outside() == PAGES
@@ -148,7 +147,7 @@ def manual_and_back(lab: Lab) -> None:
 
 
 # Two discoveries in a cycle wait in vain: it lasts about 280 s.
-@scenario(Situation(gateway=GatewaySetup(upnp=False), dynamic=_SETTINGS, clock=_CLOCK))
+@scenario(Situation(gateway=SILENT, dynamic=_SETTINGS, clock=_CLOCK))
 def manual_without_protocol(lab: Lab) -> None:
     """No mapping protocol: the service is asked for the address now and then, a new one is told."""
     _forward_by_hand(lab)
@@ -188,7 +187,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
     lab.provider.insert()
     _forward_by_hand(lab)
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
     assert lab.device.statuses_told() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
@@ -208,7 +207,7 @@ def manual_after_second_nat(lab: Lab) -> None:
     """A second NAT that the automatic test met rules out manual ports even when it is gone."""
     lab.provider.insert()
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     assert lab.device.messages.count(_DOUBLE_NAT) == 1
 
     lab.step("the second NAT goes away, and the user forwards ports by hand: they are not tested")
@@ -217,7 +216,7 @@ def manual_after_second_nat(lab: Lab) -> None:
         _forward_by_hand(lab)
         lab.device.change(**_SETTINGS)
     wait_for_log(lab, "relay mode is enforced, therefore don't manual forward ports.", 2)
-    assert _ports_tested(lab) == [9091]
+    assert ports_tested(lab) == [9091]
     assert lab.device.status == "failed"
 
     lab.step("only an automatic attempt lifts that")
@@ -248,10 +247,6 @@ def _assert_published_by_hand(lab: Lab) -> None:
     assert lab.device.setting("EXTERNAL_HTTPS_PORT") == "8444"
     assert lab.gateway.by_hand() == _BY_HAND
     assert pages_from_outside(8081, 8444) == PAGES
-
-
-def _ports_tested(lab: Lab) -> list[int]:
-    return [test.port for test in lab.central.port_tests]
 
 
 def _assert_asked_in_intervals(lab: Lab) -> None:

@@ -4,9 +4,9 @@ from __future__ import annotations
 
 from lab import network
 from lab.central import COMM_STATUS, PORT_TEST, Fault, PortTest, Record
-from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
-                        assert_stops_clean, pages_from_outside, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
+                        assert_stops_clean, pages_from_outside, wait_for_log, wait_for_next_cycle,
+                        wait_for_status)
 from lab.gateway import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -18,7 +18,6 @@ _LIST = "tavik_helper.sh list"
 _ADDRESSES = ["getip.sh wan", "getip.sh lan"]
 _OFFLINE = ("Router::initIpAddrBrenvik - Not connected to internet. "
             "Please check network connectivity.")
-_NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
 _ERROR = 3
 # The clean slate of a start, whose last word to the service needs the local address.
 _START = [_LIST, *_ADDRESSES]
@@ -107,7 +106,7 @@ def own_router_offline(lab: Lab) -> None:
     """The router has no internet address, gets one, loses it: failed, forwarded, failed."""
     lab.own_router.go_offline()
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     assert lab.device.statuses_told() == ["connecting", "failed"]
     # Once for the clean slate, once for the attempt.
     assert [message.severity for message in lab.device.messages.all
@@ -122,7 +121,7 @@ def own_router_offline(lab: Lab) -> None:
 
     lab.step("it has none any more: what the daemon opened is closed and withdrawn")
     lab.own_router.go_offline()
-    wait_for_log(lab, _NOT_RELAYED, 2)
+    wait_for_log(lab, NOT_RELAYED, 2)
     assert lab.device.status == "failed"
     assert _changes(lab)[2:] == [_remove(9091, 80), _remove(9444, 443)]
     assert lab.own_router.mappings() == []

@@ -7,10 +7,10 @@ import signal
 
 from lab import daemon, network, packet_filter, provider
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault, PortTest
-from lab.checks import (BOTH_MAPPED, OPTIONS, PAGES, RELAYED, TUNNEL_PID_FILE, asked,
-                        assert_log_is_proper, assert_published, assert_stops_clean,
-                        page_through_the_tunnel, tunnel_client, wait_for_cycle, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+from lab.checks import (BOTH_MAPPED, IMPATIENT, OPTIONS, PAGES, RELAYED, SILENT, TUNNEL_PID_FILE,
+                        asked, assert_log_is_proper, assert_published, assert_stops_clean,
+                        page_through_the_tunnel, start_direct, tunnel_client, wait_for_client_end,
+                        wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.clock import refuse_signal
 from lab.gateway import NO_PORT, GatewaySetup
 from lab.scenario import Lab, Situation
@@ -24,9 +24,6 @@ _STOPS = "closeVPNConnection() - attempting to stop process with PID"
 _KILLS = "closeVPNConnection() - attempting to SIGKILL process with PID"
 _DOUBLE_NAT = "testPort - Enforce connection as RELAY (double-NAT detected"
 
-# The five minutes for which a tunnel is tried take seven seconds, a pause takes three.
-_IMPATIENT = 40
-_SILENT = GatewaySetup(upnp=False)
 # The usual start, counted.
 _COUNTED = {"STARTCMD": "echo start >> starts; env -u LD_PRELOAD openvpn --config client.conf"
                         " --writepid openvpn.pid > openvpn.out 2>&1 &"}
@@ -42,7 +39,7 @@ table inet lab {{
 """
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def no_gateway_protocol(lab: Lab) -> None:
     """A gateway that maps nothing: the device is reached through the relay."""
     client = _start_relayed(lab)
@@ -63,7 +60,7 @@ def no_gateway_protocol(lab: Lab) -> None:
 
     lab.step("the tunnel ends with the daemon")
     assert_stops_clean(lab)
-    _wait_for_end(client)
+    wait_for_client_end(client)
     assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
 
 
@@ -91,7 +88,7 @@ def gateway_gives_in(lab: Lab) -> None:
     assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, static=_COUNTED, clock=_IMPATIENT))
+@scenario(Situation(gateway=SILENT, relay=True, static=_COUNTED, clock=IMPATIENT))
 def relay_down_at_first(lab: Lab) -> None:
     """The relay does not answer: four starts, status failed, nothing left; later it is used."""
     lab.relay.server.stop()
@@ -106,11 +103,11 @@ def relay_down_at_first(lab: Lab) -> None:
     lab.relay.start()
     client = _wait_for_relayed(lab)
     assert_stops_clean(lab)
-    _wait_for_end(client)
+    wait_for_client_end(client)
     assert lab.device.statuses_told() == ["connecting", "failed", "relayed", "disabled"]
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def tunnel_client_dies(lab: Lab) -> None:
     """The tunnel's client is killed: the next cycle starts another."""
     client = _start_relayed(lab)
@@ -118,7 +115,7 @@ def tunnel_client_dies(lab: Lab) -> None:
     lab.step("the client is killed; until the next cycle the status says relayed all the same")
     with lab.daemon.held():
         os.kill(client, signal.SIGKILL)
-        _wait_for_end(client)
+        wait_for_client_end(client)
         assert page_through_the_tunnel(lab) is None
         assert lab.device.status == "relayed"
 
@@ -129,11 +126,11 @@ def tunnel_client_dies(lab: Lab) -> None:
     assert lab.relay.connections() == 2
     second = tunnel_client()
     assert_stops_clean(lab)
-    _wait_for_end(second)
+    wait_for_client_end(second)
     assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
     """The tunnel's client cannot be told to end: after three tries it is killed."""
     client = _start_relayed(lab)
@@ -150,7 +147,7 @@ def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, dynamic={"DEVICEAUTH": "not-its-own"},
+@scenario(Situation(gateway=SILENT, relay=True, dynamic={"DEVICEAUTH": "not-its-own"},
                     static=_COUNTED, clock=RELAYED))
 def relay_refuses(lab: Lab) -> None:
     """The relay refuses the device's credentials: status failed, nothing is left running."""
@@ -185,10 +182,10 @@ def second_nat(lab: Lab) -> None:
     assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
-@scenario(Situation(relay=True, clock=_IMPATIENT))
+@scenario(Situation(relay=True, clock=IMPATIENT))
 def second_nat_appears(lab: Lab) -> None:
     """A second NAT appears while the device is reached directly: relayed in the next cycle."""
-    _start_direct(lab)
+    start_direct(lab)
     before = len(lab.central.requests)
 
     lab.step("the gateway is put behind a second NAT")
@@ -209,10 +206,10 @@ def second_nat_appears(lab: Lab) -> None:
                                           "portforwarded", "disabled"]
 
 
-@scenario(Situation(relay=True, clock=_IMPATIENT))
+@scenario(Situation(relay=True, clock=IMPATIENT))
 def address_behind_the_gateways_back(lab: Lab) -> None:
     """The service sees another address than the gateway tells: relayed, a mapping stays behind."""
-    _start_direct(lab)
+    start_direct(lab)
     before = len(lab.central.requests)
 
     lab.step("the gateway's traffic leaves by another address, nothing comes in by its own")
@@ -241,20 +238,11 @@ def address_behind_the_gateways_back(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-def _start_direct(lab: Lab) -> None:
-    """Start the daemon, and let it be content with the direct path for a cycle."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
-    assert_published(lab)
-    wait_for_cycle(lab, 2)
-    assert lab.device.messages.count("ConnectionManager::checkDNS - DNS matches local value") > 0
-
-
 def _wait_for_direct(lab: Lab, client: int) -> None:
     """Wait until the device is reached directly and the tunnel's client is gone."""
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
-    _wait_for_end(client)
+    wait_for_client_end(client)
 
 
 def _start_relayed(lab: Lab) -> int:
@@ -270,8 +258,3 @@ def _wait_for_relayed(lab: Lab) -> int:
     wait_for_log(lab, "createConnection() - connection type changed to 2")
     assert page_through_the_tunnel(lab) == PAGES[0]
     return tunnel_client()
-
-
-def _wait_for_end(client: int) -> None:
-    """Wait until the tunnel's client is gone; told to end, it takes its time."""
-    wait_until(lambda: client not in daemon.running("openvpn"), "the tunnel's client to end", 20)

@@ -7,25 +7,22 @@ import re
 from lab import daemon, network
 from lab.account import SERVICE_HOST
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault
-from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED, RELAYED,
-                        asked, assert_published, assert_stops_clean, pages_from_outside,
-                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PAUSE,
+                        PUBLISHED, RELAYED, SILENT, asked, assert_published, assert_stops_clean,
+                        pages_from_outside, ports_tested, wait_for_cycle, wait_for_log,
+                        wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 from lab.support import wait_until
 
 _NO_RELAY = Situation(static=NO_TUNNEL, clock=FAST)
-_SILENT = GatewaySetup(upnp=False)
 _ELSEWHERE = "44.128.0.99"
 _LONGEST_ANSWER = 10238
 # Three candidate ports, three tries each.
 _TRIES = 9
 _HERE = network.GATEWAY_WAN_ADDRESS
 
-_PAUSE = "DaemonControl::run - retry connection after "
-_NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
-_NOT_DUE = "createDirectConnection() - Ignore Port Test due to Interval 240."
 _CHECK = "ConnectionManager::checkDNS - "
 _TORN_DOWN = "nslookup failed or does not match local value, kill existing connections."
 _PROCEED = "Therefore using sleep time 0 secs."
@@ -47,7 +44,7 @@ def service_says_wait(lab: Lab) -> None:
     """The service says wait: no test, no relay; it permits: forwarded; wait again: kept."""
     lab.central.wait_seconds = 300
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, f"{_PAUSE}300 secs.")
+    wait_for_log(lab, f"{PAUSE}300 secs.")
     lab.central.wait_seconds = 0
     assert asked(lab) == [COMM_STATUS, PORT_FORWARD, WAIT]
     assert lab.gateway.mappings() == []
@@ -62,7 +59,7 @@ def service_says_wait(lab: Lab) -> None:
     lab.step("the next test of the ports falls due, and the service says wait again")
     lab.central.wait_seconds = 300
     before = len(lab.central.requests)
-    wait_for_log(lab, f"{_PAUSE}300 secs.", 2)
+    wait_for_log(lab, f"{PAUSE}300 secs.", 2)
     assert asked(lab, before) == [WAIT]
     assert lab.device.messages.count("testPort success 1, current connectionType 1.") == 1
     assert_published(lab)
@@ -155,12 +152,12 @@ def service_goes_away_later(lab: Lab) -> None:
 
     lab.step("the service goes away; until the next test nothing changes")
     lab.central.stop()
-    wait_for_log(lab, _NOT_DUE)
+    wait_for_log(lab, NOT_DUE)
     assert lab.device.status == "portforwarded"
     assert lab.gateway.mappings() == BOTH_MAPPED
 
     lab.step("the test falls due: it fails, so does the search and the relay")
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
     assert lab.device.messages.count("port check failed, retrying in 5 seconds") == 3 + _TRIES
     assert lab.gateway.mappings() == []
@@ -181,7 +178,7 @@ def failed_test_leaves_https_open(lab: Lab) -> None:
 
     lab.step("the ports no longer pass the test")
     lab.central.misbehave(PORT_TEST, Fault(drop=True))
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     with lab.daemon.held():
         assert lab.device.status == "failed"
         assert lab.central.record is None
@@ -199,7 +196,7 @@ def publishing_fails(lab: Lab) -> None:
     # The first of the two requests is the clean slate at the start.
     lab.central.misbehave(PORT_FORWARD, Fault(drop=True, times=2))
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, _NOT_RELAYED)
+    wait_for_log(lab, NOT_RELAYED)
     with lab.daemon.held():
         assert lab.device.statuses_told() == ["connecting", "failed"]
         assert lab.device.messages.count("failed to update mapping info, attempting to delete "
@@ -213,16 +210,16 @@ def publishing_fails(lab: Lab) -> None:
 
     lab.step("the relay's attempt has forgotten the ports: they wait for the next search")
     wait_for_status(lab, "portforwarded")
-    assert lab.device.messages.count(_NOT_RELAYED) == 2
+    assert lab.device.messages.count(NOT_RELAYED) == 2
     assert _addresses_told(lab) == ["NULL", _HERE, "NULL", "NULL", _HERE]
-    assert [test.port for test in lab.central.port_tests] == [9091, 9091]
+    assert ports_tested(lab) == [9091, 9091]
     assert lab.device.messages.count("Router::unmapPort() - success") == 0
     assert_published(lab)
     assert_stops_clean(lab)
 
 
 # Faster than other tunnels: four pauses pass here.
-@scenario(Situation(gateway=_SILENT, relay=True, clock=40))
+@scenario(Situation(gateway=SILENT, relay=True, clock=40))
 def publishing_fails_while_relayed(lab: Lab) -> None:
     """A relayed device cannot publish its new ports: only the check of the names mends that."""
     lab.start_daemon(*OPTIONS)
@@ -237,7 +234,7 @@ def publishing_fails_while_relayed(lab: Lab) -> None:
     lab.step("the next cycle takes the ports for published and stays with them")
     wait_for_log(lab, "createConnection() - connection type changed to 1")
     with lab.daemon.held():
-        assert lab.device.messages.count(_NOT_DUE) == 1
+        assert lab.device.messages.count(NOT_DUE) == 1
         assert len(lab.central.requests) == before
         assert lab.central.record is None
         assert lab.gateway.mappings() == BOTH_MAPPED
@@ -328,7 +325,7 @@ def names_disagree(lab: Lab) -> None:
                                           "portforwarded", "disabled"]
 
 
-@scenario(Situation(gateway=_SILENT, relay=True, clock=RELAYED))
+@scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def relay_names_lead_elsewhere(lab: Lab) -> None:
     """The names of a relayed device lead elsewhere: its tunnel ends, and another comes up."""
     lab.start_daemon(*OPTIONS)
@@ -369,11 +366,11 @@ def _play_fault(lab: Lab, fault: Fault, error: str, count: int, *operations: str
 def _assert_fails(lab: Lab, error: str, count: int) -> None:
     """The first cycle meets this error so often: nothing is proven, published or left behind."""
     lab.start_daemon(*OPTIONS)
-    wait_for_log(lab, _PAUSE)
+    wait_for_log(lab, PAUSE)
     lines = lab.device.messages.texts()
-    end = next(number for number, line in enumerate(lines) if line.startswith(_PAUSE))
+    end = next(number for number, line in enumerate(lines) if line.startswith(PAUSE))
     assert sum(error in line for line in lines[:end]) == count
-    assert sum(_NOT_RELAYED in line for line in lines[:end]) == 1
+    assert sum(NOT_RELAYED in line for line in lines[:end]) == 1
     assert lab.device.statuses_told() == ["connecting", "failed"]
     assert set(_addresses_told(lab)) <= {"NULL"}
     assert lab.central.record is None

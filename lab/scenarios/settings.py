@@ -4,11 +4,12 @@ from __future__ import annotations
 
 import random
 
-from lab import daemon, network
+from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
 from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_published, assert_stops_clean,
-                        assert_told_by_the_next_cycle, pages_from_outside, tunnel_client,
-                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
+                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
+                        tunnel_client, wait_for_client_end, wait_for_cycle, wait_for_log,
+                        wait_for_next_cycle, wait_for_status)
 from lab.device import DYNAMIC_COPY, DYNAMIC_FILE
 from lab.gateway import NO_PORT, GatewaySetup, Mapping
 from lab.scenario import Lab, Situation
@@ -110,7 +111,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     wait_for_status(lab, "portforwarded")
     assert len(lab.central.port_tests) == 1
     assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded"]
-    lab.wait_for(lambda: client not in daemon.running("openvpn"), "the tunnel to be gone", 20)
+    wait_for_client_end(client)
     assert_published(lab)
     assert_stops_clean(lab)
 
@@ -166,7 +167,7 @@ def internal_ports_change(lab: Lab) -> None:
         "/local/comm_status?status=portforwarded"]
     assert lab.gateway.mappings() == [Mapping("TCP", 9092, network.DEVICE_ADDRESS, 8080),
                                       Mapping("TCP", 9444, network.DEVICE_ADDRESS, 8443)]
-    assert [test.port for test in lab.central.port_tests] == [9091, 9091, 9091, 9091, 9092]
+    assert ports_tested(lab) == [9091, 9091, 9091, 9091, 9092]
     assert lab.central.record.http_port == 9092
     assert pages_from_outside(9092, 9444) == PAGES
     assert_stops_clean(lab)

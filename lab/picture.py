@@ -22,6 +22,7 @@ _HEADINGS_TOP, _HEADING, _LANE, _LINE, _AXIS = 56, 20, 38, 20, 64
 _COLUMNS, _TIME_AT, _WHO_AT, _TEXT_AT = (30, 625), 96, 103, 183
 _TITLE_LETTERS, _HEADING_LETTERS, _LIST_LETTERS = 105, 60, 48
 _MOST_NUDGE = 20
+_LEAST_LETTERS = 20
 _LETTER = 8  # mean width of a letter in the widest of the usual fonts
 _UNPRINTABLE = re.compile("[^\t\n\r\x20-\ud7ff\ue000-\ufffd\U00010000-\U0010ffff]")
 
@@ -70,14 +71,15 @@ class _Mark:
 
 
 class _Scale:
-    """Seconds to places; late headings and the last status find room for their words."""
+    """Seconds to places; the last status finds room for its word, late headings for some words."""
 
     def __init__(self, events: Sequence[Event]) -> None:
-        words = [(event.when, _heading(event)) for event in events if event.who == STORY]
-        words += _statuses(events)[-1:]
+        words = [(event.when, _LEAST_LETTERS) for event in events if event.who == STORY]
+        words += [(when, len(word)) for when, word in _statuses(events)[-1:]]
         end = max([event.when for event in events] + [1])
         self._unit = min([(_RIGHT - _LEFT) / end] + [
-            (_RIGHT - _LEFT - len(word) * _LETTER - 12) / when for when, word in words if when > 0])
+            (_RIGHT - _LEFT - letters * _LETTER - 12) / when for when, letters in words
+            if when > 0])
 
     def x(self, when: float) -> float:
         """Where a moment is."""
@@ -171,8 +173,10 @@ def _statuses(events: Sequence[Event]) -> list[tuple[float, str]]:
     return [change for before, change in zip([(0.0, ""), *told], told) if change[1] != before[1]]
 
 
-def _heading(step: Event) -> str:
-    return textwrap.shorten(step.what, _HEADING_LETTERS, placeholder=" \u2026")
+def _heading(step: Event, scale: _Scale) -> str:
+    """The words of a step as far as there is room; the list has them all."""
+    letters = int((_RIGHT - scale.x(step.when)) / _LETTER)
+    return textwrap.shorten(step.what, min(_HEADING_LETTERS, letters), placeholder=" \u2026")
 
 
 def _step_rows(events: Sequence[Event], scale: _Scale) -> list[tuple[Event, int]]:
@@ -183,7 +187,7 @@ def _step_rows(events: Sequence[Event], scale: _Scale) -> list[tuple[Event, int]
         x = scale.x(step.when)
         crossed = [row for (_, row), end in zip(rows, ends) if end > x]
         rows.append((step, max(crossed, default=-1) + 1))
-        ends.append(x + len(_heading(step)) * _LETTER + 8)
+        ends.append(x + len(_heading(step, scale)) * _LETTER + 8)
     return rows
 
 
@@ -229,7 +233,7 @@ def _draw_steps(sheet: _Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]]
     for step, row in steps:
         x, y = scale.x(step.when), _HEADINGS_TOP + row * _HEADING
         sheet.draw("line", x1=x, x2=x, y1=y + 2, y2=end + 6, stroke=_STORY, stroke_dasharray="4 3")
-        sheet.write(_heading(step), x + 5, y + 14, fill=_STORY, font_size=13, font_weight="bold")
+        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13, font_weight="bold")
 
 
 def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],

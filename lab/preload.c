@@ -19,10 +19,10 @@
 #include <time.h>
 #include <unistd.h>
 
-enum { FASTER_POLL = 10 };
+enum { FASTER = 10 };
 
 int poll(struct pollfd* fds, nfds_t count, int milliseconds) {
-    long long nanoseconds = milliseconds * 1000000LL / FASTER_POLL;
+    long long nanoseconds = milliseconds * 1000000LL / FASTER;
     struct timespec limit = {nanoseconds / 1000000000, nanoseconds % 1000000000};
     return (int)syscall(SYS_ppoll, fds, count, milliseconds < 0 ? NULL : &limit, NULL, 0);
 }

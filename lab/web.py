@@ -17,7 +17,6 @@ from lab import network
 from lab.certificates import KeyPair
 from lab.support import wait_until
 
-
 _ANSWER_SECONDS = 10
 # On, for no seconds: closing discards what is on its way and resets the connection.
 _NO_LINGERING = struct.pack("ii", 1, 0)

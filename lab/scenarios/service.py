@@ -7,10 +7,10 @@ import re
 from lab import daemon, network
 from lab.account import SERVICE_HOST
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault
-from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PAUSE,
-                        PUBLISHED, RELAYED, SILENT, asked, assert_published, assert_stops_clean,
-                        pages_from_outside, ports_tested, wait_for_cycle, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS,
+                        PAGES, PAUSE, PUBLISHED, RELAYED, SILENT, asked, assert_published,
+                        assert_stops_clean, pages_from_outside, ports_tested, wait_for_cycle,
+                        wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -218,8 +218,7 @@ def publishing_fails(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
-# Faster than other tunnels: four pauses pass here.
-@scenario(Situation(gateway=SILENT, relay=True, clock=40))
+@scenario(Situation(gateway=SILENT, relay=True, clock=IMPATIENT))
 def publishing_fails_while_relayed(lab: Lab) -> None:
     """A relayed device cannot publish its new ports: only the check of the names mends that."""
     lab.start_daemon(*OPTIONS)

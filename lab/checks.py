@@ -41,14 +41,15 @@ PUBLISHED = Record(network.GATEWAY_WAN_ADDRESS, network.DEVICE_ADDRESS, 9091, 94
 PAGES = ["welcome to mynas, over http", "welcome to mynas, over https"]
 
 
-def wait_for_status(lab: Lab, status: str, seconds: float = _PATIENCE) -> None:
+def wait_for_status(lab: Lab, status: str) -> None:
     """Wait until the device's own configuration holds the status."""
-    lab.wait_for(lambda: lab.device.status == status, f"status {status}", seconds)
+    lab.wait_for(lambda: lab.device.status == status, f"status {status}", _PATIENCE)
 
 
-def wait_for_log(lab: Lab, part: str, count: int = 1, seconds: float = _PATIENCE) -> None:
+def wait_for_log(lab: Lab, part: str, count: int = 1) -> None:
     """Wait until the device's log has held a text this often."""
-    lab.wait_for(lambda: lab.device.messages.count(part) >= count, f"{count} x [{part}]", seconds)
+    lab.wait_for(lambda: lab.device.messages.count(part) >= count, f"{count} x [{part}]",
+                 _PATIENCE)
 
 
 def wait_for_cycle(lab: Lab, number: int) -> None:

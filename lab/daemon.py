@@ -64,10 +64,10 @@ class Daemon:
         finally:
             os.kill(self.pid, signal.SIGCONT)
 
-    def stop(self, number: int = signal.SIGTERM, seconds: float = 60) -> str:
+    def stop(self, number: int = signal.SIGTERM) -> str:
         """Send a signal and return how the daemon ended."""
         os.kill(self.pid, number)
-        return wait_until(self.ended, f"the daemon to end after signal {number}", seconds)
+        return wait_until(self.ended, f"the daemon to end after signal {number}", 60)
 
 
 def running(program: str) -> list[int]:

@@ -149,7 +149,6 @@ def _mapping(protocol: str, element: list) -> Mapping:
 
 
 def _install(name: str, script: str) -> None:
-    """Put a script into the device's /etc/scripts, for which the lab's /etc needs a place."""
-    Path("/etc/scripts").mkdir(exist_ok=True)
+    """Put a script into the device's /etc/scripts."""
     network.host_file(network.DEVICE, f"scripts/{name}", script)
     Path("/etc/netns", network.DEVICE, "scripts", name).chmod(0o755)

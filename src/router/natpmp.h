@@ -11,8 +11,9 @@
 namespace pelorus {
 
 /// NAT-PMP client for the default gateway. Opened by the first request and kept open until it is
-/// destroyed. A request blocks for at most three reads of the library's retry schedule; every
-/// failure is logged and returned as false.
+/// destroyed. A request blocks for at most three reads of the library's retry schedule. One that
+/// follows a request whose answer needed repetitions first takes in what is still owed, and may wait
+/// a second for each. Every failure is logged and returned as false.
 class CMnatpmp {
 public:
     CMnatpmp() = default;

@@ -96,8 +96,7 @@ class Gateway:
         """Route and masquerade; offer the protocols of the setup and wait for their answers."""
         threading.Thread(target=packet_filter.watch, args=(self._tell_change,),
                          daemon=True).start()
-        with network.inside(network.GATEWAY):
-            Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
+        network.enable_forwarding(network.GATEWAY)
         packet_filter.load()
         self._serve()
 

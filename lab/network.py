@@ -102,6 +102,12 @@ def plug(host: str, port: str, switch_host: str, switch: str) -> None:
     ip_batch(f"link set {port} up", host=host)
 
 
+def enable_forwarding(host: str) -> None:
+    """Make a host pass packets on between its networks."""
+    with inside(host):
+        Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
+
+
 def cable_end(host: str, port: str) -> str:
     """The name of a cable's end at the switch."""
     return f"{host}-{port}"

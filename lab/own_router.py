@@ -2,14 +2,12 @@
 
 from __future__ import annotations
 
-import json
-import subprocess
 import threading
 from pathlib import Path
+from typing import Any
 
-from lab import network
+from lab import network, nft
 from lab.packet_filter import Mapping
-from lab.support import run_tool
 from lab.timeline import Timeline
 
 _FOLDER = Path("/run/own_router")
@@ -81,7 +79,7 @@ class OwnRouter:
             file.write_text(text)
         _install("getip.sh", _GET_IP)
         _install("tavik_helper.sh", _HELPER)
-        run_tool(*network.command(network.DEVICE, "nft", "-f", "-"), text=_RULES)
+        nft.change(network.DEVICE, _RULES)
         threading.Thread(target=self._watch, daemon=True).start()
 
     def predefine(self, first: int, last: int, internal_port: int, owner: str = "BRENVIK",
@@ -94,8 +92,7 @@ class OwnRouter:
         ports = str(first) if first == last else f"{first}-{last}"
         elements = ", ".join(f"{port} : {address} . {internal_port}"
                              for port in range(first, last + 1))
-        run_tool(*network.command(network.DEVICE, "nft", "create", "element", "inet", "router",
-                                  "TCP", f"{{ {elements} }}"))
+        nft.change(network.DEVICE, f"create element inet router TCP {{ {elements} }}\n")
         with _PREDEFINED.open("a") as file:
             file.write(f"{owner},TCP,{ports},{address},{internal_port},pre-defined\n")
 
@@ -117,9 +114,8 @@ class OwnRouter:
         """The forwards in force, read from the packet filter."""
         found: list[Mapping] = []
         for protocol in ("TCP", "UDP"):
-            answer = network.output(network.DEVICE, "nft", "-j", "list", "map", "inet", "router",
-                                    protocol)
-            held = next(entry["map"] for entry in json.loads(answer)["nftables"] if "map" in entry)
+            listed = nft.listed(network.DEVICE, "map", "inet", "router", protocol)
+            held = next(entry["map"] for entry in listed if "map" in entry)
             found += [_mapping(protocol, element) for element in held.get("elem", [])]
         return sorted(found)
 
@@ -130,19 +126,15 @@ class OwnRouter:
     def _watch(self) -> None:
         """Tell the timeline of every change of the forwards, whoever made it."""
         words = {"add": "forwards", "create": "forwards", "delete": "no longer forwards"}
-        monitor = subprocess.Popen(
-            network.command(network.DEVICE, "nft", "-j", "monitor", "elements"),
-            stdout=subprocess.PIPE, text=True)
-        for line in monitor.stdout:
-            for change, subject in json.loads(line).items():
-                changed = subject.get("element", {})
-                if change in words and changed.get("table") == "router":
-                    for element in changed["elem"]["set"]:
-                        mapping = _mapping(changed["name"], element)
-                        self._timeline.add("router", f"{words[change]} {mapping}")
+        for verb, subject in nft.monitor(network.DEVICE, "elements"):
+            changed = subject.get("element", {})
+            if verb in words and changed.get("table") == "router":
+                for element in changed["elem"]["set"]:
+                    mapping = _mapping(changed["name"], element)
+                    self._timeline.add("router", f"{words[verb]} {mapping}")
 
 
-def _mapping(protocol: str, element: list) -> Mapping:
+def _mapping(protocol: str, element: list[Any]) -> Mapping:
     """Read one element of a map; the filter gives it as [port, {"concat": [address, port]}]."""
     external_port, target = element
     return Mapping(protocol, external_port, *target["concat"])

@@ -2,11 +2,8 @@
 
 from __future__ import annotations
 
-from pathlib import Path
-
-from lab import network
+from lab import network, nft
 from lab.gateway import Gateway
-from lab.support import run_tool
 from lab.timeline import Timeline
 
 HOST = "provider"
@@ -48,9 +45,8 @@ class Provider:
         network.plug(HOST, "net", network.INTERNET, "net")
         network.ip_batch(f"address add {ADDRESS}/24 dev net",
                          f"route add default via {network.SERVICE_ADDRESS}", host=HOST)
-        with network.inside(HOST):
-            Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
-        run_tool(*network.command(HOST, "nft", "-f", "-"), text=_RULES)
+        network.enable_forwarding(HOST)
+        nft.change(HOST, _RULES)
         network.ip_batch(f"link set {_CABLE} nomaster netns {HOST}", host=network.INTERNET)
         network.ip_batch(f"address add {_ROUTER_ADDRESS}/24 dev {_CABLE}",
                          f"link set {_CABLE} up", host=HOST)

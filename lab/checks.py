@@ -9,7 +9,8 @@ from itertools import takewhile
 from lab import daemon, network, web
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, PortTest, Record
 from lab.device import DYNAMIC_COPY, HOME
-from lab.gateway import GatewaySetup, Mapping
+from lab.gateway import GatewaySetup
+from lab.packet_filter import Mapping
 from lab.scenario import Lab
 from lab.support import wait_until
 

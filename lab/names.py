@@ -67,13 +67,13 @@ class Names:
 
     def _publish(self, names: Iterable[str]) -> None:
         """Give the server its table, and return once it answers for these names accordingly."""
-        table = {**self._table, **self._pins}
+        table: dict[str, str | None] = {**self._table, **self._pins}
         self._hosts.write_text("".join(f"{address} {name}\n"
                                        for name, address in table.items() if address))
         self.server.send_signal(signal.SIGHUP)
         for name in names:
             wanted = [table[name]] if table.get(name) else []
-            wait_until(lambda name=name, wanted=wanted: self._ask(name) == wanted,
+            wait_until(lambda: self._ask(name) == wanted,
                        f"dnsmasq to answer {wanted} for {name}", 5, pause=0.01)
 
     def _ask(self, name: str) -> list[str] | None:

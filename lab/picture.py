@@ -39,7 +39,7 @@ class _Entry:
     def colour(self) -> str:
         """A status has its own colour, everything else its actor's."""
         status = self.event.what.removeprefix(_STATUS)
-        return STATUS_COLOURS.get(status) or _ACTOR_COLOURS.get(self.event.who, _OTHER)
+        return STATUS_COLOURS.get(status, _ACTOR_COLOURS.get(self.event.who, _OTHER))
 
     def lines(self) -> list[str]:
         """The text, cut to fit a column."""
@@ -110,7 +110,8 @@ class _Sheet:
 
     def write(self, text: str, x: float, y: float, **attributes: str | float) -> None:
         """Add a line of text."""
-        self.draw("text", text, **{"x": x, "y": y, "font_size": 14, **attributes})
+        placed: dict[str, str | float] = {"x": x, "y": y, "font_size": 14}
+        self.draw("text", text, **placed | attributes)
 
     def mark(self, mark: _Mark, y: float, colour: str) -> None:
         """Add numbers in a box with round corners."""
@@ -233,7 +234,8 @@ def _draw_steps(sheet: _Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]]
     for step, row in steps:
         x, y = scale.x(step.when), _HEADINGS_TOP + row * _HEADING
         sheet.draw("line", x1=x, x2=x, y1=y + 2, y2=end + 6, stroke=_STORY, stroke_dasharray="4 3")
-        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13, font_weight="bold")
+        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13,
+                    font_weight="bold")
 
 
 def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],

@@ -52,7 +52,7 @@ class Lab:
         self.situation = situation
         self.timeline = timeline
         self.account = Account()
-        self.daemon: Daemon | None = None
+        self._daemon: Daemon | None = None
         socket.sethostname(self.account.host_name)
         network.raise_home_network(situation.own_router)
         authority = Authority(_FOLDER / "authority")
@@ -83,8 +83,15 @@ class Lab:
     def start_daemon(self, *options: str) -> Daemon:
         """Run the daemon on the device."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
-        self.daemon = Daemon(options, self.situation.clock, self.situation.hasty)
-        return self.daemon
+        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty)
+        return self._daemon
+
+    @property
+    def daemon(self) -> Daemon:
+        """The daemon that was started last; LabError before the first start."""
+        if self._daemon is None:
+            raise LabError("no daemon was started")
+        return self._daemon
 
     def step(self, heading: str) -> None:
         """Begin the next part of the story; a failure report shows the device's log from here."""
@@ -92,7 +99,6 @@ class Lab:
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""
-        assert self.daemon is not None
         self.timeline.add("device", f"pelorus gets {signal.Signals(number).name}")
         how = self.daemon.stop(number)
         self.timeline.add("device", f"pelorus ended by {how}")
@@ -102,8 +108,8 @@ class Lab:
         """Wait for a state while the daemon runs; its death ends the waiting at once."""
 
         def seen() -> Seen:
-            if self.daemon and self.daemon.ended():
-                raise LabError(f"the daemon ended ({self.daemon.ended()}) before {what}")
+            if self._daemon and self._daemon.ended():
+                raise LabError(f"the daemon ended ({self._daemon.ended()}) before {what}")
             return condition()
 
         return wait_until(seen, what, seconds)
@@ -116,7 +122,7 @@ class Lab:
             "timeline": str(self.timeline),
             f"device log of the last part, {min(len(log), _LOG_LINES)} of {len(log)} lines":
                 "\n".join(log[-_LOG_LINES:]),
-            "daemon": f"{self.daemon.ended() or 'running' if self.daemon else 'not started'}, "
+            "daemon": f"{self._daemon.ended() or 'running' if self._daemon else 'not started'}, "
                       f"output:\n{last_lines(daemon.OUTPUT)}",
             "servers": "\n".join(server.state() for server in (
                 self.names.server, self.gateway.server, self.relay.server)),

@@ -89,7 +89,7 @@ class WebServer(ThreadingHTTPServer):
                                                do_handshake_on_connect=False)
         return connection, peer
 
-    def shutdown_request(self, request: socket.socket) -> None:
+    def shutdown_request(self, request: socket.socket | tuple[bytes, socket.socket]) -> None:
         """Close only: a connection that is to be reset must not say goodbye first."""
         self.close_request(request)
 
@@ -109,7 +109,7 @@ class WebServer(ThreadingHTTPServer):
 class _Handler(BaseHTTPRequestHandler):
     server: WebServer
 
-    def do_GET(self) -> None:  # noqa: N802 (the name is the base class's)
+    def do_GET(self) -> None:
         reply = self.server.reply_to(self.client_address[0], self.path)
         if reply.body is None:
             if reply.reset:

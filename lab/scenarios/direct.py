@@ -11,7 +11,8 @@ from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NOT_DUE, OPTIONS, PAGES, a
                         assert_published, assert_stops_clean, assert_told_in_order,
                         page_through_the_tunnel, pages_from_outside, ports_tested, start_direct,
                         wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
-from lab.gateway import STOCK_PERMISSIONS, GatewaySetup, Mapping
+from lab.gateway import STOCK_PERMISSIONS, GatewaySetup
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 

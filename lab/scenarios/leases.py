@@ -15,8 +15,9 @@ from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, asked, assert_log_is_
                         assert_published, assert_stops_clean, mapping_changes, pages_from_outside,
                         wait_for_log, wait_for_mapping_changes, wait_for_next_cycle,
                         wait_for_status)
-from lab.gateway import GatewaySetup, Mapping
+from lab.gateway import GatewaySetup
 from lab.natpmp import Grant
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 from lab.support import wait_until

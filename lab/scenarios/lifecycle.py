@@ -15,7 +15,7 @@ from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, S
                         assert_stops_clean, mapping_changes, page_through_the_tunnel,
                         pages_from_outside, tunnel_client, wait_for_client_end, wait_for_cycle,
                         wait_for_log, wait_for_next_cycle, wait_for_status)
-from lab.gateway import Mapping
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 from lab.support import wait_until
@@ -83,7 +83,7 @@ def stopped_in_a_port_test(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT in a slow port test: published after it, then withdrawn again."""
     lab.central.misbehave(PORT_TEST, Fault(delay=2))
     for time in _until_each_signal(lab, "while the service tests the port"):
-        lab.wait_for(lambda time=time: len(lab.central.requests_for(PORT_TEST)) == time,
+        lab.wait_for(lambda: len(lab.central.requests_for(PORT_TEST)) == time,
                      "the port test", 60)
         assert lab.gateway.mappings() == BOTH_MAPPED[:1]
     assert len(lab.central.port_tests) == len(_SIGNALS)
@@ -142,7 +142,7 @@ def power_cut(lab: Lab) -> None:
         assert pages_from_outside() == PAGES
         end = len(lab.device.messages.all) + cut
         lab.start_daemon(*OPTIONS)
-        wait_until(lambda end=end: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
+        wait_until(lambda: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
         _kill(lab)
         # When the gateway has answered that, it has done what the daemon had asked for.
         lab.gateway.listing()
@@ -154,7 +154,7 @@ def power_cut(lab: Lab) -> None:
             assert_published(lab)
             changes = [*(f"no longer forwards {mapping}" for mapping in left),
                        *(f"forwards {mapping}" for mapping in BOTH_MAPPED)]
-            wait_until(lambda changes=changes: mapping_changes(lab)[-len(changes):] == changes,
+            wait_until(lambda: mapping_changes(lab)[-len(changes):] == changes,
                        f"the gateway to tell {changes}", 5)
     assert_stops_clean(lab)
 

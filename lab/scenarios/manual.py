@@ -8,7 +8,7 @@ from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTI
                         PUBLISHED, SILENT, assert_published, assert_stops_clean,
                         assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
                         wait_for_log, wait_for_status)
-from lab.gateway import Mapping
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
@@ -196,8 +196,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
     with lab.daemon.held():
         lab.provider.remove()
     wait_for_status(lab, "portforwarded")
-    assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP",
-                                                      lab.account.device_id)
+    assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP", lab.account.device_id)
     _assert_published_by_hand(lab)
     assert_stops_clean(lab)
 

@@ -7,7 +7,7 @@ from lab.central import COMM_STATUS, PORT_TEST, Fault, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
                         assert_stops_clean, pages_from_outside, wait_for_log, wait_for_next_cycle,
                         wait_for_status)
-from lab.gateway import Mapping
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 

@@ -3,8 +3,9 @@
 from __future__ import annotations
 
 import sys
-from collections.abc import Callable, Iterator
+from collections.abc import Callable, Generator
 from pathlib import Path
+from typing import Any
 
 import pytest
 
@@ -58,7 +59,7 @@ def play() -> Callable[[Situation], Lab]:
 
 
 @pytest.hookimpl(hookwrapper=True)
-def pytest_runtest_makereport(item: pytest.Item) -> Iterator[None]:
+def pytest_runtest_makereport(item: pytest.Item) -> Generator[None, Any, None]:
     """Add the lab's own report to a failure."""
     outcome = yield
     report = outcome.get_result()

@@ -46,7 +46,7 @@ def processes_in(pid_namespace: str) -> list[str]:
     return found
 
 
-def test_demo_shows_the_way_and_ends_well():
+def test_demo_shows_the_way_and_ends_well() -> None:
     before = traces()
     demo = start_demo()
     text, _ = demo.communicate(timeout=90)
@@ -61,7 +61,7 @@ def test_demo_shows_the_way_and_ends_well():
     assert traces() == before
 
 
-def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path):
+def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path: Path) -> None:
     listed, _ = start_demo("--list").communicate(timeout=20)
     assert [line.split()[0] for line in listed.splitlines()] == list(SCENARIOS)
     picture = tmp_path / "ports-taken.svg"
@@ -74,7 +74,7 @@ def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path):
     assert "forwards TCP 9445 -> 192.168.77.10:443" in words
 
 
-def test_demo_fails_with_a_daemon_that_does_nothing():
+def test_demo_fails_with_a_daemon_that_does_nothing() -> None:
     demo = start_demo(binary=Path("/bin/true"))
     text, _ = demo.communicate(timeout=60)
     assert demo.returncode == 1, text
@@ -83,17 +83,18 @@ def test_demo_fails_with_a_daemon_that_does_nothing():
 
 @pytest.mark.parametrize("end", [signal.SIGINT, signal.SIGTERM, signal.SIGKILL],
                          ids=["Ctrl-C", "kill", "kill-9"])
-def test_lab_that_stays_up_leaves_no_trace_after(end):
+def test_lab_that_stays_up_leaves_no_trace_after(end: signal.Signals) -> None:
     before = traces()
     demo = start_demo("--stay")
     said: list[str] = []
-    for line in demo.stdout:
+    for line in demo.stdout or ():
         said.append(line)
         if "the view from outside" in line:
             break
     assert "the view from outside" in said[-1], "".join(said)
-    first = re.search(r"-t (\d+) ", said[-1])[1]
-    namespace = os.readlink(f"/proc/{first}/ns/pid")
+    entry = re.search(r"-t (\d+) ", said[-1])
+    assert entry, said[-1]
+    namespace = os.readlink(f"/proc/{entry[1]}/ns/pid")
     assert len(processes_in(namespace)) >= 4
     if end == signal.SIGINT:
         os.killpg(demo.pid, end)

@@ -2,9 +2,12 @@
 
 from __future__ import annotations
 
+from collections.abc import Callable
+
 import pytest
 
 from lab.relay import TUNNEL_DEVICE
+from lab.scenario import Lab, Situation
 from lab.scenarios import SCENARIOS
 
 NEEDS_TUNNEL = pytest.mark.skipif(not TUNNEL_DEVICE.exists(),
@@ -16,6 +19,6 @@ LONGEST_FIRST = sorted(SCENARIOS.values(), key=lambda scenario: "leases" not in 
 @pytest.mark.parametrize("name", [
     pytest.param(scenario.name, marks=NEEDS_TUNNEL if scenario.situation.relay else ())
     for scenario in LONGEST_FIRST])
-def test_scenario(play, name):
+def test_scenario(play: Callable[[Situation], Lab], name: str) -> None:
     scenario = SCENARIOS[name]
     scenario.play(play(scenario.situation))

@@ -80,17 +80,15 @@ std::size_t curlRcvData(void* data, std::size_t elemSize, std::size_t count, voi
         // The block leaves through httpGet, whose callers release it with free.
         buffer.data = static_cast<char*>(std::malloc(kReceiveBlockSize));  // NOLINT(*-no-malloc)
         if (buffer.data == nullptr) {
-            logLine(
-                LOG_ERR,
+            logError(
                 "TavikClient curlRcvData - failed to allocate memory for receive buffer, transfer aborted\n");
             return 0;
         }
     }
-    const std::size_t room = kLargestAnswer - static_cast<std::size_t>(buffer.size);
-    const bool fits = count == 0 || elemSize <= room / count;
+    const std::size_t remaining = kLargestAnswer - static_cast<std::size_t>(buffer.size);
+    const bool fits = count == 0 || elemSize <= remaining / count;
     if (!fits) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient curlRcvData - Buffer overrun detected, read buffer too small, transfer aborted\n");
         releaseBlock(buffer);
         return 0;
@@ -100,7 +98,7 @@ std::size_t curlRcvData(void* data, std::size_t elemSize, std::size_t count, voi
     buffer.size += static_cast<int>(bytes);
     return bytes;
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient curlRcvData - Throw exception error. **\n");
+    logError("** TavikClient curlRcvData - Throw exception error. **\n");
     return 0;
 }
 
@@ -128,8 +126,7 @@ TavikClient* TavikClient::getInstance() {
     if (!initialized) {
         if (!instance.initialize()) {
             instance.updateLocalCommStatus("disabled");
-            logLine(
-                LOG_ERR,
+            logError(
                 "TavikClient::getInstance() - initialize() returned false, set Comm Status to [disabled]\n");
         }
         initialized = true;
@@ -141,12 +138,11 @@ bool TavikClient::initialize() {
     portMapCheckSuccess = true;
     const bool complete = !getDeviceID().empty() && !getDeviceAuth().empty();
     if (!complete) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file\n");
     }
     if (curl_global_init(CURL_GLOBAL_ALL) != CURLE_OK) {
-        logLine(LOG_ERR, "TavikClient::initialize() - CURL initialization failed.\n");
+        logError("TavikClient::initialize() - CURL initialization failed.\n");
     }
     return complete;
 }
@@ -172,16 +168,14 @@ bool TavikClient::deriveServerUrls() {
         if (host + 1 < base.size()) serverHost = base.substr(host);
     }
     if (base.empty() || serverHost.empty()) {
-        logLine(LOG_ERR,
-                "TavikClient::getRestUrl - Invalid base server url %s. Return input urn.\n",
-                scrubSecrets(base).c_str());
+        logError("TavikClient::getRestUrl - Invalid base server url %s. Return input urn.\n",
+                 scrubSecrets(base).c_str());
         return false;
     }
     baseServerUrl = "http://" + serverHost;
-    logLine(LOG_INFO, "TavikClient::getRestUrl - baseServerUrl %s.\n",
-            scrubSecrets(baseServerUrl).c_str());
+    logInfo("TavikClient::getRestUrl - baseServerUrl %s.\n", scrubSecrets(baseServerUrl).c_str());
     baseSSLServerUrl = "https://" + serverHost;
-    logLine(LOG_INFO, "TavikClient::getRestUrl - baseSSLServerUrl %s.\n",
+    logInfo("TavikClient::getRestUrl - baseSSLServerUrl %s.\n",
             scrubSecrets(baseSSLServerUrl).c_str());
     return true;
 }
@@ -195,19 +189,18 @@ std::string TavikClient::getRestUrl(const std::string& urn, HttpType type) {
     } else if (type == HTTPS) {
         url = baseSSLServerUrl + urn;
     } else {
-        logLine(LOG_INFO,
-                "TavikClient::getRestUrl - Invalid http type %d. Use only the input urn.\n",
+        logInfo("TavikClient::getRestUrl - Invalid http type %d. Use only the input urn.\n",
                 static_cast<int>(type));
     }
     std::string logged = scrubSecrets(url);
     replaceAll(logged, "%", "_");
-    logLine(LOG_INFO, "TavikClient::getRestUrl - restURL %s.\n", logged.c_str());
+    logInfo("TavikClient::getRestUrl - restURL %s.\n", logged.c_str());
     return url;
 }
 
 char* TavikClient::httpGet(const char* url, int& size) {
     if (url == nullptr || *url == '\0') {
-        logLine(LOG_INFO, "TavikClient:httpGet - empty url\n");
+        logInfo("TavikClient:httpGet - empty url\n");
         return nullptr;
     }
     rcvBuffer = {};
@@ -217,11 +210,11 @@ char* TavikClient::httpGet(const char* url, int& size) {
             setOptions(handle.get(), url, rcvBuffer);
             const CURLcode result = curl_easy_perform(handle.get());
             if (result != CURLE_OK) {
-                logLine(LOG_ERR, "TavikClient::httpGet  Error: [%s]\n", curl_easy_strerror(result));
+                logError("TavikClient::httpGet  Error: [%s]\n", curl_easy_strerror(result));
             }
         }
     } catch (...) {
-        logLine(LOG_ERR, "** TavikClient::httpGet - Throw exception error. **\n");
+        logError("** TavikClient::httpGet - Throw exception error. **\n");
         releaseBlock(rcvBuffer);
         return nullptr;
     }
@@ -240,10 +233,10 @@ std::string TavikClient::nsLookup(const std::string& hostname) const {
     addrinfo* found = nullptr;
     const int error = getaddrinfo(hostname.c_str(), nullptr, nullptr, &found);
     if (error != 0) {
-        logLine(LOG_ERR, "TavikClient::nsLookup() - getAddrInfo failed with error: %s\n",
-                gai_strerror(error));
-        logLine(LOG_ERR, "TavikClient::nsLookup() - getAddrInfo failed hostname: %s\n",
-                scrubSecrets(hostname).c_str());
+        logError("TavikClient::nsLookup() - getAddrInfo failed with error: %s\n",
+                 gai_strerror(error));
+        logError("TavikClient::nsLookup() - getAddrInfo failed hostname: %s\n",
+                 scrubSecrets(hostname).c_str());
         return {};
     }
     const AddrInfoHandle list{found};

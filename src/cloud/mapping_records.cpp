@@ -17,22 +17,19 @@ constexpr const char* kLocalSuccess = "success";
 
 // What the local back end is told; its objections are logged and do not count.
 bool updateLocalRecord(const MaskedUrl& url) {
-    logLine(LOG_INFO, "TavikClient::updateServerMapping - update local config url: %s\n",
-            url.logged.c_str());
+    logInfo("TavikClient::updateServerMapping - update local config url: %s\n", url.logged.c_str());
     const auto answer = fetchLocal(url.request);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateServerMapping - failed to get response from localhost for url: [%s].\n",
             url.logged.c_str());
         return false;
     }
     if (!contains(answer->text, kLocalSuccess)) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateServerMapping - failure response received from localhost for url: [%s].\n",
             url.logged.c_str());
-        logLine(LOG_ERR, "Response: %s", scrubSecrets(answer->text).c_str());
+        logError("Response: %s", scrubSecrets(answer->text).c_str());
     }
     return true;
 }
@@ -40,18 +37,16 @@ bool updateLocalRecord(const MaskedUrl& url) {
 bool deleteLocalRecord(const std::string& url) {
     const auto answer = fetchLocal(url);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::deleteServerMapping - failed to get response from localhost for url: [%s]\n",
             scrubSecrets(url).c_str());
         return false;
     }
     if (!contains(answer->text, kLocalSuccess)) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::deleteServerMapping - failure response received from localhost for url: [%s]\n",
             scrubSecrets(url).c_str());
-        logLine(LOG_ERR, "Response: [%s]\n", scrubSecrets(answer->text).c_str());
+        logError("Response: [%s]\n", scrubSecrets(answer->text).c_str());
         return false;
     }
     return true;
@@ -76,68 +71,62 @@ bool TavikClient::updateServerMapping(const std::string& externalIp,
                                       int internalHttpPort,
                                       int /*internalHttpsPort*/) try {
     if (getDeviceID().empty()) {
-        logLine(LOG_ERR,
-                "TavikClient::updateServerMapping - failed to get Device ID from DynamicConfig.\n");
+        logError(
+            "TavikClient::updateServerMapping - failed to get Device ID from DynamicConfig.\n");
         return false;
     }
     if (getDeviceAuth().empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateServerMapping - failed to get Device Auth Code from DynamicConfig.\n");
         return false;
     }
     const MaskedUrl url = forwardingUrl(externalIp, localIp, externalHttpPort, externalHttpsPort);
-    logLine(LOG_INFO, "TavikClient::updateServerMapping - set port forward url: %s\n",
-            url.logged.c_str());
+    logInfo("TavikClient::updateServerMapping - set port forward url: %s\n", url.logged.c_str());
     const auto answer = fetchCentral(url);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateServerMapping - httpGet failed to get response from central server for url %s.\n",
             url.logged.c_str());
         return false;
     }
-    logLine(LOG_NOTICE, "TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
-            scrubSecrets(answer->text).c_str(), answer->size);
+    logNotice("TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
+              scrubSecrets(answer->text).c_str(), answer->size);
     // The local back end expects the internal HTTP port in the last place too.
     return updateLocalRecord(fillMaskedTemplate(kLocalSetKey, setting(kLocalSetKey),
                                                 {internalHttpPort, externalIp, externalHttpPort,
                                                  externalHttpsPort, localIp, internalHttpPort}));
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::updateServerMapping - Throw exception error. **\n");
+    logError("** TavikClient::updateServerMapping - Throw exception error. **\n");
     return false;
 }
 
 bool TavikClient::deleteServerMapping(int internalHttpPort, const std::string& localIp) try {
     if (getDeviceID().empty()) {
-        logLine(LOG_ERR,
-                "TavikClient::deleteServerMapping - failed to get Device ID from DynamicConfig.\n");
+        logError(
+            "TavikClient::deleteServerMapping - failed to get Device ID from DynamicConfig.\n");
         return false;
     }
     if (getDeviceAuth().empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::deleteServerMapping - failed to get Device Auth Code from DynamicConfig.\n");
         return false;
     }
     const MaskedUrl url = forwardingUrl(kNoAddress, localIp, 0, 0);
-    logLine(LOG_INFO,
-            "TavikClient::deleteServerMapping - Deleting port mapping from server, url: [%s].\n",
+    logInfo("TavikClient::deleteServerMapping - Deleting port mapping from server, url: [%s].\n",
             url.logged.c_str());
     const auto answer = fetchCentral(url);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::deleteServerMapping - httpGet failed to get response from central server for url %s.\n",
             url.logged.c_str());
         return false;
     }
-    logLine(LOG_NOTICE, "TavikClient::deleteServerMapping - httpGet got %s, %d bytes.\n",
-            scrubSecrets(answer->text).c_str(), answer->size);
+    logNotice("TavikClient::deleteServerMapping - httpGet got %s, %d bytes.\n",
+              scrubSecrets(answer->text).c_str(), answer->size);
     return deleteLocalRecord(fillTemplate(kLocalDeleteKey, setting(kLocalDeleteKey),
                                           {internalHttpPort, internalHttpPort}));
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::deleteServerMapping - Throw exception error. **\n");
+    logError("** TavikClient::deleteServerMapping - Throw exception error. **\n");
     return false;
 }
 

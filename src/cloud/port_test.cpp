@@ -48,13 +48,11 @@ TaggedText textBetween(const std::string& answer, const std::string& name) {
 std::string testedAddress(const std::string& response) {
     const TaggedText address = textBetween(response, "external_ip");
     if (!address.closed()) {
-        logLine(LOG_ERR,
-                "TavikClient::testPort - port map check received badly formatted response:\n");
-        logLine(LOG_ERR, "%s", scrubSecrets(response).c_str());
+        logError("TavikClient::testPort - port map check received badly formatted response:\n");
+        logError("%s", scrubSecrets(response).c_str());
         return {};
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [%s], start: [%d], end: [%d]. \n",
         scrubSecrets(address.text).c_str(), static_cast<int>(address.start),
         static_cast<int>(address.end));
@@ -66,8 +64,7 @@ bool reachedTheRequestedDevice(const std::string& response) {
     const std::string requested = textBetween(response, "req_device_id").text;
     const std::string responding = textBetween(response, "resp_device_id").text;
     if (requested.empty() || responding.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::testPort - Port test response contains empty request device ID and/or response device ID.\n");
         return false;
     }
@@ -76,21 +73,19 @@ bool reachedTheRequestedDevice(const std::string& response) {
 
 int judgeRespondingDevice(const std::string& response) {
     if (reachedTheRequestedDevice(response)) return PASS_TEST;
-    logLine(LOG_INFO, "TavikClient::testPort - result data [%s]\n", scrubSecrets(response).c_str());
-    logLine(
-        LOG_ERR,
+    logInfo("TavikClient::testPort - result data [%s]\n", scrubSecrets(response).c_str());
+    logError(
         "TavikClient::testPort - Port test response Device ID '%s' is different than the Device ID of this unit '%s'.\n",
         STRIPPED_DEVID_VAL, STRIPPED_DEVID_VAL);
     return FAIL_TEST;
 }
 
 void pauseBeforeRetry(int attempt, const std::string& loggedUrl, const Answer* answer) {
-    logLine(LOG_ERR,
-            "TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s].\n",
-            attempt, kPortTestRetryDelay, loggedUrl.c_str());
+    logError("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s].\n",
+             attempt, kPortTestRetryDelay, loggedUrl.c_str());
     if (answer != nullptr) {
-        logLine(LOG_ERR, "TavikClient::testPort[%d] -  failure response from server: [%s].\n",
-                attempt, scrubSecrets(answer->text).c_str());
+        logError("TavikClient::testPort[%d] -  failure response from server: [%s].\n", attempt,
+                 scrubSecrets(answer->text).c_str());
     }
     sleep(kPortTestRetryDelay);
 }
@@ -138,10 +133,10 @@ int TavikClient::testPort(std::string& externalIp,
     portMapCheckSuccess = test.passed;
     if (!test.passed) {
         updateLocalCommStatus("failed");
-        logLine(LOG_ERR, "TavikClient::testPort - port map check failed.\n");
+        logError("TavikClient::testPort - port map check failed.\n");
         return FAIL_TEST;
     }
-    logLine(LOG_INFO, "TavikClient::testPort - port map check success.\n");
+    logInfo("TavikClient::testPort - port map check success.\n");
     if (externalIp.empty()) externalIp = testedAddress(test.response);
     return judgeRespondingDevice(test.response);
 }
@@ -149,20 +144,19 @@ int TavikClient::testPort(std::string& externalIp,
 // The result of a test that cannot be run now; 0 when it can.
 int TavikClient::portTestObstacle(bool checkHddSleep) {
     if (checkHddSleep && checkHddStandByMode() != 0) {
-        logLine(LOG_INFO, "TavikClient::testPort - hard disk is asleep.\n");
+        logInfo("TavikClient::testPort - hard disk is asleep.\n");
         return SKIP_TEST;
     }
     if (serverRequestedSleep()) {
-        logLine(LOG_INFO, "TavikClient::testPort - server has requested sleep.\n");
+        logInfo("TavikClient::testPort - server has requested sleep.\n");
         return SKIP_TEST;
     }
     if (getDeviceID().empty()) {
-        logLine(LOG_ERR, "TavikClient::testPort - failed to get Device ID from DynamicConfig.\n");
+        logError("TavikClient::testPort - failed to get Device ID from DynamicConfig.\n");
         return FAIL_TEST;
     }
     if (getDeviceAuth().empty()) {
-        logLine(LOG_ERR,
-                "TavikClient::testPort - failed to get Device Auth Code from DynamicConfig.\n");
+        logError("TavikClient::testPort - failed to get Device Auth Code from DynamicConfig.\n");
         return FAIL_TEST;
     }
     return 0;
@@ -175,7 +169,7 @@ MaskedUrl TavikClient::portTestUrl(const std::string& externalIp, int port, Http
         kTestPortKey, getRestUrl(path, HTTPS),
         {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL}, externalIp, port,
          type == HTTP ? "HTTP" : "HTTPS", SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}});
-    logLine(LOG_INFO, "TavikClient::testPort[1-3] - Port Test URL: [%s].\n", url.logged.c_str());
+    logInfo("TavikClient::testPort[1-3] - Port Test URL: [%s].\n", url.logged.c_str());
     return url;
 }
 
@@ -183,38 +177,35 @@ void TavikClient::attemptPortTest(PortTest& test) try {
     requestPortTest(test);
     readRemoteAddress(test);
     if (test.passed) {
-        logLine(LOG_INFO,
-                "TavikClient::testPort - port test succeeded for requested external IP: [%s]\n",
+        logInfo("TavikClient::testPort - port test succeeded for requested external IP: [%s]\n",
                 scrubSecrets(test.externalIp).c_str());
         return;
     }
-    logLine(LOG_INFO, "TavikClient::testPort - port test failed for requested external IP: [%s]\n",
+    logInfo("TavikClient::testPort - port test failed for requested external IP: [%s]\n",
             scrubSecrets(test.externalIp).c_str());
     lookForDoubleNat(test);
     if (test.doubleNat) return;
     // The pause follows the last attempt too.
     pauseBeforeRetry(test.attempt, test.url.logged, test.answer ? &*test.answer : nullptr);
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::testPort - Throw exception error. **\n");
+    logError("** TavikClient::testPort - Throw exception error. **\n");
     test.passed = false;
 }
 
 void TavikClient::requestPortTest(PortTest& test) {
     test.response.clear();
     test.answer = fetchCentral(test.url);
-    logLine(LOG_INFO, "TavikClient::testPort[%d] - port check URL: [%s].\n", test.attempt,
+    logInfo("TavikClient::testPort[%d] - port check URL: [%s].\n", test.attempt,
             test.url.logged.c_str());
     if (!test.answer) {
-        logLine(LOG_ERR,
-                "TavikClient::testPort[%d] - httpGet for %s, no response from central server.\n",
-                test.attempt, test.url.logged.c_str());
+        logError("TavikClient::testPort[%d] - httpGet for %s, no response from central server.\n",
+                 test.attempt, test.url.logged.c_str());
         return;
     }
     test.response = test.answer->text;
     test.passed = contains(test.response, kPassed);
-    logLine(LOG_NOTICE,
-            "TavikClient::testPort[%d] - httpGet got %s, %d bytes from central server.\n",
-            test.attempt, scrubSecrets(test.response).c_str(), test.answer->size);
+    logNotice("TavikClient::testPort[%d] - httpGet got %s, %d bytes from central server.\n",
+              test.attempt, scrubSecrets(test.response).c_str(), test.answer->size);
 }
 
 void TavikClient::readRemoteAddress(PortTest& test) {
@@ -222,12 +213,11 @@ void TavikClient::readRemoteAddress(PortTest& test) {
     test.remote = textBetween(test.response, tag);
     if (!test.remote.closed() || !contains(test.response, "<" + tag + ">")) {
         test.remote = {};
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::testPort - Cannot retrieve remote_external_ip from test port response\n");
         return;
     }
-    logLine(LOG_INFO, "TavikClient::testPort - Response remote external IP: [%s].\n",
+    logInfo("TavikClient::testPort - Response remote external IP: [%s].\n",
             scrubSecrets(test.remote.text).c_str());
     if (test.passed && validateIpAddress(test.remote.text)) {
         test.remoteExternalIp = test.remote.text;
@@ -239,19 +229,16 @@ void TavikClient::readRemoteAddress(PortTest& test) {
 void TavikClient::lookForDoubleNat(PortTest& test) const {
     const std::string& remote = test.remote.text;
     if (!test.checkDoubleNat || remote.empty() || test.externalIp.empty()) return;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "TavikClient::testPort - Requested external IP: [%s] / Respond remote external IP: [%s].\n",
         scrubSecrets(test.externalIp).c_str(), scrubSecrets(remote).c_str());
     if (validateIpAddress(remote) && remote != test.externalIp) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::testPort - Enforce connection as RELAY (double-NAT detected: Server-returned external IP != router's external IP).\n");
         test.doubleNat = true;
         return;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "TavikClient::testPort - PORT TEST RESPONSE, GOT REMOTE EXTERNAL IP: [%s], start: [%d], end: [%d]\n",
         scrubSecrets(remote).c_str(), static_cast<int>(test.remote.start),
         static_cast<int>(test.remote.end));
@@ -260,30 +247,28 @@ void TavikClient::lookForDoubleNat(PortTest& test) const {
 bool TavikClient::getMyIP(std::string& ip, int& waitSeconds) try {
     if (serverRequestedSleep()) {
         waitSeconds = pollServerForSleepTime();
-        logLine(LOG_INFO, "TavikClient::getMyIP - server has requested sleep %d seconds.\n",
-                waitSeconds);
+        logInfo("TavikClient::getMyIP - server has requested sleep %d seconds.\n", waitSeconds);
         return false;
     }
     waitSeconds = 0;
     const std::string url =
         fillTemplate("the public address path", getRestUrl(kMyIpPath, HTTP), {});
-    logLine(LOG_INFO, "TavikClient::getMyIP - get my IP url: %s\n", scrubSecrets(url).c_str());
+    logInfo("TavikClient::getMyIP - get my IP url: %s\n", scrubSecrets(url).c_str());
     int size = 0;
     const MallocHandle<char> data{httpGet(url.c_str(), size)};
     if (!data) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::getMyIP - httpGet failed to get response from central server for url %s.\n",
             scrubSecrets(url).c_str());
         return false;
     }
     // As it came: an address with so much as a line feed behind it is not accepted.
     ip.assign(data.get(), static_cast<std::size_t>(size));
-    logLine(LOG_INFO, "TavikClient::getMyIP - httpGet Response [%d bytes]: %s\n", size,
+    logInfo("TavikClient::getMyIP - httpGet Response [%d bytes]: %s\n", size,
             scrubSecrets(ip).c_str());
     return validateIpAddress(ip);
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::getMyIP - Throw exception error. **\n");
+    logError("** TavikClient::getMyIP - Throw exception error. **\n");
     return false;
 }
 

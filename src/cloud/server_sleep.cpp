@@ -22,16 +22,14 @@ constexpr int kShortestPause = 120;  // seconds between two cycles
 
 int TavikClient::pollServerForSleepTime() {
     if (serverPolled) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::pollServerForSleepTime - central server already polled. Sleep time is %d secs.\n",
             serverSleepTime);
         return serverSleepTime;
     }
     const std::string id = getDeviceID();
     if (id.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::pollServerForSleepTime - failed to get Device ID from DynamicConfig. Therefore using sleep time %d secs.\n",
             serverSleepTime);
         return serverSleepTime;
@@ -39,23 +37,20 @@ int TavikClient::pollServerForSleepTime() {
     const MaskedUrl url =
         fillMaskedTemplate("the remote access status path", getRestUrl(kRemoteStatusPath, HTTP),
                            {SecretArgument{id, STRIPPED_DEVID_VAL}});
-    logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - remote status url: %s.\n",
-            url.logged.c_str());
+    logInfo("TavikClient::pollServerForSleepTime - remote status url: %s.\n", url.logged.c_str());
     try {
         if (const auto answer = fetchCentral(url)) {
-            logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - httpGet got %s, %d bytes.\n",
+            logInfo("TavikClient::pollServerForSleepTime - httpGet got %s, %d bytes.\n",
                     scrubSecrets(answer->text).c_str(), answer->size);
             applySleepAnswer(answer->text);
         } else {
-            logLine(
-                LOG_ERR,
+            logError(
                 "TavikClient::pollServerForSleepTime - httpGet for %s, failed to get response from central server. Therefore using sleep time %d secs.\n",
                 url.logged.c_str(), serverSleepTime);
         }
     } catch (...) {
         const int error = errno;
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::pollServerForSleepTime - caught exception error %d. Therefore using sleep time %d secs.\n",
             error, serverSleepTime);
     }
@@ -70,13 +65,11 @@ void TavikClient::applySleepAnswer(const std::string& answer) {
         readWaitTime(answer, wait);
     } else if (contains(answer, kProceedAction)) {
         serverSleepTime = 0;
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::pollServerForSleepTime - central server gave permission to proceed. Sleep time is %d secs.\n",
             serverSleepTime);
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::pollServerForSleepTime - missing action from central server. Therefore using sleep time %d secs.\n",
             serverSleepTime);
     }
@@ -86,22 +79,20 @@ void TavikClient::applySleepAnswer(const std::string& answer) {
 void TavikClient::readWaitTime(const std::string& answer, std::size_t action) {
     const std::size_t tag = answer.find(kWaitTimeTag, action);
     if (tag == std::string::npos) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::pollServerForSleepTime - malformed wait_time from central server. Therefore using sleep time %d secs.\n",
             serverSleepTime);
         return;
     }
     int seconds = 0;
     if (!scanInt(answer.c_str() + tag + kWaitTimeTag.size(), seconds) || seconds < 0) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::pollServerForSleepTime - received garbage sleep time from central server. Therefore using sleep time %d secs.\n",
             serverSleepTime);
         return;
     }
     serverSleepTime = seconds;
-    logLine(LOG_INFO, "TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
+    logInfo("TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
             serverSleepTime);
 }
 

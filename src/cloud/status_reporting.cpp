@@ -48,24 +48,22 @@ int internalPort() {
 
 void judgeLocalStatusAnswer(const std::string& url, const std::string& answer) {
     if (!contains(answer, kLocalSuccess)) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateLocalCommStatus - failure response received from localhost for url: [%s]\n",
             scrubSecrets(url).c_str());
-        logLine(LOG_ERR, "Response: [%s].\n", scrubSecrets(answer).c_str());
+        logError("Response: [%s].\n", scrubSecrets(answer).c_str());
         return;
     }
-    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Successful update status.\n\n");
+    logInfo("TavikClient::updateLocalCommStatus - Successful update status.\n\n");
 }
 
 bool tellBackEndLocalIp(const std::string& localIp) {
     const std::string url =
         fillTemplate(kLocalAddressKey, setting(kLocalAddressKey), {internalPort(), localIp});
-    logLine(LOG_INFO, "TavikClient::updateRemoteCommStatus - local config using url:  %s\n",
+    logInfo("TavikClient::updateRemoteCommStatus - local config using url:  %s\n",
             scrubSecrets(url).c_str());
     if (fetchLocal(url)) return true;
-    logLine(
-        LOG_ERR,
+    logError(
         "TavikClient::updateRemoteCommStatus - failed to get response from local server for url:  %s\n",
         scrubSecrets(url).c_str());
     return false;
@@ -95,14 +93,13 @@ int firstNumber(std::FILE* file) {
 int checkIdleMinutes() {
     const FileHandle file = openFile(kIdleMinutesFile, "re");
     if (!file) {
-        logLine(LOG_ERR,
-                "TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.\n");
+        logError(
+            "TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.\n");
         return 1;
     }
-    logLine(LOG_INFO, "TavikClient::checkHddStandByMode - checking sleep count.\n");
+    logInfo("TavikClient::checkHddStandByMode - checking sleep count.\n");
     if (firstNumber(file.get()) > kMostIdleMinutes) {
-        logLine(LOG_INFO,
-                "TavikClient::checkHddStandByMode - sleep count > 1, port testing SKIP.\n");
+        logInfo("TavikClient::checkHddStandByMode - sleep count > 1, port testing SKIP.\n");
         return 1;
     }
     return 0;
@@ -111,11 +108,10 @@ int checkIdleMinutes() {
 std::string logStateOf(const std::string& status) {
     const auto found = Status2LogState.find(status);
     if (found == Status2LogState.end()) {
-        logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = NOT_FOUND\n",
-                status.c_str());
+        logInfo("TavikClient::sendAnalytics - Status2LogState[%s] = NOT_FOUND\n", status.c_str());
         return "failed";
     }
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogState[%s] = %s\n", status.c_str(),
+    logInfo("TavikClient::sendAnalytics - Status2LogState[%s] = %s\n", status.c_str(),
             found->second.c_str());
     return found->second;
 }
@@ -123,11 +119,10 @@ std::string logStateOf(const std::string& status) {
 std::string logTypeOf(const std::string& status) {
     const auto found = Status2LogType.find(status);
     if (found == Status2LogType.end()) {
-        logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = NOT_FOUND\n",
-                status.c_str());
+        logInfo("TavikClient::sendAnalytics - Status2LogType[%s] = NOT_FOUND\n", status.c_str());
         return "disabled";
     }
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - Status2LogType[%s] = %s\n", status.c_str(),
+    logInfo("TavikClient::sendAnalytics - Status2LogType[%s] = %s\n", status.c_str(),
             found->second.c_str());
     return found->second;
 }
@@ -140,44 +135,39 @@ void TavikClient::updateLocalCommStatus(const std::string& status) try {
     lastLocalCommStatus = status;
     const std::string url =
         fillTemplate(kLocalStatusKey, setting(kLocalStatusKey), {internalPort(), status});
-    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - URL : [%s].\n",
-            scrubSecrets(url).c_str());
-    logLine(LOG_INFO, "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].\n",
+    logInfo("TavikClient::updateLocalCommStatus - URL : [%s].\n", scrubSecrets(url).c_str());
+    logInfo("TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].\n",
             status.c_str());
     const auto answer = fetchLocal(url);
     sleep(kLocalUpdatePause);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateLocalCommStatus - failed to get response from localhost for url:  [%s]\n",
             scrubSecrets(url).c_str());
         return;
     }
     if (std::system(kTouchDynamicConfig) != -1) {
-        logLine(LOG_INFO,
-                "TavikClient::updateLocalCommStatus - enforced touch to /tmp/dynamicconfig.ini.\n");
+        logInfo("TavikClient::updateLocalCommStatus - enforced touch to /tmp/dynamicconfig.ini.\n");
     }
     judgeLocalStatusAnswer(url, answer->text);
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::updateLocalCommStatus - Throw exception error. **\n");
+    logError("** TavikClient::updateLocalCommStatus - Throw exception error. **\n");
 }
 
 bool TavikClient::updateRemoteCommStatus(const std::string& localIp) try {
     if (getDeviceID().empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateRemoteCommStatus - failed to get Device ID from DynamicConfig\n");
         return false;
     }
     if (getDeviceAuth().empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateRemoteCommStatus - failed to get Device Auth Code from DynamicConfig\n");
         return false;
     }
     return tellServerLocalIp(localIp) && tellBackEndLocalIp(localIp);
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::updateRemoteCommStatus - Throw exception error. **\n");
+    logError("** TavikClient::updateRemoteCommStatus - Throw exception error. **\n");
     return false;
 }
 
@@ -187,27 +177,24 @@ bool TavikClient::tellServerLocalIp(const std::string& localIp) {
         fillMaskedTemplate(kRemoteStatusKey, getRestUrl(setting(kRemoteStatusKey), HTTPS),
                            {SecretArgument{getDeviceID(), STRIPPED_DEVID_VAL},
                             SecretArgument{getDeviceAuth(), STRIPPED_DEVAUTH_VAL}, localIp});
-    logLine(LOG_INFO,
-            "TavikClient::updateRemoteCommStatus - updating central server using url:  %s\n",
+    logInfo("TavikClient::updateRemoteCommStatus - updating central server using url:  %s\n",
             url.logged.c_str());
     const auto answer = fetchCentral(url);
     if (!answer) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateRemoteCommStatus - httpGet failed to get response from central server for url %s.\n",
             url.logged.c_str());
         return false;
     }
     const std::string logged = scrubSecrets(answer->text);
-    logLine(LOG_NOTICE,
-            "TavikClient::updateRemoteCommStatus - httpGet got %s. %d bytes from central server.\n",
-            logged.c_str(), answer->size);
+    logNotice(
+        "TavikClient::updateRemoteCommStatus - httpGet got %s. %d bytes from central server.\n",
+        logged.c_str(), answer->size);
     if (!contains(answer->text, kCentralSuccess)) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::updateRemoteCommStatus - failure response received from central server for url:  %s\n",
             url.logged.c_str());
-        logLine(LOG_ERR, "TavikClient::updateRemoteCommStatus - Response: [%s].\n", logged.c_str());
+        logError("TavikClient::updateRemoteCommStatus - Response: [%s].\n", logged.c_str());
     }
     return true;
 }
@@ -215,8 +202,7 @@ bool TavikClient::tellServerLocalIp(const std::string& localIp) {
 void TavikClient::sendAnalytics(const std::string& status,
                                 ConnectionType type,
                                 ConnectionSubType subType) try {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "TavikClient::sendAnalytics - COMMUNICATION status:[%s]  connectionType:[%d]  connectionSubType:[%d]\n",
         status.c_str(), static_cast<int>(type), static_cast<int>(subType));
     const std::string logState = logStateOf(status);
@@ -226,25 +212,23 @@ void TavikClient::sendAnalytics(const std::string& status,
     if ((status == "failed" || status == "connecting") && kind < ConnType2LogType.size()) {
         logType = ConnType2LogType[kind];
     }
-    logLine(LOG_INFO, "TavikClient::sendAnalytics - logState:[%s]  logType:[%s]\n",
-            logState.c_str(), logType.c_str());
+    logInfo("TavikClient::sendAnalytics - logState:[%s]  logType:[%s]\n", logState.c_str(),
+            logType.c_str());
     emitEvent(logState.c_str(), logType.c_str());
     lastConnectionSubType = subType;
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::sendAnalytics - Throw exception error. **\n");
+    logError("** TavikClient::sendAnalytics - Throw exception error. **\n");
 }
 
 int TavikClient::checkHddStandByMode() try {
     PipeHandle output{popen(kDiskStateCommand, "re")};
     if (!output) {
-        logLine(
-            LOG_ERR,
+        logError(
             "TavikClient::checkHddStandByMode - port test not performed - unable to check drive status, popen() returned NULL.\n");
         return 1;
     }
     if (reportsStandby(output.get())) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "TavikClient::checkHddStandByMode - drive is in standby, port test is suspended, port testing SKIP.\n");
         return 1;
     }
@@ -252,7 +236,7 @@ int TavikClient::checkHddStandByMode() try {
     if (leadingInt(setting("DEVICETYPE")) == kMakersRouter) return 0;
     return checkIdleMinutes();
 } catch (...) {
-    logLine(LOG_ERR, "** TavikClient::checkHddStandByMode - Throw exception error. **\n");
+    logError("** TavikClient::checkHddStandByMode - Throw exception error. **\n");
     return 1;
 }
 

@@ -55,8 +55,7 @@ std::optional<std::string> format(const std::string& urlTemplate,
 }
 
 void reportBadTemplate(const std::string& key) {
-    logLine(
-        LOG_ERR,
+    logError(
         "fillTemplate - URL template of %s asks for more or other values than it is given, no URL built.\n",
         key.c_str());
 }

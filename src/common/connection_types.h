@@ -1,4 +1,4 @@
-// Words that several rooms use to speak about a connection.
+// Connection types shared by several modules.
 #ifndef PELORUS_COMMON_CONNECTION_TYPES_H
 #define PELORUS_COMMON_CONNECTION_TYPES_H
 

@@ -2,27 +2,19 @@
 
 #include <algorithm>
 #include <array>
-#include <cstdarg>
 #include <cstdio>
 
 #include "common/signal_block.h"
 
 namespace pelorus {
 
-namespace {
-
-__attribute__((format(printf, 3, 0))) void vlogLine(std::size_t size,
-                                                    int priority,
-                                                    const char* format,
-                                                    va_list args) {
+void vlogLine(std::size_t size, int priority, const char* format, va_list args) {
     std::array<char, kLogLineSize> line{};
-    const std::size_t room = std::min(size, line.size());
-    if (std::vsnprintf(line.data(), room, format, args) < 0) return;
+    const std::size_t capacity = std::min(size, line.size());
+    if (std::vsnprintf(line.data(), capacity, format, args) < 0) return;
     const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
     syslog(priority, "%s", line.data());
 }
-
-}  // namespace
 
 void logLine(int priority, const char* format, ...) {
     va_list args;
@@ -31,10 +23,38 @@ void logLine(int priority, const char* format, ...) {
     va_end(args);
 }
 
-void logLineCut(std::size_t size, int priority, const char* format, ...) {
+void logError(const char* format, ...) {
     va_list args;
     va_start(args, format);
-    vlogLine(size, priority, format, args);
+    vlogLine(kLogLineSize, LOG_ERR, format, args);
+    va_end(args);
+}
+
+void logWarning(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kLogLineSize, LOG_WARNING, format, args);
+    va_end(args);
+}
+
+void logNotice(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kLogLineSize, LOG_NOTICE, format, args);
+    va_end(args);
+}
+
+void logInfo(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kLogLineSize, LOG_INFO, format, args);
+    va_end(args);
+}
+
+void logDebug(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kLogLineSize, LOG_DEBUG, format, args);
     va_end(args);
 }
 

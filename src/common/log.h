@@ -4,6 +4,7 @@
 
 #include <syslog.h>
 
+#include <cstdarg>
 #include <cstddef>
 
 namespace pelorus {
@@ -18,9 +19,17 @@ inline constexpr std::size_t kLogLineSize = 1280;
 /// the C library holds its log lock.
 void logLine(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
 
-/// As logLine, cut to @p size bytes, terminator included; at most kLogLineSize.
-void logLineCut(std::size_t size, int priority, const char* format, ...)
-    __attribute__((format(printf, 3, 4)));
+/// As logLine, with the priority in the name: LOG_ERR, LOG_WARNING, LOG_NOTICE, LOG_INFO, LOG_DEBUG.
+void logError(const char* format, ...) __attribute__((format(printf, 1, 2)));
+void logWarning(const char* format, ...) __attribute__((format(printf, 1, 2)));
+void logNotice(const char* format, ...) __attribute__((format(printf, 1, 2)));
+void logInfo(const char* format, ...) __attribute__((format(printf, 1, 2)));
+void logDebug(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+/// For a module with log calls of its own: the line is cut to @p size bytes, terminator included; at
+/// most kLogLineSize.
+void vlogLine(std::size_t size, int priority, const char* format, va_list args)
+    __attribute__((format(printf, 3, 0)));
 
 }  // namespace pelorus
 

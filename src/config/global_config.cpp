@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cstdarg>
 #include <cstdlib>
 #include <cstring>
 #include <string_view>
@@ -20,6 +21,20 @@ constexpr std::size_t kConfigLogSize = 1024;  // bytes of one log line of this s
 constexpr mode_t kCopyMode = 0666;            // other programs of the device rewrite the copy
 
 const std::string kTmpPathKey = "DYNAMIC_CONFIG_TMP";
+
+__attribute__((format(printf, 1, 2))) void logConfigError(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kConfigLogSize, LOG_ERR, format, args);
+    va_end(args);
+}
+
+__attribute__((format(printf, 1, 2))) void logConfigInfo(const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    vlogLine(kConfigLogSize, LOG_INFO, format, args);
+    va_end(args);
+}
 
 bool namesACopy(const std::string& path) {
     return !path.empty() && path != "empty";
@@ -116,42 +131,39 @@ bool GlobalConfig::loadConfig(const std::string& path) {
     {
         const FileHandle file = openFile(path, "re");
         if (!file) {
-            logLineCut(kConfigLogSize, LOG_ERR,
-                       "GlobalConfig::loadConfig() - failed to open config file: [%s].\n",
-                       path.c_str());
+            logConfigError("GlobalConfig::loadConfig() - failed to open config file: [%s].\n",
+                           path.c_str());
             return false;
         }
         parsed = loadConfigSettings(file.get());
     }
     if (properties.empty()) {
         // Says "open", but means a file without a single setting.
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::loadConfigSettings() - failed to open config file: [%s].\n",
-                   path.c_str());
+        logConfigError("GlobalConfig::loadConfigSettings() - failed to open config file: [%s].\n",
+                       path.c_str());
         return false;
     }
     if (!parsed) return false;
 
-    logLineCut(kConfigLogSize, LOG_INFO, "Getting path for dynamic config file.\n");
+    logConfigInfo("Getting path for dynamic config file.\n");
     const std::string dynamicPath = getProperty("DYNAMIC_CONFIG") + "/dynamicconfig.ini";
-    logLineCut(kConfigLogSize, LOG_INFO, "Getting path for TEMP dynamic config file.\n");
+    logConfigInfo("Getting path for TEMP dynamic config file.\n");
     const std::string copyPath = getProperty(kTmpPathKey);
     return namesACopy(copyPath) ? loadTemporaryCopy(dynamicPath, copyPath)
                                 : loadDynamicConfig(dynamicPath);
 }
 
 bool GlobalConfig::loadDynamicConfig(const std::string& path) {
-    logLineCut(kConfigLogSize, LOG_INFO, "OPENING dynamic config file for read: \n");
-    logLineCut(kConfigLogSize, LOG_INFO, "%s", path.c_str());
+    logConfigInfo("OPENING dynamic config file for read: \n");
+    logConfigInfo("%s", path.c_str());
     const FileHandle file = openFile(path, "re");
     if (!file) {
-        logLineCut(
-            kConfigLogSize, LOG_ERR,
+        logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [%s].\n",
             path.c_str());
         return false;
     }
-    logLineCut(kConfigLogSize, LOG_INFO, "LOADING dynamic config file settings.\n");
+    logConfigInfo("LOADING dynamic config file settings.\n");
     return loadConfigSettings(file.get());
 }
 
@@ -159,27 +171,25 @@ namespace {
 
 // Makes the first temporary copy. False, with the cause logged, when it cannot be made.
 bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
-    logLineCut(kConfigLogSize, LOG_INFO, "Opening dynamic config file for copy.\n");
+    logConfigInfo("Opening dynamic config file for copy.\n");
     const FileHandle dynamicFile = openFile(dynamicPath, "re");
     if (!dynamicFile) {
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
-                   dynamicPath.c_str());
+        logConfigError(
+            "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
+            dynamicPath.c_str());
         return false;
     }
-    logLineCut(kConfigLogSize, LOG_INFO, "Creating temp copy of dynamic config file.\n");
+    logConfigInfo("Creating temp copy of dynamic config file.\n");
     const FileHandle copy = openFile(copyPath, "we");
     if (!copy) {
-        logLineCut(
-            kConfigLogSize, LOG_ERR,
+        logConfigError(
             "GlobalConfig::loadConfig() - failed to create temporary dynamic config file: %s\n",
             copyPath.c_str());
         return false;
     }
-    logLineCut(kConfigLogSize, LOG_INFO, "Copying dynamic config file.\n");
+    logConfigInfo("Copying dynamic config file.\n");
     if (!copyFile(dynamicFile.get(), copy.get())) {
-        logLineCut(
-            kConfigLogSize, LOG_ERR,
+        logConfigError(
             "GlobalConfig::loadConfig() - failed to write temporary dynamic config file: %s\n",
             copyPath.c_str());
         // A copy that was cut short would be taken for the whole from now on.
@@ -192,17 +202,16 @@ bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copy
 }  // namespace
 
 bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
-    logLineCut(kConfigLogSize, LOG_INFO, "Loading TEMP dynamic config file.\n");
+    logConfigInfo("Loading TEMP dynamic config file.\n");
     FileHandle copy = openFile(copyPath, "re");
     if (!copy) {
         if (!createTemporaryCopy(dynamicPath, copyPath)) return false;
         static_cast<void>(chmod(copyPath.c_str(), kCopyMode));
-        logLineCut(kConfigLogSize, LOG_INFO, "Re-opening TEMP dynamic config file.\n");
+        logConfigInfo("Re-opening TEMP dynamic config file.\n");
         copy = openFile(copyPath, "re");
     }
     if (!copy) {
-        logLineCut(
-            kConfigLogSize, LOG_ERR,
+        logConfigError(
             "GlobalConfig::loadConfig() - failed to open temp dynamic config settings file: [%s].\n",
             copyPath.c_str());
         return false;
@@ -246,9 +255,9 @@ void GlobalConfig::reloadChangedCopy() {
     const std::string& path = found->second;
     struct stat status {};
     if (stat(path.c_str(), &status) != 0) {
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [%s].\n",
-                   path.c_str());
+        logConfigError(
+            "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [%s].\n",
+            path.c_str());
         return;
     }
     if (status.st_mtime == tmpModTime) return;
@@ -256,7 +265,7 @@ void GlobalConfig::reloadChangedCopy() {
     tmpModTime = status.st_mtime;
     const FileHandle copy = openFile(path, "re");
     if (!copy) return;
-    logLineCut(kConfigLogSize, LOG_INFO, "Reload dynamicconfig.ini file.\n");
+    logConfigInfo("Reload dynamicconfig.ini file.\n");
     loadConfigSettings(copy.get());
 }
 
@@ -276,30 +285,27 @@ void GlobalConfig::writeToStaticFile(const std::string& key,
         isNew ? key + "=" + value + "\n" : replaceCommand(key, oldValue, value, configPath);
     // A line or command that was cut short would damage the file, so it is not used at all.
     if (text.size() >= kLineSize || (key + value).find('\n') != std::string::npos) {
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::setProperty() - setting cannot be written to config file: %s\n",
-                   configPath.c_str());
+        logConfigError(
+            "GlobalConfig::setProperty() - setting cannot be written to config file: %s\n",
+            configPath.c_str());
         return;
     }
     if (!isNew) {
         if (std::system(text.c_str()) != 0) {
-            logLineCut(kConfigLogSize, LOG_ERR,
-                       "GlobalConfig::setProperty() - failed to update config file: %s\n",
-                       configPath.c_str());
+            logConfigError("GlobalConfig::setProperty() - failed to update config file: %s\n",
+                           configPath.c_str());
         }
         return;
     }
     const FileHandle file = openFile(configPath, "ae");
     if (!file) {
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::setProperty() - failed to open config file: %s\n",
-                   configPath.c_str());
+        logConfigError("GlobalConfig::setProperty() - failed to open config file: %s\n",
+                       configPath.c_str());
         return;
     }
     if (std::fputs(text.c_str(), file.get()) == EOF || std::fflush(file.get()) != 0) {
-        logLineCut(kConfigLogSize, LOG_ERR,
-                   "GlobalConfig::setProperty() - failed to update config file: %s\n",
-                   configPath.c_str());
+        logConfigError("GlobalConfig::setProperty() - failed to update config file: %s\n",
+                       configPath.c_str());
     }
 }
 

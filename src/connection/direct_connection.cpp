@@ -63,8 +63,7 @@ ConnectionType ConnectionManager::createDirectConnection() {
     }
     readStatusFile(attempt);
     if (!attempt.bTryPortMap) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection - failed to get connection to local router due to UPnP not working. Elapsed time %ld, portTestInterval %ld, allocatedHttpPort %d, bTryPortMap %d.\n",
             static_cast<long>(time(nullptr) - lastPortTestTime), portTestInterval,
             allocatedHttpPort, attempt.bTryPortMap);
@@ -73,8 +72,7 @@ ConnectionType ConnectionManager::createDirectConnection() {
     dropOutdatedMappings(attempt);
     decideSleepCheck(attempt);
     attempt.now = time(nullptr);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection - Elapsed time %ld, portTestInterval %ld, allocatedHttpPort %d, allocatedHttpsPort %d.\n",
         static_cast<long>(attempt.now - lastPortTestTime), portTestInterval, allocatedHttpPort,
         allocatedHttpsPort);
@@ -98,15 +96,13 @@ bool ConnectionManager::checkGateway(DirectAttempt& attempt) {
     }
     router().discover();
     if (router().isInitialized()) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection - Router is initialized and is not a Brenvik. bTryPortMap set true.\n");
         attempt.bTryPortMap = true;
         return false;
     }
     if (allocatedHttpPort != 0 && !lastManualPortForward) return testPortsWithoutGateway(attempt);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection - Don't test port since either pRouter->isInitialized %d, or allocatedHttpPort %d is 0, or lastManualPortForward %d is true.\n",
         router().isInitialized(), allocatedHttpPort, lastManualPortForward);
     return false;
@@ -115,20 +111,17 @@ bool ConnectionManager::checkGateway(DirectAttempt& attempt) {
 // The gateway no longer answers, but ports forwarded earlier may still be open: as long as the
 // test does not say otherwise, the device stays reachable through them.
 bool ConnectionManager::testPortsWithoutGateway(DirectAttempt& attempt) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection - UPnP discovery failed, running port test to see if ports are still open.\n");
     std::string requestedIp;
     attempt.testResult = testHttpPort(requestedIp, allocatedHttpPort, false, false);
     if (attempt.testResult != SKIP_TEST) lastPortTestTime = time(nullptr);
     if (attempt.testResult != FAIL_TEST) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection - Ports are still open, remaining in Port Forwarded Mode.\n");
         return attempt.endWith(PORTFORWARDED);
     }
-    logLine(LOG_INFO,
-            "ConnectionManager::createDirectConnection - Port test returned FAIL_TEST.\n");
+    logInfo("ConnectionManager::createDirectConnection - Port test returned FAIL_TEST.\n");
     return false;
 }
 
@@ -147,8 +140,7 @@ int ConnectionManager::testHttpPort(std::string& requestedIp,
 void ConnectionManager::readStatusFile(DirectAttempt& attempt) {
     attempt.defaultPortsOnly = setting("DEFAULT_PORTS_ONLY") == "TRUE";
     const std::string status = setting("COMMUNICATION_STATUS");
-    logLine(LOG_INFO,
-            "ConnectionManager::createDirectConnection - Current Status in file system: [%s].\n",
+    logInfo("ConnectionManager::createDirectConnection - Current Status in file system: [%s].\n",
             scrubSecrets(status).c_str());
     if (status == "portforwarded") {
         connectionType = PORTFORWARDED;
@@ -160,8 +152,7 @@ void ConnectionManager::readStatusFile(DirectAttempt& attempt) {
     } else if (status == "failed") {
         connectionType = FAILED;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection - Pelorus Status in Memory: [%d]. (0:NONE, 1:portforwarded, 2:relayed, 3:connecting, 4:failed/disabled).\n\n",
         connectionType);
 }
@@ -174,8 +165,7 @@ void ConnectionManager::dropOutdatedMappings(const DirectAttempt& attempt) {
         !(attempt.defaultPortsOnly && allocatedHttpPort != kHttpStartPort)) {
         return;
     }
-    logLine(
-        LOG_NOTICE,
+    logNotice(
         "ConnectionManager::createDirectConnection - Resetting HTTP allocated ports due to external or local IP change: [%d] / Default Port Only: [%d].\n",
         allocatedHttpPort, attempt.defaultPortsOnly);
     unmapAllocatedPorts(attempt);
@@ -212,14 +202,12 @@ bool ConnectionManager::retestMappedPorts(DirectAttempt& attempt) {
     if (allocatedHttpPort < 1 || allocatedHttpsPort < 1) return false;
     router().CheckExpiredMappings();
     if (!forceConnect && attempt.now - lastPortTestTime <= portTestInterval) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection() - Ignore Port Test due to Interval %ld.\n",
             portTestInterval);
         return attempt.endWith(PORTFORWARDED);
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection - Running port test for mapped ports in PORTFORWARDED HTTP:[%d] / HTTPS:[%d].\n",
         allocatedHttpPort, allocatedHttpsPort);
     if (forceConnect) reportAnalytics("connecting");
@@ -230,16 +218,14 @@ bool ConnectionManager::retestMappedPorts(DirectAttempt& attempt) {
     if (attempt.testResult != SKIP_TEST) lastPortTestTime = attempt.now;
 
     if (failed && doubleNatDetected) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection() - FAIL - Port Test, Double-NAT detected, switching to RELAY \n");
         clearMappedFlags();
         return attempt.endWith(FAILED);
     }
     if (failed) return false;
     // A test that was skipped counts as passed: nothing speaks against the ports.
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection() - testPort success %d, current connectionType %d. Going to PORTFORWARDED.\n",
         attempt.testResult, connectionType);
     return attempt.endWith(PORTFORWARDED);
@@ -251,16 +237,14 @@ bool ConnectionManager::searchIsDue(const DirectAttempt& attempt) {
         attempt.now - lastPortTestTime > portTestInterval) {
         return true;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection() - Skip testing port due to interval or nothing changed IP(RELAY OR failed PF).\n");
     return false;
 }
 
 // True, with the result, when a double NAT makes the attempt hopeless.
 bool ConnectionManager::searchPorts(DirectAttempt& attempt) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection: Check Sleep Mode:[%d](0:ignore, 1:check sleep), Test Result of Portforward: [%d](1:skip, 2:fail, 3:pass), connectionType %d.\n",
         attempt.checkSleep, attempt.testResult, connectionType);
     reportAnalytics("connecting");
@@ -276,8 +260,7 @@ bool ConnectionManager::searchPorts(DirectAttempt& attempt) {
     allocatedHttpPort = forwardPort(attempt.internalHttpPort, kHttpStartPort, kHttpExtendedPort,
                                     router().getExternalIp(), HTTP, kHttpDescription,
                                     attempt.defaultPortsOnly, attempt.checkSleep);
-    logLine(LOG_INFO,
-            "ConnectionManager::createDirectConnection() - HTTP allocatedHttpPort: [%d].\n",
+    logInfo("ConnectionManager::createDirectConnection() - HTTP allocatedHttpPort: [%d].\n",
             allocatedHttpPort);
     httpPortMapped = allocatedHttpPort != 0;
     if (doubleNatDetected) {
@@ -290,20 +273,17 @@ bool ConnectionManager::searchPorts(DirectAttempt& attempt) {
                                      router().getExternalIp(), HTTPS, kHttpsDescription,
                                      attempt.defaultPortsOnly, attempt.checkSleep)
                        : 0;
-    logLine(LOG_INFO,
-            "ConnectionManager::createDirectConnection() - HTTPS allocatedHttpsPort: [%d].\n",
+    logInfo("ConnectionManager::createDirectConnection() - HTTPS allocatedHttpsPort: [%d].\n",
             allocatedHttpsPort);
     httpsPortMapped = allocatedHttpsPort != 0;
     return false;
 }
 
 ConnectionType ConnectionManager::publishMapping(const DirectAttempt& attempt) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection() - success - internal Http Port: [%d] is mapped to external Port: [%d].\n",
         attempt.internalHttpPort, allocatedHttpPort);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection() - success - internal Https Port: [%d] is mapped to external Port: [%d].\n",
         attempt.internalHttpsPort, allocatedHttpsPort);
     auto* client = TavikClient::getInstance();
@@ -311,19 +291,16 @@ ConnectionType ConnectionManager::publishMapping(const DirectAttempt& attempt) {
                                      allocatedHttpsPort, router().getLocalIp(),
                                      attempt.internalHttpPort, attempt.internalHttpsPort)) {
         // Nothing is deleted: ports and mappings stay, and the next attempt tests them again.
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::createDirectConnection() - failed to update mapping info, attempting to delete server mapping.\n");
         reportAnalytics("failed");
         clearMappedFlags();
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createDirectConnection() - Failed trying automatic port test. Resume or try RELAY mode.\n");
         return FAILED;
     }
     if (!VPNManager::getInstance()->closeVPNConnection()) {
-        logLine(LOG_ERR,
-                "ConnectionManager::createDirectConnection() - failed to stop VPN process.\n");
+        logError("ConnectionManager::createDirectConnection() - failed to stop VPN process.\n");
     }
     reportAnalytics("portforwarded");
     client->updateLocalCommStatus("portforwarded");
@@ -336,8 +313,7 @@ ConnectionType ConnectionManager::giveUpMapping(const DirectAttempt& attempt) {
     clearMappedFlags();
     unmapAllocatedPorts(attempt);
     if (attempt.analyticsSent) reportAnalytics("failed");
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createDirectConnection() - Failed trying automatic port test. Resume or try RELAY mode.\n");
     return FAILED;
 }

@@ -24,20 +24,18 @@ std::string serviceDomain() {
     const std::size_t dot = server.find('.');
     std::string domain = kServiceDomain;
     if (server.empty()) {
-        logLine(LOG_ERR, "ConnectionManager::buildDeviceDomainName - SERVER_BASE_URL is empty\n");
+        logError("ConnectionManager::buildDeviceDomainName - SERVER_BASE_URL is empty\n");
     } else if (dot == std::string::npos) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::buildDeviceDomainName - SERVER_BASE_URL contains an invalid kavra domain %s\n",
             scrubSecrets(server).c_str());
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::buildDeviceDomainName - SERVER_BASE_URL contains a valid kavra domain %s\n",
             scrubSecrets(server).c_str());
         domain = server.substr(dot);
     }
-    logLine(LOG_INFO, "ConnectionManager::buildDeviceDomainName - kavra domain = %s\n",
+    logInfo("ConnectionManager::buildDeviceDomainName - kavra domain = %s\n",
             scrubSecrets(domain).c_str());
     return domain;
 }
@@ -46,7 +44,7 @@ std::string serviceDomain() {
 void lookUp(const std::string& name, std::string& address, const char* failure) {
     if (!address.empty()) return;
     address = TavikClient::getInstance()->nsLookup(name);
-    if (address.empty()) logLine(LOG_ERR, "%s", failure);
+    if (address.empty()) logError("%s", failure);
 }
 
 }  // namespace
@@ -83,15 +81,13 @@ struct ConnectionManager::DeviceNames {
 
     [[nodiscard]] bool agree() const {
         if (fourLevelIp.empty() || threeLevelIp.empty() || fourLevelIp != threeLevelIp) {
-            logLine(
-                LOG_ERR,
+            logError(
                 "ConnectionManager::checkDNS - nslookup 3-level and/or 4-level domain name IP addresses do not exist or do not match, 3-level [%s], 4-level [%s]\n",
                 threeLevelIp.c_str(), fourLevelIp.c_str());
             return false;
         }
         if (!hashed.empty() && hashedIp != threeLevelIp) {
-            logLine(
-                LOG_ERR,
+            logError(
                 "ConnectionManager::checkDNS - nslookup 3-level hashed domain name IP address does not exist or does not match 3-level and 4-level, 3-level [%s], 4-level [%s], 3-level hashed [%s]\n",
                 threeLevelIp.c_str(), fourLevelIp.c_str(), hashedIp.c_str());
             return false;
@@ -105,11 +101,9 @@ bool ConnectionManager::checkDNS(ConnectionType type) {
     const bool due = forceDNSCheck || now - prevDNSCheckTime >= dnsCheckInterval;
     if (!due || (type != PORTFORWARDED && type != RELAYED)) return true;
     const ClearDNSCheck recordCheck{this};
-    logLine(
-        LOG_INFO,
+    logInfo(
         "--------------------------------------------------------------------------------------\n");
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::checkDNS - forceDNSCheck or exceeded nslookup check interval, forceDNSCheck %d, prevTime %ld, checkInterval %ld, currentTime %ld, connectionType %d\n",
         forceDNSCheck, static_cast<long>(prevDNSCheckTime), dnsCheckInterval,
         static_cast<long>(now), type);
@@ -123,23 +117,20 @@ bool ConnectionManager::checkDNS(ConnectionType type) {
 bool ConnectionManager::buildOwnNames(DeviceNames& names) {
     const std::string deviceId = setting("DEVICEID");
     if (deviceId.empty()) {
-        logLine(LOG_ERR,
-                "ConnectionManager::checkDNS - failed to get DEVICEID from config file!\n");
+        logError("ConnectionManager::checkDNS - failed to get DEVICEID from config file!\n");
         return false;
     }
     std::array<char, kHostnameSize> hostname{};
     if (gethostname(hostname.data(), hostname.size()) != 0) {
-        logLine(LOG_ERR,
-                "ConnectionManager::checkDNS - failed to retrieve NAS hostname, errno = %d\n",
-                errno);
+        logError("ConnectionManager::checkDNS - failed to retrieve NAS hostname, errno = %d\n",
+                 errno);
         return false;
     }
     const std::string shownHostname = scrubSecrets(hostname.data());
-    logLine(LOG_INFO, "ConnectionManager::checkDNS - NAS hostname %s\n", shownHostname.c_str());
+    logInfo("ConnectionManager::checkDNS - NAS hostname %s\n", shownHostname.c_str());
     if (buildDeviceDomainName(hostname.data(), deviceId, names.fourLevel, names.threeLevel,
                               names.hashed) == 0) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::checkDNS - cannot generate device domain names, NAS hostname = %s, deviceid = %s\n",
             shownHostname.c_str(), STRIPPED_DEVID_VAL);
         return false;
@@ -156,8 +147,7 @@ int ConnectionManager::buildDeviceDomainName(char* hostname,
     const std::string host = hostname == nullptr ? "" : hostname;
     const std::string shownHost = hostname == nullptr ? "NULL" : scrubSecrets(host);
     if (host.empty() || deviceId.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::buildDeviceDomainName - NAS hostname and/or deviceID are empty.  Hostname=%s, deviceID=%s\n",
             shownHost.c_str(), STRIPPED_DEVID_VAL);
         return 0;
@@ -168,8 +158,7 @@ int ConnectionManager::buildDeviceDomainName(char* hostname,
     threeLevel = host + "-" + label;
     const std::string shownLabel =
         std::string{"device"} + STRIPPED_DEVID_VAL + scrubSecrets(domain);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::buildDeviceDomainName - 4-level domain name %s, 3-level domain name %s, 3-level hashed domain name %s\n",
         (shownHost + "." + shownLabel).c_str(), (shownHost + "-" + shownLabel).c_str(),
         STRIPPED_SUBDOMAIN_VAL);
@@ -177,26 +166,22 @@ int ConnectionManager::buildDeviceDomainName(char* hostname,
 }
 
 bool ConnectionManager::namesLeadHere(const DeviceNames& names, ConnectionType type) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::checkDNS - nslookup device domain name IP addresses. 3-level [%s], 4-level [%s], 3-level hashed [%s]\n",
         names.threeLevelIp.c_str(), names.fourLevelIp.c_str(), names.hashedIp.c_str());
     std::string ip;
     if (fetchLocalDeviceDomainIPAddr(type, ip) != 1) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::checkDNS - failed to retrieve local value of the device domain IP address\n");
         return true;
     }
     if (names.fourLevelIp != ip) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::checkDNS - DNS check failed for 4-level device domain name, DNS IP address is %s, local value of IP address is %s\n",
             names.fourLevelIp.c_str(), scrubSecrets(ip).c_str());
         return false;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::checkDNS - DNS matches local value for device domain names, IP address is %s\n",
         scrubSecrets(ip).c_str());
     return true;
@@ -208,8 +193,7 @@ int ConnectionManager::fetchLocalDeviceDomainIPAddr(ConnectionType type, std::st
     } else if (type == RELAYED) {
         fetchRelayIp(ip);
     } else {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - connection type %d not supported\n",
             type);
         return 0;
@@ -222,27 +206,22 @@ void ConnectionManager::fetchExternalIp(std::string& ip) {
     router().discover();
     if (router().isInitialized()) {
         ip = router().getExternalIp();
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for auto/manual portforward, router discovery successfully obtained external IP\n");
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for auto/manual portforward, router discovery failed to obtain external IP\n");
     }
     if (ip.empty() && !responseExternalIP.empty()) {
         ip = responseExternalIP;
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for auto/manual portforward, use most recent remote external IP in test port response = %s\n",
             ip.c_str());
     } else if (ip.empty()) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for auto/manual portforward, most recent remote external IP in test port response is empty\n");
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::fetchLocalDeviceDomainIPAddr - auto/manual portforward external router IP = %s\n",
         scrubSecrets(ip).c_str());
 }
@@ -250,16 +229,13 @@ void ConnectionManager::fetchExternalIp(std::string& ip) {
 void ConnectionManager::fetchRelayIp(std::string& ip) {
     ip.clear();
     if (VPNManager::getInstance()->fetchOpenVPN_IPAddr(ip)) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for relayed mode, successfully retrieved openVPN server external IP\n");
     } else {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::fetchLocalDeviceDomainIPAddr - for relayed mode, failed to retrieve openVPN server external IP\n");
     }
-    logLine(LOG_INFO,
-            "ConnectionManager::fetchLocalDeviceDomainIPAddr - relayed mode external IP = %s\n",
+    logInfo("ConnectionManager::fetchLocalDeviceDomainIPAddr - relayed mode external IP = %s\n",
             ip.c_str());
 }
 

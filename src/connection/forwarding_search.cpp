@@ -42,10 +42,9 @@ int ConnectionManager::forwardPort(int internalPort,
                                    bool checkSleep) {
     ForwardSearch search{internalPort, startPort,   extendedStartPort, externalIp,
                          type,         description, defaultPortsOnly,  checkSleep};
-    logLine(LOG_INFO, "ConnectionManager::forwardPort - forwarding internal port: %d \n",
-            internalPort);
+    logInfo("ConnectionManager::forwardPort - forwarding internal port: %d \n", internalPort);
     if (!checkSleep || badPorts.size() > kMostBadPorts) {
-        logLine(LOG_INFO, "ConnectionManager::forwardPort - ** Cleared bad port vector. **\n");
+        logInfo("ConnectionManager::forwardPort - ** Cleared bad port vector. **\n");
         badPorts.clear();
     }
     int result = 0;
@@ -69,8 +68,7 @@ int ConnectionManager::forwardPort(int internalPort,
 bool ConnectionManager::tryPredefinedPorts(ForwardSearch& search, int& result) {
     const auto entries = router().getPortListBrenvik(kTcp);
     if (entries.empty()) return false;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::forwardPort - BEGIN Port Test pre-defined list - [%d] by Brenvik router.\n",
         static_cast<int>(entries.size()));
     for (const auto& entry : entries) {
@@ -81,7 +79,7 @@ bool ConnectionManager::tryPredefinedPorts(ForwardSearch& search, int& result) {
                     testHttpPort(search.externalIp, port, search.checkSleep, false) == PASS_TEST;
             }
             if (doubleNatDetected) {
-                logLine(LOG_INFO, "ConnectionManager::forwardPort - return with Enforced Relay.\n");
+                logInfo("ConnectionManager::forwardPort - return with Enforced Relay.\n");
                 result = kEnforcedRelay;
                 return true;
             }
@@ -91,8 +89,7 @@ bool ConnectionManager::tryPredefinedPorts(ForwardSearch& search, int& result) {
             }
         }
     }
-    logLine(LOG_INFO,
-            "ConnectionManager::forwardPort - END Port Test pre-defined list by Brenvik router.\n");
+    logInfo("ConnectionManager::forwardPort - END Port Test pre-defined list by Brenvik router.\n");
     return false;
 }
 
@@ -100,8 +97,7 @@ bool ConnectionManager::tryPredefinedPorts(ForwardSearch& search, int& result) {
 void ConnectionManager::mapCandidate(ForwardSearch& search) {
     if (!isBadPort(search.startPort)) {
         if (deviceType == kMakersRouter) {
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "ConnectionManager::forwardPort - trying to check up port number and mapping port : e-[%d] i-[%d]\n",
                 search.startPort, search.internalPort);
         }
@@ -120,8 +116,7 @@ void ConnectionManager::mapInExtendedRange(ForwardSearch& search) {
         if (!httpPortMapped) unmapDevicePort(search.internalPort, allocatedHttpPort);
         if (!httpsPortMapped) unmapDevicePort(search.internalPort, allocatedHttpsPort);
         if (deviceType == kMakersRouter) {
-            logLine(LOG_INFO,
-                    "ConnectionManager::forwardPort - extended port range : e-[%d] i-[%d].\n",
+            logInfo("ConnectionManager::forwardPort - extended port range : e-[%d] i-[%d].\n",
                     search.candidatePort, search.internalPort);
         }
         search.mapped = mapDevicePort(search, search.candidatePort);
@@ -142,8 +137,7 @@ bool ConnectionManager::testCandidate(ForwardSearch& search, int& result) {
     const int testResult =
         testHttpPort(search.externalIp, search.candidatePort, search.checkSleep, false);
     if (testResult == SKIP_TEST) {
-        logLine(LOG_INFO,
-                "ConnectionManager::forwardPort - HTTP port mapped %d but SKIPPED port test\n",
+        logInfo("ConnectionManager::forwardPort - HTTP port mapped %d but SKIPPED port test\n",
                 search.candidatePort);
     } else {
         lastPortTestTime = time(nullptr);
@@ -160,14 +154,12 @@ bool ConnectionManager::testCandidate(ForwardSearch& search, int& result) {
     unmapDevicePort(search.internalPort, search.candidatePort);
     // Counts one ahead: "exceeded" is also said before the last cycle.
     if (search.retries + 1 > kCyclesBeforeExceeded) {
-        logLine(LOG_INFO, "ConnectionManager::forwardPort - Port test failed, retries exceeded.\n");
+        logInfo("ConnectionManager::forwardPort - Port test failed, retries exceeded.\n");
     } else {
-        logLine(LOG_INFO,
-                "ConnectionManager::forwardPort - Port test failed, trying next port in range.\n");
+        logInfo("ConnectionManager::forwardPort - Port test failed, trying next port in range.\n");
     }
     if (testResult != SKIP_TEST) return false;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::forwardPort - Skipped port test, unmapped HTTP port %d, leaving forwardPort()\n",
         search.candidatePort);
     return true;

@@ -47,14 +47,12 @@ struct ConnectionManager::ManualAttempt {
         testHttpPort = readPort("MANUAL_EXTERNAL_HTTP_PORT");
         testHttpsPort = readPort("MANUAL_EXTERNAL_HTTPS_PORT");
         if (!isPort(testHttpPort)) {
-            logLine(
-                LOG_ERR,
+            logError(
                 "ConnectionManager::manualPortForward - bad value for manually configured HTTP Port.\n");
             return false;
         }
         if (!isPort(testHttpsPort)) {
-            logLine(
-                LOG_ERR,
+            logError(
                 "ConnectionManager::manualPortForward - bad value for manually configured HTTPS Port.\n");
             return false;
         }
@@ -72,8 +70,7 @@ ConnectionType ConnectionManager::manualPortForward(int internalHttpPort,
     attempt.localIp = std::move(localIp);
     clearMappedFlags();
     if (!attempt.readPorts()) return FAILED;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - allocatedHttpPort %d, manualHttpPort %d, allocatedHttpsPort %d, manualHttpsPort %d.\n",
         allocatedHttpPort, attempt.testHttpPort, allocatedHttpsPort, attempt.testHttpsPort);
     if (!lastManualPortForward) leaveAutomaticForwarding();
@@ -81,19 +78,16 @@ ConnectionType ConnectionManager::manualPortForward(int internalHttpPort,
 
     attempt.forced = forceConnect;
     attempt.now = time(nullptr);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - Elapsed time %ld, portTestInterval %ld, manualPortForwardChange %d, lastManualPortForward %d, forceConnect %d\n",
         static_cast<long>(attempt.now - lastPortTestTime), portTestInterval, attempt.changed,
         lastManualPortForward, forceConnect);
     if (!attempt.mustBePublished() && attempt.now - lastPortTestTime <= portTestInterval) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::manualPortForward - Not time to do port test, or manual ports not changed on NAS.\n");
         attempt.result = connectionType;
     } else if (doubleNatDetected) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::manualPortForward - relay mode is enforced, therefore don't manual forward ports.\n");
         return FAILED;
     } else {
@@ -105,8 +99,7 @@ ConnectionType ConnectionManager::manualPortForward(int internalHttpPort,
     } else if (attempt.portTestPassed) {
         attempt.result = PORTFORWARDED;
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::manualPortForward - port test was skipped, failed or no change in manually forwarded ports.\n");
     }
     return endManualAttempt(attempt);
@@ -116,7 +109,7 @@ ConnectionType ConnectionManager::manualPortForward(int internalHttpPort,
 void ConnectionManager::leaveAutomaticForwarding() {
     if (!router().isInitialized()) router().discover();
     if (!router().isInitialized()) return;
-    logLine(LOG_INFO, "ConnectionManager::manualPortForward - unmapping existing ports.\n");
+    logInfo("ConnectionManager::manualPortForward - unmapping existing ports.\n");
     router().unmapAllPorts(kTcp, kHttpDescription);
     router().unmapAllPorts(kTcp, kHttpsDescription);
     allocatedHttpPort = 0;
@@ -133,15 +126,13 @@ void ConnectionManager::noticeManualChanges(ManualAttempt& attempt) const {
     }
     if (addresses->discoverNetworkAddrs() != 1 || !addresses->haveNetworkAddrsChanged()) return;
     attempt.changed = true;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - detected change to external IP [%s] or local IP [%s]\n",
         scrubSecrets(addresses->getExternalIp()).c_str(), addresses->getLocalIp().c_str());
 }
 
 void ConnectionManager::testManualPorts(ManualAttempt& attempt) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - Running port test for manually forwarded ports.\n");
     if (attempt.mustBePublished()) reportAnalytics("connecting");
     const int testResult =
@@ -158,27 +149,23 @@ void ConnectionManager::testManualPorts(ManualAttempt& attempt) {
 }
 
 void ConnectionManager::publishManualPorts(ManualAttempt& attempt) {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - success - internal Http Port: [%d] is mapped to external Port: [%d].\n",
         attempt.internalHttpPort, allocatedHttpPort);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - success - internal Https Port: [%d] is mapped to external Port: [%d].\n",
         attempt.internalHttpsPort, allocatedHttpsPort);
     auto* client = TavikClient::getInstance();
     if (!client->updateServerMapping(attempt.externalIp, allocatedHttpPort, allocatedHttpsPort,
                                      attempt.localIp, attempt.internalHttpPort,
                                      attempt.internalHttpsPort)) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::manualPortForward - failed to update port mapping on server.\n");
         reportAnalytics("failed");
         attempt.result = FAILED;
         return;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::manualPortForward - successfully updated port mapping on server.\n");
     if (VPNManager::getInstance()->closeVPNConnection()) {
         reportAnalytics("portforwarded");
@@ -189,8 +176,7 @@ void ConnectionManager::publishManualPorts(ManualAttempt& attempt) {
     } else {
         // The ports work and are published: a relay that stays up beside them is no failure of
         // the attempt.
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::manualPortForward - failed to stop VPN process, relay connection cannot be closed.\n");
         reportAnalytics("failed");
     }
@@ -201,8 +187,7 @@ void ConnectionManager::publishManualPorts(ManualAttempt& attempt) {
 
 ConnectionType ConnectionManager::endManualAttempt(const ManualAttempt& attempt) const {
     if (attempt.mustBePublished() && !attempt.portTestPassed) reportAnalytics("failed");
-    logLine(LOG_INFO, "ConnectionManager::manualPortForward - localConnectionType %d.\n",
-            attempt.result);
+    logInfo("ConnectionManager::manualPortForward - localConnectionType %d.\n", attempt.result);
     return attempt.result;
 }
 

@@ -23,8 +23,7 @@ void NetworkAddrs::init() {
     externalIP.clear();
     localIP.clear();
     clearIPChanged();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "NetworkAddrs::init - cleared local and external IP addresses.  Interval duration: %d\n",
         static_cast<int>(interval.GetIntervalDuration()));
 }
@@ -38,8 +37,7 @@ void NetworkAddrs::setNetworkAddrs(const std::string& externalIp, const std::str
     externalIP = externalIp;
     localIP = localIp;
     interval.StartTheInterval();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "NetworkAddrs::setNetworkAddrs - external IP [%s], local IP [%s], interval start time [%ld], interval duration [%d] \n",
         scrubSecrets(externalIP).c_str(), localIP.c_str(), interval.GetIntervalStartTime(),
         static_cast<int>(interval.GetIntervalDuration()));
@@ -47,8 +45,7 @@ void NetworkAddrs::setNetworkAddrs(const std::string& externalIp, const std::str
 
 int NetworkAddrs::discoverNetworkAddrs() {
     if (externalIP.empty() && localIP.empty()) {
-        logLine(LOG_INFO,
-                "NetworkAddrs::discoverNetworkAddrs - both externalIP and localIP are empty\n");
+        logInfo("NetworkAddrs::discoverNetworkAddrs - both externalIP and localIP are empty\n");
         return 0;
     }
     if (!pRouter) pRouter = std::make_unique<Router>();
@@ -59,8 +56,7 @@ int NetworkAddrs::discoverNetworkAddrs() {
 
     externalIPChanged = externalIP != discoveredExternal;
     internalIPChanged = localIP != discoveredLocal;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "NetworkAddrs::discoverNetworkAddrs - externalIPChanged [%d], external IP [%s], discovered external IP [%s], internalIPChanged [%d], internal IP [%s], discovered internal IP [%s]\n",
         externalIPChanged, scrubSecrets(externalIP).c_str(),
         scrubSecrets(discoveredExternal).c_str(), internalIPChanged, localIP.c_str(),
@@ -72,28 +68,25 @@ int NetworkAddrs::discoverNetworkAddrs() {
 bool NetworkAddrs::findExternalIp(std::string& discovered) {
     if (pRouter->isInitialized()) {
         discovered = pRouter->getExternalIp();
-        logLine(
-            LOG_INFO,
+        logInfo(
             "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [1], discovered external IP [%s]\n",
             scrubSecrets(discovered).c_str());
         return true;
     }
     if (!interval.hasExpired()) {
-        logLine(LOG_INFO, "NetworkAddrs::discoverNetworkAddrs - interval not expired.\n");
+        logInfo("NetworkAddrs::discoverNetworkAddrs - interval not expired.\n");
         return false;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [0], interval expired.  Interval start time [%ld], interval duration [%d], current time [%ld]\n",
         interval.GetIntervalStartTime(), static_cast<int>(interval.GetIntervalDuration()),
         static_cast<long>(time(nullptr)));
     if (getMyIP(discovered) != 1) {
-        logLine(LOG_INFO, "NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
+        logInfo("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
         return false;
     }
     interval.StartTheInterval();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "NetworkAddrs::discoverNetworkAddrs - discovered external IP [%s], reset interval start time [%ld]\n",
         discovered.c_str(), interval.GetIntervalStartTime());
     return true;
@@ -114,7 +107,7 @@ int NetworkAddrs::getMyIP(std::string& out) {
     int waitSeconds = 0;
     bool found = client->getMyIP(ip, waitSeconds);
     while (!found && waitSeconds > 0 && !terminationRequested()) {
-        logLine(LOG_INFO, "NetworkAddrs::getMyIP - wait %d seconds\n", waitSeconds);
+        logInfo("NetworkAddrs::getMyIP - wait %d seconds\n", waitSeconds);
         pauseUnlessTerminated(waitSeconds);
         // The server's answer is kept for a cycle; without this, that answer would be asked.
         client->resetServerSleepTime();
@@ -123,11 +116,11 @@ int NetworkAddrs::getMyIP(std::string& out) {
         found = client->getMyIP(ip, waitSeconds);
     }
     if (!found) {
-        logLine(LOG_INFO, "NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
+        logInfo("NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
         return 0;
     }
     out = ip;
-    logLine(LOG_INFO, "NetworkAddrs::getMyIP - external IP address %s\n", out.c_str());
+    logInfo("NetworkAddrs::getMyIP - external IP address %s\n", out.c_str());
     return 1;
 }
 

@@ -23,12 +23,10 @@ ConnectionType ConnectionManager::createRelayConnection() {
     if (VPNManager::getInstance()->isVPNRunning()) {
         client->updateLocalCommStatus("relayed");
         result = RELAYED;
-        logLine(LOG_INFO,
-                "ConnectionManager::createRelayConnection() - openVPN process is running.\n");
+        logInfo("ConnectionManager::createRelayConnection() - openVPN process is running.\n");
         setForceConnect(false);
     } else if (client->serverRequestedSleep()) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createRelayConnection() - server requested sleep, therefore openVPN will not be started, and this relay connection creation attempt will return failure.\n");
         return FAILED;
     } else {
@@ -36,8 +34,7 @@ ConnectionType ConnectionManager::createRelayConnection() {
     }
     if (router().hasLocalIpChanged()) {
         client->updateRemoteCommStatus(router().getLocalIp());
-        logLine(
-            LOG_NOTICE,
+        logNotice(
             "ConnectionManager::createRelayConnection() - local IP address has changed! Updating server with new address.\n");
     }
     if (result == RELAYED) lastManualPortForward = false;
@@ -47,28 +44,24 @@ ConnectionType ConnectionManager::createRelayConnection() {
 // Withdraws the direct path from the server and starts the tunnel. Mappings on the gateway stay.
 ConnectionType ConnectionManager::startRelay() {
     auto* client = TavikClient::getInstance();
-    logLine(LOG_INFO, "ConnectionManager::createRelayConnection() - creating VPN connection.\n");
+    logInfo("ConnectionManager::createRelayConnection() - creating VPN connection.\n");
     reportAnalytics("connecting");
     const int internalHttpPort = leadingInt(setting("INTERNAL_HTTP_PORT"));
     if (client->deleteServerMapping(internalHttpPort, router().getLocalIp())) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createRelayConnection() - deleted port mappings from server.\n");
     } else {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager:createRelayConnection() - failed to delete port mapping info.\n");
     }
     allocatedHttpPort = 0;
     allocatedHttpsPort = 0;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createRelayConnection() - attempting to open VPN relay connection.\n");
     if (!VPNManager::getInstance()->openVPNConnection()) {
         reportAnalytics("failed");
         client->updateLocalCommStatus("failed");
-        logLine(LOG_ERR,
-                "ConnectionManager::createRelayConnection() - failed to create VPN connection.\n");
+        logError("ConnectionManager::createRelayConnection() - failed to create VPN connection.\n");
         return FAILED;
     }
     reportAnalytics("relayed");
@@ -90,13 +83,12 @@ void ConnectionManager::removeMappings() {
         if (deviceType != kMakersRouter && !router().discover()) return;
         if (router().hasLocalIpChanged()) {
             TavikClient::getInstance()->updateRemoteCommStatus(router().getLocalIp());
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "ConnectionManager::killConnection() - local IP address has changed! Updating server with new address\n");
         }
     }
     if (router().isInitialized() && deviceType != kMakersRouter) {
-        logLine(LOG_INFO, "ConnectionManager::killConnection() - unmapping all ports\n");
+        logInfo("ConnectionManager::killConnection() - unmapping all ports\n");
         router().unmapAllPorts(kTcp, kHttpDescription);
         router().unmapAllPorts(kTcp, kHttpsDescription);
     } else {
@@ -111,18 +103,15 @@ void ConnectionManager::removeMappings() {
 void ConnectionManager::withdrawMappingRecord() {
     const std::string port = setting("INTERNAL_HTTP_PORT");
     if (port.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "ConnectionManager::killConnection() - failed to get internal port number from dynamicconfig.ini.\n");
         return;
     }
     if (TavikClient::getInstance()->deleteServerMapping(leadingInt(port), router().getLocalIp())) {
-        logLine(
-            LOG_NOTICE,
+        logNotice(
             "ConnectionManager::killConnection() - successfully deleted port mappings on central server.\n");
     } else {
-        logLine(LOG_ERR,
-                "ConnectionManager::killConnection() - failed to delete port mapping info.\n");
+        logError("ConnectionManager::killConnection() - failed to delete port mapping info.\n");
     }
 }
 

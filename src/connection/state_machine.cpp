@@ -45,8 +45,7 @@ void ConnectionManager::checkConnection(ConnectionType current) {
     if (checkDNS(current)) return;
     TavikClient::getInstance()->sendAnalytics("failed", current, SUBTYPE_NONE);
     TavikClient::getInstance()->updateLocalCommStatus("failed");
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::checkConnection - nslookup failed or does not match local value, kill existing connections.\n");
     killConnection(PORTFORWARDED);
     killConnection(RELAYED);
@@ -55,28 +54,23 @@ void ConnectionManager::checkConnection(ConnectionType current) {
 
 ConnectionType ConnectionManager::createConnection() {
     prevConnectionType = connectionType;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "--------------------------------------------------------------------------------------\n");
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createConnection() - checking status & attempting direct connection. Current connection type %d.\n",
         prevConnectionType);
     if (setting("DEVICEID").empty() || setting("DEVICEAUTH").empty()) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createConnection() - Deviceid and DeviceAuth is empty. Idle Process.\n");
         return FAILED;
     }
     connectionType = createDirectConnection();
     if (connectionType == FAILED) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createConnection() - port-forwarding failed, [attempting relay connection].\n");
         connectionType = createRelayConnection();
     }
-    logLine(LOG_INFO,
-            "ConnectionManager::createConnection() - port test response remote external IP [%s]\n",
+    logInfo("ConnectionManager::createConnection() - port test response remote external IP [%s]\n",
             responseExternalIP.c_str());
     if (connectionType == PORTFORWARDED || connectionType == RELAYED) noteConnectionType();
     return connectionType;
@@ -89,22 +83,19 @@ void ConnectionManager::noteConnectionType() {
         connTypeUnchangedCount = 0;
         portTestInterval = kShortestPortTestInterval;
         // The line says that the last port test time was set; it is only shown.
-        logLine(
-            LOG_INFO,
+        logInfo(
             "ConnectionManager::createConnection() - connection type changed to %d, port test interval reset to %ld, last port test time set to %ld, connTypeUnchangedCount %d, forceDNSCheck=true.\n",
             connectionType, portTestInterval, static_cast<long>(lastPortTestTime),
             connTypeUnchangedCount);
         return;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createConnection() - connection type %d un-changed. connTypeUnchangedCount %d, forceDNSCheck=false\n",
         connectionType, connTypeUnchangedCount);
     if (++connTypeUnchangedCount <= kUnchangedCyclesPerStep) return;
     connTypeUnchangedCount = 0;
     increasePortTestInterval();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "ConnectionManager::createConnection() - connection type un-changed, increased port test interval to %ld.\n",
         portTestInterval);
 }
@@ -115,7 +106,7 @@ void ConnectionManager::increasePortTestInterval() {
 
 void ConnectionManager::setForceConnect(bool force) {
     forceConnect = force;
-    logLine(LOG_INFO, "ConnectionManager::setForceConnect = %d\n", forceConnect ? 1 : 0);
+    logInfo("ConnectionManager::setForceConnect = %d\n", forceConnect ? 1 : 0);
 }
 
 void ConnectionManager::setReqPortMappingLifetime(unsigned upnp, unsigned natpmp) {
@@ -126,8 +117,7 @@ void ConnectionManager::getReqPortMappingLifetime(unsigned& upnp, unsigned& natp
     upnp = Router::INVALID_LEASE_DURATION;
     natpmp = Router::INVALID_LEASE_DURATION;
     if (!pRouter) {
-        logLine(LOG_WARNING,
-                "ConnectionManager::getReqPortMappingLifetime - UPnP lifetimes not set yet\n");
+        logWarning("ConnectionManager::getReqPortMappingLifetime - UPnP lifetimes not set yet\n");
         return;
     }
     pRouter->getReqPortMappingLifetime(upnp, natpmp);

@@ -42,21 +42,21 @@ void DaemonControl::run() {
 void DaemonControl::startClean() {
     const std::string status = setting("COMMUNICATION_STATUS");
     if (status.empty() || status == "disabled") {
-        logLine(LOG_NOTICE, "DaemonControl::run - Update local comm mode.\n");
+        logNotice("DaemonControl::run - Update local comm mode.\n");
         TavikClient::getInstance()->updateLocalCommStatus("connecting");
     }
     if (remoteAccessEnabled) {
         // An earlier run may have ended without removing its mappings or its tunnel.
-        logLine(LOG_NOTICE, "DaemonControl::run - Kill direct connection comm mode.\n");
+        logNotice("DaemonControl::run - Kill direct connection comm mode.\n");
         ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
         VPNManager::getInstance()->cleanupVPNConnection();
     }
-    logLine(LOG_INFO, "DaemonControl::run - nslookup check interval %ld\n",
+    logInfo("DaemonControl::run - nslookup check interval %ld\n",
             ConnectionManager::getInstance()->getDNSCheckInterval());
     unsigned upnp = 0;
     unsigned natpmp = 0;
     ConnectionManager::getInstance()->getReqPortMappingLifetime(upnp, natpmp);
-    logLine(LOG_INFO, "DaemonControl::run - UPnP lifetime %u, NAT-PMP lifetime %u\n", upnp, natpmp);
+    logInfo("DaemonControl::run - UPnP lifetime %u, NAT-PMP lifetime %u\n", upnp, natpmp);
 }
 
 void DaemonControl::runCycle() {
@@ -64,11 +64,10 @@ void DaemonControl::runCycle() {
     lastConnectionType = ConnectionManager::getInstance()->createConnection();
     const int serverSleepTime = TavikClient::getInstance()->getServerSleepTime();
     if (sleepTime >= serverSleepTime) {
-        logLine(LOG_INFO, "DaemonControl::run - sleep %d secs.\n", sleepTime);
+        logInfo("DaemonControl::run - sleep %d secs.\n", sleepTime);
         pauseUnlessTerminated(sleepTime);
     } else {
-        logLine(LOG_INFO, "DaemonControl::run - retry connection after %d secs.\n",
-                serverSleepTime);
+        logInfo("DaemonControl::run - retry connection after %d secs.\n", serverSleepTime);
         pauseUnlessTerminated(serverSleepTime);
     }
     TavikClient::getInstance()->resetServerSleepTime();
@@ -80,7 +79,7 @@ void DaemonControl::shutDown() {
     stopRequested = false;
     ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
     ConnectionManager::getInstance()->killConnection(RELAYED);
-    logLine(LOG_INFO, "DaemonControl::run - Remote access disabled.\n");
+    logInfo("DaemonControl::run - Remote access disabled.\n");
     // sigTrap gave the signal its default action back, so whoever waits for this process sees
     // that it ended by that signal.
     if (terminationRequested()) static_cast<void>(kill(getpid(), sigConnKilled));
@@ -91,13 +90,13 @@ void DaemonControl::setSleepTime(int seconds) {
 }
 
 void DaemonControl::enableRemoteAccess() {
-    logLine(LOG_NOTICE, "DaemonControl::enableRemoteAcces - remote access is enabled.\n");
+    logNotice("DaemonControl::enableRemoteAcces - remote access is enabled.\n");
     remoteAccessEnabled = true;
     stopRequested = false;
 }
 
 void DaemonControl::disableRemoteAccess() {
-    logLine(LOG_NOTICE, "DaemonControl::disableRemoteAccess - remote access is disabled.\n");
+    logNotice("DaemonControl::disableRemoteAccess - remote access is disabled.\n");
     remoteAccessEnabled = false;
     stopRequested = true;
 }

@@ -17,33 +17,33 @@ void leaveBySignal(int sig) {
     DaemonControl::getInstance()->stop();
     static_cast<void>(std::signal(sig, SIG_DFL));
     sigConnKilled = sig;
-    logLine(LOG_INFO, "sigTrap - sigConnKilled is set to incoming signal.\n");
+    logInfo("sigTrap - sigConnKilled is set to incoming signal.\n");
 }
 
 void handle(int sig) {
     switch (sig) {
         case SIGINT:
-            logLine(LOG_ERR, "sigTrap - Received SIGINT signal.\n");
+            logError("sigTrap - Received SIGINT signal.\n");
             leaveBySignal(sig);
             break;
         case SIGQUIT:
-            logLine(LOG_ERR, "sigTrap - Received SIGQUIT signal.\n");
+            logError("sigTrap - Received SIGQUIT signal.\n");
             leaveBySignal(sig);
             break;
         case SIGTERM:
-            logLine(LOG_ERR, "sigTrap - Received SIGTERM signal.\n");
+            logError("sigTrap - Received SIGTERM signal.\n");
             leaveBySignal(sig);
             break;
         case _SIGENABLEREMOTEACCESS:
             DaemonControl::getInstance()->enableRemoteAccess();
-            logLine(LOG_ERR, "sigTrap - Received _SIGENABLEREMOTEACCESS signal.\n");
+            logError("sigTrap - Received _SIGENABLEREMOTEACCESS signal.\n");
             break;
         case _SIGDISABLEREMOTEACCESS:
             DaemonControl::getInstance()->disableRemoteAccess();
-            logLine(LOG_ERR, "sigTrap - Received _SIGDISABLEREMOTEACCESS signal.\n");
+            logError("sigTrap - Received _SIGDISABLEREMOTEACCESS signal.\n");
             break;
         default:
-            logLine(LOG_ERR, "Unhandled signal (%d) \n", sig);
+            logError("Unhandled signal (%d) \n", sig);
             break;
     }
 }

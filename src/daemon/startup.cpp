@@ -66,10 +66,9 @@ pid_t becomeDaemon() {
 }
 
 void logBanner(pid_t session) {
-    logLine(LOG_NOTICE,
-            "=======================================================================\n");
-    logLine(LOG_NOTICE, "main - %s daemon starting up, Version: [%s], PID: [%d], SID: [%d] \n",
-            "pelorus", GetPelorusVersion(), getpid(), session);
+    logNotice("=======================================================================\n");
+    logNotice("main - %s daemon starting up, Version: [%s], PID: [%d], SID: [%d] \n", "pelorus",
+              GetPelorusVersion(), getpid(), session);
 }
 
 // The folder is everybody's: a link planted there must not redirect the write, nor a FIFO hold
@@ -87,7 +86,7 @@ bool loadConfiguration() {
     if (GlobalConfig::getInstance()->loadConfig(path != nullptr ? path : kDefaultStaticConfig)) {
         return true;
     }
-    logLine(LOG_ERR, "main - config file failed to load.\n");
+    logError("main - config file failed to load.\n");
     return false;
 }
 

@@ -64,8 +64,7 @@ bool isNumber(const std::string& text) {
 bool killProcess(const std::string& pid, const char* signal) {
     const int result = runShell(std::string{"kill "} + signal + " " + pid);
     if (result == 0) return true;
-    logLine(
-        LOG_ERR,
+    logError(
         "VPNManager::closeVPNConnection() - failed to stop openVPN process with PID: %s, result %d\n",
         pid.c_str(), result);
     return false;
@@ -73,17 +72,14 @@ bool killProcess(const std::string& pid, const char* signal) {
 
 bool stopProcess(const std::string& pid, int pass) {
     if (pass <= kGracefulStopPasses) {
-        logLine(LOG_INFO,
-                "VPNManager::closeVPNConnection() - attempting to stop process with PID: %s \n",
+        logInfo("VPNManager::closeVPNConnection() - attempting to stop process with PID: %s \n",
                 pid.c_str());
         return killProcess(pid, "-15");
     }
-    logLine(
-        LOG_ERR,
+    logError(
         "VPNManager::closeVPNConnection() - failed to gracefully stop openVPN, terminating with SIGKILL\n");
-    logLine(LOG_ERR,
-            "VPNManager::closeVPNConnection() - attempting to SIGKILL process with PID: %s \n",
-            pid.c_str());
+    logError("VPNManager::closeVPNConnection() - attempting to SIGKILL process with PID: %s \n",
+             pid.c_str());
     return killProcess(pid, "-9");
 }
 
@@ -96,33 +92,30 @@ VPNManager* VPNManager::getInstance() {
 
 bool VPNManager::openVPNConnection() {
     const WorkingDirectory inConfigPath{setting("OPENVPN_CONFIG_PATH")};
-    logLine(LOG_INFO, "VPNManager::openVPNConnection() - checking if openVPN is running...\n");
+    logInfo("VPNManager::openVPNConnection() - checking if openVPN is running...\n");
     if (isVPNRunning()) {
-        logLine(LOG_INFO, "VPNManager::openVPNConnection() - openVPN is already running\n");
+        logInfo("VPNManager::openVPNConnection() - openVPN is already running\n");
         return true;
     }
     if (!writeCredentials()) return false;
     runShell(setting("UPDATE_CONF_WITH_SERVER_CMD"));
-    logLine(
-        LOG_NOTICE,
+    logNotice(
         "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.\n");
     return startClient();
 }
 
 bool VPNManager::writeCredentials() {
-    logLine(LOG_INFO, "VPNManager::openVPNConnection() - creating auth.txt \n");
+    logInfo("VPNManager::openVPNConnection() - creating auth.txt \n");
     const std::string deviceId = setting("DEVICEID");
     const std::string deviceAuth = setting("DEVICEAUTH");
     if (deviceId.empty() || deviceAuth.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "VPNManager::openVPNConnection() - failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n");
         return false;
     }
     const FileHandle file = openFile(setting("OPENVPN_AUTH_FILE"), "we");
     if (!file) {
-        logLine(LOG_ERR,
-                "VPNManager::openVPNConnection() - failed to open VPN Auth file for write!\n");
+        logError("VPNManager::openVPNConnection() - failed to open VPN Auth file for write!\n");
         return false;
     }
     static_cast<void>(std::fprintf(file.get(), "%s\n%s\n", deviceId.c_str(), deviceAuth.c_str()));
@@ -137,8 +130,7 @@ bool VPNManager::startClient() {
         if (isUp) return true;
         closeVPNConnection();
     }
-    logLine(
-        LOG_ERR,
+    logError(
         "VPNManager::openVPNConnection() - Failed to establish VPN connection, retries exceeded\n");
     return false;
 }
@@ -161,17 +153,14 @@ bool VPNManager::waitUntilUp(bool& isUp) {
         sleep(kStartCheckDelay);
         const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
         if (!output) {
-            logLine(LOG_ERR,
-                    "VPNManager::openVPNConnection() - failed to open openVPN stdout file!\n");
+            logError("VPNManager::openVPNConnection() - failed to open openVPN stdout file!\n");
             return false;
         }
         isUp = holdsSuccessText(output.get(), setting("LOG_SUCCESS_TEXT"));
         if (isUp) {
-            logLine(LOG_INFO,
-                    "VPNManager::openVPNConnection() - openVPN has started successfully\n");
+            logInfo("VPNManager::openVPNConnection() - openVPN has started successfully\n");
         } else {
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "VPNManager::openVPNConnection() - openVPN initialization did not complete, waiting...\n");
         }
     }
@@ -188,16 +177,13 @@ bool VPNManager::isVPNRunning() {
     }
     std::string pid;
     if (line.front() == '\0') {
-        logLine(LOG_WARNING, "VPNManager::isVPNRunning() - openVPN pid file %s is empty\n",
-                pidFile.c_str());
+        logWarning("VPNManager::isVPNRunning() - openVPN pid file %s is empty\n", pidFile.c_str());
     } else if (pidIsOpenVPNProcess(line.data(), pid)) {
         return true;
     }
-    logLine(LOG_WARNING, "VPNManager::isVPNRunning() - unlink stale openVPN pid file %s\n",
-            pidFile.c_str());
+    logWarning("VPNManager::isVPNRunning() - unlink stale openVPN pid file %s\n", pidFile.c_str());
     if (unlink(pidFile.c_str()) != 0) {
-        logLine(
-            LOG_WARNING,
+        logWarning(
             "VPNManager::isVPNRunning() - failed to unlink stale openVPN pid file %s, errno %d.\n",
             pidFile.c_str(), errno);
     }
@@ -211,41 +197,38 @@ bool VPNManager::pidIsOpenVPNProcess(char* line, std::string& pid) {
     // The pid file is a configured path: it may name any file, the credentials file included.
     const std::string shownPid = scrubSecrets(pid);
     const std::string shownPath = "/proc/" + shownPid + "/exe";
-    logLine(LOG_INFO, "VPNManager::pidIsOpenVPNProcess() - openvpn proc_pid_exe path %s\n",
+    logInfo("VPNManager::pidIsOpenVPNProcess() - openvpn proc_pid_exe path %s\n",
             shownPath.c_str());
     struct stat status {};
     if (stat(exePath.c_str(), &status) != 0) {
-        logLine(LOG_WARNING, "VPNManager::pidIsOpenVPNProcess() - stat %s failed, errno %d\n",
-                shownPath.c_str(), errno);
+        logWarning("VPNManager::pidIsOpenVPNProcess() - stat %s failed, errno %d\n",
+                   shownPath.c_str(), errno);
         return false;
     }
     std::array<char, kLinkTargetSize> target{};
     if (readlink(exePath.c_str(), target.data(), target.size() - 1) < 0) {
-        logLine(LOG_WARNING, "VPNManager::pidIsOpenVPNProcess() - readlink %s failed, errno %d\n",
-                shownPath.c_str(), errno);
+        logWarning("VPNManager::pidIsOpenVPNProcess() - readlink %s failed, errno %d\n",
+                   shownPath.c_str(), errno);
         return false;
     }
-    logLine(LOG_INFO, "VPNManager::pidIsOpenVPNProcess() - readlink %s succeeded, symlink %s\n",
+    logInfo("VPNManager::pidIsOpenVPNProcess() - readlink %s succeeded, symlink %s\n",
             shownPath.c_str(), target.data());
 
     const std::string pidFile = setting("OPENVPN_PID_FILE");
     // The text ends up in a shell command: whatever /proc makes of it, only a number is a pid.
     if (isNumber(pid) && strcasestr(target.data(), "openvpn") != nullptr) {
-        logLine(LOG_INFO,
-                "VPNManager::pidIsOpenVPNProcess() - pid %s in %s matches %s symlink %s\n",
+        logInfo("VPNManager::pidIsOpenVPNProcess() - pid %s in %s matches %s symlink %s\n",
                 shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
         return true;
     }
-    logLine(LOG_WARNING,
-            "VPNManager::pidIsOpenVPNProcess() - pid %s in %s does not match %s symlink %s\n",
-            shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
+    logWarning("VPNManager::pidIsOpenVPNProcess() - pid %s in %s does not match %s symlink %s\n",
+               shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
     return false;
 }
 
 bool VPNManager::closeVPNConnection() {
     if (!isVPNRunning()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "VPNManager::closeVPNConnection() - openVPN process is not running, so return true.\n");
         return true;
     }
@@ -253,19 +236,19 @@ bool VPNManager::closeVPNConnection() {
         if (!stopOnce(pass)) break;
     }
     if (!isVPNRunning()) return true;
-    logLine(LOG_ERR, "VPNManager::closeVPNConnection() - failed to stop openVPN process\n");
+    logError("VPNManager::closeVPNConnection() - failed to stop openVPN process\n");
     return false;
 }
 
 // One pass. False when the pid file cannot be read, so that another pass has no use.
 bool VPNManager::stopOnce(int pass) {
     const std::string pidFile = setting("OPENVPN_PID_FILE");
-    logLine(LOG_INFO, "VPNManager::closeVPNConnection() - openVPN process is running\n");
+    logInfo("VPNManager::closeVPNConnection() - openVPN process is running\n");
     bool allStopped = true;
     {
         const FileHandle file = openFile(pidFile, "re");
         if (!file) {
-            logLine(LOG_ERR, "VPNManager::closeVPNConnection() - failed to open PID output file\n");
+            logError("VPNManager::closeVPNConnection() - failed to open PID output file\n");
             return false;
         }
         std::array<char, kStopPidLineSize> line{};
@@ -278,8 +261,7 @@ bool VPNManager::stopOnce(int pass) {
     }
     // Without the file the client counts as stopped, even if it is still on its way out.
     if (allStopped && unlink(pidFile.c_str()) != 0) {
-        logLine(
-            LOG_ERR,
+        logError(
             "VPNManager::closeVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
             pidFile.c_str(), errno);
     }
@@ -291,8 +273,7 @@ bool VPNManager::cleanupVPNConnection() {
     struct stat status {};
     if (stat(pidFile.c_str(), &status) != 0) return true;
     if (unlink(pidFile.c_str()) == 0) return true;
-    logLine(
-        LOG_ERR,
+    logError(
         "VPNManager::cleanupVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
         pidFile.c_str(), errno);
     return false;
@@ -320,8 +301,7 @@ bool readAddress(const char* text, std::string& address) {
 bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
     const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
     if (!output) {
-        logLine(LOG_ERR,
-                "VPNManager::fetchOpenVPN_IPAddr() - failed to open openVPN stdout file!\n");
+        logError("VPNManager::fetchOpenVPN_IPAddr() - failed to open openVPN stdout file!\n");
         return false;
     }
     std::array<char, kOutputLineSize> line{};
@@ -329,12 +309,10 @@ bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
         const char* peer = std::strstr(line.data(), kPeerText);
         if (peer == nullptr) continue;
         if (readAddress(peer + std::strlen(kPeerText), ip)) {
-            logLine(LOG_INFO,
-                    "VPNManager::fetchOpenVPN_IPAddr - found openVPN AF_INET IP address %s.\n",
+            logInfo("VPNManager::fetchOpenVPN_IPAddr - found openVPN AF_INET IP address %s.\n",
                     ip.c_str());
         } else {
-            logLine(
-                LOG_ERR,
+            logError(
                 "VPNManager::fetchOpenVPN_IPAddr - failed to fetch openVPN AF_INET IP address from line %s.\n",
                 scrubSecrets(line.data()).c_str());
         }

@@ -37,10 +37,10 @@ using Devices = std::unique_ptr<UPNPDev, DevicesFreer>;
 struct UrlsFreer {
     void operator()(UPNPUrls* urls) const { FreeUPNPUrls(urls); }
 };
-/// What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
+// What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
 using UrlContents = std::unique_ptr<UPNPUrls, UrlsFreer>;
 
-/// A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
+// A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
 bool leadsToLan(const ifaddrs& entry) {
     constexpr unsigned kUnfit = IFF_LOOPBACK | IFF_POINTOPOINT | IFF_NOARP;
     constexpr unsigned kInUse = IFF_UP | IFF_RUNNING;
@@ -48,29 +48,27 @@ bool leadsToLan(const ifaddrs& entry) {
            (entry.ifa_flags & kInUse) != 0 && !contains(entry.ifa_name, "docker");
 }
 
-/// Where the address bytes stand in an interface's socket address.
+// Where the address bytes stand in an interface's socket address.
 const void* addressBytes(const sockaddr* address) {
     const void* const raw = address;
     if (address->sa_family == AF_INET6) return &static_cast<const sockaddr_in6*>(raw)->sin6_addr;
     return &static_cast<const sockaddr_in*>(raw)->sin_addr;
 }
 
-/// The address text of one interface, empty when it cannot be had.
+// The address text of one interface, empty when it cannot be had.
 std::string addressText(const ifaddrs& entry) {
     const int family = entry.ifa_addr->sa_family;
     const char* const familyName = family == AF_INET6 ? "AF_INET6" : "AF_INET";
     std::array<char, INET6_ADDRSTRLEN> text{};
-    const socklen_t room = family == AF_INET6 ? INET6_ADDRSTRLEN : INET_ADDRSTRLEN;
-    if (inet_ntop(family, addressBytes(entry.ifa_addr), text.data(), room) == nullptr) {
+    const socklen_t capacity = family == AF_INET6 ? INET6_ADDRSTRLEN : INET_ADDRSTRLEN;
+    if (inet_ntop(family, addressBytes(entry.ifa_addr), text.data(), capacity) == nullptr) {
         const int error = errno;
-        logLine(
-            LOG_ERR,
+        logError(
             "Router::initLocalIp() - inet_ntop failed, errno [%d]  Address Name: [%s]   Address Family: [%s][%d]   Flags: [%#08x]\n",
             error, entry.ifa_name, familyName, family, entry.ifa_flags);
         return "";
     }
-    logLine(
-        LOG_DEBUG,
+    logDebug(
         "Router::initLocalIp() - Address Name: [%s]   Address Family: [%s][%d]   Address: [%s]  Flags: [%#08x]\n",
         entry.ifa_name, familyName, family, text.data(), entry.ifa_flags);
     return text.data();
@@ -81,14 +79,14 @@ std::string textOf(const char* text) {
 }
 
 void logDevices(const UPNPDev* device) {
-    logLine(LOG_INFO, "Router::upnp_discover - List of UPNP devices found on the network :\n");
+    logInfo("Router::upnp_discover - List of UPNP devices found on the network :\n");
     for (; device != nullptr; device = device->pNext) {
-        logLine(LOG_INFO, " desc: %s\n st: %s\n\n", scrubSecrets(textOf(device->descURL)).c_str(),
+        logInfo(" desc: %s\n st: %s\n\n", scrubSecrets(textOf(device->descURL)).c_str(),
                 scrubSecrets(textOf(device->st)).c_str());
     }
 }
 
-/// Some hosts announce a gateway that their own "udhisapi.dll" only pretends to be.
+// Some hosts announce a gateway that their own "udhisapi.dll" only pretends to be.
 bool isGateway(const UPNPDev& device) {
     const std::string target = textOf(device.st);
     const bool wanted = target == "urn:schemas-upnp-org:device:InternetGatewayDevice:1" ||
@@ -97,8 +95,8 @@ bool isGateway(const UPNPDev& device) {
     return wanted && !contains(textOf(device.descURL), "udhisapi.dll");
 }
 
-/// The gateways among @p device and what follows it, as a list of its own in the same order. The
-/// texts stay those of the original list.
+// The gateways among @p device and what follows it, as a list of its own in the same order. The
+// texts stay those of the original list.
 std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
     std::vector<UPNPDev> gateways;
     for (; device != nullptr; device = device->pNext) {
@@ -116,25 +114,21 @@ void logChosenDevice(int state, const std::string& controlUrl, const char* lanAd
     const std::string url = scrubSecrets(controlUrl);
     switch (state) {
         case miniupnpc::CONNECTED_IGD:
-            logLine(LOG_INFO,
-                    "Router::upnp_discover - IGD found at: %s, local host IP address: %s \n",
+            logInfo("Router::upnp_discover - IGD found at: %s, local host IP address: %s \n",
                     url.c_str(), lanAddress);
             break;
         case miniupnpc::UNCONNECTED_IGD:
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "Router::upnp_discover - Unconnected IGD found at: %s local host IP address: %s, proceeding anyway \n",
                 url.c_str(), lanAddress);
             break;
         case miniupnpc::OTHER_UPNP_DEVICE:
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "Router::upnp_discover - Non-IGD UPnP device found at: %s local hostIP address: %s , proceeding anyway \n",
                 url.c_str(), lanAddress);
             break;
         default:
-            logLine(
-                LOG_INFO,
+            logInfo(
                 "Router::upnp_discover - Unknown device type found at: %s local address: %s, proceeding anyway \n",
                 url.c_str(), lanAddress);
             break;
@@ -161,7 +155,7 @@ void Router::forgetSeenChanges() {
 void Router::initLocalIp() {
     ifaddrs* list = nullptr;
     if (getifaddrs(&list) != 0) {
-        logLine(LOG_ERR, "Router::initLocalIP() - failed to get local NIC info.\n");
+        logError("Router::initLocalIP() - failed to get local NIC info.\n");
         return;
     }
     const Interfaces interfaces(list);
@@ -178,20 +172,20 @@ void Router::initLocalIp() {
 
 void Router::takeLocalIp(const std::string& ipv4, const std::string& ipv6) {
     if (ipv4.empty() && ipv6.empty()) {
-        logLine(LOG_ERR, "Router::initLocalIP() - failed to retrieve local IPv4 or IPv6\n");
+        logError("Router::initLocalIP() - failed to retrieve local IPv4 or IPv6\n");
         return;
     }
     if (!localIp.empty() && (localIp == ipv4 || localIp == ipv6)) return;
     localIp = ipv4.empty() ? ipv6 : ipv4;
     localIpChanged = true;
-    logLine(LOG_INFO, "Router::initLocalIP() - IPv4: [%s]  IPv6: [%s]  setting localIP to: [%s] \n",
+    logInfo("Router::initLocalIP() - IPv4: [%s]  IPv6: [%s]  setting localIP to: [%s] \n",
             ipv4.c_str(), ipv6.c_str(), localIp.c_str());
 }
 
 bool Router::upnp_discover() {
     Devices devices(miniupnpc::discover(kDiscoverDelay));
     if (!devices) {
-        logLine(LOG_ERR, "Router::upnp_discover - UPnP Discover failed to return any response.\n");
+        logError("Router::upnp_discover - UPnP Discover failed to return any response.\n");
         return false;
     }
     logDevices(devices.get());
@@ -200,12 +194,12 @@ bool Router::upnp_discover() {
     const bool success = useGateway(gateways.front());
     devices.reset();
     gateways.clear();
-    logLine(LOG_INFO, "Router::upnp_discover - finished discovery, success = %s \n",
+    logInfo("Router::upnp_discover - finished discovery, success = %s \n",
             success ? "true" : "false");
     return success;
 }
 
-/// Chooses among the gateways of a list and learns the external address from the chosen one.
+// Chooses among the gateways of a list and learns the external address from the chosen one.
 bool Router::useGateway(UPNPDev& gateways) {
     UPNPUrls urls{};
     IGDdatas data{};
@@ -213,7 +207,7 @@ bool Router::useGateway(UPNPDev& gateways) {
     const int state =
         miniupnpc::getValidIgd(&gateways, urls, data, lanAddress.buffer(), lanAddress.documented());
     if (state == miniupnpc::NO_IGD) {
-        logLine(LOG_INFO, "Router::upnp_discover - invalid device type \n");
+        logInfo("Router::upnp_discover - invalid device type \n");
         return false;
     }
     const UrlContents contents(&urls);
@@ -222,7 +216,7 @@ bool Router::useGateway(UPNPDev& gateways) {
     serviceType.assign(type, strnlen(type, sizeof data.first.servicetype));
     logChosenDevice(state, controlUrl, lanAddress.text());
     const bool found = findExternalIp();
-    logLine(LOG_INFO, "Router::upnp_discover - FreeUPNPUrls.\n");
+    logInfo("Router::upnp_discover - FreeUPNPUrls.\n");
     return found;
 }
 
@@ -231,16 +225,15 @@ bool Router::findExternalIp() {
     const int status = miniupnpc::call(UPNP_GetExternalIPAddress, controlUrl.c_str(),
                                        serviceType.c_str(), address.buffer());
     if (status != 0 || address.empty()) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::upnp_discover - failed to get External IP address, ipStatus: %d, value received: %s \n",
             status, scrubSecrets(address.text()).c_str());
         return false;
     }
     if (takeExternalIp(address.text())) {
-        logLine(LOG_NOTICE, "Router::upnp_discover - Router's external IP address has changed!\n");
+        logNotice("Router::upnp_discover - Router's external IP address has changed!\n");
     }
-    logLine(LOG_INFO, "Router::upnp_discover - Router's external IP address: %s \n",
+    logInfo("Router::upnp_discover - Router's external IP address: %s \n",
             scrubSecrets(address.text()).c_str());
     initialized = true;
     return true;
@@ -249,28 +242,27 @@ bool Router::findExternalIp() {
 bool Router::natpmp_discover() {
     if (!pNatpmp) {
         pNatpmp.reset(new (std::nothrow) CMnatpmp);
-        logLine(LOG_NOTICE, "Router::natpmp_discover - unexpected pNatpmp is NULL.\n");
+        logNotice("Router::natpmp_discover - unexpected pNatpmp is NULL.\n");
     }
     if (!pNatpmp) {
-        logLine(LOG_NOTICE, "Router::natpmp_discover - unexpected pNatpmp is still NULL.\n");
+        logNotice("Router::natpmp_discover - unexpected pNatpmp is still NULL.\n");
         return false;
     }
     std::string ip;
     if (!pNatpmp->retrieveExternalIP(ip) || ip.empty()) {
-        logLine(LOG_INFO, "Router::natpmp_discover - failed to get External IP address\n");
+        logInfo("Router::natpmp_discover - failed to get External IP address\n");
         return false;
     }
     isNatPMP = true;
     if (takeExternalIp(ip)) {
-        logLine(LOG_NOTICE,
-                "Router::natpmp_discover - Router's external IP address has changed!\n");
+        logNotice("Router::natpmp_discover - Router's external IP address has changed!\n");
     }
-    logLine(LOG_INFO, "Router::natpmp_discover - Router's external IP address: %s \n", ip.c_str());
+    logInfo("Router::natpmp_discover - Router's external IP address: %s \n", ip.c_str());
     initialized = true;
     return true;
 }
 
-/// True when @p address is new.
+// True when @p address is new.
 bool Router::takeExternalIp(const std::string& address) {
     if (externalIp == address) return false;
     externalIp = address;

@@ -53,8 +53,8 @@ bool isAddress(const std::string& text) {
            inet_pton(AF_INET6, text.c_str(), &bytes) == 1;
 }
 
-/// The address a script prints in its first line; empty when it prints none. Anything but an
-/// address would travel on into shell commands and requests, so it counts as none.
+// The address a script prints in its first line; empty when it prints none. Anything but an
+// address would travel on into shell commands and requests, so it counts as none.
 std::string askForAddress(const char* command) {
     const PipeHandle answer(popen(command, "re"));
     std::string line;
@@ -83,7 +83,7 @@ bool parsePortRange(const std::string& text, int& first, int& last) {
     return parsePort(trimmed(text.substr(dash + 1)), last) && first <= last;
 }
 
-/// Cuts @p line at its first commas; the last part is the description, commas and all.
+// Cuts @p line at its first commas; the last part is the description, commas and all.
 std::vector<std::string> splitFields(const std::string& line) {
     std::vector<std::string> fields;
     std::size_t start = 0;
@@ -97,7 +97,7 @@ std::vector<std::string> splitFields(const std::string& line) {
     return fields;
 }
 
-/// OWNER,PROTOCOL,FIRST[-LAST],LANADDRESS,INTERNALPORT,DESCRIPTION
+// OWNER,PROTOCOL,FIRST[-LAST],LANADDRESS,INTERNALPORT,DESCRIPTION
 bool parseEntry(const std::string& line, _BrenvikPortIp& entry) {
     const std::vector<std::string> fields = splitFields(line);
     if (fields.size() <= kFieldsBeforeDescription) return false;
@@ -111,8 +111,8 @@ bool parseEntry(const std::string& line, _BrenvikPortIp& entry) {
            isAddress(entry.localIp) && parsePort(fields[4], entry.internalPort);
 }
 
-/// Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
-/// be started, else 1; what the script made of it is not known.
+// Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
+// be started, else 1; what the script made of it is not known.
 int runHelper(const char* action, const std::string& argument) {
     constexpr std::string_view kSpecialInQuotes = "\"$`\\";
     std::string command = std::string(kHelperScript) + " " + action + " \"";
@@ -132,8 +132,7 @@ int Router::initIpAddrBrenvik() {
     if (!wan.empty()) externalIp = wan;
     if (!lan.empty()) localIp = lan;
     if (wan.empty()) {
-        logLine(
-            LOG_ERR,
+        logError(
             "Router::initIpAddrBrenvik - Not connected to internet. Please check network connectivity.\n");
         return 0;
     }

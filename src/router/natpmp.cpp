@@ -23,7 +23,7 @@ constexpr int kMaxLateAnswers = 100;
 constexpr int kLateAnswerWait = 1000;  // milliseconds
 constexpr int kSelectDescriptors = FD_SETSIZE;
 
-/// The protocol's number for "TCP" or "UDP", 0 for anything else.
+// The protocol's number for "TCP" or "UDP", 0 for anything else.
 int protocolNumber(const std::string& protocol) {
     if (protocol == "TCP") return NATPMP_PROTOCOL_TCP;
     if (protocol == "UDP") return NATPMP_PROTOCOL_UDP;
@@ -76,7 +76,7 @@ bool CMnatpmp::init() {
         // The library opens its socket first and keeps it when it then finds no gateway.
         if (natpmp.s > 0) static_cast<void>(closenatpmp(&natpmp));
         natpmp = {};
-        logLine(LOG_ERR, "CMnatpmp::init  initnatpmp failed %d\n", status);
+        logError("CMnatpmp::init  initnatpmp failed %d\n", status);
     }
     return initialized;
 }
@@ -84,7 +84,7 @@ bool CMnatpmp::init() {
 bool CMnatpmp::close() {
     if (initialized) {
         const int status = closenatpmp(&natpmp);
-        if (status < 0) logLine(LOG_ERR, "CMnatpmp::close  closenatpmp failed %d\n", status);
+        if (status < 0) logError("CMnatpmp::close  closenatpmp failed %d\n", status);
         initialized = false;
     }
     return true;
@@ -96,8 +96,8 @@ int CMnatpmp::CheckNATPMPResponse() {
         timeval timeout{};
         const int timeoutStatus = getnatpmprequesttimeout(&natpmp, &timeout);
         if (timeoutStatus < 0) {
-            logLine(LOG_ERR, "CMnatpmp::CheckNATPMPResponse  getnatpmprequesttimeout error %d\n",
-                    timeoutStatus);
+            logError("CMnatpmp::CheckNATPMPResponse  getnatpmprequesttimeout error %d\n",
+                     timeoutStatus);
             return timeoutStatus;
         }
         waitForAnswer(natpmp.s, timeout);
@@ -108,25 +108,22 @@ int CMnatpmp::CheckNATPMPResponse() {
 
 bool CMnatpmp::retrieveExternalIP(std::string& ip) {
     if (!init()) {
-        logLine(LOG_ERR,
-                "CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
+        logError("CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
     discardLateAnswers(natpmp);
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
-        logLine(LOG_ERR,
-                "CMnatpmp::retrieveExternalIP  sendpublicaddressrequest error %d, errno %d\n", sent,
-                error);
+        logError("CMnatpmp::retrieveExternalIP  sendpublicaddressrequest error %d, errno %d\n",
+                 sent, error);
         return false;
     }
     if (CheckNATPMPResponse() < 0) {
         const int error = errno;
         externalIp.clear();
         ip.clear();
-        logLine(LOG_INFO,
-                "CMnatpmp::retrieveExternalIP  failed to fetched external IP address, errno %d\n",
+        logInfo("CMnatpmp::retrieveExternalIP  failed to fetched external IP address, errno %d\n",
                 error);
         return false;
     }
@@ -135,8 +132,7 @@ bool CMnatpmp::retrieveExternalIP(std::string& ip) {
         inet_ntop(AF_INET, &response.pnu.publicaddress.addr, text.data(), text.size()));
     externalIp = text.data();
     ip = externalIp;
-    logLine(LOG_INFO, "CMnatpmp::retrieveExternalIP  fetched external IP address %s\n",
-            externalIp.c_str());
+    logInfo("CMnatpmp::retrieveExternalIP  fetched external IP address %s\n", externalIp.c_str());
     return true;
 }
 
@@ -147,13 +143,11 @@ bool CMnatpmp::portMappingRequest(int internalPort,
                                   bool isHttps,
                                   unsigned& lifetime) {
     if (!init()) {
-        logLine(LOG_ERR,
-                "CMnatpmp::portMappingRequest  libnatpmp was not previously initialized.\n");
+        logError("CMnatpmp::portMappingRequest  libnatpmp was not previously initialized.\n");
         return false;
     }
     if (protocolNumber(protocol) == 0) {
-        logLine(LOG_ERR, "CMnatpmp::portMappingRequest  invalid protocol string %s\n",
-                protocol.c_str());
+        logError("CMnatpmp::portMappingRequest  invalid protocol string %s\n", protocol.c_str());
         return false;
     }
     if (!exchangeMapping(protocolNumber(protocol), internalPort, externalPort, lifetime)) {
@@ -169,7 +163,7 @@ bool CMnatpmp::portMappingRequest(int internalPort,
     return true;
 }
 
-/// Sends one request and takes over what the gateway granted: it wins over what was asked.
+// Sends one request and takes over what the gateway granted: it wins over what was asked.
 bool CMnatpmp::exchangeMapping(int protocol,
                                int internalPort,
                                int& externalPort,
@@ -180,31 +174,27 @@ bool CMnatpmp::exchangeMapping(int protocol,
                                   static_cast<std::uint16_t>(externalPort), lifetime);
     if (sent < 0) {
         const int error = errno;
-        logLine(
-            LOG_ERR,
+        logError(
             "CMnatpmp::portMappingRequest  sendnewportmappingrequest error %d, protocol %d, internalPort %d, externalPort %d, lifetime %u, errno %d\n",
             sent, protocol, internalPort, externalPort, lifetime, error);
         return false;
     }
     if (CheckNATPMPResponse() < 0) {
         const int error = errno;
-        logLine(
-            LOG_ERR,
+        logError(
             "CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u, errno %d\n",
             externalPort, internalPort, protocol, lifetime, error);
         return false;
     }
     const auto& granted = response.pnu.newportmapping;
-    logLine(
-        LOG_INFO,
+    logInfo(
         "CMnatpmp::portMappingRequest  mapped public port %hu to localport %hu protocol %d, lifetime %u\n",
         granted.mappedpublicport, granted.privateport, static_cast<int>(response.type),
         granted.lifetime);
     externalPort = granted.mappedpublicport;
     lifetime = granted.lifetime;
     if (granted.privateport != internalPort) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "CMnatpmp::portMappingRequest  requested internal port does not match the response internal port. req_internal_port %d, resp_internal_port %hu, external_port %d, lifetime %u\n",
             internalPort, granted.privateport, externalPort, lifetime);
     }
@@ -215,13 +205,11 @@ void CMnatpmp::trackMapping(int internalPort, int externalPort, bool isHttps, un
     PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     const char* const label = isHttps ? "HTTPS" : "HTTP";
     tracker.setParams(internalPort, externalPort, lifetime);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "CMnatpmp::portMappingRequest  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
         label, internalPort, externalPort, lifetime);
     const TrackedMapping tracked = tracker.read();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "CMnatpmp::portMappingRequest - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
 }
@@ -231,19 +219,16 @@ void CMnatpmp::forgetMapping(int internalPort) {
     const TrackedMapping https = gwPorts.https.read();
     if (http.internalPort == internalPort) {
         gwPorts.http.setParams(0, 0, 0);
-        logLine(
-            LOG_INFO,
+        logInfo(
             "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
             http.internalPort, http.externalPort, http.lifetime);
     } else if (https.internalPort == internalPort) {
         gwPorts.https.setParams(0, 0, 0);
-        logLine(
-            LOG_INFO,
+        logInfo(
             "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
             https.internalPort, https.externalPort, https.lifetime);
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
             https.internalPort, internalPort, https.externalPort, https.lifetime);
     }
@@ -252,8 +237,7 @@ void CMnatpmp::forgetMapping(int internalPort) {
 void CMnatpmp::forgetAllMappings(int internalPort, int externalPort, unsigned lifetime) {
     gwPorts.http.setParams(0, 0, 0);
     gwPorts.https.setParams(0, 0, 0);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "CMnatpmp::portMappingRequest  destroyed all mappings. internal_port %d, external_port %d, lifetime %u\n",
         internalPort, externalPort, lifetime);
 }
@@ -284,11 +268,10 @@ void CMnatpmp::renewPortMapping(const char* which) {
     const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     if (!tracker.pastHalfway()) return;
     const unsigned requested = getReqPortMappingLifetime();
-    logLine(LOG_INFO, "CMnatpmp::renewPortMapping - pastHalfway() returned TRUE\n");
+    logInfo("CMnatpmp::renewPortMapping - pastHalfway() returned TRUE\n");
     TrackedMapping tracked = tracker.read();
     const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
         which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
         static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),

@@ -27,7 +27,7 @@ bool isKnownProtocol(const std::string& protocol) {
     return protocol == "TCP" || protocol == "UDP";
 }
 
-/// The number as the UPnP library takes it.
+// The number as the UPnP library takes it.
 std::string portText(int port) {
     return std::to_string(port).substr(0, kPortDigits);
 }
@@ -37,7 +37,7 @@ int portNumber(const char* text) {
     return scanInt(text, port) ? port : kNoPort;
 }
 
-/// One mapping as the gateway tells it.
+// One mapping as the gateway tells it.
 struct MappingReply {
     ReplyText<6> externalPort;
     ReplyText<16> internalClient;
@@ -49,7 +49,7 @@ struct MappingReply {
     ReplyText<16> duration;
 };
 
-/// Whether an address names a host of its own: dotted, and not ending in 0.
+// Whether an address names a host of its own: dotted, and not ending in 0.
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
@@ -57,8 +57,8 @@ bool namesOneHost(const std::string& client) {
     return scanLong(client.c_str() + dot + 1, last) && last != 0;
 }
 
-/// Hands the gateway's mappings one by one to @p visit(entry), which returns false to stop. True
-/// when neither the gateway nor the visitor ended the enumeration.
+// Hands the gateway's mappings one by one to @p visit(entry), which returns false to stop. True
+// when neither the gateway nor the visitor ended the enumeration.
 template <typename Visitor>
 bool enumerateMappings(const std::string& controlUrl,
                        const std::string& serviceType,
@@ -84,18 +84,16 @@ bool Router::mapPort(int internalPort,
                      const std::string& description,
                      bool isHttps) {
     if (internalPort <= kReservedPorts || externalPort <= kReservedPorts) {
-        logLine(LOG_ERR,
-                "Router::mapPort() - internal and external ports must be greater than 10\n");
+        logError("Router::mapPort() - internal and external ports must be greater than 10\n");
         return false;
     }
     if (!initialized) {
-        logLine(
-            LOG_ERR,
+        logError(
             "Router::mapPort() - must call Router:: discover() to load port map before calling this function \n");
         return false;
     }
     if (!isKnownProtocol(protocol)) {
-        logLine(LOG_ERR, "Router::mapPort() - protocol must be either 'TCP' or 'UDP' \n");
+        logError("Router::mapPort() - protocol must be either 'TCP' or 'UDP' \n");
         return false;
     }
     if (isNatPMPGateway()) {
@@ -115,21 +113,19 @@ bool Router::mapThroughNatpmp(int internalPort,
     const bool mapped =
         pNatpmp->mapPort(internalPort, externalPort, protocol, description, isHttps);
     if (mapped) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
             externalPort, internalPort);
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d\n",
             externalPort, internalPort);
     }
     return mapped;
 }
 
-/// Asks the gateway who has the external port. An entry counts whatever the status of the answer,
-/// and one that leads to another port of this device counts as another's.
+// Asks the gateway who has the external port. An entry counts whatever the status of the answer,
+// and one that leads to another port of this device counts as another's.
 bool Router::heldByAnother(int internalPort, int externalPort, const std::string& protocol) const {
     MappingReply entry;
     const int status = miniupnpc::getSpecificPortMappingEntry(
@@ -137,27 +133,24 @@ bool Router::heldByAnother(int internalPort, int externalPort, const std::string
         entry.internalClient.buffer(), entry.internalPort.buffer(), entry.description.buffer(),
         entry.enabled.buffer(), entry.duration.buffer());
     if (status == 0) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d], intClient[%s], intPort[%s], desc[%s], enabled[%s], leaseDuration[%s]\n",
             status, scrubSecrets(entry.internalClient.text()).c_str(), entry.internalPort.text(),
             scrubSecrets(entry.description.text()).c_str(), entry.enabled.text(),
             scrubSecrets(entry.duration.text()).c_str());
     } else {
-        logLine(LOG_INFO,
-                "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
+        logInfo("Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
                 status);
     }
     if (entry.internalClient.empty()) return false;
     const std::string client = entry.internalClient.text();
     if (portNumber(entry.internalPort.text()) == internalPort && client == localIp) {
-        logLine(LOG_INFO,
-                "Router::mapPort() - internal port: %d is already mapped to external port: %d\n",
+        logInfo("Router::mapPort() - internal port: %d is already mapped to external port: %d\n",
                 internalPort, externalPort);
         return false;
     }
     if (!namesOneHost(client)) return false;
-    logLine(LOG_INFO, "Router::mapPort() - internal port: %d is already mapped to another IP: %s\n",
+    logInfo("Router::mapPort() - internal port: %d is already mapped to another IP: %s\n",
             internalPort, scrubSecrets(client).c_str());
     return true;
 }
@@ -166,21 +159,19 @@ bool Router::addMapping(int internalPort,
                         int externalPort,
                         const std::string& protocol,
                         const std::string& description) const {
-    logLine(LOG_DEBUG, "Router::mapPort() - lifetime %s\n", "0");
+    logDebug("Router::mapPort() - lifetime %s\n", "0");
     // Without a lease the gateway keeps the mapping for good; the lease is this side's own.
     const int status =
         miniupnpc::call(UPNP_AddPortMapping, controlUrl.c_str(), serviceType.c_str(),
                         portText(externalPort).c_str(), portText(internalPort).c_str(),
                         localIp.c_str(), description.c_str(), protocol.c_str(), nullptr, nullptr);
     if (status != 0) {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d\n",
             externalPort, internalPort, status);
         return false;
     }
-    logLine(
-        LOG_INFO,
+    logInfo(
         "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
         externalPort, internalPort);
     return true;
@@ -193,36 +184,32 @@ void Router::trackMapping(int internalPort, int externalPort, bool isHttps) {
     unsigned natpmpLease = 0;
     getReqPortMappingLifetime(upnpLease, natpmpLease);
     tracker.setParams(internalPort, externalPort, upnpLease);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "Router::mapPort  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
         label, internalPort, externalPort, upnpLease);
     const TrackedMapping tracked = tracker.read();
-    logLine(
-        LOG_INFO,
+    logInfo(
         "Router::mapPort - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
 }
 
 bool Router::unmapPort(int internalPort, int externalPort, const std::string& protocol) {
     if (!initialized) {
-        logLine(LOG_INFO, "Router::unmapPort() - router discovery failed or was not done \n");
+        logInfo("Router::unmapPort() - router discovery failed or was not done \n");
         return false;
     }
     if (!isKnownProtocol(protocol)) {
-        logLine(LOG_ERR, "Router::unmapPort() - protocol must be either 'TCP' or 'UDP' \n");
+        logError("Router::unmapPort() - protocol must be either 'TCP' or 'UDP' \n");
         return false;
     }
     const bool natpmp = isNatPMPGateway();
     const bool removed = natpmp ? pNatpmp->unmapPort(internalPort, externalPort, protocol)
                                 : deleteMapping(externalPort, protocol);
     if (!removed) {
-        logLine(LOG_INFO, "Router::unmapPort() - fail - failed to unmap external port: %d\n",
-                externalPort);
+        logInfo("Router::unmapPort() - fail - failed to unmap external port: %d\n", externalPort);
         return false;
     }
-    logLine(LOG_INFO, "Router::unmapPort() - success - external port: %d has been unmapped\n",
-            externalPort);
+    logInfo("Router::unmapPort() - success - external port: %d has been unmapped\n", externalPort);
     if (!natpmp) forgetMapping(internalPort);
     return true;
 }
@@ -232,25 +219,22 @@ bool Router::deleteMapping(int externalPort, const std::string& protocol) const 
                            portText(externalPort).c_str(), protocol.c_str(), nullptr) == 0;
 }
 
-/// Port 0 stands for no mapping and belongs to no tracker, idle ones included.
+// Port 0 stands for no mapping and belongs to no tracker, idle ones included.
 void Router::forgetMapping(int internalPort) {
     const TrackedMapping http = gwPorts.http.read();
     const TrackedMapping https = gwPorts.https.read();
     if (internalPort != 0 && http.internalPort == internalPort) {
         gwPorts.http.setParams(0, 0, 0);
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
             http.internalPort, http.externalPort, http.lifetime);
     } else if (internalPort != 0 && https.internalPort == internalPort) {
         gwPorts.https.setParams(0, 0, 0);
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
             https.internalPort, https.externalPort, https.lifetime);
     } else {
-        logLine(
-            LOG_INFO,
+        logInfo(
             "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
             https.internalPort, internalPort, https.externalPort, https.lifetime);
     }
@@ -258,34 +242,33 @@ void Router::forgetMapping(int internalPort) {
 
 bool Router::unmapAllPorts(const std::string& protocol, const std::string& description) {
     if (!initialized) {
-        logLine(
-            LOG_ERR,
+        logError(
             "Router::unmapAllPorts() - must call Router:: discover() to load port map before calling this function \n");
         return false;
     }
     if (!isKnownProtocol(protocol)) {
-        logLine(LOG_ERR, "Router::unmapAllPorts() - protocol must be either 'TCP' or 'UDP' \n");
+        logError("Router::unmapAllPorts() - protocol must be either 'TCP' or 'UDP' \n");
         return false;
     }
     const bool natpmp = isNatPMPGateway();
     const bool removed = natpmp ? pNatpmp->unmapAllPorts(protocol, description)
                                 : removeOwnMappings(protocol, description);
     if (!removed) {
-        logLine(LOG_INFO, "Router::unmapAllPorts() - fail\n");
+        logInfo("Router::unmapAllPorts() - fail\n");
         return false;
     }
-    logLine(LOG_INFO, "Router::unmapAllPorts() - success\n");
+    logInfo("Router::unmapAllPorts() - success\n");
     if (!natpmp) {
         gwPorts.http.setParams(0, 0, 0);
         gwPorts.https.setParams(0, 0, 0);
-        logLine(LOG_INFO, "Router::unmapAllPorts()  destroyed all mappings.\n");
+        logInfo("Router::unmapAllPorts()  destroyed all mappings.\n");
     }
     return true;
 }
 
-/// A removal moves the next entry into its place, where the first pass does not look again; the
-/// second pass is for those. The end of the gateway's table counts as failure, so the result is
-/// false on every gateway whose table ends.
+// A removal moves the next entry into its place, where the first pass does not look again; the
+// second pass is for those. The end of the gateway's table counts as failure, so the result is
+// false on every gateway whose table ends.
 bool Router::removeOwnMappings(const std::string& protocol, const std::string& description) {
     bool removed = false;
     const auto removeOwn = [&](const MappingReply& entry) {
@@ -294,7 +277,7 @@ bool Router::removeOwnMappings(const std::string& protocol, const std::string& d
             return true;
         }
         const int port = portNumber(entry.externalPort.text());
-        logLine(LOG_INFO, "Router::unmapAllPorts() - un-mapping port: %d for IP: %s \n", port,
+        logInfo("Router::unmapAllPorts() - un-mapping port: %d for IP: %s \n", port,
                 entry.internalClient.text());
         unmapPort(0, port, protocol);
         removed = true;
@@ -308,14 +291,12 @@ bool Router::removeOwnMappings(const std::string& protocol, const std::string& d
 
 int Router::getMappedInternalPort(int externalPort, const std::string& protocol) {
     if (!initialized) {
-        logLine(
-            LOG_ERR,
+        logError(
             "Router::getMappedInternalPort - must call Router:: discover() to load port map before calling this function \n");
         return 0;
     }
     if (!isKnownProtocol(protocol)) {
-        logLine(LOG_ERR,
-                "Router::getMappedInternalPort - protocol must be either 'TCP' or 'UDP' \n");
+        logError("Router::getMappedInternalPort - protocol must be either 'TCP' or 'UDP' \n");
         return 0;
     }
     int internalPort = kNoPort;
@@ -344,12 +325,11 @@ void Router::renewPortMapping(const char* which) {
     unsigned upnpLease = 0;
     unsigned natpmpLease = 0;
     getReqPortMappingLifetime(upnpLease, natpmpLease);
-    logLine(LOG_INFO, "Router::renewPortMapping - pastHalfway() returned TRUE\n");
+    logInfo("Router::renewPortMapping - pastHalfway() returned TRUE\n");
     TrackedMapping tracked = tracker.read();
     // An idle tracker has port 0, which mapPort refuses.
     const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
-    logLine(
-        LOG_INFO,
+    logInfo(
         "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
         which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
         static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),

@@ -50,11 +50,10 @@ void Router::setReqPortMappingLifetime(unsigned upnp, unsigned natpmp) {
     gwPorts.reqLifetime = upnp;
     if (!pNatpmp) {
         pNatpmp.reset(new (std::nothrow) CMnatpmp);
-        logLine(LOG_NOTICE, "Router::setReqPortMappingLifetime - unexpected pNatpmp is NULL.\n");
+        logNotice("Router::setReqPortMappingLifetime - unexpected pNatpmp is NULL.\n");
     }
     if (!pNatpmp) {
-        logLine(LOG_NOTICE,
-                "Router::setReqPortMappingLifetime - unexpected pNatpmp is still NULL.\n");
+        logNotice("Router::setReqPortMappingLifetime - unexpected pNatpmp is still NULL.\n");
         return;
     }
     pNatpmp->setReqPortMappingLifetime(natpmp);

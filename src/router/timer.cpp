@@ -22,8 +22,7 @@ void Timer::stop() {
 }
 
 long Timer::getElapsedTimeInMicroSec() {
-    logLine(
-        LOG_INFO,
+    logInfo(
         "Timer::getElapsedTimeInMicroSec - end.sec[%ld] end.usec[%ld] start.sec[%ld] start.usec[%ld]\n",
         static_cast<long>(endCount.tv_sec), static_cast<long>(endCount.tv_usec),
         static_cast<long>(startCount.tv_sec), static_cast<long>(startCount.tv_usec));

@@ -16,10 +16,10 @@
 
 namespace {
 
-// As the library does it: not terminated when the text fills the room.
-void fill(char* room, std::size_t size, const std::string& text) {
-    std::memset(room, 0, size);
-    std::copy_n(text.data(), std::min(size, text.size()), room);
+// As the library does it: not terminated when the text fills the buffer.
+void fill(char* buffer, std::size_t size, const std::string& text) {
+    std::memset(buffer, 0, size);
+    std::copy_n(text.data(), std::min(size, text.size()), buffer);
 }
 
 }  // namespace

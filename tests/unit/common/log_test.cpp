@@ -9,14 +9,18 @@ using LogTest = PelorusTest;
 
 TEST_F(LogTest, OutsideTextIsNoFormatAndLongLinesAreCutToTheBuffer) {
     const std::string text(5000, 'x');
-    logLine(LOG_ERR, "answer %s, %d bytes\n", "100%s%n", 7);
-    logLine(LOG_INFO, "%s", text.c_str());
-    logLineCut(1024, LOG_INFO, "%s", text.c_str());
-    logLineCut(4000, LOG_INFO, "%s", text.c_str());
-    expectLogIs({{LOG_ERR, "answer 100%s%n, 7 bytes\n"},
-                 {LOG_INFO, text.substr(0, 1279)},
-                 {LOG_INFO, text.substr(0, 1023)},
-                 {LOG_INFO, text.substr(0, 1279)}});
+    logLine(LOG_ALERT, "answer %s, %d bytes\n", "100%s%n", 7);
+    logError("%s", text.c_str());
+    logWarning("%d", 1);
+    logNotice("%d", 2);
+    logInfo("%d", 3);
+    logDebug("%d", 4);
+    expectLogIs({{LOG_ALERT, "answer 100%s%n, 7 bytes\n"},
+                 {LOG_ERR, text.substr(0, 1279)},
+                 {LOG_WARNING, "1"},
+                 {LOG_NOTICE, "2"},
+                 {LOG_INFO, "3"},
+                 {LOG_DEBUG, "4"}});
 }
 
 }  // namespace

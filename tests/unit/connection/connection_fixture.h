@@ -1,4 +1,4 @@
-// The fixture of the connection room: the real classes of all rooms below it, between a fake
+// The fixture of the connection module: the real classes of all modules below it, between a fake
 // gateway, a fake web and a tunnel whose start command writes its output.
 #ifndef PELORUS_UNIT_CONNECTION_FIXTURE_H
 #define PELORUS_UNIT_CONNECTION_FIXTURE_H

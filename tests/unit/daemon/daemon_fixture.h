@@ -1,4 +1,4 @@
-// The fixture of the daemon room: all rooms, on a device that reaches a direct connection in its
+// The fixture of the daemon module: all modules, on a device that reaches a direct connection in its
 // first cycle.
 #ifndef PELORUS_UNIT_DAEMON_FIXTURE_H
 #define PELORUS_UNIT_DAEMON_FIXTURE_H

@@ -1,0 +1,20 @@
+# pelorus_module(NAME SOURCES a.cpp ... [DEPENDS module ...] [LINKS library ...])
+#
+# One folder below src/ is one static library. Its headers are reachable only through a folder of
+# its own in the build tree (modules/NAME/NAME -> src/NAME), so "#include "NAME/x.h"" compiles only
+# in a module that names NAME under DEPENDS, directly or through one of those: an include against
+# the direction of the dependencies is a build error, not a matter of review.
+function(pelorus_module name)
+  cmake_parse_arguments(MODULE "" "" "SOURCES;DEPENDS;LINKS" ${ARGN})
+  set(include_root ${PROJECT_BINARY_DIR}/modules/${name})
+  file(MAKE_DIRECTORY ${include_root})
+  file(CREATE_LINK ${CMAKE_CURRENT_SOURCE_DIR} ${include_root}/${name} SYMBOLIC)
+
+  add_library(${name} STATIC ${MODULE_SOURCES})
+  add_library(pelorus::${name} ALIAS ${name})
+  target_include_directories(${name} PUBLIC ${include_root})
+  target_link_libraries(${name} PUBLIC ${MODULE_LINKS} PRIVATE pelorus_flags)
+  foreach(dependency IN LISTS MODULE_DEPENDS)
+    target_link_libraries(${name} PUBLIC pelorus::${dependency})
+  endforeach()
+endfunction()

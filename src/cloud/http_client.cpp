@@ -28,15 +28,8 @@ constexpr std::size_t kLargestAnswer = 10238;     // bytes
 constexpr long kTransferTimeout = 30000;          // milliseconds, for the whole transfer
 constexpr long kVerifyPeer = 1;
 
-struct CurlCleaner {
-    void operator()(CURL* handle) const { curl_easy_cleanup(handle); }
-};
-using CurlHandle = std::unique_ptr<CURL, CurlCleaner>;
-
-struct AddrInfoFreer {
-    void operator()(addrinfo* list) const { freeaddrinfo(list); }
-};
-using AddrInfoHandle = std::unique_ptr<addrinfo, AddrInfoFreer>;
+using CurlHandle = std::unique_ptr<CURL, Releaser<curl_easy_cleanup>>;
+using AddrInfoHandle = std::unique_ptr<addrinfo, Releaser<freeaddrinfo>>;
 
 void releaseBlock(CurlRcvBuffer& buffer) {
     std::free(buffer.data);  // NOLINT(*-no-malloc): allocated by curlRcvData

@@ -9,11 +9,17 @@
 
 namespace pelorus {
 
-struct FileCloser {
-    void operator()(std::FILE* file) const { static_cast<void>(std::fclose(file)); }
+/// Deleter of a std::unique_ptr: passes the handle to the C function that releases it.
+template <auto release>
+struct Releaser {
+    template <typename T>
+    void operator()(T* handle) const {
+        static_cast<void>(release(handle));
+    }
 };
+
 /// An open file, closed at the end of the scope.
-using FileHandle = std::unique_ptr<std::FILE, FileCloser>;
+using FileHandle = std::unique_ptr<std::FILE, Releaser<std::fclose>>;
 
 /// Opens @p path as fopen does; null, and errno set, when that fails. Pass "e" in @p mode, so that
 /// no child process inherits the file.
@@ -21,18 +27,12 @@ inline FileHandle openFile(const std::string& path, const char* mode) {
     return FileHandle{std::fopen(path.c_str(), mode)};
 }
 
-struct PipeCloser {
-    void operator()(std::FILE* pipe) const { static_cast<void>(pclose(pipe)); }
-};
 /// A popen stream, waited for at the end of the scope.
-using PipeHandle = std::unique_ptr<std::FILE, PipeCloser>;
+using PipeHandle = std::unique_ptr<std::FILE, Releaser<pclose>>;
 
-struct MallocFreer {
-    void operator()(void* block) const { std::free(block); }  // NOLINT(*-no-malloc)
-};
 /// A malloc'd block that a library hands over.
 template <typename T>
-using MallocHandle = std::unique_ptr<T, MallocFreer>;
+using MallocHandle = std::unique_ptr<T, Releaser<std::free>>;
 
 }  // namespace pelorus
 

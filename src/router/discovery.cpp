@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "common/handles.h"
 #include "common/log.h"
 #include "common/miniupnpc_api.h"
 #include "common/text.h"
@@ -24,21 +25,10 @@ namespace {
 
 constexpr int kDiscoverDelay = 2000;  // milliseconds
 
-struct InterfacesFreer {
-    void operator()(ifaddrs* list) const { freeifaddrs(list); }
-};
-using Interfaces = std::unique_ptr<ifaddrs, InterfacesFreer>;
-
-struct DevicesFreer {
-    void operator()(UPNPDev* list) const { freeUPNPDevlist(list); }
-};
-using Devices = std::unique_ptr<UPNPDev, DevicesFreer>;
-
-struct UrlsFreer {
-    void operator()(UPNPUrls* urls) const { FreeUPNPUrls(urls); }
-};
+using Interfaces = std::unique_ptr<ifaddrs, Releaser<freeifaddrs>>;
+using Devices = std::unique_ptr<UPNPDev, Releaser<freeUPNPDevlist>>;
 // What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
-using UrlContents = std::unique_ptr<UPNPUrls, UrlsFreer>;
+using UrlContents = std::unique_ptr<UPNPUrls, Releaser<FreeUPNPUrls>>;
 
 // A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
 bool leadsToLan(const ifaddrs& entry) {

@@ -75,7 +75,7 @@ def _wait_for_cycle(lab: Lab, number: int) -> None:
 
 def _state(lab: Lab) -> tuple[object, ...]:
     """What a cycle can change."""
-    return (lab.device.status, lab.central.record, lab.device.statuses_told(),
+    return (lab.device.status, lab.central.record, lab.device.statuses_sent(),
             sorted(map(str, lab.gateway.mappings())))
 
 
@@ -124,12 +124,12 @@ def _memory_of_bare_client(program: str, urls: list[str]) -> dict[str, int]:
     argv = network.command(network.DEVICE, "env", "-i", f"PATH={PATH}", program, *urls)
     with subprocess.Popen(argv, stdout=subprocess.PIPE, text=True) as started:
         assert started.stdout is not None
-        told = started.stdout.readline()
-        if not told:
+        line = started.stdout.readline()
+        if not line:
             raise LabError("the bare client did not get through its requests")
         time.sleep(_SETTLE_SECONDS)
-        memory = _memory(int(told))
-        os.kill(int(told), signal.SIGKILL)
+        memory = _memory(int(line))
+        os.kill(int(line), signal.SIGKILL)
     return memory
 
 

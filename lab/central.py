@@ -240,5 +240,5 @@ def _who_answers(address: str, port: int, protocol: str) -> str:
     """Ask whoever listens there for its identity; empty when nobody sensible answers."""
     page = web.fetch_from_here(f"{protocol.lower()}://{address}:{port}{IDENTITY_PATH}",
                                seconds=_CONNECT_BACK_SECONDS) or ""
-    told = re.search(r"<device_id>(.*?)</device_id>", page)
-    return told.group(1) if told else ""
+    found = re.search(r"<device_id>(.*?)</device_id>", page)
+    return found.group(1) if found else ""

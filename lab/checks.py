@@ -58,13 +58,18 @@ def wait_for_cycle(lab: Lab, number: int) -> None:
     wait_for_log(lab, PAUSE, number)
 
 
+def start(lab: Lab, status: str, *options: str) -> None:
+    """Start the daemon and wait for a status."""
+    lab.start_daemon(*OPTIONS, *options)
+    wait_for_status(lab, status)
+
+
 def start_direct(lab: Lab, *options: str) -> None:
     """Start the daemon and let it be content with the direct path for a cycle.
 
     Its pause has just begun then, so a gateway that is changed now is not asked meanwhile.
     """
-    lab.start_daemon(*OPTIONS, *options)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded", *options)
     with lab.daemon.held():
         assert_published(lab)
         assert pages_from_outside() == PAGES
@@ -76,7 +81,7 @@ def wait_for_next_cycle(lab: Lab, cycles: int = 1) -> None:
     wait_for_cycle(lab, lab.device.messages.count(PAUSE) + cycles)
 
 
-def assert_told_by_the_next_cycle(lab: Lab, since: int, part: str) -> None:
+def assert_logged_by_next_cycle(lab: Lab, since: int, part: str) -> None:
     """The device's log has a text after its first `since` lines, before a second cycle begins."""
     wait_for_log(lab, part)
     lines = lab.device.messages.texts()[since:]
@@ -132,7 +137,7 @@ def wait_for_mapping_changes(lab: Lab, changes: Sequence[str], since: int = 0) -
     lab.wait_for(lambda: mapping_changes(lab)[since:] == list(changes), f"{changes}", 10)
 
 
-def assert_told_in_order(lab: Lab) -> None:
+def assert_reported_in_order(lab: Lab) -> None:
     """The service hears: here I am, clean slate, may I, test my port, publish; each once."""
     device_id, auth, _ = lab.account.secrets
     forward = f"/api/1.0/rest/{PORT_FORWARD}/{device_id}?external_ip="

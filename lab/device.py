@@ -137,7 +137,7 @@ class Device:
         SLEEP_COUNT.write_text(f"{count}\n")
         self._timeline.add("device", f"the disk is unused for {count} minutes")
 
-    def statuses_told(self) -> list[str]:
+    def statuses_sent(self) -> list[str]:
         """The status words the local back end was told, in order."""
         return [request.argument("status") for request in self.local_requests
                 if request.path == "/local/comm_status"]

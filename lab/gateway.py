@@ -199,11 +199,11 @@ class Gateway:
 
     def listing(self) -> list[Listed]:
         """What the router itself tells a UPnP client about its mappings."""
-        told = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
-        if "Found valid IGD" not in told:
-            raise LabError(f"the gateway does not list its mappings: {told}")
+        listing = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
+        if "Found valid IGD" not in listing:
+            raise LabError(f"the gateway does not list its mappings: {listing}")
         return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
-                for protocol, external, address, internal, words, lease in _LISTED.findall(told)]
+                for protocol, external, address, internal, words, lease in _LISTED.findall(listing)]
 
     def requests(self) -> int:
         """How often the device asked; the questions of the lab and the neighbour do not count."""

@@ -30,6 +30,6 @@ class Neighbour:
         self._timeline.add("neighbour", f"holds the gateway's TCP port {external_port}")
 
     def _ask(self, success: str, *argv: str) -> None:
-        told = network.output(network.NEIGHBOUR, *argv)
-        if success not in told:
-            raise LabError(f"the gateway refused the neighbour ({' '.join(argv)}):\n{told}")
+        answer = network.output(network.NEIGHBOUR, *argv)
+        if success not in answer:
+            raise LabError(f"the gateway refused the neighbour ({' '.join(argv)}):\n{answer}")

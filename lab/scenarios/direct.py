@@ -8,9 +8,10 @@ from collections.abc import Sequence
 from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
 from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NOT_DUE, OPTIONS, PAGES, asked,
-                        assert_published, assert_stops_clean, assert_told_in_order,
-                        page_through_the_tunnel, pages_from_outside, ports_tested, start_direct,
-                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
+                        assert_published, assert_reported_in_order, assert_stops_clean,
+                        page_through_the_tunnel, pages_from_outside, ports_tested, start,
+                        start_direct, wait_for_cycle, wait_for_log, wait_for_next_cycle,
+                        wait_for_status)
 from lab.gateway import STOCK_PERMISSIONS, GatewaySetup
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
@@ -39,33 +40,31 @@ _NEXT_SEARCH = 3 * (99 * _MAP + 98 * _TAKE_BACK)
 def upnp(lab: Lab) -> None:
     """A UPnP gateway: both ports mapped, proven, published and reached from the internet."""
     assert pages_from_outside() == [None, None]
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
-    assert_told_in_order(lab)
+    start(lab, "portforwarded")
+    assert_reported_in_order(lab)
     _assert_reached(lab)
 
     lab.step("the next cycle checks the public names and changes nothing")
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
     wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value for device domain "
                       "names, IP address is 44.128.0.20")
     wait_for_cycle(lab, 2)
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert lab.gateway.mappings() == BOTH_MAPPED
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
     assert pages_from_outside() == [None, None]
 
 
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
 def natpmp(lab: Lab) -> None:
     """A gateway that speaks only NAT-PMP is used as well as one that speaks UPnP."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
-    assert_told_in_order(lab)
+    start(lab, "portforwarded")
+    assert_reported_in_order(lab)
     _assert_reached(lab)
     assert lab.device.messages.count("Router::upnp_discover - UPnP Discover failed") > 0
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(secure=False), clock=FAST))
@@ -73,16 +72,14 @@ def ports_taken(lab: Lab) -> None:
     """Another computer holds 9091, then 9444 too: the next ports are used, it keeps its own."""
     lab.neighbour.hold(9091, 80)
     others = lab.gateway.mappings()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     _assert_reached(lab, 9092, 9444, others)
     assert_stops_clean(lab, left=others)
 
     lab.step("it holds 9444 as well, and pelorus starts again")
     lab.neighbour.hold(9444, 443)
     others = lab.gateway.mappings()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     _assert_reached(lab, 9092, 9445, others)
     assert ports_tested(lab) == [9092, 9092]
     assert lab.device.messages.count(_TAKEN) == 3
@@ -95,8 +92,7 @@ def natpmp_port_taken(lab: Lab) -> None:
     """Another computer holds 9091 of a NAT-PMP gateway: the port granted instead is published."""
     lab.neighbour.hold(9091, 80)
     others = lab.gateway.mappings()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     _assert_reached(lab, 9092, 9444, others)
     assert ports_tested(lab) == [9092]
     # The gateway chose it: nothing was refused, and nothing had to be asked for a second time.
@@ -107,8 +103,7 @@ def natpmp_port_taken(lab: Lab) -> None:
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=FAST))
 def natpmp_and_other_programs(lab: Lab) -> None:
     """NAT-PMP takes back all ports of a device at once: other programs lose theirs, at the end."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("another program on the device maps a port; the gateway knows no names to tell whose")
     network.output(network.DEVICE, "natpmpc", "-g", lab.gateway.lan_address,
@@ -137,8 +132,8 @@ def natpmp_answers_late(lab: Lab) -> None:
     renewals = lab.device.messages.count("mapPort returncode[1]")
     wait_for_log(lab, "mapPort returncode[1]", renewals + 4)
     assert lab.device.messages.count("does not match the response internal port") == 0
-    told = [text for text in lab.device.messages.texts() if "fetched external IP address" in text]
-    assert len(set(told)) == 1
+    assert len({text for text in lab.device.messages.texts()
+                if "fetched external IP address" in text}) == 1
     _assert_reached(lab)
     assert_stops_clean(lab)
 
@@ -166,7 +161,7 @@ def default_ports_only(lab: Lab) -> None:
     assert lab.gateway.mappings() == others
     assert ports_tested(lab) == []
     assert_stops_clean(lab, left=others)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
@@ -174,7 +169,7 @@ def port_filtered(lab: Lab) -> None:
     """Port 9091 is filtered on its way from the internet: the second candidate is published."""
     lab.gateway.block(9091)
     lab.start_daemon(*OPTIONS)
-    _wait_for_told(lab, "connecting", "failed", "portforwarded")
+    _wait_for_sent(lab, "connecting", "failed", "portforwarded")
     assert ports_tested(lab) == [9091] * 3 + [9092]
     _assert_reached(lab, 9092)
     assert_stops_clean(lab)
@@ -184,27 +179,27 @@ def port_filtered(lab: Lab) -> None:
 def forwarding_dies(lab: Lab) -> None:
     """A port is listed but no longer forwarded: the next takes its place, it is not tried again."""
     lab.start_daemon(*OPTIONS)
-    _wait_for_told(lab, "connecting", "portforwarded")
+    _wait_for_sent(lab, "connecting", "portforwarded")
     with lab.daemon.held():
         _assert_reached(lab)
-        requests, told = len(lab.central.requests), len(lab.device.local_requests)
+        requests, sent = len(lab.central.requests), len(lab.device.local_requests)
 
         lab.step("nothing comes through port 9091 any more")
         lab.gateway.block(9091)
-    _wait_for_told(lab, "connecting", "portforwarded", "failed", "portforwarded")
+    _wait_for_sent(lab, "connecting", "portforwarded", "failed", "portforwarded")
     with lab.daemon.held():
         _assert_reached(lab, 9092)
         assert sorted(listed.mapping for listed in lab.gateway.listing()) == lab.gateway.mappings()
         # Three tests of the mapping, three more of the same port mapped anew, one of the next port.
         assert ports_tested(lab)[1:] == [9091] * 6 + [9092]
         assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 7, PORT_FORWARD]
-        assert [request.path for request in lab.device.local_requests[told:]] == [
+        assert [request.path for request in lab.device.local_requests[sent:]] == [
             "/local/comm_status", "/local/port_forward", "/local/comm_status"]
 
         lab.step("port 9091 works again and 9092 does not; 9091 still counts as bad")
         lab.gateway.unblock(9091)
         lab.gateway.block(9092)
-    _wait_for_told(lab, "connecting", *["portforwarded", "failed"] * 2, "portforwarded")
+    _wait_for_sent(lab, "connecting", *["portforwarded", "failed"] * 2, "portforwarded")
     assert ports_tested(lab)[8:] == [9092] * 6 + [9093]
     _assert_reached(lab, 9093)
     assert_stops_clean(lab)
@@ -221,7 +216,7 @@ def http_forwarding_lost(lab: Lab) -> None:
     with lab.daemon.held():
         lab.gateway.lose(9091)
         assert pages_from_outside() == [None, PAGES[1]]
-    _wait_for_told(lab, "connecting", "portforwarded", "failed", "portforwarded")
+    _wait_for_sent(lab, "connecting", "portforwarded", "failed", "portforwarded")
     # Two minutes from cycle to cycle, four from test to test.
     assert lab.device.messages.count(NOT_DUE) - ignored <= 2
     assert ports_tested(lab)[tests:] == [9091] * 4
@@ -236,7 +231,7 @@ def https_forwarding_lost(lab: Lab) -> None:
     start_direct(lab, "-t", "1200")
     # With -t the start asks no gateway, so the second cycle still holds the address for changed.
     assert lab.device.messages.count(_MAPPED_ANEW) == 1
-    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+    requests, sent = len(lab.central.requests), len(lab.device.local_requests)
 
     lab.step("a gateway that cleans up drops port 9444; the port test looks at HTTP only")
     with lab.daemon.held():
@@ -250,7 +245,7 @@ def https_forwarding_lost(lab: Lab) -> None:
     lab.wait_for(lambda: lab.gateway.mappings() == BOTH_MAPPED, "the renewal", 60)
     _assert_reached(lab)
     assert set(asked(lab, requests)) == {WAIT, PORT_TEST}
-    assert len(lab.device.local_requests) == told
+    assert len(lab.device.local_requests) == sent
     # A renewal that has to make the mapping anew gives it no name by which the end would find it.
     assert {listed.mapping: listed.description for listed in lab.gateway.listing()} == dict(
         zip(BOTH_MAPPED, ("Kavra", "")))
@@ -284,13 +279,13 @@ def privileged_ports_refused(lab: Lab) -> None:
         lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
     wait_for_status(lab, "portforwarded")
     _assert_reached(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded"]
     assert_stops_clean(lab)
 
 
-def _wait_for_told(lab: Lab, *statuses: str) -> None:
+def _wait_for_sent(lab: Lab, *statuses: str) -> None:
     """Wait until the local back end was told these status words and no other."""
-    lab.wait_for(lambda: lab.device.statuses_told() == list(statuses), " ".join(statuses), 60)
+    lab.wait_for(lambda: lab.device.statuses_sent() == list(statuses), " ".join(statuses), 60)
     wait_for_status(lab, statuses[-1])
 
 

@@ -13,8 +13,7 @@ from lab import network, web
 from lab.central import PORT_FORWARD, PortTest
 from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, asked, assert_log_is_proper,
                         assert_published, assert_stops_clean, mapping_changes, pages_from_outside,
-                        wait_for_log, wait_for_mapping_changes, wait_for_next_cycle,
-                        wait_for_status)
+                        start, wait_for_log, wait_for_mapping_changes, wait_for_next_cycle)
 from lab.gateway import GatewaySetup
 from lab.natpmp import Grant
 from lab.packet_filter import Mapping
@@ -49,7 +48,7 @@ class _Renewal:
 @scenario(Situation(clock=_CLOCK))
 def upnp_leases(lab: Lab) -> None:
     """Mappings made through UPnP are renewed over ten leases; the device is never out of reach."""
-    _start(lab, _LEASE)
+    _start_leasing(lab, _LEASE)
     changes = mapping_changes(lab)
 
     lab.step("a visitor calls all the time, over ten leases")
@@ -68,13 +67,13 @@ def upnp_leases(lab: Lab) -> None:
                 for port in (9091, 9444)] == [len(renewals) // 2] * 2
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), clock=_CLOCK))
 def natpmp_leases(lab: Lab) -> None:
     """Mappings made through NAT-PMP are renewed over ten leases, and end with the daemon."""
-    _start(lab, _LEASE)
+    _start_leasing(lab, _LEASE)
     changes = len(mapping_changes(lab))
 
     lab.step("a visitor calls all the time, over ten leases")
@@ -89,7 +88,7 @@ def natpmp_leases(lab: Lab) -> None:
         wait_for_mapping_changes(lab, replaced, changes)
     assert_published(lab)
     _assert_end_unrenewed(lab, BOTH_MAPPED)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded"]
 
 
 _OTHER_PORTS = Grant(port=lambda asked: asked + 1000, lease=_LEASE)
@@ -98,8 +97,7 @@ _OTHER_PORTS = Grant(port=lambda asked: asked + 1000, lease=_LEASE)
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True, grant=_OTHER_PORTS), clock=FAST))
 def natpmp_other_ports(lab: Lab) -> None:
     """A NAT-PMP gateway grants other ports and a short lease: those ports are used and renewed."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert_published(lab, 10091, 10444)
     assert lab.central.port_tests == [
         PortTest(network.GATEWAY_WAN_ADDRESS, 10091, "HTTP", lab.account.device_id)]
@@ -119,7 +117,7 @@ def natpmp_other_ports(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def renewal_without_name(lab: Lab) -> None:
     """A renewal brings back what a reboot lost, but without name: it stays open after the end."""
-    _start(lab, 200)
+    _start_leasing(lab, 200)
     before = len(lab.central.requests)
 
     lab.step("the gateway loses the mappings, and a renewal is due before a port test")
@@ -139,15 +137,14 @@ def renewal_without_name(lab: Lab) -> None:
     assert pages_from_outside() == PAGES
 
     lab.step("the next start uses them; this gateway keeps them nameless, so they stay again")
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert_published(lab)
     assert _descriptions(lab) == ["", ""]
     assert_stops_clean(lab, left=BOTH_MAPPED)
-    assert "failed" not in lab.device.statuses_told()
+    assert "failed" not in lab.device.statuses_sent()
 
 
-def _start(lab: Lab, lease: int) -> None:
+def _start_leasing(lab: Lab, lease: int) -> None:
     """Start the daemon with a lease, and wait for the end of its second cycle or a later one.
 
     When a lease is given, the daemon has not looked at its own address before the first cycle. The

@@ -13,8 +13,8 @@ from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, Fault
 from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, SILENT,
                         TUNNEL_PID_FILE, asked, assert_log_is_proper, assert_published,
                         assert_stops_clean, mapping_changes, page_through_the_tunnel,
-                        pages_from_outside, tunnel_client, wait_for_client_end, wait_for_cycle,
-                        wait_for_log, wait_for_next_cycle, wait_for_status)
+                        pages_from_outside, start, tunnel_client, wait_for_client_end,
+                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -31,22 +31,21 @@ def unmap_all(lab: Lab) -> None:
     """What a killed daemon left at the gateway and the service, `pelorus -u` takes down."""
     neighbours = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 80)
     lab.neighbour.hold(neighbours.external_port, neighbours.internal_port)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("kill -9 leaves everything as it is")
     _kill(lab)
     assert lab.gateway.mappings() == [neighbours, *BOTH_MAPPED]
     assert lab.central.record == PUBLISHED
     assert lab.device.status == "portforwarded"
-    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+    requests, sent = len(lab.central.requests), len(lab.device.local_requests)
 
     lab.step("pelorus -u clears up and ends")
-    _clear_up(lab)
+    _clean_up(lab)
     assert lab.gateway.mappings() == [neighbours]
     assert lab.central.record is None
     assert asked(lab, requests) == [COMM_STATUS, PORT_FORWARD]
-    assert [request.url for request in lab.device.local_requests[told:]] == [
+    assert [request.url for request in lab.device.local_requests[sent:]] == [
         "/local/comm_status?status=disabled",
         "/local/local_ip?address=192.168.77.10",
         "/local/port_forward_delete?internal_port=80"]
@@ -55,14 +54,13 @@ def unmap_all(lab: Lab) -> None:
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def unmap_all_while_relayed(lab: Lab) -> None:
     """A tunnel that outlived its daemon serves on until `pelorus -u` stops it."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
     client = tunnel_client()
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
 
     lab.step("pelorus -u clears up and ends")
-    _clear_up(lab)
+    _clean_up(lab)
     wait_for_client_end(client)
     assert not TUNNEL_PID_FILE.exists()
 
@@ -75,7 +73,7 @@ def stopped_in_discovery(lab: Lab) -> None:
     for time in _until_each_signal(lab, "while a gateway is looked for"):
         wait_for_log(lab, "setting localIP to: [192.168.77.10]", time)
     assert lab.device.messages.count(_CYCLE) == 0
-    assert lab.device.statuses_told() == ["connecting", "disabled"] * len(_SIGNALS)
+    assert lab.device.statuses_sent() == ["connecting", "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(clock=FAST))
@@ -87,7 +85,7 @@ def stopped_in_a_port_test(lab: Lab) -> None:
                      "the port test", 60)
         assert lab.gateway.mappings() == BOTH_MAPPED[:1]
     assert len(lab.central.port_tests) == len(_SIGNALS)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
 
 
@@ -100,7 +98,7 @@ def stopped_in_the_relay_start(lab: Lab) -> None:
         wait_for_log(lab, _TUNNEL_NOT_UP, (time - 1) * _LOOKS_AT_THE_TUNNEL + 1)
         assert lab.gateway.mappings() == BOTH_MAPPED
     assert lab.device.messages.count(_TUNNEL_NOT_UP) == len(_SIGNALS) * _LOOKS_AT_THE_TUNNEL
-    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
+    assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
@@ -111,7 +109,7 @@ def stopped_as_the_tunnel_starts(lab: Lab) -> None:
     lab.step("SIGTERM before the daemon knows that the tunnel is up")
     assert_stops_clean(lab)
     assert lab.relay.connections() == 1
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
     assert not TUNNEL_PID_FILE.exists()
     wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay itself to be left", 20)
 
@@ -125,7 +123,7 @@ def stopped_in_its_sleep(lab: Lab) -> None:
             assert_published(lab)
         wait_for_cycle(lab, time)
     assert lab.device.messages.count(_CYCLE) == len(_SIGNALS)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
 
 
@@ -162,8 +160,7 @@ def power_cut(lab: Lab) -> None:
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def killed_while_relayed(lab: Lab) -> None:
     """A killed daemon's tunnel is forgotten by the next, and fights its tunnel until stopped."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
     old = tunnel_client()
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
@@ -209,7 +206,7 @@ def _kill(lab: Lab) -> None:
     assert lab.stop_daemon(signal.SIGKILL) == "SIGKILL"
 
 
-def _clear_up(lab: Lab) -> None:
+def _clean_up(lab: Lab) -> None:
     """Run `pelorus -u`, which ends by itself and leaves the device reported as disabled."""
     assert wait_until(lab.start_daemon("-u", *OPTIONS).ended, "pelorus -u to end", 60) == "exit 0"
     assert lab.device.status == "disabled"

@@ -5,9 +5,9 @@ from __future__ import annotations
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES,
-                        PUBLISHED, SILENT, assert_published, assert_stops_clean,
-                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
-                        wait_for_log, wait_for_status)
+                        PUBLISHED, SILENT, assert_logged_by_next_cycle, assert_published,
+                        assert_stops_clean, pages_from_outside, ports_tested, start, wait_for_log,
+                        wait_for_status)
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -28,8 +28,7 @@ _CLOCK, _INTERVAL = 100, 500
 def manual_ports(lab: Lab) -> None:
     """Ports forwarded by hand are proven and published; with a wrong port configured it fails."""
     _forward_by_hand(lab)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     device_id, auth, _ = lab.account.secrets
     assert [request.url for request in lab.central.requests_for(PORT_TEST)] == [
         f"/api/1.0/rest/{PORT_TEST}/{device_id}?external_ip=&port=8081&protocol=HTTP&auth={auth}"]
@@ -57,7 +56,7 @@ def manual_ports(lab: Lab) -> None:
     _assert_published_by_hand(lab)
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
     assert lab.gateway.by_hand() == _BY_HAND
 
@@ -67,8 +66,7 @@ def manual_ports_that_are_none(lab: Lab) -> None:
     """A manual port that is no port stops everything; what was mapped before stays open."""
     lab.gateway.forward_by_hand(65535, 80)
     lab.gateway.forward_by_hand(1, 443)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     for http, https, kind in (("0", "1", "HTTP"), ("65536", "1", "HTTP"), ("http", "1", "HTTP"),
                               ("65535", "", "HTTPS")):
@@ -81,7 +79,7 @@ def manual_ports_that_are_none(lab: Lab) -> None:
                           MANUAL_EXTERNAL_HTTPS_PORT=https)
         wait_for_log(lab, NOT_RELAYED, failures + 1)
         assert lab.device.messages.texts().count(line) == before + 1
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed"]
     assert ports_tested(lab) == [9091]
     assert lab.central.record is None
     # The relay withdraws the record but leaves the gateway alone.
@@ -106,8 +104,7 @@ def manual_and_back(lab: Lab) -> None:
     network.output(network.DEVICE, "upnpc", "-u", lab.gateway.description_url, "-e", "camera",
                    "-a", network.DEVICE_ADDRESS, "80", "7000", "tcp")
     lab.neighbour.hold(9092, 80)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
 
     lab.step("the user forwards ports by hand and tells the device")
@@ -116,7 +113,7 @@ def manual_and_back(lab: Lab) -> None:
         lab.device.change(**_SETTINGS)
         changed = len(lab.device.messages.all)
     _wait_until_told(lab, 8081)
-    assert_told_by_the_next_cycle(lab, changed, _BEGIN)
+    assert_logged_by_next_cycle(lab, changed, _BEGIN)
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
@@ -142,7 +139,7 @@ def manual_and_back(lab: Lab) -> None:
 
     lab.step("the end leaves the others their ports")
     assert_stops_clean(lab, left=others)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
@@ -151,10 +148,9 @@ def manual_and_back(lab: Lab) -> None:
 def manual_without_protocol(lab: Lab) -> None:
     """No mapping protocol: the service is asked for the address now and then, a new one is told."""
     _forward_by_hand(lab)
-    lab.start_daemon(*OPTIONS, "-p", f"{_INTERVAL}")
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded", "-p", f"{_INTERVAL}")
     _assert_published_by_hand(lab)
-    told = list(lab.device.local_requests)
+    sent = list(lab.device.local_requests)
 
     lab.step("once the interval has passed, the service is asked; the address is what it was")
     wait_for_log(lab, f"NetworkAddrs::getMyIP - external IP address {_HERE}")
@@ -164,7 +160,7 @@ def manual_without_protocol(lab: Lab) -> None:
     lab.step("the provider gives another address: the ports pass their test there as well")
     lab.gateway.move_to(_ELSEWHERE)
     lab.wait_for(lambda: lab.central.port_tests[-1].address == _ELSEWHERE, "a test there", 60)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
 
     lab.step("the next question for the address is due, but the service wants it a minute later")
     lab.central.wait_seconds = 60
@@ -177,7 +173,7 @@ def manual_without_protocol(lab: Lab) -> None:
     assert lab.central.record == Record(_ELSEWHERE, network.DEVICE_ADDRESS, 8081, 8444)
     _assert_asked_in_intervals(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
     assert lab.gateway.by_hand() == _BY_HAND
 
 
@@ -189,7 +185,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
-    assert lab.device.statuses_told() == ["connecting", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
 
     lab.step("the provider's box is gone")

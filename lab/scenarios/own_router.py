@@ -5,8 +5,8 @@ from __future__ import annotations
 from lab import network
 from lab.central import COMM_STATUS, PORT_TEST, Fault, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
-                        assert_stops_clean, pages_from_outside, wait_for_log, wait_for_next_cycle,
-                        wait_for_status)
+                        assert_stops_clean, pages_from_outside, start, wait_for_log,
+                        wait_for_next_cycle, wait_for_status)
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -28,8 +28,7 @@ _START = [_LIST, *_ADDRESSES]
 def own_router(lab: Lab) -> None:
     """The device is itself the home's router: it opens its own ports and closes them at the end."""
     assert pages_from_outside() == [None, None]
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     _assert_own_ports_published(lab)
     assert lab.own_router.calls() == [
         *_START, *_ADDRESSES, _LIST, _LIST, _add(9091, 80, "Kavra"),
@@ -56,8 +55,7 @@ def own_router_predefined(lab: Lab) -> None:
     # Start and end ask for the first port of each; the router keeps what the daemon did not add.
     in_vain = [_LIST, _remove(2222, 22), _remove(8080, 80), _remove(8443, 443)]
     lab.central.misbehave(PORT_TEST, Fault(drop=True, times=3))
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert [request.argument("port") for request in lab.central.requests_for(PORT_TEST)] == [
         *["8080"] * 3, "8081"]
     calls = lab.own_router.calls()
@@ -77,7 +75,7 @@ def own_router_predefined(lab: Lab) -> None:
     assert_stops_clean(lab)
     assert lab.own_router.calls()[-len(in_vain):] == in_vain
     assert (lab.own_router.mappings(), lab.own_router.entries()) == (forwards, entries)
-    assert lab.device.statuses_told() == ["connecting", "failed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(own_router=True, static=_TYPE, clock=FAST))
@@ -86,8 +84,7 @@ def own_router_port_taken(lab: Lab) -> None:
     for port, internal_port in ((9091, 80), (9444, 443)):
         lab.own_router.predefine(port, port, internal_port, "OTHER", network.NEIGHBOUR_ADDRESS)
     foreign, entries = lab.own_router.mappings(), lab.own_router.entries()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     own = [Mapping("TCP", 9092, network.DEVICE_ADDRESS, 80),
            Mapping("TCP", 9445, network.DEVICE_ADDRESS, 443)]
     assert lab.own_router.mappings() == sorted([*foreign, *own])
@@ -107,7 +104,7 @@ def own_router_offline(lab: Lab) -> None:
     lab.own_router.go_offline()
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
-    assert lab.device.statuses_told() == ["connecting", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "failed"]
     # Once for the clean slate, once for the attempt.
     assert [message.severity for message in lab.device.messages.all
             if message.text == _OFFLINE] == [_ERROR, _ERROR]
@@ -127,7 +124,7 @@ def own_router_offline(lab: Lab) -> None:
     assert lab.own_router.mappings() == []
     assert lab.central.record is None
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "failed", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "failed", "portforwarded", "failed",
                                           "disabled"]
 
 
@@ -135,8 +132,7 @@ def own_router_offline(lab: Lab) -> None:
 def own_router_disk_asleep(lab: Lab) -> None:
     """On the maker's router a disk in standby puts off a port test, a long disuse does not."""
     lab.device.minutes_since_disk_access(99)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the ports are to be tested again, but the disk is in standby")
     lab.device.disk_sleeps()

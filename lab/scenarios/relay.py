@@ -9,8 +9,8 @@ from lab import daemon, network, packet_filter, provider
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault, PortTest
 from lab.checks import (BOTH_MAPPED, IMPATIENT, OPTIONS, PAGES, RELAYED, SILENT, TUNNEL_PID_FILE,
                         asked, assert_log_is_proper, assert_published, assert_stops_clean,
-                        page_through_the_tunnel, start_direct, tunnel_client, wait_for_client_end,
-                        wait_for_log, wait_for_next_cycle, wait_for_status)
+                        page_through_the_tunnel, start, start_direct, tunnel_client,
+                        wait_for_client_end, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.clock import refuse_signal
 from lab.gateway import NO_PORT, GatewaySetup
 from lab.scenario import Lab, Situation
@@ -51,17 +51,17 @@ def no_gateway_protocol(lab: Lab) -> None:
     assert [lab.names.resolve(name) for name in lab.account.names] == [network.RELAY_ADDRESS] * 3
 
     lab.step("the next cycle checks the public names and keeps the tunnel")
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
     wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value for device domain "
                       f"names, IP address is {network.RELAY_ADDRESS}")
     wait_for_next_cycle(lab)
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert (tunnel_client(), lab.relay.connections()) == (client, 1)
 
     lab.step("the tunnel ends with the daemon")
     assert_stops_clean(lab)
     wait_for_client_end(client)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(permissions=NO_PORT), relay=True, clock=RELAYED))
@@ -85,15 +85,14 @@ def gateway_gives_in(lab: Lab) -> None:
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert lab.device.messages.count(_STOPS) == 1
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, static=_COUNTED, clock=IMPATIENT))
 def relay_down_at_first(lab: Lab) -> None:
     """The relay does not answer: four starts, status failed, nothing left; later it is used."""
     lab.relay.server.stop()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "failed")
+    start(lab, "failed")
     assert _STARTS.read_text().split() == ["start"] * 4
     assert lab.device.messages.count(_NOT_UP) == 28
     assert lab.device.messages.count(_STOPS) == 4
@@ -104,7 +103,7 @@ def relay_down_at_first(lab: Lab) -> None:
     client = _wait_for_relayed(lab)
     assert_stops_clean(lab)
     wait_for_client_end(client)
-    assert lab.device.statuses_told() == ["connecting", "failed", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
@@ -127,7 +126,7 @@ def tunnel_client_dies(lab: Lab) -> None:
     second = tunnel_client()
     assert_stops_clean(lab)
     wait_for_client_end(second)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
@@ -151,8 +150,7 @@ def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
                     static=_COUNTED, clock=RELAYED))
 def relay_refuses(lab: Lab) -> None:
     """The relay refuses the device's credentials: status failed, nothing is left running."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "failed")
+    start(lab, "failed")
     assert (_FOLDER / "auth.txt").read_text() == f"{lab.account.device_id}\nnot-its-own\n"
     assert "AUTH_FAILED" in lab.device.tunnel_output().read_text()
     assert _STARTS.read_text().split() == ["start"] * 4
@@ -160,7 +158,7 @@ def relay_refuses(lab: Lab) -> None:
     assert lab.device.messages.count("not-its-own") == 0
     wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay itself to be left", 20)
     assert lab.stop_daemon() == "SIGTERM"
-    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"]
     assert_log_is_proper(lab)
 
 
@@ -179,7 +177,7 @@ def second_nat(lab: Lab) -> None:
         lab.provider.remove()
     _wait_for_direct(lab, client)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(relay=True, clock=IMPATIENT))
@@ -202,7 +200,7 @@ def second_nat_appears(lab: Lab) -> None:
         lab.provider.remove()
     _wait_for_direct(lab, client)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "relayed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "relayed",
                                           "portforwarded", "disabled"]
 
 

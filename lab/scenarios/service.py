@@ -9,7 +9,7 @@ from lab.account import SERVICE_HOST
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault
 from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS,
                         PAGES, PAUSE, PUBLISHED, RELAYED, SILENT, asked, assert_published,
-                        assert_stops_clean, pages_from_outside, ports_tested, wait_for_cycle,
+                        assert_stops_clean, pages_from_outside, ports_tested, start, wait_for_cycle,
                         wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
@@ -49,7 +49,7 @@ def service_says_wait(lab: Lab) -> None:
     assert asked(lab) == [COMM_STATUS, PORT_FORWARD, WAIT]
     assert lab.gateway.mappings() == []
     assert lab.device.messages.count("therefore openVPN will not be started") == 1
-    assert lab.device.statuses_told() == ["connecting"]
+    assert lab.device.statuses_sent() == ["connecting"]
 
     lab.step("the pause is over, the service permits")
     wait_for_status(lab, "portforwarded")
@@ -64,7 +64,7 @@ def service_says_wait(lab: Lab) -> None:
     assert lab.device.messages.count("testPort success 1, current connectionType 1.") == 1
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
@@ -74,8 +74,7 @@ def service_says_wait_unclearly(lab: Lab) -> None:
         lab.step(f"the answer is '{answer}'")
         lab.central.misbehave(WAIT, Fault(body=answer))
         before = lab.device.messages.count(line)
-        lab.start_daemon(*OPTIONS)
-        wait_for_status(lab, "portforwarded")
+        start(lab, "portforwarded")
         assert lab.device.messages.count(line) == before + 1
         assert_published(lab)
         assert_stops_clean(lab)
@@ -147,8 +146,7 @@ def service_talks_rubbish(lab: Lab) -> None:
 @scenario(_NO_RELAY)
 def service_goes_away_later(lab: Lab) -> None:
     """The service goes away from a forwarded device: the next test fails, the ports close."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the service goes away; until the next test nothing changes")
     lab.central.stop()
@@ -158,7 +156,7 @@ def service_goes_away_later(lab: Lab) -> None:
 
     lab.step("the test falls due: it fails, so does the search and the relay")
     wait_for_log(lab, NOT_RELAYED)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed"]
     assert lab.device.messages.count("port check failed, retrying in 5 seconds") == 3 + _TRIES
     assert lab.gateway.mappings() == []
     # The withdrawal did not get through: the service sends clients to closed ports for a while.
@@ -173,8 +171,7 @@ def service_goes_away_later(lab: Lab) -> None:
 @scenario(Situation(static={**NO_TUNNEL, "DEFAULT_PORTS_ONLY": "TRUE"}, clock=FAST))
 def failed_test_leaves_https_open(lab: Lab) -> None:
     """Only the default ports are allowed, a later test fails: HTTP closes, HTTPS stays open."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the ports no longer pass the test")
     lab.central.misbehave(PORT_TEST, Fault(drop=True))
@@ -198,20 +195,20 @@ def publishing_fails(lab: Lab) -> None:
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
     with lab.daemon.held():
-        assert lab.device.statuses_told() == ["connecting", "failed"]
+        assert lab.device.statuses_sent() == ["connecting", "failed"]
         assert lab.device.messages.count("failed to update mapping info, attempting to delete "
                                          "server mapping.") == 1
         # Nothing is deleted there; what withdraws the record is the relay.
-        assert _addresses_told(lab) == ["NULL", _HERE, "NULL"]
+        assert _addresses_sent(lab) == ["NULL", _HERE, "NULL"]
         assert (lab.central.record, lab.central.withdrawals) == (None, 1)
-        assert "/local/port_forward" not in {told.path for told in lab.device.local_requests}
+        assert "/local/port_forward" not in {request.path for request in lab.device.local_requests}
         assert lab.gateway.mappings() == BOTH_MAPPED
         assert pages_from_outside() == PAGES
 
     lab.step("the relay's attempt has forgotten the ports: they wait for the next search")
     wait_for_status(lab, "portforwarded")
     assert lab.device.messages.count(NOT_RELAYED) == 2
-    assert _addresses_told(lab) == ["NULL", _HERE, "NULL", "NULL", _HERE]
+    assert _addresses_sent(lab) == ["NULL", _HERE, "NULL", "NULL", _HERE]
     assert ports_tested(lab) == [9091, 9091]
     assert lab.device.messages.count("Router::unmapPort() - success") == 0
     assert_published(lab)
@@ -221,8 +218,7 @@ def publishing_fails(lab: Lab) -> None:
 @scenario(Situation(gateway=SILENT, relay=True, clock=IMPATIENT))
 def publishing_fails_while_relayed(lab: Lab) -> None:
     """A relayed device cannot publish its new ports: only the check of the names mends that."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
 
     lab.step("a gateway appears, the ports pass the test, the service does not take the record")
     lab.central.misbehave(PORT_FORWARD, Fault(drop=True, times=1))
@@ -246,15 +242,14 @@ def publishing_fails_while_relayed(lab: Lab) -> None:
     assert asked(lab, before) == [PORT_FORWARD, WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "failed", "portforwarded",
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "portforwarded",
                                           "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def names_lead_elsewhere(lab: Lab) -> None:
     """The public names lead elsewhere: all is torn down, tested at once and put up again."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the names lead elsewhere, the disk sleeps, and a port test takes its time")
     with lab.daemon.held():
@@ -279,7 +274,7 @@ def names_lead_elsewhere(lab: Lab) -> None:
     assert lab.central.record == PUBLISHED
     assert lab.gateway.mappings() == BOTH_MAPPED
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
@@ -287,8 +282,7 @@ def names_lead_elsewhere(lab: Lab) -> None:
 def names_disagree(lab: Lab) -> None:
     """A name is missing, then one differs: torn down each time; right again: left alone."""
     four_level, _, hashed = lab.account.names
-    lab.start_daemon(*OPTIONS, "-d", "60")
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded", "-d", "60")
 
     lab.step("a name is missing: looked up three times")
     with lab.daemon.held():
@@ -317,18 +311,17 @@ def names_disagree(lab: Lab) -> None:
     wait_for_log(lab, f"{_CHECK}DNS matches local value for device domain names, IP address is "
                       f"{_HERE}")
     wait_for_next_cycle(lab)
-    assert _addresses_told(lab) == ["NULL", _HERE] * 3
+    assert _addresses_sent(lab) == ["NULL", _HERE] * 3
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", *["portforwarded", "failed"] * 2,
+    assert lab.device.statuses_sent() == ["connecting", *["portforwarded", "failed"] * 2,
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def relay_names_lead_elsewhere(lab: Lab) -> None:
     """The names of a relayed device lead elsewhere: its tunnel ends, and another comes up."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
     before = set(daemon.running("openvpn"))
 
     lab.step("the names lead elsewhere")
@@ -348,7 +341,7 @@ def relay_names_lead_elsewhere(lab: Lab) -> None:
     assert lab.relay.client_address()
     assert_stops_clean(lab)
     wait_until(lambda: not set(daemon.running("openvpn")) - before, "the tunnel to end", 20)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "failed", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "relayed", "disabled"]
 
 
 def _play_fault(lab: Lab, fault: Fault, error: str, count: int, *operations: str) -> None:
@@ -370,19 +363,19 @@ def _assert_fails(lab: Lab, error: str, count: int) -> None:
     end = next(number for number, line in enumerate(lines) if line.startswith(PAUSE))
     assert sum(error in line for line in lines[:end]) == count
     assert sum(NOT_RELAYED in line for line in lines[:end]) == 1
-    assert lab.device.statuses_told() == ["connecting", "failed"]
-    assert set(_addresses_told(lab)) <= {"NULL"}
+    assert lab.device.statuses_sent() == ["connecting", "failed"]
+    assert set(_addresses_sent(lab)) <= {"NULL"}
     assert lab.central.record is None
     assert lab.gateway.mappings() == []
 
 
-def _assert_recovers(lab: Lab, *told: str) -> None:
+def _assert_recovers(lab: Lab, *statuses: str) -> None:
     """The daemon that failed makes the device reachable, without a restart."""
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", *(told or ["failed"]), "portforwarded",
-                                          "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", *(statuses or ["failed"]),
+                                          "portforwarded", "disabled"]
 
 
 def _questions(lab: Lab) -> int:
@@ -392,7 +385,7 @@ def _questions(lab: Lab) -> int:
     return len(seen)
 
 
-def _addresses_told(lab: Lab) -> list[str]:
+def _addresses_sent(lab: Lab) -> list[str]:
     """The addresses the device wanted to be published under, NULL for a withdrawal."""
     return [request.argument("external_ip") for request in lab.central.requests_for(PORT_FORWARD)]
 

@@ -6,9 +6,9 @@ import random
 
 from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
-from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_published, assert_stops_clean,
-                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
-                        tunnel_client, wait_for_client_end, wait_for_cycle, wait_for_log,
+from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_logged_by_next_cycle,
+                        assert_published, assert_stops_clean, pages_from_outside, ports_tested,
+                        start, tunnel_client, wait_for_client_end, wait_for_cycle, wait_for_log,
                         wait_for_next_cycle, wait_for_status)
 from lab.device import DYNAMIC_COPY, DYNAMIC_FILE
 from lab.gateway import NO_PORT, GatewaySetup
@@ -24,9 +24,8 @@ _STARTED = "main - pelorus daemon starting up"
 @scenario(Situation(clock=FAST))
 def disk_asleep(lab: Lab) -> None:
     """A sleeping disk is not woken for a port test, and the device stays port forwarded."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    start(lab, "portforwarded")
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
 
     lab.step("the ports are to be tested again, but the disk is in standby")
     lab.device.disk_sleeps()
@@ -36,13 +35,13 @@ def disk_asleep(lab: Lab) -> None:
     lab.device.minutes_since_disk_access(2)
     lab.device.disk_wakes()
     wait_for_log(lab, "sleep count > 1, port testing SKIP.")
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
 
     lab.step("the disk is in use again, so the test is made up for")
     lab.device.minutes_since_disk_access(1)
     lab.wait_for(lambda: len(lab.central.port_tests) == 2, "the second port test", 60)
     wait_for_next_cycle(lab)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
     assert_published(lab)
     assert_stops_clean(lab)
 
@@ -62,7 +61,7 @@ def disk_asleep_at_the_start(lab: Lab) -> None:
         assert_published(lab)
         assert_stops_clean(lab)
         first = ["connecting"] if word == "disabled" else []
-        assert lab.device.statuses_told() == [*first, "portforwarded", "disabled"]
+        assert lab.device.statuses_sent() == [*first, "portforwarded", "disabled"]
     assert lab.device.messages.count("checkHddStandByMode") == 0
 
 
@@ -71,11 +70,10 @@ def disk_asleep_and_names_wrong(lab: Lab) -> None:
     """Public names that lead elsewhere are worth waking the disk: everything is built anew."""
     lab.device.disk_sleeps()
     lab.names.pin(lab.account.names[0], network.SERVICE_ADDRESS)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the next cycle finds the names wrong")
-    lab.wait_for(lambda: lab.device.statuses_told().count("portforwarded") == 2,
+    lab.wait_for(lambda: lab.device.statuses_sent().count("portforwarded") == 2,
                  "the device to be published again", 60)
     lab.names.unpin(lab.account.names[0])
     wait_for_next_cycle(lab)
@@ -87,15 +85,14 @@ def disk_asleep_and_names_wrong(lab: Lab) -> None:
     wait_for_log(lab, "testPort - hard disk is asleep.")
     assert len(lab.central.port_tests) == 2
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(permissions=NO_PORT), relay=True, clock=RELAYED))
 def disk_asleep_while_relayed(lab: Lab) -> None:
     """A sleeping disk keeps a device relayed, until another program says "connecting"."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
     client = tunnel_client()
 
     lab.step("the gateway maps ports now, but they cannot be proven")
@@ -104,14 +101,14 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     wait_for_log(lab, "Skipped port test, unmapped HTTP port 9091, leaving forwardPort()")
     assert lab.gateway.mappings() == []
     assert lab.central.port_tests == []
-    assert lab.device.statuses_told() == ["connecting", "relayed"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed"]
     assert tunnel_client() == client
 
     lab.step("another program wants the connection built anew")
     lab.device.change(COMMUNICATION_STATUS="connecting")
     wait_for_status(lab, "portforwarded")
     assert len(lab.central.port_tests) == 1
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded"]
     wait_for_client_end(client)
     assert_published(lab)
     assert_stops_clean(lab)
@@ -135,20 +132,19 @@ def credentials_missing(lab: Lab) -> None:
         lab.device.change(DEVICEAUTH=lab.account.auth)
         changed = len(lab.device.messages.all)
     wait_for_status(lab, "portforwarded")
-    assert_told_by_the_next_cycle(lab, changed, "createDirectConnection() - success")
+    assert_logged_by_next_cycle(lab, changed, "createDirectConnection() - success")
     # The service gets the local address with the record; it is told of it alone only at a start.
     assert asked(lab) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert lab.device.messages.count(_STARTED) == 1
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["disabled", "connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["disabled", "connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def internal_ports_change(lab: Lab) -> None:
     """The device's web server moves to other ports; the gateway is led there by the next test."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     wait_for_cycle(lab, 1)
     requests = len(lab.device.local_requests)
 
@@ -182,17 +178,17 @@ def default_ports_only_later(lab: Lab) -> None:
     lab.start_daemon(*OPTIONS)
     wait_for_cycle(lab, 1)
     assert_published(lab, 9092, others=others)
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
 
     lab.step("only the default ports are allowed, and 9091 is free: no search is due yet")
     with lab.daemon.held():
         lab.gateway.lose(9091)
         lab.device.change(DEFAULT_PORTS_ONLY="TRUE")
         changed = len(lab.device.messages.all)
-    assert_told_by_the_next_cycle(lab, changed, "Skip testing port due to interval")
+    assert_logged_by_next_cycle(lab, changed, "Skip testing port due to interval")
     # Clients are sent to closed ports until the search; nobody is told of it.
     assert lab.gateway.mappings() == []
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert lab.central.record and lab.central.record.http_port == 9092
     assert lab.device.status == "portforwarded"
 
@@ -202,7 +198,7 @@ def default_ports_only_later(lab: Lab) -> None:
     assert_published(lab)
     assert pages_from_outside() == PAGES
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
@@ -227,10 +223,9 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def rubbish_amid_settings(lab: Lab) -> None:
     """Rubbish among the settings of a running daemon changes nothing."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     wait_for_next_cycle(lab)
-    told = list(lab.device.local_requests)
+    sent = list(lab.device.local_requests)
     proper = DYNAMIC_COPY.read_bytes()
     reloads = lab.device.messages.count("Reload dynamicconfig.ini file.")
 
@@ -238,7 +233,7 @@ def rubbish_amid_settings(lab: Lab) -> None:
     DYNAMIC_COPY.write_bytes(_RUBBISH + b"\n" + proper)
     wait_for_log(lab, "Reload dynamicconfig.ini file.", reloads + 1)
     wait_for_next_cycle(lab)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
     assert lab.central.withdrawals == 1
     assert_published(lab)
     DYNAMIC_COPY.write_bytes(proper)

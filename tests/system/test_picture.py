@@ -52,8 +52,8 @@ def test_story_of_a_log_is_told_in_few_and_harmless_words() -> None:
     timeline.add("relay", "a tunnel begins")
     timeline.add("relay", "a tunnel begins")
 
-    told = [(event.who, event.what) for event in timeline.events]
-    assert told[1:] == [("device", "gateway refuses a port")] * 2 + [("relay",
+    seen = [(event.who, event.what) for event in timeline.events]
+    assert seen[1:] == [("device", "gateway refuses a port")] * 2 + [("relay",
                                                                       "a tunnel begins")] * 2
     picture = drawn(timeline.events)
     assert {element.tag for element in picture.iter()} == {
@@ -66,12 +66,13 @@ def test_story_of_a_log_is_told_in_few_and_harmless_words() -> None:
 
 
 def test_status_bars_are_to_scale_and_the_last_word_has_room() -> None:
-    told = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"), (80, "disabled")]
+    changes = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"),
+               (80, "disabled")]
     picture = drawn([Event(5, "lab", "is raised"), Event(81, "lab", "is gone"), *(
-        Event(when, "device", f"status: {word}") for when, word in told)])
+        Event(when, "device", f"status: {word}") for when, word in changes)])
     bars = {word: row for word, colour in STATUS_COLOURS.items()
             for row in side_by_side(picture, "rect", fill=colour, height="24")}
-    assert [len(bars[word]) for _, word in told] == [1] * 5 and "portforwarded" not in bars
+    assert [len(bars[word]) for _, word in changes] == [1] * 5 and "portforwarded" not in bars
     ticks = {label: measure(element, "x") for element in picture.iter(f"{SVG}text")
              for label in [element.text] if element.get("text-anchor") == "middle"}
     for word, seconds in (("connecting", 10), ("relayed", 40), ("failed", 70), ("disabled", 80)):

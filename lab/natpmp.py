@@ -1,4 +1,4 @@
-"""A NAT-PMP gateway of the lab's own, for what no well-behaved router can be told to do."""
+"""The lab's own NAT-PMP gateway, for behaviour that miniupnpd cannot be made to show."""
 
 from __future__ import annotations
 
@@ -22,10 +22,10 @@ _LOOK_SECONDS = 0.05
 
 @dataclass(frozen=True)
 class Grant:
-    """What the router makes of a request for a mapping.
+    """How the router answers a request for a mapping.
 
-    `port` gives the external port that is granted for the one asked for; a port that somebody
-    else holds is passed over for the next free one. `lease` is the longest lease in seconds.
+    `port` gives the external port granted for a requested one; if that is taken, the next free
+    port is granted. `lease` is the longest lease in seconds.
     """
 
     port: Callable[[int], int]
@@ -33,10 +33,10 @@ class Grant:
 
 
 class NatPmp:
-    """The server on the router's LAN side; its mappings are rules of the router."""
+    """The server on the router's LAN side; its mappings are rules in the router's packet filter."""
 
     def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str]) -> None:
-        """Leases are in a time that runs `clock` times as fast as ours."""
+        """Leases run in a time that is `clock` times as fast as ours."""
         self._grant = grant
         self._clock = clock
         self._public_address = public_address
@@ -54,7 +54,7 @@ class NatPmp:
         self._thread.start()
 
     def stop(self) -> None:
-        """Answer no more; what is forwarded stays forwarded."""
+        """Stop answering; existing forwardings stay."""
         self._stopping.set()
         self._thread.join()
 
@@ -75,7 +75,7 @@ class NatPmp:
             self._close(mapping)
 
     def _answer(self, request: bytes, client: str) -> bytes:
-        """The answer to a datagram; nothing for one that is no request."""
+        """The answer to a datagram; empty if it is not a request."""
         if len(request) < 2 or request[1] >= _REPLY:
             return b""
         version, operation = request[:2]

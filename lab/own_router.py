@@ -1,4 +1,4 @@
-"""A device that is itself the home's router, of the same maker: its scripts and their effect."""
+"""A device that is itself the home router, by the same maker: its scripts and their effect."""
 
 from __future__ import annotations
 
@@ -38,7 +38,7 @@ echo "getip.sh $1" >>{_CALLS}
 cat "{_FOLDER}/$1"
 """
 
-# An external port is forwarded once, and only what was added can be removed.
+# An external port is forwarded only once, and only an added forward can be removed.
 _HELPER = f"""#!/bin/sh
 # The router's port forwards: tavik_helper.sh list
 #   tavik_helper.sh add PROTOCOL,PORT,LANADDRESS,INTERNALPORT,DESCRIPTION
@@ -63,7 +63,7 @@ esac
 
 
 class OwnRouter:
-    """The router in the device; it lets nobody in from the internet but through its forwards."""
+    """The router in the device; its forwards are the only way in from the internet."""
 
     def __init__(self, timeline: Timeline) -> None:
         self._timeline = timeline
@@ -84,9 +84,10 @@ class OwnRouter:
 
     def predefine(self, first: int, last: int, internal_port: int, owner: str = "BRENVIK",
                   lan_address: str | None = None) -> None:
-        """Forward TCP ports on the router's own account; the scripts cannot take that away.
+        """Add pre-defined TCP forwards, which the scripts cannot remove.
 
-        Without `lan_address` to the device itself; owner OTHER stands for another LAN device.
+        They lead to the device itself unless `lan_address` is given; owner OTHER is another LAN
+        device.
         """
         address = lan_address or self._lan_address
         ports = str(first) if first == last else f"{first}-{last}"
@@ -97,12 +98,12 @@ class OwnRouter:
             file.write(f"{owner},TCP,{ports},{address},{internal_port},pre-defined\n")
 
     def go_offline(self) -> None:
-        """Have no address on the internet side to tell."""
+        """Report no internet address from now on."""
         _WAN_ADDRESS.write_text("\n")
         self._timeline.add("router", "has no internet address")
 
     def go_online(self) -> None:
-        """Have the address on the internet side again."""
+        """Report the internet address again."""
         _WAN_ADDRESS.write_text(f"{self._wan_address}\n")
         self._timeline.add("router", f"has the internet address {self._wan_address}")
 
@@ -120,11 +121,11 @@ class OwnRouter:
         return sorted(found)
 
     def calls(self) -> list[str]:
-        """The scripts' names with their arguments, in the order in which they were run."""
+        """The script calls with their arguments, in order."""
         return _CALLS.read_text().splitlines()
 
     def _watch(self) -> None:
-        """Tell the timeline of every change of the forwards, whoever made it."""
+        """Record every change of the forwards in the timeline, whoever made it."""
         words = {"add": "forwards", "create": "forwards", "delete": "no longer forwards"}
         for verb, subject in nft.monitor(network.DEVICE, "elements"):
             changed = subject.get("element", {})

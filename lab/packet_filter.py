@@ -13,8 +13,8 @@ _PROTOCOLS = {6: "TCP", 17: "UDP"}
 # miniupnpd compares protocol and target as raw bits of the IPv4 header, at these offsets.
 _PROTOCOL_BIT, _TARGET_BIT = 72, 128
 
-# Closed towards the internet except for what a mapping or the user opens. The table "lab" is no
-# part of the router: it counts what the device asks the router, and makes the router fail.
+# Closed towards the internet except for what a mapping or the user opens. The table "lab" is not
+# part of the router: it counts the device's requests to the router and makes the router fail.
 _RULES = f"""
 table inet gate {{
     chain miniupnpd {{ }}
@@ -80,7 +80,7 @@ class Mapping:
 
 @dataclass(frozen=True)
 class Chains:
-    """The two chains of one source of forwardings: one redirects, the other lets in."""
+    """The two chains of one source of forwardings: one redirects packets, the other admits them."""
 
     redirect: str
     admit: str
@@ -96,7 +96,7 @@ def change(rules: str) -> None:
 
 
 def load() -> None:
-    """Give the router its rules, with nothing forwarded yet."""
+    """Load the router's rules, with nothing forwarded yet."""
     change(_RULES)
 
 
@@ -106,7 +106,7 @@ def mappings(chains: Chains = ASKED_FOR) -> list[Mapping]:
 
 
 def forward(mapping: Mapping, chains: Chains = ASKED_FOR) -> None:
-    """Forward, with rules that miniupnpd reads as its own."""
+    """Add a forwarding, with rules that miniupnpd takes for its own."""
     number = {name: number for number, name in _PROTOCOLS.items()}[mapping.protocol]
     protocol = f'iif "wan" meta l4proto {number} @nh,{_PROTOCOL_BIT},8 {number}'
     change(f"add rule inet gate {chains.redirect} {protocol} th dport {mapping.external_port} "
@@ -116,7 +116,7 @@ def forward(mapping: Mapping, chains: Chains = ASKED_FOR) -> None:
 
 
 def remove(mapping: Mapping) -> None:
-    """Take out both rules of a forwarding that somebody asked for."""
+    """Delete both rules of a forwarding that a client requested."""
     let_in = {_PROTOCOL_BIT: mapping.protocol, "dport": mapping.internal_port,
               _TARGET_BIT: _number(mapping.internal_address)}
     unwanted = [rule for rule in _rules(ASKED_FOR.redirect) if _mapping(rule["expr"]) == mapping]
@@ -126,7 +126,7 @@ def remove(mapping: Mapping) -> None:
 
 
 def flush(chains: Chains) -> None:
-    """Take out every forwarding of one source."""
+    """Delete every forwarding of one source."""
     change(f"flush chain inet gate {chains.redirect}\nflush chain inet gate {chains.admit}\n")
 
 
@@ -137,7 +137,7 @@ def counted(name: str) -> int:
 
 
 def watch(tell: Callable[[str, Mapping], None]) -> None:
-    """Tell of every forwarding that is added ("add") or deleted ("delete"), for ever."""
+    """Call `tell` for each forwarding that is added ("add") or deleted ("delete"), for ever."""
     for verb, subject in nft.monitor(network.GATEWAY, "rules"):
         rule = subject.get("rule", {})
         if verb in ("add", "delete") and rule.get("chain") == ASKED_FOR.redirect:

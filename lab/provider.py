@@ -1,4 +1,4 @@
-"""The internet provider that puts its customers behind a NAT of its own."""
+"""An internet provider that puts its customers behind its own NAT."""
 
 from __future__ import annotations
 
@@ -11,7 +11,7 @@ ADDRESS, CUSTOMER_ADDRESS = "44.128.0.21", "44.128.1.20"
 _ROUTER_ADDRESS = "44.128.1.1"
 _CABLE = network.cable_end(network.GATEWAY, "wan")
 
-# Nobody on the internet reaches a customer who did not call first.
+# The internet cannot open a connection to a customer.
 _RULES = """
 table inet carrier {
     chain forward {
@@ -32,7 +32,7 @@ table inet carrier {
 
 
 class Provider:
-    """The box between the router and the internet, once it is inserted."""
+    """The provider's NAT between the router and the internet, once inserted."""
 
     def __init__(self, gateway: Gateway, timeline: Timeline) -> None:
         self._gateway = gateway
@@ -40,7 +40,7 @@ class Provider:
         self._direct_address = ""
 
     def insert(self) -> None:
-        """Plug the router into the provider's box instead of the internet."""
+        """Plug the router into the provider's NAT instead of the internet."""
         network.ip_batch(f"netns add {HOST}")
         network.plug(HOST, "net", network.INTERNET, "net")
         network.ip_batch(f"address add {ADDRESS}/24 dev net",
@@ -56,10 +56,11 @@ class Provider:
                            f"puts the gateway, now {CUSTOMER_ADDRESS}, behind {ADDRESS}")
 
     def remove(self) -> None:
-        """Plug the router into the internet again, under its address of before."""
+        """Plug the router into the internet again, with its previous address."""
         network.ip_batch(f"link set {_CABLE} netns {network.INTERNET}", "link delete net",
                          host=HOST)
         network.ip_batch(f"link set {_CABLE} master net up", host=network.INTERNET)
         network.ip_batch(f"netns delete {HOST}")
         self._gateway.take_wan_address(self._direct_address, network.SERVICE_ADDRESS)
-        self._timeline.add("provider", f"gives the gateway {self._direct_address} of its own")
+        self._timeline.add("provider",
+                           f"gives the gateway its own address {self._direct_address} again")

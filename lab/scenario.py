@@ -1,4 +1,4 @@
-"""A situation, stated in a few words, and the lab raised to play it."""
+"""A situation, stated in a few words, and the lab set up for it."""
 
 from __future__ import annotations
 
@@ -29,11 +29,11 @@ _LOG_LINES = 150
 
 @dataclass(frozen=True)
 class Situation:
-    """What is special about a run; everything else is as usual.
+    """How a run differs from the default.
 
-    `static` and `dynamic` are settings of the device's two files; `clock` makes the device's time
-    run faster by that factor, and `hasty` the time limit of its transfers with it. With
-    `own_router` the device is itself the router of its home.
+    `static` and `dynamic` are settings of the device's two files. The device's time runs `clock`
+    times as fast, with `hasty` also the time limit of its transfers. With `own_router` the device
+    is itself the home router.
     """
 
     gateway: GatewaySetup = GatewaySetup()
@@ -46,7 +46,7 @@ class Situation:
 
 
 class Lab:
-    """The raised network with everything in it. It lives as long as its sandbox, one per run."""
+    """The network with everything in it; there is one per sandbox, and it ends with it."""
 
     def __init__(self, situation: Situation, timeline: Timeline) -> None:
         self.situation = situation
@@ -69,7 +69,7 @@ class Lab:
         self._start()
 
     def _start(self) -> None:
-        """Start what answers first, so that each can be asked from where its clients are."""
+        """Start servers before their clients, so that each can be checked from a client's host."""
         self.device.messages.start()
         self.names.start()
         self.gateway.start()
@@ -94,18 +94,18 @@ class Lab:
         return self._daemon
 
     def step(self, heading: str) -> None:
-        """Begin the next part of the story; a failure report shows the device's log from here."""
+        """Begin the next step; a failure report shows the device's log from here on."""
         self.timeline.step(heading)
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""
-        self.timeline.add("device", f"pelorus gets {signal.Signals(number).name}")
+        self.timeline.add("device", f"pelorus receives {signal.Signals(number).name}")
         how = self.daemon.stop(number)
-        self.timeline.add("device", f"pelorus ended by {how}")
+        self.timeline.add("device", f"pelorus ended with {how}")
         return how
 
     def wait_for(self, condition: Callable[[], Seen], what: str, seconds: float) -> Seen:
-        """Wait for a state while the daemon runs; its death ends the waiting at once."""
+        """Wait for a state; LabError at once if the daemon ends meanwhile."""
 
         def seen() -> Seen:
             if self._daemon and self._daemon.ended():
@@ -115,12 +115,12 @@ class Lab:
         return wait_until(seen, what, seconds)
 
     def report(self) -> str:
-        """Everything one needs to see when a run went wrong."""
+        """Everything needed to see why a run failed."""
         log = [str(message) for message in self.device.messages.all
                if message.when >= self.timeline.last_step]
         sections = {
             "timeline": str(self.timeline),
-            f"device log of the last part, {min(len(log), _LOG_LINES)} of {len(log)} lines":
+            f"device log of the last step, {min(len(log), _LOG_LINES)} of {len(log)} lines":
                 "\n".join(log[-_LOG_LINES:]),
             "daemon": f"{self._daemon.ended() or 'running' if self._daemon else 'not started'}, "
                       f"output:\n{last_lines(daemon.OUTPUT)}",

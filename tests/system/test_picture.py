@@ -1,4 +1,4 @@
-"""The picture of a timeline: everything is in it, to scale, readable, and nothing but drawing."""
+"""The picture of a timeline: complete, to scale, readable, and made of plain shapes only."""
 
 from __future__ import annotations
 
@@ -39,7 +39,7 @@ def side_by_side(picture: ElementTree.Element, kind: str, **wanted: str) -> list
     return [sorted(row) for row in rows.values()]
 
 
-def test_story_of_a_log_is_told_in_few_and_harmless_words() -> None:
+def test_repeated_lines_become_one_entry_without_control_characters() -> None:
     timeline = Timeline()
     timeline.step("the gateway has <no> port & says \x1b[31mso\udc80")
     refusal = ("Router::mapPort() - fail - failed to map external port: {}, "
@@ -65,7 +65,7 @@ def test_story_of_a_log_is_told_in_few_and_harmless_words() -> None:
     assert sum(word.startswith("a tunnel begins (2 times") for word in words) == 1
 
 
-def test_status_bars_are_to_scale_and_the_last_word_has_room() -> None:
+def test_status_bars_are_to_scale() -> None:
     changes = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"),
                (80, "disabled")]
     picture = drawn([Event(5, "lab", "is raised"), Event(81, "lab", "is gone"), *(
@@ -81,7 +81,7 @@ def test_status_bars_are_to_scale_and_the_last_word_has_room() -> None:
     assert {"connecting", "relayed", "disabled"} <= set(texts(picture))
 
 
-def test_crowded_moments_stay_apart_and_on_the_paper() -> None:
+def test_crowded_marks_and_headings_do_not_overlap() -> None:
     moments = [Event(60 + number ** 2 / 50, who, f"event {number} of {who}")
                for number in range(40) for who in ("device", "gateway", "somebody")]
     steps = [Event(60 + number / 5, "story", f"and then, as step {number}, it goes on and on")

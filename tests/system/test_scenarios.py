@@ -1,4 +1,4 @@
-"""Every situation the daemon exists for, played in a lab of its own."""
+"""Plays every scenario in a lab of its own."""
 
 from __future__ import annotations
 
@@ -12,7 +12,7 @@ from lab.scenarios import SCENARIOS
 
 NEEDS_TUNNEL = pytest.mark.skipif(not TUNNEL_DEVICE.exists(),
                                   reason="this machine has no tunnel device")
-# Ten leases take longest of all: whoever else plays, plays meanwhile.
+# Scenarios over ten leases take longest, so they start first.
 LONGEST_FIRST = sorted(SCENARIOS.values(), key=lambda scenario: "leases" not in scenario.name)
 
 

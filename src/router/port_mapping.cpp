@@ -1,3 +1,4 @@
+#include <cstdint>
 #include <cstring>
 #include <ctime>
 #include <string>
@@ -53,8 +54,8 @@ struct MappingReply {
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
-    long last = 0;
-    return scanLong(client.c_str() + dot + 1, last) && last != 0;
+    std::int64_t last = 0;
+    return scanInt64(client.c_str() + dot + 1, last) && last != 0;
 }
 
 // Hands the gateway's mappings one by one to @p visit(entry), which returns false to stop. True

@@ -26,7 +26,7 @@ _CLOCK, _INTERVAL = 100, 500
 
 @scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
 def manual_ports(lab: Lab) -> None:
-    """Ports forwarded by hand are proven and published; with a wrong port configured it fails."""
+    """Ports forwarded by hand are tested and published; with a wrong port configured it fails."""
     _forward_by_hand(lab)
     start(lab, "portforwarded")
     device_id, auth, _ = lab.account.secrets
@@ -37,20 +37,20 @@ def manual_ports(lab: Lab) -> None:
     with lab.daemon.held():
         _assert_published_by_hand(lab)
 
-        lab.step("the device's settings name an HTTP port that nobody forwards")
+        lab.step("the device's settings name an HTTP port that is not forwarded")
         lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
     wait_for_log(lab, NOT_RELAYED)
     assert lab.device.status == "failed"
     assert ports_tested(lab) == [8081, 8082, 8082, 8082]
     assert lab.central.record is None
 
-    lab.step("as long as it is wrong, every cycle tests it, due or not, and whatever the disk does")
+    lab.step("while it is wrong, every cycle tests it, due or not, even with the disk asleep")
     lab.device.disk_sleeps()
     wait_for_log(lab, NOT_RELAYED, 2)
     assert ports_tested(lab)[1:] == [8082] * 6
     lab.device.disk_wakes()
 
-    lab.step("the settings are right again")
+    lab.step("the settings are correct again")
     lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
     wait_for_status(lab, "portforwarded")
     _assert_published_by_hand(lab)
@@ -63,14 +63,14 @@ def manual_ports(lab: Lab) -> None:
 
 @scenario(Situation(static=NO_TUNNEL, clock=FAST))
 def manual_ports_that_are_none(lab: Lab) -> None:
-    """A manual port that is no port stops everything; what was mapped before stays open."""
+    """An invalid manual port stops everything; what was mapped before stays open."""
     lab.gateway.forward_by_hand(65535, 80)
     lab.gateway.forward_by_hand(1, 443)
     start(lab, "portforwarded")
 
     for http, https, kind in (("0", "1", "HTTP"), ("65536", "1", "HTTP"), ("http", "1", "HTTP"),
                               ("65535", "", "HTTPS")):
-        lab.step(f"the user wants the ports '{http}' and '{https}'")
+        lab.step(f"the user enters the ports '{http}' and '{https}'")
         line = ("ConnectionManager::manualPortForward - bad value for manually configured "
                 f"{kind} Port.")
         before = lab.device.messages.texts().count(line)
@@ -82,10 +82,10 @@ def manual_ports_that_are_none(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed"]
     assert ports_tested(lab) == [9091]
     assert lab.central.record is None
-    # The relay withdraws the record but leaves the gateway alone.
+    # Switching to the relay withdraws the record but leaves the gateway alone.
     assert lab.gateway.mappings() == BOTH_MAPPED
 
-    lab.step("both ports are valid, and the automatic ones go")
+    lab.step("both ports are valid, and the automatic ones are removed")
     lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
     wait_for_status(lab, "portforwarded")
     assert lab.gateway.mappings() == []
@@ -107,12 +107,12 @@ def manual_and_back(lab: Lab) -> None:
     start(lab, "portforwarded")
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
 
-    lab.step("the user forwards ports by hand and tells the device")
+    lab.step("the user forwards ports by hand and configures the device")
     with lab.daemon.held():
         _forward_by_hand(lab)
         lab.device.change(**_SETTINGS)
         changed = len(lab.device.messages.all)
-    _wait_until_told(lab, 8081)
+    _wait_for_port(lab, 8081)
     assert_logged_by_next_cycle(lab, changed, _BEGIN)
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
@@ -128,7 +128,7 @@ def manual_and_back(lab: Lab) -> None:
 
         lab.step("the user's ports are gone, and the next test makes the daemon map its own")
         lab.gateway.stop_forwarding_by_hand()
-    _wait_until_told(lab, 9091)
+    _wait_for_port(lab, 9091)
     wait_for_status(lab, "portforwarded")
     assert ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
@@ -137,32 +137,32 @@ def manual_and_back(lab: Lab) -> None:
     assert [request.argument("http_port") for request in lab.central.requests_for(PORT_FORWARD)
             ] == ["0", "9091", "8081", "9091"]
 
-    lab.step("the end leaves the others their ports")
+    lab.step("stopping leaves the other ports alone")
     assert_stops_clean(lab, left=others)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
-# Two discoveries in a cycle wait in vain: it lasts about 280 s.
+# Two discoveries per cycle time out, so it lasts about 280 s.
 @scenario(Situation(gateway=SILENT, dynamic=_SETTINGS, clock=_CLOCK))
 def manual_without_protocol(lab: Lab) -> None:
-    """No mapping protocol: the service is asked for the address now and then, a new one is told."""
+    """No mapping protocol: the service is asked for the address at times, a new one published."""
     _forward_by_hand(lab)
     start(lab, "portforwarded", "-p", f"{_INTERVAL}")
     _assert_published_by_hand(lab)
     sent = list(lab.device.local_requests)
 
-    lab.step("once the interval has passed, the service is asked; the address is what it was")
+    lab.step("after the interval the service is asked; the address has not changed")
     wait_for_log(lab, f"NetworkAddrs::getMyIP - external IP address {_HERE}")
     lab.wait_for(lambda: lab.device.messages.count(_BEGIN) == lab.device.messages.count(_END),
                  "the attempt to end", 60)
 
-    lab.step("the provider gives another address: the ports pass their test there as well")
+    lab.step("the provider assigns another address: the ports pass their test there as well")
     lab.gateway.move_to(_ELSEWHERE)
     lab.wait_for(lambda: lab.central.port_tests[-1].address == _ELSEWHERE, "a test there", 60)
     assert lab.device.local_requests == sent
 
-    lab.step("the next question for the address is due, but the service wants it a minute later")
+    lab.step("the next request for the address is due, but the service asks to wait a minute")
     lab.central.wait_seconds = 60
     wait_for_log(lab, "NetworkAddrs::getMyIP - wait 60 seconds")
     lab.central.wait_seconds = 0
@@ -179,7 +179,7 @@ def manual_without_protocol(lab: Lab) -> None:
 
 @scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
 def manual_behind_second_nat(lab: Lab) -> None:
-    """A second NAT closes ports forwarded by hand: the test just fails, and passes without it."""
+    """A second NAT blocks ports forwarded by hand: the test just fails, and passes without it."""
     lab.provider.insert()
     _forward_by_hand(lab)
     lab.start_daemon(*OPTIONS)
@@ -188,7 +188,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
 
-    lab.step("the provider's box is gone")
+    lab.step("the provider's NAT is gone")
     with lab.daemon.held():
         lab.provider.remove()
     wait_for_status(lab, "portforwarded")
@@ -199,7 +199,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
 
 @scenario(Situation(static=NO_TUNNEL, clock=FAST))
 def manual_after_second_nat(lab: Lab) -> None:
-    """A second NAT that the automatic test met rules out manual ports even when it is gone."""
+    """A second NAT found by the automatic test rules out manual ports even after it is gone."""
     lab.provider.insert()
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
@@ -219,7 +219,7 @@ def manual_after_second_nat(lab: Lab) -> None:
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     lab.device.change(MANUAL_PORT_FORWARD="TRUE")
-    _wait_until_told(lab, 8081)
+    _wait_for_port(lab, 8081)
     _assert_published_by_hand(lab)
     assert_stops_clean(lab)
 
@@ -229,13 +229,13 @@ def _forward_by_hand(lab: Lab) -> None:
     lab.gateway.forward_by_hand(8444, 443)
 
 
-def _wait_until_told(lab: Lab, http_port: int) -> None:
+def _wait_for_port(lab: Lab, http_port: int) -> None:
     lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == str(http_port),
-                 f"the device to be told the port {http_port}", 60)
+                 f"the device to be published on port {http_port}", 60)
 
 
 def _assert_published_by_hand(lab: Lab) -> None:
-    """Everybody knows the user's ports, which lead to the device and are as the user made them."""
+    """The user's ports are published, lead to the device, and are unchanged."""
     assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 8081, 8444)
     assert lab.device.setting("EXTERNAL_IP") == _HERE
     assert lab.device.setting("EXTERNAL_HTTP_PORT") == "8081"
@@ -245,10 +245,10 @@ def _assert_published_by_hand(lab: Lab) -> None:
 
 
 def _assert_asked_in_intervals(lab: Lab) -> None:
-    """Twice, each time when the interval since the publication or the last question had passed."""
+    """Twice, each time an interval or more after the publication or the previous request."""
     published, *_ = lab.central.requests_for(PORT_FORWARD)
     first, second = lab.central.requests_for(MY_IP)
     assert {(asking.scheme, asking.url) for asking in (first, second)} == {
         ("http", "/api/1.0/rest/myip")}
     shortest = min(first.when - published.when, second.when - first.when)
-    assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts full seconds
+    assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts whole seconds

@@ -1,4 +1,4 @@
-"""What other programs on the device change: credentials, ports, switches, a sleeping disk."""
+"""Changes by other programs on the device: credentials, ports, switches, a sleeping disk."""
 
 from __future__ import annotations
 
@@ -27,11 +27,11 @@ def disk_asleep(lab: Lab) -> None:
     start(lab, "portforwarded")
     requests, sent = list(lab.central.requests), list(lab.device.local_requests)
 
-    lab.step("the ports are to be tested again, but the disk is in standby")
+    lab.step("the next port test is due, but the disk is in standby")
     lab.device.disk_sleeps()
     wait_for_log(lab, "drive is in standby, port test is suspended")
 
-    lab.step("the disk turns, but nobody has used it for two minutes")
+    lab.step("the disk spins up, but has not been used for two minutes")
     lab.device.minutes_since_disk_access(2)
     lab.device.disk_wakes()
     wait_for_log(lab, "sleep count > 1, port testing SKIP.")
@@ -67,7 +67,7 @@ def disk_asleep_at_the_start(lab: Lab) -> None:
 
 @scenario(Situation(clock=FAST))
 def disk_asleep_and_names_wrong(lab: Lab) -> None:
-    """Public names that lead elsewhere are worth waking the disk: everything is built anew."""
+    """Wrong public names justify waking the disk: everything is rebuilt."""
     lab.device.disk_sleeps()
     lab.names.pin(lab.account.names[0], network.SERVICE_ADDRESS)
     start(lab, "portforwarded")
@@ -81,7 +81,7 @@ def disk_asleep_and_names_wrong(lab: Lab) -> None:
     assert lab.central.withdrawals == 2
     assert_published(lab)
 
-    lab.step("with nothing forced any more the disk is left asleep")
+    lab.step("once nothing is forced, the disk is left asleep")
     wait_for_log(lab, "testPort - hard disk is asleep.")
     assert len(lab.central.port_tests) == 2
     assert_stops_clean(lab)
@@ -95,7 +95,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     start(lab, "relayed")
     client = tunnel_client()
 
-    lab.step("the gateway maps ports now, but they cannot be proven")
+    lab.step("the gateway maps ports now, but they cannot be tested")
     lab.device.disk_sleeps()
     lab.gateway.become(GatewaySetup())
     wait_for_log(lab, "Skipped port test, unmapped HTTP port 9091, leaving forwardPort()")
@@ -104,7 +104,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "relayed"]
     assert tunnel_client() == client
 
-    lab.step("another program wants the connection built anew")
+    lab.step("another program requests a new connection")
     lab.device.change(COMMUNICATION_STATUS="connecting")
     wait_for_status(lab, "portforwarded")
     assert len(lab.central.port_tests) == 1
@@ -116,7 +116,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
 
 @scenario(Situation(dynamic={"DEVICEID": "", "DEVICEAUTH": ""}, clock=FAST))
 def credentials_missing(lab: Lab) -> None:
-    """Without credentials the daemon idles in silence; it starts to work as soon as they appear."""
+    """Without credentials the daemon idles silently; it starts working as soon as they appear."""
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, _IDLE, 2)
 
@@ -133,7 +133,7 @@ def credentials_missing(lab: Lab) -> None:
         changed = len(lab.device.messages.all)
     wait_for_status(lab, "portforwarded")
     assert_logged_by_next_cycle(lab, changed, "createDirectConnection() - success")
-    # The service gets the local address with the record; it is told of it alone only at a start.
+    # The service gets the local address with the record; it is sent alone only at a start.
     assert asked(lab) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert lab.device.messages.count(_STARTED) == 1
@@ -143,7 +143,7 @@ def credentials_missing(lab: Lab) -> None:
 
 @scenario(Situation(clock=FAST))
 def internal_ports_change(lab: Lab) -> None:
-    """The device's web server moves to other ports; the gateway is led there by the next test."""
+    """The device's web server moves to other ports; the next port test has them remapped."""
     start(lab, "portforwarded")
     wait_for_cycle(lab, 1)
     requests = len(lab.device.local_requests)
@@ -172,7 +172,7 @@ def internal_ports_change(lab: Lab) -> None:
 
 @scenario(Situation(clock=FAST))
 def default_ports_only_later(lab: Lab) -> None:
-    """Other ports than 9091 are forbidden while 9092 is used: closed at once, 9091 only later."""
+    """Only 9091 is allowed while 9092 is in use: 9092 closes at once, 9091 opens only later."""
     lab.neighbour.hold(9091, 80)
     others = lab.gateway.mappings()
     lab.start_daemon(*OPTIONS)
@@ -186,7 +186,7 @@ def default_ports_only_later(lab: Lab) -> None:
         lab.device.change(DEFAULT_PORTS_ONLY="TRUE")
         changed = len(lab.device.messages.all)
     assert_logged_by_next_cycle(lab, changed, "Skip testing port due to interval")
-    # Clients are sent to closed ports until the search; nobody is told of it.
+    # Clients are sent to closed ports until the search; nothing is reported.
     assert lab.gateway.mappings() == []
     assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert lab.central.record and lab.central.record.http_port == 9092
@@ -203,7 +203,7 @@ def default_ports_only_later(lab: Lab) -> None:
 
 @scenario(Situation(clock=FAST))
 def rubbish_in_place_of_settings(lab: Lab) -> None:
-    """A dynamic configuration that is all rubbish: the daemon idles until it is mended."""
+    """A dynamic configuration that is all rubbish: the daemon idles until it is repaired."""
     proper = DYNAMIC_FILE.read_bytes()
     DYNAMIC_FILE.write_bytes(_RUBBISH)
     lab.start_daemon(*OPTIONS)
@@ -211,7 +211,7 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
     assert lab.central.requests == []
     assert lab.gateway.mappings() == []
 
-    lab.step("the configuration is mended")
+    lab.step("the configuration is repaired")
     for path in (DYNAMIC_FILE, DYNAMIC_COPY):
         path.write_bytes(proper)
     wait_for_status(lab, "portforwarded")
@@ -229,7 +229,7 @@ def rubbish_amid_settings(lab: Lab) -> None:
     proper = DYNAMIC_COPY.read_bytes()
     reloads = lab.device.messages.count("Reload dynamicconfig.ini file.")
 
-    lab.step("another program spoils the file")
+    lab.step("another program corrupts the file")
     DYNAMIC_COPY.write_bytes(_RUBBISH + b"\n" + proper)
     wait_for_log(lab, "Reload dynamicconfig.ini file.", reloads + 1)
     wait_for_next_cycle(lab)

@@ -21,7 +21,7 @@ DAEMON_FILES = (Path("/tmp/tavik_cm_pid"), Path("/tmp/dynamicconfig.ini"))
 
 
 def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Popen[str]:
-    """Start the demo as a terminal does, in its own process group, with the daemon already built."""
+    """Start the demo as a terminal does, in its own process group, with a built daemon."""
     environment = dict(os.environ, PELORUS=str(binary))
     return subprocess.Popen([sandbox.PYTHON, "-m", "lab.demo", *options], env=environment,
                             cwd=sandbox.PROJECT, stdout=subprocess.PIPE, text=True,

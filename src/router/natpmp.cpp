@@ -2,9 +2,7 @@
 
 #include <arpa/inet.h>
 #include <fcntl.h>
-#include <poll.h>
 #include <sys/select.h>
-#include <sys/socket.h>
 
 #include <array>
 #include <cerrno>
@@ -20,7 +18,6 @@ namespace {
 
 constexpr int kMaxReads = 3;
 constexpr int kMaxLateAnswers = 100;
-constexpr int kLateAnswerWait = 1000;  // milliseconds
 constexpr int kSelectDescriptors = FD_SETSIZE;
 
 // The protocol's number for "TCP" or "UDP", 0 for anything else.
@@ -34,22 +31,6 @@ int protocolNumber(const std::string& protocol) {
 void closeOnExec(int socket) {
     const int flags = fcntl(socket, F_GETFD);
     if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));
-}
-
-// A gateway that is slow answers a request and each of its repetitions. What is not read then would
-// be taken for the answer to the next request, and every answer from then on for that to the next.
-// Answers to repetitions are on their way once the request itself was answered, so they are waited
-// for; a gateway that answered nothing owes nothing.
-void discardLateAnswers(const natpmp_t& client) {
-    int expected = client.has_pending_request != 0 ? 0 : client.try_number - 1;
-    std::array<char, sizeof(natpmpresp_t)> answer{};
-    for (int count = 0; count < kMaxLateAnswers; ++count) {
-        pollfd readable{client.s, POLLIN, 0};
-        if (poll(&readable, 1, expected > 0 ? kLateAnswerWait : 0) == 0) return;
-        // A refusal that waits here is taken away like an answer.
-        static_cast<void>(recv(client.s, answer.data(), answer.size(), MSG_DONTWAIT));
-        --expected;
-    }
 }
 
 void waitForAnswer(int socket, timeval timeout) {
@@ -86,13 +67,16 @@ bool CMnatpmp::close() {
         const int status = closenatpmp(&natpmp);
         if (status < 0) logError("CMnatpmp::close  closenatpmp failed %d\n", status);
         initialized = false;
+        answers = {};
     }
     return true;
 }
 
 int CMnatpmp::CheckNATPMPResponse() {
     int status = NATPMP_TRYAGAIN;
-    for (int reads = 0; status == NATPMP_TRYAGAIN && reads < kMaxReads; ++reads) {
+    int reads = 0;
+    int late = 0;
+    while (status == NATPMP_TRYAGAIN && reads < kMaxReads) {
         timeval timeout{};
         const int timeoutStatus = getnatpmprequesttimeout(&natpmp, &timeout);
         if (timeoutStatus < 0) {
@@ -102,7 +86,17 @@ int CMnatpmp::CheckNATPMPResponse() {
         }
         waitForAnswer(natpmp.s, timeout);
         status = readnatpmpresponseorretry(&natpmp, &response);
+        if (status >= 0 && late < kMaxLateAnswers && answers.isLate(response)) {
+            // The library takes any answer for the one it waits for; ours is still to come.
+            natpmp.has_pending_request = 1;
+            status = NATPMP_TRYAGAIN;
+            answers.countLate();
+            ++late;
+        } else {
+            ++reads;
+        }
     }
+    answers.end(natpmp, status);
     return status;
 }
 
@@ -111,7 +105,7 @@ bool CMnatpmp::retrieveExternalIP(std::string& ip) {
         logError("CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
-    discardLateAnswers(natpmp);
+    answers.begin(natpmp, {});
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
@@ -168,7 +162,7 @@ bool CMnatpmp::exchangeMapping(int protocol,
                                int internalPort,
                                int& externalPort,
                                unsigned& lifetime) {
-    discardLateAnswers(natpmp);
+    answers.begin(natpmp, {protocol, internalPort, lifetime == 0});
     const int sent =
         sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
                                   static_cast<std::uint16_t>(externalPort), lifetime);

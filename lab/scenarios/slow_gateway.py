@@ -58,7 +58,8 @@ def natpmp_too_slow(lab: Lab) -> None:
     wait_for_cycle(lab, 1)
     assert lab.device.messages.count("failed to map public port") > 0
     wait_for_cycle(lab, 3)
-    fetched = [text for text in lab.device.messages.texts() if "::retrieveExternalIP  fetched" in text]
+    fetched = [text for text in lab.device.messages.texts()
+               if "::retrieveExternalIP  fetched" in text]
     assert {text.split()[-1] for text in fetched} == {network.GATEWAY_WAN_ADDRESS}
     assert _tracked(lab) == set()
     assert lab.gateway.mappings() == []

@@ -9,6 +9,7 @@
 #include <cstdint>
 #include <cstring>
 #include <ctime>
+#include <optional>
 
 #include "common/log.h"
 
@@ -181,6 +182,7 @@ bool CMnatpmp::exchangeMapping(int protocol,
         return false;
     }
     const auto& granted = response.pnu.newportmapping;
+    // The protocol in this line is the answer's type; the two have the same numbers.
     logInfo(
         "CMnatpmp::portMappingRequest  mapped public port %hu to localport %hu protocol %d, lifetime %u\n",
         granted.mappedpublicport, granted.privateport, static_cast<int>(response.type),
@@ -196,41 +198,39 @@ bool CMnatpmp::exchangeMapping(int protocol,
 }
 
 void CMnatpmp::trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime) {
-    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     const char* const label = isHttps ? "HTTPS" : "HTTP";
-    tracker.setParams(internalPort, externalPort, lifetime);
+    const TrackedMapping tracked = gwPorts.track(isHttps, internalPort, externalPort, lifetime);
     logInfo(
         "CMnatpmp::portMappingRequest  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
         label, internalPort, externalPort, lifetime);
-    const TrackedMapping tracked = tracker.read();
     logInfo(
         "CMnatpmp::portMappingRequest - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
 }
 
 void CMnatpmp::forgetMapping(int internalPort) {
-    const TrackedMapping http = gwPorts.http.read();
-    const TrackedMapping https = gwPorts.https.read();
-    if (http.internalPort == internalPort) {
-        gwPorts.http.setParams(0, 0, 0);
-        logInfo(
-            "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            http.internalPort, http.externalPort, http.lifetime);
-    } else if (https.internalPort == internalPort) {
-        gwPorts.https.setParams(0, 0, 0);
-        logInfo(
-            "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, https.externalPort, https.lifetime);
-    } else {
-        logInfo(
-            "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    const auto [service, mapping] = gwPorts.forget(internalPort);
+    switch (service) {
+        case GWPortsTracker::Service::HTTP:
+            logInfo(
+                "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::HTTPS:
+            logInfo(
+                "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::NONE:
+            logInfo(
+                "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, internalPort, mapping.externalPort, mapping.lifetime);
+            break;
     }
 }
 
 void CMnatpmp::forgetAllMappings(int internalPort, int externalPort, unsigned lifetime) {
-    gwPorts.http.setParams(0, 0, 0);
-    gwPorts.https.setParams(0, 0, 0);
+    gwPorts.forgetAll();
     logInfo(
         "CMnatpmp::portMappingRequest  destroyed all mappings. internal_port %d, external_port %d, lifetime %u\n",
         internalPort, externalPort, lifetime);
@@ -259,17 +259,16 @@ bool CMnatpmp::unmapAllPorts(const std::string& protocol, const std::string& des
 
 void CMnatpmp::renewPortMapping(const char* which) {
     const bool isHttps = std::strcmp(which, "HTTPS") == 0;
-    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
-    if (!tracker.pastHalfway()) return;
-    const unsigned requested = getReqPortMappingLifetime();
+    std::optional<TrackedMapping> due = gwPorts.due(isHttps);
+    if (!due) return;
     logInfo("CMnatpmp::renewPortMapping - pastHalfway() returned TRUE\n");
-    TrackedMapping tracked = tracker.read();
-    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    const bool renewed = mapPort(due->internalPort, due->externalPort, "TCP", "", isHttps);
+    const std::int64_t now = std::time(nullptr);
     logInfo(
-        "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
-        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
-        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
-        tracked.interval.GetIntervalDuration(), requested);
+        "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%jd], previous start[%jd], previous lifetime[%jd], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), due->internalPort, due->externalPort, now,
+        due->interval.GetIntervalStartTime(), due->interval.GetIntervalDuration(),
+        getReqPortMappingLifetime());
 }
 
 void CMnatpmp::CheckExpiredMappings() {

@@ -1,5 +1,7 @@
+#include <cstdint>
 #include <cstring>
 #include <ctime>
+#include <optional>
 #include <string>
 
 #include "common/log.h"
@@ -127,16 +129,12 @@ bool Router::addMapping(int internalPort,
 }
 
 void Router::trackMapping(int internalPort, int externalPort, bool isHttps) {
-    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     const char* const label = isHttps ? "HTTPS" : "HTTP";
-    unsigned upnpLease = 0;
-    unsigned natpmpLease = 0;
-    getReqPortMappingLifetime(upnpLease, natpmpLease);
-    tracker.setParams(internalPort, externalPort, upnpLease);
+    const unsigned lease = gwPorts.reqLifetime;
+    const TrackedMapping tracked = gwPorts.track(isHttps, internalPort, externalPort, lease);
     logInfo(
         "Router::mapPort  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
-        label, internalPort, externalPort, upnpLease);
-    const TrackedMapping tracked = tracker.read();
+        label, internalPort, externalPort, lease);
     logInfo(
         "Router::mapPort - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
@@ -163,24 +161,24 @@ bool Router::unmapPort(int internalPort, int externalPort, const std::string& pr
     return true;
 }
 
-// Port 0 stands for no mapping and belongs to no tracker, idle ones included.
 void Router::forgetMapping(int internalPort) {
-    const TrackedMapping http = gwPorts.http.read();
-    const TrackedMapping https = gwPorts.https.read();
-    if (internalPort != 0 && http.internalPort == internalPort) {
-        gwPorts.http.setParams(0, 0, 0);
-        logInfo(
-            "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            http.internalPort, http.externalPort, http.lifetime);
-    } else if (internalPort != 0 && https.internalPort == internalPort) {
-        gwPorts.https.setParams(0, 0, 0);
-        logInfo(
-            "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, https.externalPort, https.lifetime);
-    } else {
-        logInfo(
-            "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    const auto [service, mapping] = gwPorts.forget(internalPort);
+    switch (service) {
+        case GWPortsTracker::Service::HTTP:
+            logInfo(
+                "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::HTTPS:
+            logInfo(
+                "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::NONE:
+            logInfo(
+                "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, internalPort, mapping.externalPort, mapping.lifetime);
+            break;
     }
 }
 
@@ -203,8 +201,7 @@ bool Router::unmapAllPorts(const std::string& protocol, const std::string& descr
     }
     logInfo("Router::unmapAllPorts() - success\n");
     if (!natpmp) {
-        gwPorts.http.setParams(0, 0, 0);
-        gwPorts.https.setParams(0, 0, 0);
+        gwPorts.forgetAll();
         logInfo("Router::unmapAllPorts()  destroyed all mappings.\n");
     }
     return true;
@@ -264,20 +261,17 @@ bool Router::isPortMapped(int externalPort, const std::string& protocol) {
 
 void Router::renewPortMapping(const char* which) {
     const bool isHttps = std::strcmp(which, "HTTPS") == 0;
-    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
-    if (!tracker.pastHalfway()) return;
-    unsigned upnpLease = 0;
-    unsigned natpmpLease = 0;
-    getReqPortMappingLifetime(upnpLease, natpmpLease);
+    std::optional<TrackedMapping> due = gwPorts.due(isHttps);
+    if (!due) return;
     logInfo("Router::renewPortMapping - pastHalfway() returned TRUE\n");
-    TrackedMapping tracked = tracker.read();
     // An idle tracker has port 0, which mapPort refuses.
-    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    const bool renewed = mapPort(due->internalPort, due->externalPort, "TCP", "", isHttps);
+    const std::int64_t now = std::time(nullptr);
     logInfo(
-        "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
-        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
-        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
-        tracked.interval.GetIntervalDuration(), upnpLease);
+        "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%jd], previous start[%jd], previous lifetime[%jd], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), due->internalPort, due->externalPort, now,
+        due->interval.GetIntervalStartTime(), due->interval.GetIntervalDuration(),
+        gwPorts.reqLifetime);
 }
 
 void Router::CheckExpiredMappings() {

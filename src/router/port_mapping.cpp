@@ -30,8 +30,8 @@ int portNumber(const std::string& text) {
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
-    long last = 0;
-    return scanLong(client.c_str() + dot + 1, last) && last != 0;
+    std::int64_t last = 0;
+    return scanInt64(client.c_str() + dot + 1, last) && last != 0;
 }
 
 }  // namespace

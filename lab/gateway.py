@@ -130,6 +130,13 @@ class Gateway:
         self._stop()
         self._timeline.add("gateway", "no longer answers the mapping protocols")
 
+    def hang_once(self, seconds: float) -> None:
+        """Let the lab's NAT-PMP server hang when the device next asks for a mapping."""
+        if not self._natpmp:
+            raise LabError("only the lab's own NAT-PMP server can be told to hang")
+        self._natpmp.hang_once(seconds)
+        self._timeline.add("gateway", f"will hang for {seconds} s at the next request")
+
     def lose(self, *external_ports: int) -> None:
         """Drop the forwardings of these ports, or all, without notice.
 

@@ -14,7 +14,7 @@ from lab.packet_filter import Mapping
 
 PORT = 5351
 
-_UNSUPPORTED_VERSION, _UNSUPPORTED_OPCODE = 1, 5
+_UNSUPPORTED_VERSION, _NOT_AUTHORIZED, _UNSUPPORTED_OPCODE = 1, 2, 5
 _PROTOCOLS = {1: "UDP", 2: "TCP"}
 _REPLY = 128
 _LOOK_SECONDS = 0.05
@@ -25,11 +25,15 @@ class Grant:
     """How the router answers a request for a mapping.
 
     `port` gives the external port granted for a requested one; if that is taken, the next free
-    port is granted. `lease` is the longest lease in seconds.
+    port is granted. `lease` is the longest lease in seconds. The external ports in `refused` are
+    never granted. From its first request for a mapping on, the device gets each answer `delay`
+    seconds late, in real time.
     """
 
     port: Callable[[int], int]
     lease: int
+    refused: frozenset[int] = frozenset()
+    delay: float = 0
 
 
 class NatPmp:
@@ -42,6 +46,10 @@ class NatPmp:
         self._public_address = public_address
         self._born = time.monotonic()
         self._ends: dict[Mapping, float] = {}
+        self._delay = 0.0
+        self._hang_length = 0.0
+        self._hung_until = 0.0
+        self._outgoing: list[tuple[float, bytes, tuple[str, int]]] = []
         self._stopping = threading.Event()
         self._thread = threading.Thread(target=self._serve, daemon=True)
 
@@ -53,6 +61,10 @@ class NatPmp:
         self._socket.bind((address, PORT))
         self._thread.start()
 
+    def hang_once(self, seconds: float) -> None:
+        """Hang for `seconds` at the next request for a mapping, then answer everything."""
+        self._hang_length = seconds
+
     def stop(self) -> None:
         """Stop answering; existing forwardings stay."""
         self._stopping.set()
@@ -62,13 +74,34 @@ class NatPmp:
         with self._socket:
             while not self._stopping.is_set():
                 self._expire()
+                self._send_due()
                 try:
                     request, client = self._socket.recvfrom(1500)
                 except TimeoutError:
                     continue
                 answer = self._answer(request, client[0])
                 if answer:
-                    self._socket.sendto(answer, client)
+                    self._outgoing.append((self._time_to_answer(request, client[0]),
+                                           answer, client))
+                self._send_due()
+
+    def _time_to_answer(self, request: bytes, client: str) -> float:
+        """When the answer is sent, in real time."""
+        now = time.monotonic()
+        if client != network.DEVICE_ADDRESS:
+            return now
+        if request[1] in _PROTOCOLS:
+            self._delay = self._grant.delay
+            if self._hang_length:
+                self._hung_until, self._hang_length = now + self._hang_length, 0.0
+        return max(now + self._delay, self._hung_until)
+
+    def _send_due(self) -> None:
+        now = time.monotonic()
+        for due, answer, client in self._outgoing:
+            if due <= now:
+                self._socket.sendto(answer, client)
+        self._outgoing = [waiting for waiting in self._outgoing if waiting[0] > now]
 
     def _expire(self) -> None:
         for mapping in [mapping for mapping, end in self._ends.items() if end <= self._now()]:
@@ -88,6 +121,9 @@ class NatPmp:
         internal, external, lease = struct.unpack_from(">HHI", request, 4)
         if lease == 0:
             return self._unmap(operation, client, internal)
+        if external in self._grant.refused:
+            return (self._head(operation, _NOT_AUTHORIZED)
+                    + struct.pack(">HHI", internal, external, 0))
         return self._map(operation, client, internal, external, lease)
 
     def _map(self, operation: int, client: str, internal: int, external: int,

@@ -6,7 +6,8 @@ them, `scripts/demo NAME` plays and shows one.
 
 # Importing a module registers its scenarios; --list shows them in this order.
 from lab.scenarios import direct  # noqa: F401
-from lab.scenarios import changes, leases, relay, manual, service, settings  # noqa: F401
+from lab.scenarios import changes, leases, slow_gateway  # noqa: F401
+from lab.scenarios import relay, manual, service, settings  # noqa: F401
 from lab.scenarios import own_router, lifecycle  # noqa: F401
 from lab.scenarios.registry import SCENARIOS, Scenario
 

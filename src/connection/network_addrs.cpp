@@ -82,7 +82,7 @@ bool NetworkAddrs::findExternalIp(std::string& discovered) {
         interval.GetIntervalStartTime(), static_cast<int>(interval.GetIntervalDuration()),
         static_cast<long>(time(nullptr)));
     if (getMyIP(discovered) != 1) {
-        logInfo("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
+        logError("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
         return false;
     }
     interval.StartTheInterval();
@@ -116,7 +116,7 @@ int NetworkAddrs::getMyIP(std::string& out) {
         found = client->getMyIP(ip, waitSeconds);
     }
     if (!found) {
-        logInfo("NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
+        logError("NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
         return 0;
     }
     out = ip;

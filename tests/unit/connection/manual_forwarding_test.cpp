@@ -195,6 +195,8 @@ TEST_F(NetworkAddrsTest, FailedQuestionIsRepeatedAtTheNextChance) {
     EXPECT_EQ(addresses.discoverNetworkAddrs(), 0);
     EXPECT_EQ(addresses.discoverNetworkAddrs(), 0);
     EXPECT_EQ(web.count("/myip"), 2);
+    expectLogged(LOG_ERR, "NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
+    expectLogged(LOG_ERR, "NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
 }
 
 TEST_F(NetworkAddrsTest, WaitsAsOftenAsTheServerAsks) {

@@ -37,7 +37,7 @@ ConnectionType ManualAttempt::run() {
     if (!testIsDue()) {
         result = manager.connectionType;
     } else if (manager.doubleNatDetected) {
-        // Lasts until an automatic test clears the flag: manual tests do not look for a double NAT.
+        // No manual test runs any more, so only an automatic one can clear the flag.
         logInfo(
             "ConnectionManager::manualPortForward - relay mode is enforced, therefore don't manual forward ports.\n");
         return FAILED;

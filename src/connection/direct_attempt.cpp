@@ -68,8 +68,9 @@ std::optional<ConnectionType> DirectAttempt::checkGateway() {
         bTryPortMap = true;
         return std::nullopt;
     }
-    if (manager.allocatedHttpPort != 0 && !manager.lastManualPortForward)
+    if (manager.allocatedHttpPort != 0 && !manager.lastManualPortForward) {
         return testPortsWithoutGateway();
+    }
     logInfo(
         "ConnectionManager::createDirectConnection - Don't test port since either pRouter->isInitialized %d, or allocatedHttpPort %d is 0, or lastManualPortForward %d is true.\n",
         manager.router().isInitialized(), manager.allocatedHttpPort, manager.lastManualPortForward);
@@ -109,7 +110,6 @@ void DirectAttempt::readStatusFile() {
         manager.connectionType = RELAYED;
     } else if (status == "connecting") {
         manager.connectionType = CONNECTING;
-        checkSleep = false;
     } else if (status == "failed") {
         manager.connectionType = FAILED;
     }
@@ -138,8 +138,7 @@ void DirectAttempt::unmapAllocatedPorts() {
     manager.forgetPorts();
 }
 
-// A new address or a forced attempt is worth waking the disk for. This overrides what the status
-// file said; searchPorts() comes back to that.
+// A new address or a forced attempt is worth waking the disk for.
 void DirectAttempt::decideSleepCheck() {
     checkSleep = !(manager.router().hasExternalIpChanged() ||
                    manager.router().hasLocalIpChanged() || manager.forceConnect);
@@ -162,8 +161,9 @@ std::optional<ConnectionType> DirectAttempt::retestMappedPorts() {
     std::string requestedIp = manager.router().getExternalIp();
     testResult = manager.testHttpPort(requestedIp, manager.allocatedHttpPort, checkSleep, false);
     const bool failed = testResult == FAIL_TEST;
-    if (manager.forceConnect)
+    if (manager.forceConnect) {
         reportAnalytics(failed ? "failed" : "portforwarded", SUBTYPE_AUTOMATIC);
+    }
     if (testResult != SKIP_TEST) manager.lastPortTestTime = now;
 
     if (failed && manager.doubleNatDetected) {
@@ -191,7 +191,7 @@ bool DirectAttempt::searchIsDue() {
     return false;
 }
 
-// Ends the attempt when a double NAT makes it hopeless; the mappings then stay.
+// Ends the attempt when a double NAT makes it hopeless.
 std::optional<ConnectionType> DirectAttempt::searchPorts() {
     logInfo(
         "ConnectionManager::createDirectConnection: Check Sleep Mode:[%d](0:ignore, 1:check sleep), Test Result of Portforward: [%d](1:skip, 2:fail, 3:pass), connectionType %d.\n",
@@ -204,8 +204,9 @@ std::optional<ConnectionType> DirectAttempt::searchPorts() {
         manager.router().discover();
         decideSleepCheck();
     }
-    if (manager.connectionType == CONNECTING || manager.prevConnectionType == FAILED)
+    if (manager.connectionType == CONNECTING || manager.prevConnectionType == FAILED) {
         checkSleep = false;
+    }
 
     manager.allocatedHttpPort = forwardHttpPort();
     logInfo("ConnectionManager::createDirectConnection() - HTTP allocatedHttpPort: [%d].\n",
@@ -250,10 +251,7 @@ ConnectionType DirectAttempt::publishMapping() {
         logError(
             "ConnectionManager::createDirectConnection() - failed to update mapping info, attempting to delete server mapping.\n");
         reportAnalytics("failed", SUBTYPE_AUTOMATIC);
-        manager.clearMappedFlags();
-        logInfo(
-            "ConnectionManager::createDirectConnection() - Failed trying automatic port test. Resume or try RELAY mode.\n");
-        return FAILED;
+        return endInFailure();
     }
     if (!VPNManager::getInstance()->closeVPNConnection()) {
         logError("ConnectionManager::createDirectConnection() - failed to stop VPN process.\n");
@@ -266,9 +264,13 @@ ConnectionType DirectAttempt::publishMapping() {
 }
 
 ConnectionType DirectAttempt::giveUpMapping() {
-    manager.clearMappedFlags();
     unmapAllocatedPorts();
     if (analyticsSent) reportAnalytics("failed", SUBTYPE_AUTOMATIC);
+    return endInFailure();
+}
+
+ConnectionType DirectAttempt::endInFailure() {
+    manager.clearMappedFlags();
     logInfo(
         "ConnectionManager::createDirectConnection() - Failed trying automatic port test. Resume or try RELAY mode.\n");
     return FAILED;

@@ -33,6 +33,7 @@ private:
     int forwardHttpsPort();
     ConnectionType publishMapping();
     ConnectionType giveUpMapping();
+    ConnectionType endInFailure();
     void unmapAllocatedPorts();
 
     ConnectionManager& manager;

@@ -17,10 +17,10 @@ namespace pelorus {
 
 namespace {
 
-constexpr std::int64_t kShortestPortTestInterval = 240;       // seconds
-constexpr std::int64_t kLongestPortTestInterval = 960;        // seconds
-constexpr std::int64_t kPortTestIntervalStep = 120;           // seconds
-constexpr std::int64_t kDefaultDnsCheckInterval = 24 * 3600;  // seconds
+constexpr std::int64_t kShortestPortTestInterval = 240;                     // seconds
+constexpr std::int64_t kLongestPortTestInterval = 960;                      // seconds
+constexpr std::int64_t kPortTestIntervalStep = 120;                         // seconds
+constexpr std::int64_t kDefaultDnsCheckInterval = std::int64_t{24} * 3600;  // seconds
 constexpr int kUnchangedCyclesPerStep = 3;
 
 }  // namespace

@@ -224,8 +224,8 @@ void TavikClient::readRemoteAddress(PortTest& test) {
     }
 }
 
-// A server that sees another address than the router's own is behind one more NAT: the port that
-// was opened on the router cannot be reached from outside.
+// When the server sees another address than the router's own, the router itself stands behind
+// another NAT: the port it forwards cannot be reached from the internet.
 void TavikClient::lookForDoubleNat(PortTest& test) const {
     const std::string& remote = test.remote.text;
     if (!test.checkDoubleNat || remote.empty() || test.externalIp.empty()) return;

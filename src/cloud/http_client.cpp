@@ -129,7 +129,9 @@ TavikClient* TavikClient::getInstance() {
 
 bool TavikClient::initialize() {
     portMapCheckSuccess = true;
-    const bool complete = !getDeviceID().empty() && !getDeviceAuth().empty();
+    const std::string deviceId = getDeviceID();
+    const std::string deviceAuth = getDeviceAuth();
+    const bool complete = !deviceId.empty() && !deviceAuth.empty();
     if (!complete) {
         logError(
             "TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file\n");

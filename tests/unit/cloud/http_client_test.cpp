@@ -64,6 +64,14 @@ TEST_F(HttpClientTest, WithoutCredentialsTheFirstUseReportsDisabledOnce) {
     EXPECT_EQ(log.countPart("initialize() returned false, set Comm Status to [disabled]\n"), 1);
 }
 
+TEST_F(HttpClientTest, InitializingReadsBothCredentials) {
+    TavikClient& client = givenClient();
+    setConfig("DEVICEID", "");
+    setConfig("DYNAMIC_CONFIG_TMP", path("gone"));  // every read of a setting complains once
+    EXPECT_FALSE(client.initialize());
+    EXPECT_EQ(log.countPart("failed to stat TEMP dynamic config file"), 2);
+}
+
 struct BaseRow {
     const char* name;
     std::string base;

@@ -244,11 +244,4 @@ void TavikClient::ReplaceStringInPlace(std::string& subject,
     replaceAll(subject, search, replace);
 }
 
-// NOLINTNEXTLINE(performance-unnecessary-value-param): the interface takes a copy
-bool TavikClient::validateIpAddress(std::string address) const {
-    in_addr parsed{};
-    const bool isText = std::strlen(address.c_str()) == address.size();
-    return isText && inet_pton(AF_INET, address.c_str(), &parsed) != 0;
-}
-
 }  // namespace pelorus

@@ -14,6 +14,8 @@
 
 namespace pelorus {
 
+struct SleepAnswer;
+
 /// Receive area of one transfer. The block is allocated with the first chunk.
 struct CurlRcvBuffer {
     char* data = nullptr;
@@ -144,7 +146,7 @@ public:
     int checkHddStandByMode();
 
 private:
-    struct PortTest;
+    friend class PortTest;  // one call of testPort
 
     TavikClient();
     ~TavikClient();
@@ -152,16 +154,7 @@ private:
     bool deriveServerUrls();
     std::optional<Answer> fetchCentral(const MaskedUrl& url);
 
-    void applySleepAnswer(const std::string& answer);
-    void readWaitTime(const std::string& answer, std::size_t action);
-
-    int portTestObstacle(bool checkHddSleep);
-    MaskedUrl portTestUrl(const std::string& externalIp, int port, HttpType type);
-    void attemptPortTest(PortTest& test);
-    void requestPortTest(PortTest& test);
-    void readRemoteAddress(PortTest& test);
-    void lookForDoubleNat(PortTest& test) const;
-
+    void applySleepAnswer(const SleepAnswer& answer);
     MaskedUrl forwardingUrl(const std::string& externalIp,
                             const std::string& localIp,
                             int externalHttpPort,

@@ -54,7 +54,8 @@ int TavikClient::pollServerForSleepTime() {
     return serverSleepTime;
 }
 
-// An answer that is not understood leaves the wait as it is, so that the device proceeds.
+// An answer that is not understood leaves the wait as it is, which is 0 unless an earlier answer of
+// this cycle set it.
 void TavikClient::applySleepAnswer(const SleepAnswer& answer) {
     switch (answer.kind) {
         case SleepAnswer::WAIT:

@@ -15,12 +15,12 @@ public:
     VPNManager& operator=(const VPNManager&) = delete;
 
     /// Starts the client, unless it is running, and waits until its output says that the tunnel is
-    /// up; true when it is. A client that does not come up in time is stopped. Blocks for up to four
-    /// starts of 70 seconds each, plus the stops. Changes the working directory meanwhile.
+    /// up; true when it is. A client that does not come up in time is stopped. Blocks for up to
+    /// four starts of 70 seconds each, plus the stops. Changes the working directory meanwhile.
     bool openVPNConnection();
 
-    /// Stops the client: SIGTERM in the first three passes, SIGKILL in two more, 3 seconds each. True
-    /// when none is left running; a client that was signalled and is still exiting counts as
+    /// Stops the client: SIGTERM in the first three passes, SIGKILL in two more, 3 seconds each.
+    /// True when none is left running; a client that was signalled and is still exiting counts as
     /// stopped.
     bool closeVPNConnection();
 
@@ -34,8 +34,8 @@ public:
     /// The tunnel has no health check of its own: always true.
     [[nodiscard]] bool isVPNHealthy() const { return true; }
 
-    /// Reads the relay's IPv4 address from the client's output, the last one when there are several.
-    /// Pass @p ip empty: the result says only that it is not empty at the end.
+    /// Reads the relay's IPv4 address from the client's output, the last one when there are
+    /// several. Pass @p ip empty: the result says only that it is not empty at the end.
     bool fetchOpenVPN_IPAddr(std::string& ip);
 
     /// True when @p line of the pid file names a live openvpn process. @p pid becomes the trimmed

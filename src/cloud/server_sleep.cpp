@@ -54,17 +54,15 @@ int TavikClient::pollServerForSleepTime() {
     return serverSleepTime;
 }
 
-// An answer that is not understood leaves the wait as it is, which is 0 unless an earlier answer of
-// this cycle set it.
 void TavikClient::applySleepAnswer(const SleepAnswer& answer) {
+    // 0 since the cycle began: after an answer that is not understood the device proceeds.
+    serverSleepTime = answer.seconds.value_or(serverSleepTime);
     switch (answer.kind) {
         case SleepAnswer::WAIT:
-            serverSleepTime = answer.seconds;
             logInfo("TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
                     serverSleepTime);
             break;
         case SleepAnswer::PROCEED:
-            serverSleepTime = 0;
             logInfo(
                 "TavikClient::pollServerForSleepTime - central server gave permission to proceed. Sleep time is %d secs.\n",
                 serverSleepTime);

@@ -15,7 +15,8 @@ const std::string kWaitTimeTag = "<wait_time>";
 SleepAnswer readSleepAnswer(const std::string& text) {
     const std::size_t action = text.find(kWaitAction);
     if (action == std::string::npos) {
-        return {contains(text, kProceedAction) ? SleepAnswer::PROCEED : SleepAnswer::NO_ACTION};
+        if (contains(text, kProceedAction)) return {SleepAnswer::PROCEED, 0};
+        return {SleepAnswer::NO_ACTION};
     }
     const std::size_t tag = text.find(kWaitTimeTag, action);
     if (tag == std::string::npos) return {SleepAnswer::NO_TIME};

@@ -2,6 +2,7 @@
 #ifndef PELORUS_CLOUD_SLEEP_ANSWER_H
 #define PELORUS_CLOUD_SLEEP_ANSWER_H
 
+#include <optional>
 #include <string>
 
 namespace pelorus {
@@ -9,13 +10,13 @@ namespace pelorus {
 struct SleepAnswer {
     enum Kind {
         NO_ACTION,  ///< neither told to wait nor to proceed
-        PROCEED,    ///< no wait
-        WAIT,       ///< wait for @p seconds, which may be 0
-        NO_TIME,    ///< told to wait, but no time behind the action
+        PROCEED,    ///< told not to wait
+        WAIT,       ///< told to wait for a time, which may be 0
+        NO_TIME,    ///< told to wait, but no time stands behind the action
         BAD_TIME,   ///< told to wait, but the time is negative or no number that fits
     };
     Kind kind = NO_ACTION;
-    int seconds = 0;  ///< of WAIT
+    std::optional<int> seconds{};  ///< the wait; nothing when the answer does not settle it
 };
 
 /// Reads @p text, in which tags are searched, not parsed. A wait overrides a proceed.

@@ -1,4 +1,4 @@
-// The fixture of the cloud module: a configured client in front of the fake web.
+// A configured client in front of the fake web.
 #ifndef PELORUS_UNIT_CLOUD_FIXTURE_H
 #define PELORUS_UNIT_CLOUD_FIXTURE_H
 

@@ -50,7 +50,8 @@ TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
                                                  : (Urls{report.centralUrl, report.localUrl}));
         EXPECT_EQ(log.countPart("fail"), error.empty() ? 0 : 1) << log.dump();
         EXPECT_GT(log.countPart(error), 0);
-        EXPECT_GT(log.countPart("auth=*AUTH_REMOVED*"), 0);
+        EXPECT_GT(log.countPart("?id=*ID_REMOVED*&"), 0);
+        EXPECT_GT(log.countPart("&auth=*AUTH_REMOVED*"), 0);
     };
     // clang-format off
     row(kUpdate, "any device-7350142", "a success", true, "");
@@ -68,17 +69,8 @@ TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
     // clang-format on
 }
 
-TEST_F(ReportsTest, WithoutCredentialsNobodyIsToldAndExceptionsStayInside) {
+TEST_F(ReportsTest, WithoutCredentialsNobodyIsTold) {
     givenClient();
-    const auto fail = [](const std::string&) { throw std::runtime_error{"broken"}; };
-    web.answer("", FakeWeb::Answer{"", CURLE_OK, 0, fail});
-    EXPECT_FALSE(kUpdate.send());
-    EXPECT_EQ(log.countPart("** TavikClient::httpGet - Throw exception error. **\n"), 1);
-    web.answer("web.kavra.example", "Success");
-    for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
-    client().updateLocalCommStatus("relayed");
-    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1);
-    web.clear();
     for (const char* const key : {"DEVICEAUTH", "DEVICEID"}) {
         setConfig(key, "");
         for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
@@ -88,10 +80,36 @@ TEST_F(ReportsTest, WithoutCredentialsNobodyIsToldAndExceptionsStayInside) {
     EXPECT_EQ(log.countPart("failed to get Device ID from DynamicConfig"), 3);
 }
 
-TEST_F(ReportsTest, OnlyAChangeOfStatusIsSentAndAnAnswerTouchesTheConfigurationAfterThePause) {
+TEST_F(ReportsTest, ExceptionsStayInside) {
+    givenClient();
+    FakeWeb::Answer broken{""};
+    broken.action = [] { throw std::runtime_error{"broken"}; };
+    web.answer("", broken);
+    EXPECT_FALSE(kUpdate.send());
+    EXPECT_EQ(log.countPart("** TavikClient::httpGet - Throw exception error. **\n"), 1);
+    web.answer("web.kavra.example", "Success");
+    for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
+    client().updateLocalCommStatus("relayed");
+    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1);
+}
+
+TEST_F(ReportsTest, ATemplateThatAsksForTooMuchIsNamed) {
+    givenClient();
+    web.answer("web.kavra.example", "Success");
+    for (const char* const key :
+         {"LOCAL_SETFORWARDURL", "LOCAL_DELFORWARDURL", "LOCAL_SETLOCALIPURL",
+          "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"}) {
+        setConfig(key, "%n");
+        for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
+        client().updateLocalCommStatus(key);
+        EXPECT_GT(log.countPart(std::string{"URL template of "} + key + " asks for more"), 0);
+    }
+}
+
+TEST_F(ReportsTest, OnlyAChangeOfStatusIsSent) {
     givenClient();
     const auto afterPause = [this](const std::string&) {
-        EXPECT_EQ(clock.pauses().size(), web.urls().size());
+        EXPECT_EQ(clock.pauses().size(), web.urls().size()) << "touched after the pause";
     };
     commands.answer("touch", support::FakeCommands::Answer{"", 0, false, afterPause});
     web.answer("is=relayed", "success");

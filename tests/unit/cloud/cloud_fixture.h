@@ -13,6 +13,7 @@
 namespace pelorus {
 
 using support::expectLogged;
+using support::FakeCommands;
 using support::FakeWeb;
 using Urls = std::vector<std::string>;
 

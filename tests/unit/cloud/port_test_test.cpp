@@ -66,21 +66,21 @@ TEST_F(PortTestTest, ALaterAttemptMayPass) {
 }
 
 TEST_F(PortTestTest, OnlyAnotherAddressIsASecondNatAndEndsTheTestAtOnce) {
-    const auto relays = [&](const char* external, const std::string& seen, bool skip) {
+    const auto relays = [&](const char* external, const char* seen) {
         web.clear();
         web.answer("/test", "no " + remote(seen));
         externalIp = external;
-        skipDoubleNat = skip;
         EXPECT_EQ(test(), FAIL_TEST);
         EXPECT_EQ(web.count("/test"), enforceRelay ? 1 : 3);
         return enforceRelay;
     };
-    EXPECT_TRUE(relays("44.128.0.20", "44.128.0.9", false));
+    EXPECT_TRUE(relays("44.128.0.20", "44.128.0.9"));
     EXPECT_TRUE(client.lastPortTestPassed());
-    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.9", true));
-    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.20", false));
-    EXPECT_FALSE(relays("44.128.0.20", "x", false));
-    EXPECT_FALSE(relays("", "44.128.0.9", false));
+    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.20"));
+    EXPECT_FALSE(relays("44.128.0.20", "x"));
+    EXPECT_FALSE(relays("", "44.128.0.9"));
+    skipDoubleNat = true;
+    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.9"));
 }
 
 TEST_F(PortTestTest, APassTakesTheTestedAddressAndFailsForAnotherDevice) {
@@ -124,13 +124,13 @@ TEST_F(PortTestTest, ObstaclesPreventTheTest) {
 
 TEST_F(PortTestTest, ThePublicAddressIsTheBodyAsItCame) {
     int wait = 5;
-    for (const std::string body : {"44.128.0.9", "device-7350142"}) {
-        web.answerOnce("/myip", body);
-        EXPECT_EQ(client.getMyIP(externalIp, wait), body == "44.128.0.9");
-        EXPECT_EQ(externalIp, body);
-        EXPECT_EQ(wait, 0);
-    }
+    web.answerOnce("/myip", "44.128.0.9");
+    EXPECT_TRUE(client.getMyIP(externalIp, wait));
+    EXPECT_EQ(wait, 0);
+    web.answerOnce("/myip", "device-7350142\n");
     EXPECT_FALSE(client.getMyIP(externalIp, wait));
+    EXPECT_FALSE(client.getMyIP(externalIp, wait));
+    EXPECT_EQ(externalIp, "device-7350142\n");
     client.resetServerSleepTime();
     web.answer(kPoll, "<action>wait</action><wait_time>9</wait_time>");
     EXPECT_FALSE(client.getMyIP(externalIp, wait));

@@ -1,6 +1,6 @@
-// The least a libcurl program can be: gets each URL it is given, tells its number, waits to be
-// looked at. It detaches first, as the daemon does: what only the loader touched stays behind with
-// the parent and counts for neither.
+// A minimal libcurl program, as the baseline for the daemon's memory: it fetches each URL it is given,
+// prints its process id and waits to be measured. Like the daemon it forks first, so that memory
+// touched by the loader only is left with the parent and counts for neither.
 #include <curl/curl.h>
 #include <unistd.h>
 

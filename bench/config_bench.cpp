@@ -1,4 +1,4 @@
-// The settings store against the least that could do its work, on the same files.
+// The settings store against a minimal implementation, on the same files.
 #include <benchmark/benchmark.h>
 #include <sys/stat.h>
 #include <syslog.h>
@@ -23,11 +23,11 @@ using pelorus::GlobalConfig;
 using Settings = std::map<std::string, std::string>;
 
 constexpr std::size_t kKeyCount = 200;
-constexpr std::size_t kDynamicCount = 40;  // as many of them come from the dynamic file
+constexpr std::size_t kDynamicCount = 40;  // of these from the dynamic file
 constexpr std::size_t kLineSize = 300;
 
-/// Settings with names and values as long as those in a device's files; the two that steer the
-/// store stand last.
+// Settings with names and values as long as those in a device's files; the two that configure the
+// store come last.
 std::vector<std::pair<std::string, std::string>> deviceSettings(const std::string& folder) {
     static constexpr std::array<const char*, 8> kNames{
         "INTERNAL_PORT_",  "EXTERNAL_PORT_", "REMOTE_SETFORWARDURL_", "DEVICE_",
@@ -45,7 +45,7 @@ std::vector<std::pair<std::string, std::string>> deviceSettings(const std::strin
     return all;
 }
 
-/// A device's configuration in a temporary folder, loaded into the store.
+// A device's configuration in a temporary folder, loaded into the store.
 class Device {
 public:
     Device() {
@@ -67,7 +67,7 @@ public:
     Device(const Device&) = delete;
     Device& operator=(const Device&) = delete;
 
-    /// One file with all the settings.
+    // One file with all the settings.
     [[nodiscard]] std::string allKeys() const { return folder + "/all.ini"; }
 
     std::vector<std::string> keys;
@@ -116,8 +116,8 @@ void lookUpByHand(benchmark::State& state) {
     }
 }
 
-// With @p fresh every key is new to the map, as at start-up; else every value is replaced, as when
-// the dynamic file has changed.
+// With fresh set, every key is new to the map, as at start-up; otherwise every value is replaced, as
+// after a change of the dynamic file.
 void parseByStore(benchmark::State& state, bool fresh) {
     auto* config = GlobalConfig::getInstance();
     const FileHandle file = pelorus::openFile(device().allKeys(), "re");
@@ -167,7 +167,7 @@ BENCHMARK_CAPTURE(parseByHand, again, false);
 }  // namespace
 
 int main(int argc, char** argv) {
-    // The host's log is none of ours; nothing that is measured logs.
+    // Keeps the host's log clean; nothing that is measured logs.
     setlogmask(LOG_MASK(LOG_EMERG));
     benchmark::Initialize(&argc, argv);
     device();

@@ -1,13 +1,22 @@
-# The three libraries a firmware updates on its own; all linked dynamically.
-find_package(CURL REQUIRED)
+# The three libraries a firmware updates on its own; all linked dynamically. With PELORUS_HEADERS_ONLY
+# they are compiled against and not linked: the unit tests' fakes stand in for every call.
+if(PELORUS_HEADERS_ONLY)
+  find_path(CURL_INCLUDE_DIR curl/curl.h PATH_SUFFIXES x86_64-linux-gnu REQUIRED)
+  add_library(CURL::libcurl INTERFACE IMPORTED)
+  target_include_directories(CURL::libcurl SYSTEM INTERFACE ${CURL_INCLUDE_DIR})
+else()
+  find_package(CURL REQUIRED)
+endif()
 
 function(pelorus_import name header library)
   find_path(${name}_INCLUDE_DIR ${header} REQUIRED)
-  find_library(${name}_LIBRARY ${library} REQUIRED)
-  mark_as_advanced(${name}_INCLUDE_DIR ${name}_LIBRARY)
   add_library(pelorus_${name} INTERFACE)
   target_include_directories(pelorus_${name} SYSTEM INTERFACE ${${name}_INCLUDE_DIR})
-  target_link_libraries(pelorus_${name} INTERFACE ${${name}_LIBRARY})
+  mark_as_advanced(${name}_INCLUDE_DIR ${name}_LIBRARY)
+  if(NOT PELORUS_HEADERS_ONLY)
+    find_library(${name}_LIBRARY ${library} REQUIRED)
+    target_link_libraries(pelorus_${name} INTERFACE ${${name}_LIBRARY})
+  endif()
 endfunction()
 
 pelorus_import(miniupnpc miniupnpc/miniupnpc.h miniupnpc)

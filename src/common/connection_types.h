@@ -33,8 +33,8 @@ enum PortTestResult : int {
     PASS_TEST = 3,  ///< the server reached this device on the port
 };
 
-/// DEVICETYPE of a device that is itself the maker's router: it has helper scripts in place of a
-/// gateway and no count of idle minutes for its disk.
+/// DEVICETYPE of a device that is itself the maker's router: it uses helper scripts instead of a
+/// gateway and keeps no count of its disk's idle minutes.
 inline constexpr int kMakersRouter = 5;
 
 }  // namespace pelorus

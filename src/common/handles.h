@@ -1,4 +1,4 @@
-// Owners for what the C library hands out.
+// Owners of C library resources.
 #ifndef PELORUS_COMMON_HANDLES_H
 #define PELORUS_COMMON_HANDLES_H
 

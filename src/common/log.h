@@ -1,4 +1,4 @@
-// The one way to the system log.
+// Writing to the system log.
 #ifndef PELORUS_COMMON_LOG_H
 #define PELORUS_COMMON_LOG_H
 
@@ -9,7 +9,8 @@
 
 namespace pelorus {
 
-/// Size of the buffer a log line is formatted into, terminator included; the rest is cut off.
+/// Size of the buffer a log line is formatted into, terminator included; longer lines are
+/// truncated.
 inline constexpr std::size_t kLogLineSize = 1280;
 
 /// Formats one line and sends it to syslog with @p priority (LOG_ERR, LOG_INFO, ...).
@@ -26,8 +27,8 @@ void logNotice(const char* format, ...) __attribute__((format(printf, 1, 2)));
 void logInfo(const char* format, ...) __attribute__((format(printf, 1, 2)));
 void logDebug(const char* format, ...) __attribute__((format(printf, 1, 2)));
 
-/// For a module with log calls of its own: the line is cut to @p size bytes, terminator included; at
-/// most kLogLineSize.
+/// For a module that has its own log calls: the line is truncated to @p size bytes (at most
+/// kLogLineSize), terminator included.
 void vlogLine(std::size_t size, int priority, const char* format, va_list args)
     __attribute__((format(printf, 3, 0)));
 

@@ -1,4 +1,4 @@
-// What stands in the log where a secret would.
+// What the log shows in place of a secret.
 #ifndef PELORUS_COMMON_MASKS_H
 #define PELORUS_COMMON_MASKS_H
 

@@ -4,8 +4,8 @@
 
 namespace pelorus {
 
-/// Waits for @p seconds. Returns early when a signal comes, and at once when a termination signal
-/// has come already: it cannot slip in between the look and the wait.
+/// Waits for @p seconds. Returns early when a signal arrives, and immediately when a termination
+/// signal already has; a signal between that check and the wait is not missed.
 void pauseUnlessTerminated(int seconds);
 
 }  // namespace pelorus

@@ -1,4 +1,4 @@
-// Holding signals back for the length of a scope.
+// Blocking signals for the duration of a scope.
 #ifndef PELORUS_COMMON_SIGNAL_BLOCK_H
 #define PELORUS_COMMON_SIGNAL_BLOCK_H
 
@@ -9,7 +9,7 @@
 namespace pelorus {
 
 /// Blocks the given signals for the calling thread until the end of the scope; a signal that
-/// comes meanwhile is delivered then. Start no child process inside such a scope: it would
+/// arrives meanwhile is delivered then. Do not start a child process inside such a scope: it would
 /// inherit the mask.
 class SignalBlock {
 public:
@@ -18,16 +18,16 @@ public:
     SignalBlock(const SignalBlock&) = delete;
     SignalBlock& operator=(const SignalBlock&) = delete;
 
-    /// The mask that was in force before, e.g. for ppoll.
+    /// The previous mask, e.g. for ppoll.
     [[nodiscard]] const sigset_t& previousMask() const { return previous; }
 
 private:
     sigset_t previous{};
 };
 
-/// Keeps a peer that closes its connection early from ending the process with SIGPIPE: the
-/// signal is held back for the scope and taken off the queue at its end, so that the writing
-/// call just fails. For libraries that write to sockets without MSG_NOSIGNAL.
+/// Keeps SIGPIPE from ending the process when a peer closes its connection early: the signal is
+/// blocked for the scope and discarded at its end, so that the write merely fails. For libraries
+/// that write to sockets without MSG_NOSIGNAL.
 class BrokenPipeGuard {
 public:
     BrokenPipeGuard();

@@ -1,4 +1,4 @@
-// What the termination signal handler leaves for the rest of the process.
+// State set by the termination signal handler.
 #ifndef PELORUS_COMMON_TERMINATION_H
 #define PELORUS_COMMON_TERMINATION_H
 
@@ -6,15 +6,15 @@
 
 namespace pelorus {
 
-/// Value of sigConnKilled while no termination signal has come.
+/// Value of sigConnKilled while no termination signal has arrived.
 inline constexpr int kNoSignal = -1;
 
 /// Number of the termination signal that ended remote access, or kNoSignal. Written by the
-/// signal handler, raised again when everything is torn down.
+/// signal handler, raised again after everything has been torn down.
 extern std::atomic<int> sigConnKilled;
 static_assert(std::atomic<int>::is_always_lock_free, "written by a signal handler");
 
-/// True once a termination signal has come; for waits that have no bound of their own.
+/// True once a termination signal has arrived; for waits without a time limit.
 [[nodiscard]] bool terminationRequested();
 
 }  // namespace pelorus

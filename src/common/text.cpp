@@ -42,8 +42,8 @@ bool scanUnsigned(const char* text, unsigned& value) {
     errno = 0;
     const long long number = std::strtoll(text, &end, 10);
     if (end == text || errno == ERANGE) return false;
-    constexpr auto kMost = static_cast<long long>(std::numeric_limits<unsigned>::max());
-    if (number < -kMost || number > kMost) return false;
+    constexpr auto kMax = static_cast<long long>(std::numeric_limits<unsigned>::max());
+    if (number < -kMax || number > kMax) return false;
     value = static_cast<unsigned>(number);
     return true;
 }

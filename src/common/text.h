@@ -1,4 +1,4 @@
-// Small text operations without a home of their own.
+// Small text helpers.
 #ifndef PELORUS_COMMON_TEXT_H
 #define PELORUS_COMMON_TEXT_H
 
@@ -7,7 +7,7 @@
 
 namespace pelorus {
 
-/// True when @p text holds @p part anywhere (case-sensitive).
+/// True when @p part occurs anywhere in @p text (case-sensitive).
 [[nodiscard]] bool contains(const std::string& text, const std::string& part);
 
 /// Replaces every occurrence of @p search in @p subject by @p replace, from left to right;

@@ -16,8 +16,9 @@ bool sameLetter(unsigned char left, unsigned char right) {
     return std::tolower(left) == std::tolower(right);
 }
 
-// A secret is part of host names, which come back from DNS in any case. A file with CRLF line
-// ends gives it a carriage return that nobody repeats.
+// Upper and lower case are the same: secrets are part of host names, and DNS changes their case. A
+// configuration file with CRLF line ends leaves a carriage return behind a secret, which no answer
+// repeats.
 void hide(std::string& text, std::string secret, const std::string& mask) {
     while (!secret.empty() && secret.back() == '\r') secret.pop_back();
     if (secret.empty()) return;
@@ -40,7 +41,7 @@ std::string scrubSecrets(std::string text) {
         {config->knownProperty("DEVICEAUTH"), STRIPPED_DEVAUTH_VAL},
         {config->knownProperty("SUBDOMAIN"), STRIPPED_SUBDOMAIN_VAL},
     }};
-    // The longest first: a secret that holds another one would otherwise leave its rest behind.
+    // Longest first: a secret that contains another one would otherwise be masked only in part.
     std::stable_sort(secrets.begin(), secrets.end(), [](const auto& left, const auto& right) {
         return left.first.size() > right.first.size();
     });

@@ -11,11 +11,11 @@ namespace pelorus {
 
 namespace {
 
-constexpr int kLeastFrequency = 30;  // seconds
-constexpr int kMostFrequency = 900;  // seconds
-constexpr int kMostSeverity = 7;     // LOG_DEBUG
+constexpr int kMinFrequency = 30;   // seconds
+constexpr int kMaxFrequency = 900;  // seconds
+constexpr int kMaxSeverity = 7;     // LOG_DEBUG
 
-// The readers of the options' values. A null value means that the option came last.
+// One reader per option. A null value means that the option was the last argument.
 
 void readFrequency(const char* value, Options& options) {
     int seconds = 0;
@@ -23,11 +23,11 @@ void readFrequency(const char* value, Options& options) {
     if (value == nullptr) {
         std::fprintf(stderr, "Run frequency is missing. A default of %d secs will be used.\n",
                      Options::kDefaultFrequency);
-    } else if (!scanInt(value, seconds) || seconds < kLeastFrequency || seconds > kMostFrequency) {
+    } else if (!scanInt(value, seconds) || seconds < kMinFrequency || seconds > kMaxFrequency) {
         std::fprintf(
             stderr,
             "Run frequency is %s. It must be between %d and %d seconds. A default of %d secs will be used.\n",
-            value, kLeastFrequency, kMostFrequency, Options::kDefaultFrequency);
+            value, kMinFrequency, kMaxFrequency, Options::kDefaultFrequency);
     } else {
         options.frequency = seconds;
     }
@@ -39,7 +39,7 @@ void readSeverity(const char* value, Options& options) {
     if (value == nullptr) {
         std::fprintf(stderr, "Severity level is missing. A default of %d will be used.\n",
                      Options::kDefaultSeverity);
-    } else if (!scanInt(value, severity) || severity < 0 || severity > kMostSeverity) {
+    } else if (!scanInt(value, severity) || severity < 0 || severity > kMaxSeverity) {
         std::fprintf(stderr, "Invalid syslog severity %s. Default %d shall be used.\n", value,
                      Options::kDefaultSeverity);
     } else {
@@ -126,8 +126,8 @@ const Option* findOption(const char* name) {
     return nullptr;
 }
 
-// Answers an argument that is no option of the daemon; returns the exit status.
-int answerOther(const char* argument) {
+// Handles -v and unknown arguments; returns the exit status.
+int handleOther(const char* argument) {
     if (std::strcmp(argument, "-v") == 0) {
         std::printf("Version: %s\n", GetPelorusVersion());
         return 0;
@@ -144,7 +144,7 @@ int answerOther(const char* argument) {
 std::optional<int> parseCommandLine(int argc, const char* const* argv, Options& options) {
     for (int index = 1; index < argc; ++index) {
         const Option* option = findOption(argv[index]);
-        if (option == nullptr) return answerOther(argv[index]);
+        if (option == nullptr) return handleOther(argv[index]);
         const char* value = nullptr;
         if (option->takesValue && index + 1 < argc) value = argv[++index];
         option->read(value, options);

@@ -7,7 +7,7 @@
 
 namespace pelorus {
 
-/// What the command line asks for. Durations in seconds.
+/// The parsed command line. Durations are in seconds.
 struct Options {
     static constexpr int kDefaultFrequency = 30;
     static constexpr int kDefaultSeverity = 5;
@@ -16,7 +16,7 @@ struct Options {
     int frequency = kDefaultFrequency;  ///< time between cycles, 30 to 900
     int severity = kDefaultSeverity;    ///< highest syslog priority that is logged, 0 to 7
     std::int64_t dnsCheckInterval = kDefaultDnsCheckInterval;
-    std::optional<unsigned> portMapLifetime;   ///< lease to ask for; unset: the built-in ones
+    std::optional<unsigned> portMapLifetime;   ///< requested lease; unset: the built-in ones
     std::optional<int> publicIpCheckInterval;  ///< unset: the built-in one
     bool log = false;
     bool logToConsole = false;

@@ -18,13 +18,13 @@ namespace pelorus {
 
 namespace {
 
-constexpr int kLeastSleepTime = 30;  // seconds
-constexpr int kMostSleepTime = 900;  // seconds
+constexpr int kMinSleepTime = 30;   // seconds
+constexpr int kMaxSleepTime = 900;  // seconds
 
 }  // namespace
 
 DaemonControl* DaemonControl::getInstance() {
-    // Initialised at compile time: a signal handler may be the first to ask for it.
+    // Constant-initialised: the signal handler may be the first caller.
     static DaemonControl instance;
     return &instance;
 }
@@ -32,7 +32,7 @@ DaemonControl* DaemonControl::getInstance() {
 void DaemonControl::run() {
     lastConnectionType = NONE;
     startClean();
-    // With both switches off this spins; the operations that set them never leave it so.
+    // Would spin with both flags false, a state that no public operation leaves behind.
     while (remoteAccessEnabled || !stopRequested) {
         if (remoteAccessEnabled) runCycle();
     }
@@ -80,13 +80,12 @@ void DaemonControl::shutDown() {
     ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
     ConnectionManager::getInstance()->killConnection(RELAYED);
     logInfo("DaemonControl::run - Remote access disabled.\n");
-    // sigTrap gave the signal its default action back, so whoever waits for this process sees
-    // that it ended by that signal.
+    // sigTrap has restored the default action, so the parent process sees that the signal ended us.
     if (terminationRequested()) static_cast<void>(kill(getpid(), sigConnKilled));
 }
 
 void DaemonControl::setSleepTime(int seconds) {
-    sleepTime = std::clamp(seconds, kLeastSleepTime, kMostSleepTime);
+    sleepTime = std::clamp(seconds, kMinSleepTime, kMaxSleepTime);
 }
 
 void DaemonControl::enableRemoteAccess() {

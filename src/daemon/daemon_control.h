@@ -8,22 +8,22 @@
 
 namespace pelorus {
 
-/// Owns the main loop and the switch that ends it.
+/// Owns the main loop and the flags that end it.
 class DaemonControl {
 public:
     static DaemonControl* getInstance();
     DaemonControl(const DaemonControl&) = delete;
     DaemonControl& operator=(const DaemonControl&) = delete;
 
-    /// Runs cycles while remote access is enabled, then reports "disabled", tears both kinds of
-    /// connection down and ends the process with the termination signal that came. Returns only
-    /// when none did.
+    /// Runs cycles while remote access is enabled, then reports "disabled", tears down both kinds of
+    /// connection and ends the process by the termination signal that arrived. Returns only when
+    /// none did.
     void run();
 
-    /// Own period between cycles, seconds; kept within 30 to 900.
+    /// Period between cycles in seconds, clamped to 30 to 900. The server may ask for a longer one.
     void setSleepTime(int seconds);
 
-    /// The switch. Both may be called by a signal handler.
+    /// Safe to call from a signal handler, as is disableRemoteAccess.
     void enableRemoteAccess();
     void disableRemoteAccess();
     /// Does nothing: disabling remote access is what ends the loop.

@@ -12,7 +12,7 @@ namespace pelorus {
 
 namespace {
 
-void leaveBySignal(int sig) {
+void requestTermination(int sig) {
     DaemonControl::getInstance()->disableRemoteAccess();
     DaemonControl::getInstance()->stop();
     static_cast<void>(std::signal(sig, SIG_DFL));
@@ -24,15 +24,15 @@ void handle(int sig) {
     switch (sig) {
         case SIGINT:
             logError("sigTrap - Received SIGINT signal.\n");
-            leaveBySignal(sig);
+            requestTermination(sig);
             break;
         case SIGQUIT:
             logError("sigTrap - Received SIGQUIT signal.\n");
-            leaveBySignal(sig);
+            requestTermination(sig);
             break;
         case SIGTERM:
             logError("sigTrap - Received SIGTERM signal.\n");
-            leaveBySignal(sig);
+            requestTermination(sig);
             break;
         case _SIGENABLEREMOTEACCESS:
             DaemonControl::getInstance()->enableRemoteAccess();

@@ -47,14 +47,14 @@ Options readCommandLine(int argc, char** argv) {
 // Without a log option the defaults of the C library stay in force.
 void openLog(const Options& options) {
     if (!options.log && !options.logToConsole) return;
-    // Both take the lock that the signal handler's own lines need.
+    // Both take the lock that the signal handler needs for its own lines.
     const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
     setlogmask((1 << (options.severity + 1)) - 1);
     openlog("Pelorus", options.logToConsole ? LOG_CONS : 0, LOG_LOCAL0);
     logLine(LOG_ALERT, "main - syslog severity level set to %d.\n", options.severity);
 }
 
-// Goes on in the child; returns its session id.
+// Returns in the child only, with its session id.
 pid_t becomeDaemon() {
     const pid_t child = fork();
     if (child < 0) std::exit(EXIT_FAILURE);
@@ -71,8 +71,8 @@ void logBanner(pid_t session) {
               GetPelorusVersion(), getpid(), session);
 }
 
-// The folder is everybody's: a link planted there must not redirect the write, nor a FIFO hold
-// the start until somebody reads it.
+// /tmp is world-writable: a symbolic link planted there must not redirect the write, and a FIFO must
+// not block start-up.
 void writePidFile() {
     const int file = open(
         kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPidFileMode);
@@ -90,18 +90,18 @@ bool loadConfiguration() {
     return false;
 }
 
-// A start that leaves remote access off runs no cycle: the main loop only tears down.
+// With remote access off no cycle runs: the main loop only tears down.
 void switchRemoteAccess(const Options& options) {
     if (!options.unmapAll && setting("ENABLEREMOTEACCESS") == "1") {
         DaemonControl::getInstance()->enableRemoteAccess();
-        // A signal that came before must not be undone; one that comes later disables by itself.
+        // Must not undo a termination signal that came first; a later one disables again by itself.
         if (terminationRequested()) DaemonControl::getInstance()->disableRemoteAccess();
     } else {
         DaemonControl::getInstance()->disableRemoteAccess();
     }
 }
 
-void handOver(const Options& options) {
+void applyTunables(const Options& options) {
     DaemonControl::getInstance()->setSleepTime(options.frequency);
     ConnectionManager::getInstance()->setDNSCheckInterval(options.dnsCheckInterval);
     if (options.portMapLifetime) {
@@ -131,7 +131,7 @@ void runPelorus(int argc, char** argv) {
     writePidFile();
     if (!loadConfiguration()) endProcess(EXIT_FAILURE);
     switchRemoteAccess(options);
-    handOver(options);
+    applyTunables(options);
     DaemonControl::getInstance()->run();
     endProcess(EXIT_SUCCESS);
 }

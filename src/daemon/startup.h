@@ -1,10 +1,10 @@
-// From the command line to the main loop.
+// The life of the daemon process.
 #ifndef PELORUS_DAEMON_STARTUP_H
 #define PELORUS_DAEMON_STARTUP_H
 
 namespace pelorus {
 
-/// The whole life of the process: start-up, main loop, end. Ends the process itself.
+/// Runs the daemon: start-up, main loop, exit.
 [[noreturn]] void runPelorus(int argc, char** argv);
 
 }  // namespace pelorus

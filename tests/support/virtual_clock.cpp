@@ -37,9 +37,9 @@ void VirtualClock::duringPause(int number, Action action) {
     actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
 }
 
-bool VirtualClock::wait(long waitMicros, const sigset_t* mask) {
+bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
     constexpr std::size_t kMostPauses = 100'000;
-    asked.push_back(waitMicros / kMicrosPerSecond);
+    asked.push_back(static_cast<long>(waitMicros / kMicrosPerSecond));
     if (asked.size() > kMostPauses) {
         std::fputs("virtual clock: the code under test pauses for ever\n", stderr);
         std::abort();
@@ -72,13 +72,13 @@ int __wrap_gettimeofday(timeval* result, void* /*zone*/) {
 unsigned __wrap_sleep(unsigned seconds) {
     // A thread of the test tool itself; the daemon has one thread.
     if (gettid() != getpid()) return __real_sleep(seconds);
-    VirtualClock::get().wait(seconds * 1'000'000L, nullptr);
+    VirtualClock::get().wait(std::int64_t{seconds} * 1'000'000, nullptr);
     return 0;
 }
 
 int __wrap_ppoll(pollfd* /*fds*/, nfds_t count, const timespec* timeout, const sigset_t* mask) {
     EXPECT_EQ(count, 0U) << "only a pause without descriptors is known here";
-    const long micros = timeout->tv_sec * 1'000'000 + timeout->tv_nsec / 1000;
+    const std::int64_t micros = std::int64_t{timeout->tv_sec} * 1'000'000 + timeout->tv_nsec / 1000;
     if (!VirtualClock::get().wait(micros, mask)) return 0;
     errno = EINTR;
     return -1;

@@ -6,6 +6,7 @@
 #include <sys/time.h>
 
 #include <csignal>
+#include <cstdint>
 #include <ctime>
 #include <functional>
 #include <map>
@@ -37,14 +38,16 @@ public:
     void reset() { *this = VirtualClock{}; }
 
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
-    bool wait(long waitMicros, const sigset_t* mask);
-    [[nodiscard]] timeval timeOfDay() const { return {now(), micros % kMicrosPerSecond}; }
+    bool wait(std::int64_t waitMicros, const sigset_t* mask);
+    [[nodiscard]] timeval timeOfDay() const {
+        return {now(), static_cast<suseconds_t>(micros % kMicrosPerSecond)};
+    }
 
 private:
-    static constexpr long kMicrosPerSecond = 1'000'000;
+    static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
     VirtualClock() = default;
 
-    long micros = kStart * kMicrosPerSecond;
+    std::int64_t micros = kStart * kMicrosPerSecond;
     std::vector<long> asked;
     std::map<std::size_t, Action> actions;
 };

@@ -1,0 +1,4 @@
+# Toolchain: 32-bit code from the machine's own g++ (package g++-multilib). No 32-bit library is needed
+# besides libc and libstdc++: the unit tests take libcurl, miniupnpc and libnatpmp as headers only.
+set(CMAKE_C_FLAGS_INIT -m32)
+set(CMAKE_CXX_FLAGS_INIT -m32)

@@ -1,8 +1,8 @@
 # pelorus_module(NAME SOURCES a.cpp ... [DEPENDS module ...] [LINKS library ...])
 #
 # Each folder in src/ is a static library. Its headers are reachable only through a folder of their
-# own in the build tree (modules/NAME/NAME -> src/NAME), so that #include "NAME/x.h" compiles only in
-# modules that depend on NAME, directly or indirectly: an include against the direction of the
+# own in the build tree (modules/NAME/NAME -> src/NAME), so that #include "NAME/x.h" compiles only
+# in modules that depend on NAME, directly or indirectly: an include against the direction of the
 # dependencies is a build error, not a matter of review.
 function(pelorus_module name)
   cmake_parse_arguments(MODULE "" "" "SOURCES;DEPENDS;LINKS" ${ARGN})

@@ -18,18 +18,18 @@ void replaceAll(std::string& subject, const std::string& search, const std::stri
     }
 }
 
-bool scanLong(const char* text, long& value) {
+bool scanInt64(const char* text, std::int64_t& value) {
     char* end = nullptr;
     errno = 0;
-    const long number = std::strtol(text, &end, 10);
+    const long long number = std::strtoll(text, &end, 10);
     if (end == text || errno == ERANGE) return false;
     value = number;
     return true;
 }
 
 bool scanInt(const char* text, int& value) {
-    long number = 0;
-    if (!scanLong(text, number)) return false;
+    std::int64_t number = 0;
+    if (!scanInt64(text, number)) return false;
     if (number < std::numeric_limits<int>::min() || number > std::numeric_limits<int>::max()) {
         return false;
     }

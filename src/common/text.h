@@ -2,6 +2,7 @@
 #ifndef PELORUS_COMMON_TEXT_H
 #define PELORUS_COMMON_TEXT_H
 
+#include <cstdint>
 #include <string>
 
 namespace pelorus {
@@ -15,10 +16,10 @@ void replaceAll(std::string& subject, const std::string& search, const std::stri
 
 /// Reads the number at the start of @p text as scanf("%d") does: leading white space is skipped,
 /// what follows the digits is ignored. False, and @p value untouched, when there is no number or
-/// it does not fit. The same for scanLong ("%ld") and scanUnsigned ("%u", which accepts a minus
+/// it does not fit. The same for scanInt64 ("%jd") and scanUnsigned ("%u", which accepts a minus
 /// sign and wraps).
 [[nodiscard]] bool scanInt(const char* text, int& value);
-[[nodiscard]] bool scanLong(const char* text, long& value);
+[[nodiscard]] bool scanInt64(const char* text, std::int64_t& value);
 [[nodiscard]] bool scanUnsigned(const char* text, unsigned& value);
 
 /// The number at the start of @p text, or 0, as atoi gives it.

@@ -62,15 +62,15 @@ void readUnmapAll(const char* /*value*/, Options& options) {
 }
 
 void readDnsCheckInterval(const char* value, Options& options) {
-    long seconds = 0;
+    std::int64_t seconds = 0;
     options.dnsCheckInterval = Options::kDefaultDnsCheckInterval;
     if (value == nullptr) {
-        std::fprintf(stderr, "DNS check interval is missing. A default of %ld secs will be used.\n",
+        std::fprintf(stderr, "DNS check interval is missing. A default of %jd secs will be used.\n",
                      Options::kDefaultDnsCheckInterval);
-    } else if (!scanLong(value, seconds) || seconds <= 0) {
+    } else if (!scanInt64(value, seconds) || seconds <= 0) {
         std::fprintf(
             stderr,
-            "DNS check interval is %s which is not valid.  A default of %ld secs will be used.\n",
+            "DNS check interval is %s which is not valid.  A default of %jd secs will be used.\n",
             value, Options::kDefaultDnsCheckInterval);
     } else {
         options.dnsCheckInterval = seconds;

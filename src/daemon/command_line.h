@@ -2,6 +2,7 @@
 #ifndef PELORUS_DAEMON_COMMAND_LINE_H
 #define PELORUS_DAEMON_COMMAND_LINE_H
 
+#include <cstdint>
 #include <optional>
 
 namespace pelorus {
@@ -10,11 +11,11 @@ namespace pelorus {
 struct Options {
     static constexpr int kDefaultFrequency = 30;
     static constexpr int kDefaultSeverity = 5;
-    static constexpr long kDefaultDnsCheckInterval = 86400;
+    static constexpr std::int64_t kDefaultDnsCheckInterval = 86400;
 
     int frequency = kDefaultFrequency;  ///< time between cycles, 30 to 900
     int severity = kDefaultSeverity;    ///< highest syslog priority that is logged, 0 to 7
-    long dnsCheckInterval = kDefaultDnsCheckInterval;
+    std::int64_t dnsCheckInterval = kDefaultDnsCheckInterval;
     std::optional<unsigned> portMapLifetime;   ///< lease to ask for; unset: the built-in ones
     std::optional<int> publicIpCheckInterval;  ///< unset: the built-in one
     bool log = false;

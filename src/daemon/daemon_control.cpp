@@ -51,7 +51,7 @@ void DaemonControl::startClean() {
         ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
         VPNManager::getInstance()->cleanupVPNConnection();
     }
-    logInfo("DaemonControl::run - nslookup check interval %ld\n",
+    logInfo("DaemonControl::run - nslookup check interval %jd\n",
             ConnectionManager::getInstance()->getDNSCheckInterval());
     unsigned upnp = 0;
     unsigned natpmp = 0;

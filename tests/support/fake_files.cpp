@@ -1,6 +1,9 @@
 #include "support/fake_files.h"
 
+#include <gtest/gtest.h>
+
 #include <cerrno>
+#include <cstring>
 
 // NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
@@ -10,6 +13,16 @@ std::FILE* __wrap_fopen(const char* path, const char* mode);
 // NOLINTEND(bugprone-reserved-identifier)
 
 namespace pelorus::support {
+
+namespace {
+
+// googletest and the fuzzer open files of their own.
+bool isOfTheRunner(const char* path) {
+    return testing::UnitTest::GetInstance()->current_test_info() == nullptr ||
+           std::strstr(path, "gtest_captured_stream") != nullptr;
+}
+
+}  // namespace
 
 FakeFiles::FakeFiles() {
     reset();
@@ -29,6 +42,8 @@ void FakeFiles::reset() {
 }
 
 std::FILE* FakeFiles::open(const char* path, const char* mode) {
+    EXPECT_TRUE(isOfTheRunner(path) || std::strchr(mode, 'e') != nullptr)
+        << path << " is inherited by children";
     const auto found = targets.find(path);
     if (found == targets.end()) return __real_fopen(path, mode);
     if (!found->second.empty()) return __real_fopen(found->second.c_str(), mode);

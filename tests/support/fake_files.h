@@ -1,5 +1,6 @@
 // Fixed paths of a test: fopen of a path that is the same on every machine ends in a file of the
-// test. All other paths are opened as they are.
+// test. All other paths are opened as they are. A file that is not opened close-on-exec fails the
+// test.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 

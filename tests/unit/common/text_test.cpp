@@ -24,7 +24,7 @@ struct ScanRow {
     const char* name;
     const char* text;
     std::optional<int> asInt{};
-    std::optional<long> asLong{};
+    std::optional<std::int64_t> asInt64{};
     std::optional<unsigned> asUnsigned{};
 };
 
@@ -34,13 +34,13 @@ class Scan : public ::testing::TestWithParam<ScanRow> {};
 TEST_P(Scan, ReadsLikeScanf) {
     const ScanRow& row = GetParam();
     int asInt = 77;
-    long asLong = 77;
+    std::int64_t asInt64 = 77;
     unsigned asUnsigned = 77;
     EXPECT_EQ(scanInt(row.text, asInt), row.asInt.has_value());
-    EXPECT_EQ(scanLong(row.text, asLong), row.asLong.has_value());
+    EXPECT_EQ(scanInt64(row.text, asInt64), row.asInt64.has_value());
     EXPECT_EQ(scanUnsigned(row.text, asUnsigned), row.asUnsigned.has_value());
     EXPECT_EQ(asInt, row.asInt.value_or(77));
-    EXPECT_EQ(asLong, row.asLong.value_or(77));
+    EXPECT_EQ(asInt64, row.asInt64.value_or(77));
     EXPECT_EQ(asUnsigned, row.asUnsigned.value_or(77));
     EXPECT_EQ(leadingInt(row.text), row.asInt.value_or(0));
 }
@@ -54,10 +54,10 @@ INSTANTIATE_TEST_SUITE_P(
                       ScanRow{"AMinusSignWraps", "-1", -1, -1, 4294967295U},
                       ScanRow{"Nothing", ""},
                       ScanRow{"LettersFirst", "x80"},
-                      ScanRow{"TooLargeForInt", "2147483648", std::nullopt, 2147483648L,
+                      ScanRow{"TooLargeForInt", "2147483648", std::nullopt, 2147483648,
                               2147483648U},
-                      ScanRow{"TooLargeForUnsigned", "4294967296", std::nullopt, 4294967296L},
-                      ScanRow{"TooLargeForLong", "9223372036854775808"}),
+                      ScanRow{"TooLargeForUnsigned", "4294967296", std::nullopt, 4294967296},
+                      ScanRow{"TooLargeForInt64", "9223372036854775808"}),
     RowName{});
 
 }  // namespace

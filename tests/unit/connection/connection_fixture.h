@@ -23,6 +23,7 @@
 namespace pelorus {
 
 using support::expectLogged;
+using support::expectLoggedInOrder;
 using support::FakeGateway;
 using support::FakeWeb;
 using support::RowName;

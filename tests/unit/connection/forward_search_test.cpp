@@ -62,7 +62,7 @@ TEST_F(ForwardSearchTest, SkippedTestRemovesTheMappingAndIsNoMarkAgainstThePort)
     diskIsAsleep();
     EXPECT_EQ(search(), 0);
     EXPECT_TRUE(mappedPorts().empty());
-    support::expectLoggedInOrder(
+    expectLoggedInOrder(
         {"ConnectionManager::forwardPort - HTTP port mapped 9091 but SKIPPED port test\n",
          "ConnectionManager::forwardPort - Port test failed, trying next port in range.\n",
          "ConnectionManager::forwardPort - Skipped port test, unmapped HTTP port 9091, leaving forwardPort()\n"});

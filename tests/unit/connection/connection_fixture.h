@@ -23,6 +23,7 @@
 namespace pelorus {
 
 using support::expectLogged;
+using support::expectLoggedInOrder;
 using support::FakeGateway;
 using support::FakeWeb;
 using support::RowName;
@@ -46,10 +47,9 @@ protected:
         web.reset();
         gateway.reset();
         files.reset();
-        web.answer("/setstatus", "success");
-        web.answer("/setforward", "success");
-        web.answer("/delforward", "success");
-        web.answer("/setlanip", "success");
+        for (const char* part : {"/setstatus", "/setforward", "/delforward", "/setlanip"}) {
+            web.answer(part, "success");
+        }
         web.answer("/remote_access_status/", "<action>proceed</action>");
         web.answer("/forward?", "Success");
         web.answer("/lanip?", "Success");
@@ -109,6 +109,13 @@ protected:
         writeFile("client.pid", std::to_string(client) + "\n");
     }
     void clientCannotBeStopped() { commands.answer("kill -", "", 1); }
+    /// The device is the maker's router; an empty @p wan: without a connection.
+    void givenMakersRouter(const std::string& wan, const std::string& list) {
+        setConfig("DEVICETYPE", "5");
+        commands.answer("getip.sh wan", wan);
+        commands.answer("getip.sh lan", "192.168.77.1\n");
+        commands.answer("tavik_helper.sh list", list);
+    }
     void askToWait() {
         web.answer("/remote_access_status/", "<action>wait</action><wait_time>300</wait_time>");
     }

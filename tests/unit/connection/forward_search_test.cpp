@@ -62,7 +62,7 @@ TEST_F(ForwardSearchTest, SkippedTestRemovesTheMappingAndIsNoMarkAgainstThePort)
     diskIsAsleep();
     EXPECT_EQ(search(), 0);
     EXPECT_TRUE(mappedPorts().empty());
-    support::expectLoggedInOrder(
+    expectLoggedInOrder(
         {"ConnectionManager::forwardPort - HTTP port mapped 9091 but SKIPPED port test\n",
          "ConnectionManager::forwardPort - Port test failed, trying next port in range.\n",
          "ConnectionManager::forwardPort - Skipped port test, unmapped HTTP port 9091, leaving forwardPort()\n"});
@@ -128,13 +128,10 @@ class PredefinedPortsTest : public ForwardSearchTest,
                             public testing::WithParamInterface<Predefined> {};
 
 TEST_P(PredefinedPortsTest, OfTheMakersRouterComeFirst) {
-    setConfig("DEVICETYPE", "5");
-    commands.answer("getip.sh lan", "192.168.77.1\n");
-    commands.answer("getip.sh wan", "44.128.0.20\n");
-    commands.answer("tavik_helper.sh list",
-                    "OTHER,TCP,6000-6001,192.168.77.1,8888,other\n"
-                    "OTHER,TCP,7000-7001,192.168.77.1,8080,web\n"
-                    "OTHER,TCP,7443,192.168.77.1,8443,web\n");
+    givenMakersRouter("44.128.0.20\n",
+                      "OTHER,TCP,6000-6001,192.168.77.1,8888,other\n"
+                      "OTHER,TCP,7000-7001,192.168.77.1,8080,web\n"
+                      "OTHER,TCP,7443,192.168.77.1,8443,web\n");
     web.answer("/test?", GetParam().testAnswer);
     if (GetParam().testAnswer == kPassed) failTest(7000);
     EXPECT_EQ(search(GetParam().type), GetParam().wanted);

@@ -21,7 +21,8 @@ std::map<std::string, std::string> Status2LogType;
 const std::array<const char*, 5> ConnType2LogType{"disabled", "portforwarded", "relayed",
                                                   "disabled", "disabled"};
 
-// Construction only fills the tables, so it stands with them.
+// Only fills the tables, so it stands with them. A failure has no type of its own: sendAnalytics
+// takes that of the connection that failed.
 TavikClient::TavikClient() {
     Status2LogState["disabled"] = "connecting";
     Status2LogState["connecting"] = "connecting";
@@ -48,6 +49,7 @@ constexpr const char* kLocalSuccess = "success";
 constexpr const char* kCentralSuccess = "Success";
 
 constexpr unsigned kLocalUpdatePause = 1;  // seconds the local back end is given to write
+// A new time stamp makes GlobalConfig read what the back end has written.
 constexpr const char* kTouchDynamicConfig = "touch /tmp/dynamicconfig.ini";
 
 constexpr const char* kDiskStateCommand = "hdparm -C /dev/sda";
@@ -56,7 +58,7 @@ constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 constexpr int kMostIdleMinutes = 1;
 constexpr std::size_t kShortLineSize = 80;  // bytes, terminator included
 
-// Of the event log's library.
+// Values of the event log library.
 constexpr int kEventLevel = 3;
 constexpr int kTextValue = 3;
 

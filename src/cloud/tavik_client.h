@@ -168,7 +168,7 @@ private:
     std::string baseServerUrl;
     std::string baseSSLServerUrl;
     std::string lastLocalCommStatus;
-    int lastConnectionSubType = 0;
+    int lastConnectionSubType = 0;  // of the last analytics event; not read yet
     CurlRcvBuffer rcvBuffer;
     bool portMapCheckSuccess = false;
 };

@@ -108,25 +108,20 @@ TEST_F(ConfigTest, ACopyIsMadeForAllProgramsAndReadWhenItChanges) {
 }
 
 TEST_F(ConfigTest, AnIncompleteCopyIsRemoved) {
+    const std::string line =
+        "GlobalConfig::loadConfig() - failed to write temporary dynamic config file: " + copy;
     for (const std::size_t size : {100U, 10'000U}) {
         const std::string file = writeConfig(std::string(size, 'x') + "\nLAST=1\n");
         limitFiles(50);
         EXPECT_FALSE(config.loadConfig(file));
         limitFiles(RLIM_INFINITY);
-        EXPECT_EQ(lastLine(),
-                  (LogLine{LOG_ERR,
-                           "GlobalConfig::loadConfig() - failed to write temporary dynamic config "
-                           "file: " +
-                               copy + "\n"}));
+        EXPECT_EQ(lastLine(), (LogLine{LOG_ERR, line + "\n"}));
         EXPECT_FALSE(fs::exists(copy));
     }
-}
-
-TEST_F(ConfigTest, ACopyThatVanishesAtOnceIsAFailure) {
-    log.onLine([&](const LogLine& line) {
-        if (line.text == "Re-opening TEMP dynamic config file.\n") fs::remove(copy);
+    log.onLine([&](const LogLine& last) {
+        if (last.text == "Re-opening TEMP dynamic config file.\n") fs::remove(copy);
     });
-    EXPECT_FALSE(config.loadConfig(writeConfig("KEY=v\n")));
+    EXPECT_FALSE(config.refresh()) << "nor is there one to read";
 }
 
 TEST_F(ConfigTest, AStoreThatLostItsSettingsLoadsThemAgain) {
@@ -143,59 +138,39 @@ TEST_F(ConfigTest, AStoreThatLostItsSettingsLoadsThemAgain) {
     }
 }
 
-struct FailureRow {
-    const char* name;
-    const char* staticText;  // null: no static file
-    const char* line;
-};
-
-class ConfigFailure : public ConfigTest, public ::testing::WithParamInterface<FailureRow> {};
-
-TEST_P(ConfigFailure, IsLoggedAndReturned) {
+TEST_F(ConfigTest, AFileThatIsMissingIsNamedInTheLog) {
     fs::current_path(folder);
     writeFile("dynamicconfig.ini", "KEY=v\n");
-    if (GetParam().staticText != nullptr) writeFile("static.ini", GetParam().staticText);
     EXPECT_FALSE(config.loadConfig("static.ini"));
-    EXPECT_EQ(lastLine(), (LogLine{LOG_ERR, GetParam().line}));
+    const std::vector<std::pair<const char*, const char*>> rows{
+        {"nothing\nhere\n",
+         "GlobalConfig::loadConfigSettings() - failed to open config file: [static.ini].\n"},
+        {"DYNAMIC_CONFIG=gone\n",
+         "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [gone/dynamicconfig.ini].\n"},
+        {"DYNAMIC_CONFIG_TMP=copy.ini\n",
+         "GlobalConfig::loadConfig() - failed to open dynamic config settings file: gone/dynamicconfig.ini\n"},
+        {"DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=gone/copy.ini\n",
+         "GlobalConfig::loadConfig() - failed to create temporary dynamic config file: gone/copy.ini\n"}};
+    for (const auto& [text, line] : rows) {
+        writeFile("static.ini", text);
+        EXPECT_FALSE(config.refresh());
+        EXPECT_EQ(lastLine(), (LogLine{LOG_ERR, line}));
+    }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Rows,
-    ConfigFailure,
-    ::testing::Values(
-        FailureRow{"NoStaticFile", nullptr,
-                   "GlobalConfig::loadConfig() - failed to open config file: [static.ini].\n"},
-        FailureRow{
-            "AStaticFileWithoutASetting", "nothing\nhere\n",
-            "GlobalConfig::loadConfigSettings() - failed to open config file: [static.ini].\n"},
-        FailureRow{
-            "NoDynamicFile", "DYNAMIC_CONFIG=gone\n",
-            "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [gone/dynamicconfig.ini].\n"},
-        FailureRow{
-            "NoDynamicFileToCopy", "DYNAMIC_CONFIG=gone\nDYNAMIC_CONFIG_TMP=copy.ini\n",
-            "GlobalConfig::loadConfig() - failed to open dynamic config settings file: gone/dynamicconfig.ini\n"},
-        FailureRow{
-            "NoPlaceForTheCopy", "DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=gone/copy.ini\n",
-            "GlobalConfig::loadConfig() - failed to create temporary dynamic config file: gone/copy.ini\n"}),
-    RowName{});
 
 // Runs the real shell and the real sed: no character of a value means anything to either.
 TEST_F(ConfigTest, AWriteThroughTakesValuesAsTheyAre) {
-    const std::string odd = "it's $(touch hurt)";  // the path is quoted as well
-    fs::create_directory(path(odd));
-    writeFile("dynamicconfig.ini", "");
+    const std::string file = path("it's $(touch hurt)");
     commands.runForReal("sed");
-    const std::vector<std::pair<std::string, std::string>> rows{
-        {"http://a/b", "/c/d"},           {"a.*[x]^$\\", "plain"},
-        {"ab.", "the dot is no pattern"}, {"plain", "a&b\\1\\n&"},
-        {"it's", "'; touch hurt; '"},     {"$HOME `id`", "$(touch hurt) | \" ; > x"}};
-    for (const auto& [before, after] : rows) {
-        const std::string rest = "\nDYNAMIC_CONFIG=" + folder + "\nOLDX=1\n\n#KEY\nKEY=abx\n";
-        const std::string file = writeFile(odd + "/static.ini", "KEY=" + before + rest);
-        ASSERT_TRUE(config.loadConfig(file));
+    const std::string rest = "\nOLDX=1\n\n#KEY\nKEY=abx\n";
+    std::string before = "plain";
+    for (const char* value : {"http://a/b", "a.*[x]^$\\", "ab.", "a&b\\1\\n&", "it's",
+                              "'; touch hurt; '", "$HOME `id` | \" ; > x", "last"}) {
+        writeFile("it's $(touch hurt)", "KEY=" + before + rest);
+        EXPECT_FALSE(config.loadConfig(file)) << "there is no dynamic file";
         config.setProperty("KEY", before, false);
-        config.setProperty("KEY", after, true);
-        EXPECT_EQ(readFile(file), "KEY=" + after + rest);
+        before = config.setProperty("KEY", value, true);
+        EXPECT_EQ(readFile(file), "KEY=" + before + rest);
     }
 }
 

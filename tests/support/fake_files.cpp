@@ -1,59 +1,92 @@
 #include "support/fake_files.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <csignal>
+#include <cstdarg>
+#include <cstdio>
 #include <cstring>
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
-extern "C" {
-std::FILE* __real_fopen(const char* path, const char* mode);
-std::FILE* __wrap_fopen(const char* path, const char* mode);
-}
-// NOLINTEND(bugprone-reserved-identifier)
-
 namespace pelorus::support {
-
-namespace {
-
-// googletest and the fuzzer open files of their own.
-bool isOfTheRunner(const char* path) {
-    return testing::UnitTest::GetInstance()->current_test_info() == nullptr ||
-           std::strstr(path, "gtest_captured_stream") != nullptr;
-}
-
-}  // namespace
-
-FakeFiles::FakeFiles() {
-    reset();
-}
 
 FakeFiles& FakeFiles::get() {
     static FakeFiles instance;
     return instance;
 }
 
-void FakeFiles::redirect(const std::string& path, const std::string& target) {
-    targets[path] = target;
-}
-
-void FakeFiles::reset() {
-    targets = {{kIdleMinutesFile, ""}};
-}
-
-std::FILE* FakeFiles::open(const char* path, const char* mode) {
-    EXPECT_TRUE(isOfTheRunner(path) || std::strchr(mode, 'e') != nullptr)
-        << path << " is inherited by children";
+const char* FakeFiles::target(const char* path) {
     const auto found = targets.find(path);
-    if (found == targets.end()) return __real_fopen(path, mode);
-    if (!found->second.empty()) return __real_fopen(found->second.c_str(), mode);
-    errno = ENOENT;
-    return nullptr;
+    return found == targets.end() ? path : found->second.c_str();
+}
+
+FakeProcess& FakeProcess::get() {
+    static FakeProcess instance;
+    return instance;
 }
 
 }  // namespace pelorus::support
 
-// NOLINTNEXTLINE(bugprone-reserved-identifier): a name the linker gives
-std::FILE* __wrap_fopen(const char* path, const char* mode) {
-    return pelorus::support::FakeFiles::get().open(path, mode);
+using pelorus::support::FakeFiles;
+using pelorus::support::FakeProcess;
+
+namespace {
+
+bool fails(const char* call) {
+    errno = EPERM;
+    return FakeProcess::get().failing.count(call) != 0;
 }
+
+// GoogleTest opens files of its own, between tests and to capture output.
+void checkCloseOnExec(bool closes, const char* path) {
+    if (::testing::UnitTest::GetInstance()->current_test_info() == nullptr) return;
+    EXPECT_TRUE(closes || std::strstr(path, "/gtest_") != nullptr) << "child inherits: " << path;
+}
+
+}  // namespace
+
+// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
+extern "C" {
+std::FILE* __real_fopen(const char* path, const char* mode);
+pid_t __real_fork();
+pid_t __real_setsid();
+int __real_chdir(const char* path);
+int __real_open(const char* path, int flags, ...);
+int __real_kill(pid_t pid, int signal);
+
+std::FILE* __wrap_fopen(const char* path, const char* mode) {
+    checkCloseOnExec(std::strchr(mode, 'e') != nullptr, path);
+    return __real_fopen(FakeFiles::get().target(path), mode);
+}
+
+int __wrap_open(const char* path, int flags, ...) {
+    va_list args;
+    va_start(args, flags);
+    const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
+    va_end(args);
+    checkCloseOnExec((flags & O_CLOEXEC) != 0, path);
+    return __real_open(FakeFiles::get().target(path), flags, mode);
+}
+
+pid_t __wrap_fork() {
+    return fails("fork") ? -1 : __real_fork();
+}
+
+pid_t __wrap_setsid() {
+    return fails("setsid") ? -1 : __real_setsid();
+}
+
+int __wrap_chdir(const char* path) {
+    return fails("chdir") ? -1 : __real_chdir(path);
+}
+
+int __wrap_kill(pid_t pid, int signal) {
+    FakeProcess& process = FakeProcess::get();
+    if (pid != getpid()) return __real_kill(pid, signal);
+    process.selfKills.push_back(signal);
+    return process.killForReal ? __real_kill(pid, signal) : 0;
+}
+}
+// NOLINTEND(bugprone-reserved-identifier)

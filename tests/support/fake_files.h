@@ -1,34 +1,44 @@
-// Fixed paths of a test: fopen of a path that is the same on every machine ends in a file of the
-// test. All other paths are opened as they are. A file that is not opened close-on-exec fails the
-// test.
+// Files and process of a test: fopen, open, fork, setsid, chdir and kill pass through here. They
+// mostly do what they say. A file that is opened without close-on-exec fails the test: a child process
+// would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 
-#include <cstdio>
 #include <map>
+#include <set>
 #include <string>
+#include <vector>
 
 namespace pelorus::support {
 
-/// The count of minutes that tells whether the disk may sleep.
+/// The count of minutes that tells whether the disk may sleep. Missing until redirected, whatever the
+/// machine has there.
 inline constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 
-/// At first kIdleMinutesFile is missing, whatever the machine has there, and nothing else is
-/// redirected.
+/// Paths that are the same on every machine lead to files of the test.
 class FakeFiles {
 public:
     static FakeFiles& get();
 
-    /// Opens @p target (see PelorusTest::path and writeFile) in place of @p path.
-    void redirect(const std::string& path, const std::string& target);
-    void reset();
-
-    std::FILE* open(const char* path, const char* mode);
+    /// Opens @p target (see PelorusTest::path and writeFile) in place of @p path; an empty target is a
+    /// missing file.
+    void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
+    void reset() { *this = FakeFiles{}; }
+    /// What to open for @p path.
+    const char* target(const char* path);
 
 private:
-    FakeFiles();
+    FakeFiles() = default;
 
-    std::map<std::string, std::string> targets;  // an empty one is a missing file
+    std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
+};
+
+struct FakeProcess {
+    static FakeProcess& get();
+
+    std::set<std::string> failing;  ///< of "fork", "setsid", "chdir"
+    std::vector<int> selfKills;     ///< signals this process sent to itself
+    bool killForReal = false;       ///< also delivers those
 };
 
 }  // namespace pelorus::support

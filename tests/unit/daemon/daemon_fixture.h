@@ -4,7 +4,7 @@
 #define PELORUS_UNIT_DAEMON_FIXTURE_H
 
 #include "daemon/daemon_control.h"
-#include "support/fake_process.h"
+#include "support/fake_files.h"
 #include "unit/connection/connection_fixture.h"
 
 namespace pelorus {

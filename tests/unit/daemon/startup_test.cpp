@@ -37,7 +37,7 @@ void reportExit() {
 class StartupTest : public DaemonTest {
 protected:
     StartupTest() {
-        process.targets["/tmp/tavik_cm_pid"] = path("pid");
+        files.redirect("/tmp/tavik_cm_pid", path("pid"));
         setenv("TAVIK_STATIC_CONFIG", path("static.ini").c_str(), 1);
         process.killForReal = true;
         atLine = [this](const LogLine& line) {

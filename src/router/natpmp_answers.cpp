@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 
 namespace pelorus {
 
@@ -54,14 +55,19 @@ void NatpmpAnswers::begin(const natpmp_t& client, const NatpmpRequest& request) 
     }
     // Two seconds without any: they are lost. One that comes all the same is still recognised.
     if (gatewayAnswers && owed == before) owed = 0;
-    for (int more = 0; more < kMostDropped && isReadable(client.s, 0); ++more) drop(client.s);
+    for (int more = 0; more < kMostDropped; ++more) {
+        if (!drop(client.s)) break;
+    }
 }
 
-// Takes one answer away; a refused connection that waits here likewise.
-void NatpmpAnswers::drop(int socket) {
+// Takes one answer away, or a refused connection. False when nothing was there.
+bool NatpmpAnswers::drop(int socket) {
     std::array<char, sizeof(natpmpresp_t)> answer{};
-    static_cast<void>(recv(socket, answer.data(), answer.size(), MSG_DONTWAIT));
+    if (recv(socket, answer.data(), answer.size(), MSG_DONTWAIT) < 0 && errno == EAGAIN) {
+        return false;
+    }
     countLate();
+    return true;
 }
 
 // The library's try_number counts what was sent. Its has_pending_request does not tell whether the

@@ -38,7 +38,7 @@ public:
     void countLate();
 
 private:
-    void drop(int socket);
+    bool drop(int socket);
 
     NatpmpRequest current;
     std::vector<NatpmpRequest> earlier;  // those with answers still owed

@@ -78,14 +78,6 @@ public:
     /// Fails the test when a device list or URLs were not released.
     void checkReleased() const;
 
-    /// A NAT-PMP request; protocol 0 asks for the address.
-    struct Request {
-        int protocol = 0;
-        int privatePort = 0;
-        int publicPort = 0;
-        unsigned lifetime = 0;
-    };
-
     // --- what the gateway is; each may change at any time --------------------------------
 
     void speakUpnp(bool on) { upnp = on; }
@@ -142,18 +134,30 @@ public:
     /// Runs @p action at each following call, before it is answered; gets its line.
     void onCall(std::function<void(const std::string&)> action) { hook = std::move(action); }
 
-private:
-    friend struct GatewayCalls;
-    struct DeviceList;
+    // --- for the library calls -----------------------------------------------------------
+
+    struct DeviceList {
+        std::vector<Device> texts;
+        std::vector<UPNPDev> nodes;
+    };
     struct Datagram {
         int status = 0;
         natpmpresp_t response{};
     };
-    FakeGateway();
+    /// A NAT-PMP request; protocol 0 asks for the address.
+    struct Request {
+        int protocol = 0;
+        int privatePort = 0;
+        int publicPort = 0;
+        unsigned lifetime = 0;
+    };
+
     void note(const std::string& line);
-    bool fails(Natpmp call, int& status) const;
-    std::vector<Mapping>::iterator find(int externalPort, const std::string& protocol);
-    [[nodiscard]] bool refuses(int externalPort) const;
+    /// The status to fail with, errno set, or 0.
+    [[nodiscard]] int failure(Natpmp call) const;
+    [[nodiscard]] std::vector<Mapping>::iterator find(int externalPort,
+                                                      const std::string& protocol);
+    [[nodiscard]] bool refuses(int port) const { return refuseAll || refused.count(port) != 0; }
 
     bool upnp = true;
     bool natpmp = false;
@@ -171,6 +175,9 @@ private:
     long retryTime = 0;
     bool connectionRefused = false;
     std::multimap<long, Datagram> onTheWay;
+
+private:
+    FakeGateway() { reset(); }
 };
 
 bool operator==(const FakeGateway::Mapping& left, const FakeGateway::Mapping& right);

@@ -1,5 +1,5 @@
-# The three libraries a firmware updates on its own; all linked dynamically. With PELORUS_HEADERS_ONLY
-# they are compiled against and not linked: the unit tests' fakes stand in for every call.
+# The three libraries that a firmware can update on its own; all linked dynamically. With
+# PELORUS_HEADERS_ONLY only their headers are used: the unit tests' fakes replace every call.
 if(PELORUS_HEADERS_ONLY)
   find_path(CURL_INCLUDE_DIR curl/curl.h PATH_SUFFIXES x86_64-linux-gnu REQUIRED)
   add_library(CURL::libcurl INTERFACE IMPORTED)

@@ -1,7 +1,7 @@
-"""The daemon idle in the lab after three cycles: its memory, its wake-ups, what it opens to write.
+"""Measures the idle daemon in the lab: memory, wake-ups, and files opened to write.
 
 Runs inside a lab's sandbox, in real time, because a sped-up clock is a library in the daemon's own
-memory. The cycles are as far apart as the central service lets them be, so this takes minutes.
+memory. It waits for three cycles, two minutes apart.
 """
 
 from __future__ import annotations
@@ -29,7 +29,7 @@ _CYCLE_SECONDS = 180   # longest time from one end of a cycle to the next
 _SETTLE_SECONDS = 2    # from the line that ends a cycle to the sleep that follows it
 _IDLE_SECONDS = 90     # well inside the pause of 120 s between two cycles
 _TRACE = Path("/tmp/opens")
-# Attempts count too: with several processes the result may stand on a line of its own.
+# Attempts count too: with several processes strace may print the result on another line.
 _OPEN_TO_WRITE = re.compile(r"(?:open|openat|openat2|creat)\([^\"]*\"([^\"]*)\""
                             r".*\b(?:O_WRONLY|O_RDWR|O_CREAT)\b|creat\(\"([^\"]*)\"")
 
@@ -56,7 +56,7 @@ def _measure(lab: Lab, bare_client: str) -> dict[str, object]:
     with _opens_to_write(pid) as opened:
         _wait_for_cycle(lab, 3)
     if _state(lab) != before:
-        raise LabError(f"the third cycle was to change nothing, but:\n{before}\n{_state(lab)}")
+        raise LabError(f"the third cycle should change nothing, but did:\n{before}\n{_state(lab)}")
     memory = _memory(pid)
     urls = [f"https://{SERVICE_HOST}{request.url}" for request in lab.central.requests
             if request.scheme == "https"]
@@ -74,8 +74,8 @@ def _wait_for_cycle(lab: Lab, number: int) -> None:
 
 
 def _state(lab: Lab) -> tuple[object, ...]:
-    """What a cycle can change."""
-    return (lab.device.status, lab.central.record, lab.device.statuses_told(),
+    """Everything that a cycle can change."""
+    return (lab.device.status, lab.central.record, lab.device.statuses_sent(),
             sorted(map(str, lab.gateway.mappings())))
 
 
@@ -109,7 +109,7 @@ def _opens_to_write(pid: int) -> Iterator[list[str]]:
 
 
 def written_files(calls: list[str]) -> list[str]:
-    """What strace's lines show as opened for writing, devices left out."""
+    """The files that strace shows as opened for writing, without devices."""
     found = (match[1] or match[2] for match in map(_OPEN_TO_WRITE.search, calls) if match)
     return [path for path in found if not path.startswith("/dev/")]
 
@@ -124,12 +124,12 @@ def _memory_of_bare_client(program: str, urls: list[str]) -> dict[str, int]:
     argv = network.command(network.DEVICE, "env", "-i", f"PATH={PATH}", program, *urls)
     with subprocess.Popen(argv, stdout=subprocess.PIPE, text=True) as started:
         assert started.stdout is not None
-        told = started.stdout.readline()
-        if not told:
-            raise LabError("the bare client did not get through its requests")
+        line = started.stdout.readline()
+        if not line:
+            raise LabError("the bare client failed in its requests")
         time.sleep(_SETTLE_SECONDS)
-        memory = _memory(int(told))
-        os.kill(int(told), signal.SIGKILL)
+        memory = _memory(int(line))
+        os.kill(int(line), signal.SIGKILL)
     return memory
 
 

@@ -1,4 +1,4 @@
-# Flags every target of the project is built with.
+# Flags of every target in the project.
 #   pelorus_flags: warnings, sanitizers and, in a release, hardening.
 
 add_library(pelorus_flags INTERFACE)
@@ -23,7 +23,7 @@ if(PELORUS_SANITIZE)
   string(REPLACE "fuzzer-no-link," "" PELORUS_SANITIZE_LINK "${PELORUS_SANITIZE}")
   target_link_options(pelorus_flags INTERFACE -fsanitize=${PELORUS_SANITIZE_LINK})
 elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
-  # Fortify and the sanitizers exclude each other.
+  # Fortify does not work with the sanitizers.
   set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
   target_compile_options(pelorus_flags INTERFACE
     -D_FORTIFY_SOURCE=2 -D_GLIBCXX_ASSERTIONS -fstack-protector-strong -fstack-clash-protection

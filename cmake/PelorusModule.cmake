@@ -1,9 +1,9 @@
 # pelorus_module(NAME SOURCES a.cpp ... [DEPENDS module ...] [LINKS library ...])
 #
-# One folder below src/ is one static library. Its headers are reachable only through a folder of
-# its own in the build tree (modules/NAME/NAME -> src/NAME), so "#include "NAME/x.h"" compiles only
-# in a module that names NAME under DEPENDS, directly or through one of those: an include against
-# the direction of the dependencies is a build error, not a matter of review.
+# Each folder in src/ is a static library. Its headers are reachable only through a folder of their
+# own in the build tree (modules/NAME/NAME -> src/NAME), so that #include "NAME/x.h" compiles only
+# in modules that depend on NAME, directly or indirectly: an include against the direction of the
+# dependencies is a build error, not a matter of review.
 function(pelorus_module name)
   cmake_parse_arguments(MODULE "" "" "SOURCES;DEPENDS;LINKS" ${ARGN})
   set(include_root ${PROJECT_BINARY_DIR}/modules/${name})

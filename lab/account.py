@@ -1,4 +1,4 @@
-"""Who the device is, as the device, the central service and the relay all know it."""
+"""The device's identity, shared by the device, the central service and the relay."""
 
 from __future__ import annotations
 
@@ -10,7 +10,7 @@ DOMAIN = ".kavra.example"
 
 @dataclass(frozen=True)
 class Account:
-    """A device as it was sold; identifier, authorisation and subdomain are its secrets."""
+    """A device as shipped; identifier, authorisation and subdomain are secret."""
 
     device_id: str = "4711830295"
     auth: str = "b7Qk2xN9wTz4"
@@ -19,11 +19,11 @@ class Account:
 
     @property
     def secrets(self) -> tuple[str, str, str]:
-        """What must never show in a log."""
+        """What must never appear in a log."""
         return self.device_id, self.auth, self.subdomain
 
     @property
     def names(self) -> tuple[str, str, str]:
-        """The device's public names: below its own label, beside it, and the hashed one."""
+        """The device's public names: under its own label, joined to it, and hashed."""
         label = f"device{self.device_id}{DOMAIN}"
         return f"{self.host_name}.{label}", f"{self.host_name}-{label}", self.subdomain

@@ -1,8 +1,8 @@
-"""The maker's central service, as a device meets it at the edge.
+"""The maker's central service as the device sees it.
 
-It tells devices their address, lets them proceed or makes them wait, tests a port by connecting
-back through the home router, keeps the record of where each device is reachable, and points the
-device's public names there. A test can make it slow, mute or wrong.
+It tells the device its address, lets it proceed or makes it wait, tests a port by connecting back
+through the home router, records where the device can be reached, and points the device's public
+names there. A test can make it slow, silent or wrong.
 """
 
 from __future__ import annotations
@@ -39,7 +39,7 @@ class Record:
 
 @dataclass(frozen=True)
 class PortTest:
-    """One connection back to a device, and who answered there."""
+    """One connection back to a device, and the device id found there."""
 
     address: str
     port: int
@@ -53,10 +53,10 @@ class PortTest:
 
 @dataclass(frozen=True)
 class Fault:
-    """How an operation misbehaves: other words, after a pause, or no answer at all.
+    """How an operation misbehaves: a different answer, a delay, or no answer at all.
 
-    `drop` closes the connection, `reset` tears it down. With `times` the operation is right again
-    after that many requests.
+    `drop` closes the connection, `reset` resets it. With `times` the operation recovers after that
+    many requests.
     """
 
     body: str | None = None
@@ -67,7 +67,7 @@ class Fault:
 
     def __str__(self) -> str:
         pause = f" after {self.delay:g} s" if self.delay else ""
-        often = f", {self.times} x" if self.times else ""
+        often = f", {self.times} times" if self.times else ""
         return f"{self._ending()}{pause}{often}"
 
     def _ending(self) -> str:
@@ -79,7 +79,7 @@ class Fault:
 
 
 class CentralService:
-    """The service with its books open: `requests`, `port_tests`, `record`, `withdrawals`."""
+    """The service; `requests`, `port_tests`, `record` and `withdrawals` are open to inspection."""
 
     def __init__(self, account: Account, authority: Authority, names: Names,
                  timeline: Timeline) -> None:
@@ -101,8 +101,8 @@ class CentralService:
                             COMM_STATUS: self._comm_status}
 
     def start(self) -> None:
-        """Listen on HTTP and HTTPS; a client at home must get an answer from both."""
-        is_back = bool(self._servers)
+        """Listen on HTTP and HTTPS, and wait until a client at home gets answers from both."""
+        restarted = bool(self._servers)
         self._names.set({SERVICE_HOST: network.SERVICE_ADDRESS})
         self._point_names()
         self._servers = [
@@ -113,34 +113,34 @@ class CentralService:
             web.expect_answer(f"central service ({scheme})", network.DEVICE,
                               f"{scheme}://{network.SERVICE_ADDRESS}{_READY_PATH}",
                               trust=str(self._authority.certificate), name=SERVICE_HOST)
-        if is_back:
-            self._timeline.add("central", "is back")
+        if restarted:
+            self._timeline.add("central", "is back up")
 
     def stop(self) -> None:
-        """Go away: connections are refused until `start`."""
-        self._timeline.add("central", "goes away")
+        """Stop listening: connections are refused until `start`."""
+        self._timeline.add("central", "goes down")
         for server in self._servers:
             server.close()
 
     def misbehave(self, operation: str, fault: Fault | None) -> None:
-        """Make one operation go wrong from now on, or right again with None."""
+        """Make one operation misbehave from now on, or work again with None."""
         with self._lock:
             self._faults.pop(operation, None)
             if fault:
                 self._faults[operation] = fault
-        self._timeline.add("central", f"{operation} from now on: {fault or 'as it should be'}")
+        self._timeline.add("central", f"{operation} now {fault or 'works normally'}")
 
     def show_certificate_of(self, name: str) -> None:
-        """Prove to be `name` on HTTPS from now on; a wrong one makes devices hang up."""
+        """Present a certificate for `name` from now on; devices reject a wrong one."""
         self._servers[1].show_certificate(self._authority.sign(name))
-        self._timeline.add("central", f"shows the certificate of {name} from now on")
+        self._timeline.add("central", f"now presents a certificate for {name}")
 
     def requests_for(self, operation: str) -> list[Request]:
         """The requests for one operation, in order."""
         return [request for request in self.requests if _operation(request) == operation]
 
     def state(self) -> str:
-        """Books and requests in short, for a failure report."""
+        """A summary for a failure report."""
         lines = [f"record: {self.record}, withdrawn {self.withdrawals} times, "
                  f"device last seen at {self.local_ip or 'nowhere'}"]
         lines += [f"port test: {test}" for test in self.port_tests]
@@ -170,7 +170,7 @@ class CentralService:
         return Reply(operation(request).encode())
 
     def _next_fault(self, operation: str) -> Fault | None:
-        """The fault for one more request; the last of a counted one ends it."""
+        """The fault for the next request; a counted one ends after its last."""
         fault = self._faults.get(operation)
         if fault and fault.times == 1:
             del self._faults[operation]
@@ -222,7 +222,7 @@ class CentralService:
         return "<status>Success</status>"
 
     def _point_names(self) -> None:
-        """Send clients to the device where it is published, else to the relay."""
+        """Point the names at the device if it is published, else at the relay."""
         address = self.record.external_ip if self.record else network.RELAY_ADDRESS
         self._names.set(dict.fromkeys(self._account.names, address))
 
@@ -237,8 +237,8 @@ def _operation(request: Request) -> str:
 
 
 def _who_answers(address: str, port: int, protocol: str) -> str:
-    """Ask whoever listens there for its identity; empty when nobody sensible answers."""
+    """The device id of whoever listens there; empty without a proper answer."""
     page = web.fetch_from_here(f"{protocol.lower()}://{address}:{port}{IDENTITY_PATH}",
                                seconds=_CONNECT_BACK_SECONDS) or ""
-    told = re.search(r"<device_id>(.*?)</device_id>", page)
-    return told.group(1) if told else ""
+    found = re.search(r"<device_id>(.*?)</device_id>", page)
+    return found.group(1) if found else ""

@@ -16,21 +16,14 @@ class KeyPair:
     key: Path
 
 
-def _new_key(*arguments: str) -> tuple[str, ...]:
-    return ("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-noenc",
-            "-days", "3650", *arguments)
-
-
 class Authority:
-    """Signs server certificates; hosts trust it where its certificate is their bundle."""
+    """Signs server certificates; a host trusts it when its certificate is the host's bundle."""
 
     def __init__(self, folder: Path, name: str = "Lab Authority") -> None:
         self._folder = folder
         folder.mkdir(parents=True, exist_ok=True)
         self._own = KeyPair(folder / "ca.crt", folder / "ca.key")
-        run_tool("openssl", *_new_key("-subj", f"/CN={name}", "-keyout", str(self._own.key),
-                           "-out", str(self._own.certificate),
-                           "-addext", "keyUsage=critical,keyCertSign,cRLSign"))
+        _make(self._own, name, ["keyUsage=critical,keyCertSign,cRLSign"])
 
     @property
     def certificate(self) -> Path:
@@ -38,13 +31,18 @@ class Authority:
         return self._own.certificate
 
     def sign(self, host_name: str) -> KeyPair:
-        """A server certificate for one name."""
+        """Make a server certificate for one name."""
         pair = KeyPair(self._folder / f"{host_name}.crt", self._folder / f"{host_name}.key")
-        run_tool("openssl", *_new_key("-subj", f"/CN={host_name}", "-keyout", str(pair.key),
-                           "-out", str(pair.certificate), "-CA", str(self._own.certificate),
-                           "-CAkey", str(self._own.key),
-                           "-addext", f"subjectAltName=DNS:{host_name}",
-                           "-addext", "extendedKeyUsage=serverAuth",
-                           "-addext", "basicConstraints=critical,CA:FALSE",
-                           "-addext", "keyUsage=digitalSignature"))
+        _make(pair, host_name,
+              [f"subjectAltName=DNS:{host_name}", "extendedKeyUsage=serverAuth",
+               "basicConstraints=critical,CA:FALSE", "keyUsage=digitalSignature"], self._own)
         return pair
+
+
+def _make(pair: KeyPair, name: str, extensions: list[str], signer: KeyPair | None = None) -> None:
+    """Make a key and its certificate, self-signed without a signer."""
+    signing = ["-CA", str(signer.certificate), "-CAkey", str(signer.key)] if signer else []
+    run_tool("openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256",
+             "-noenc", "-days", "3650", "-subj", f"/CN={name}", "-keyout", str(pair.key),
+             "-out", str(pair.certificate), *signing,
+             *(word for extension in extensions for word in ("-addext", extension)))

@@ -1,4 +1,4 @@
-"""What scenarios look at again and again."""
+"""Waits and checks shared by the scenarios."""
 
 from __future__ import annotations
 
@@ -9,25 +9,26 @@ from itertools import takewhile
 from lab import daemon, network, web
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, PortTest, Record
 from lab.device import DYNAMIC_COPY, HOME
-from lab.gateway import GatewaySetup, Mapping
+from lab.gateway import GatewaySetup
+from lab.packet_filter import Mapping
 from lab.scenario import Lab
 from lab.support import wait_until
 
 OPTIONS = ("-l", "7", "-f", "30")
 # A pause of two minutes takes two seconds.
 FAST = 60
-# The tunnel comes up in real time while the daemon counts ten fast seconds between its looks.
+# The tunnel comes up in real time, while the ten seconds between the daemon's checks run fast.
 RELAYED = 20
-# The five minutes for which a tunnel is tried take seven seconds, a pause takes three.
+# The five minutes spent on trying a tunnel take seven seconds, a pause takes three.
 IMPATIENT = 40
-# A tunnel that never starts is given up at the first look instead of after five minutes.
+# A tunnel that never starts is given up at the first check instead of after five minutes.
 NO_TUNNEL = {"STARTCMD": "true"}
 TUNNEL_PID_FILE = HOME / "openvpn/openvpn.pid"
 
 # A gateway that only masquerades.
 SILENT = GatewaySetup(upnp=False)
 
-# Lines of the device's log: a cycle's last, ports that are not tested, a tunnel that is given up.
+# Lines of the device's log: the end of a cycle, a skipped port test, a tunnel given up.
 PAUSE = "DaemonControl::run - retry connection after "
 NOT_DUE = "createDirectConnection() - Ignore Port Test due to Interval"
 NOT_RELAYED = "createRelayConnection() - failed to create VPN connection."
@@ -42,28 +43,33 @@ PAGES = ["welcome to mynas, over http", "welcome to mynas, over https"]
 
 
 def wait_for_status(lab: Lab, status: str) -> None:
-    """Wait until the device's own configuration holds the status."""
+    """Wait until the device's configuration has this status."""
     lab.wait_for(lambda: lab.device.status == status, f"status {status}", _PATIENCE)
 
 
 def wait_for_log(lab: Lab, part: str, count: int = 1) -> None:
-    """Wait until the device's log has held a text this often."""
+    """Wait until the device's log has at least `count` lines with a text."""
     lab.wait_for(lambda: lab.device.messages.count(part) >= count, f"{count} x [{part}]",
                  _PATIENCE)
 
 
 def wait_for_cycle(lab: Lab, number: int) -> None:
-    """Wait until this cycle has run to its pause, counted from the first start of the daemon."""
+    """Wait for the pause that ends cycle `number`, counted from the daemon's first start."""
     wait_for_log(lab, PAUSE, number)
 
 
-def start_direct(lab: Lab, *options: str) -> None:
-    """Start the daemon and let it be content with the direct path for a cycle.
-
-    Its pause has just begun then, so a gateway that is changed now is not asked meanwhile.
-    """
+def start(lab: Lab, status: str, *options: str) -> None:
+    """Start the daemon and wait for a status."""
     lab.start_daemon(*OPTIONS, *options)
-    wait_for_status(lab, "portforwarded")
+    wait_for_status(lab, status)
+
+
+def start_direct(lab: Lab, *options: str) -> None:
+    """Start the daemon and wait until it has kept the direct path for one cycle.
+
+    Its pause has then just begun, so it does not notice a change at the gateway half done.
+    """
+    start(lab, "portforwarded", *options)
     with lab.daemon.held():
         assert_published(lab)
         assert pages_from_outside() == PAGES
@@ -71,12 +77,12 @@ def start_direct(lab: Lab, *options: str) -> None:
 
 
 def wait_for_next_cycle(lab: Lab, cycles: int = 1) -> None:
-    """Wait until that many more cycles have run to their pause."""
+    """Wait for the end of that many more cycles."""
     wait_for_cycle(lab, lab.device.messages.count(PAUSE) + cycles)
 
 
-def assert_told_by_the_next_cycle(lab: Lab, since: int, part: str) -> None:
-    """The device's log has a text after its first `since` lines, before a second cycle begins."""
+def assert_logged_by_next_cycle(lab: Lab, since: int, part: str) -> None:
+    """The log has a text after its first `since` lines, before a second cycle begins."""
     wait_for_log(lab, part)
     lines = lab.device.messages.texts()[since:]
     assert any(part in line for line in lines)
@@ -102,37 +108,37 @@ def ports_tested(lab: Lab) -> list[int]:
 
 
 def tunnel_client() -> int:
-    """The tunnel client's pid, of a process that really runs."""
+    """The pid of the tunnel client, which must be running."""
     client = int(TUNNEL_PID_FILE.read_text())
     assert client in daemon.running("openvpn")
     return client
 
 
 def wait_for_client_end(client: int) -> None:
-    """Wait until a tunnel client is gone; told to end, it takes its time."""
+    """Wait until a tunnel client has exited, which takes it a while."""
     wait_until(lambda: client not in daemon.running("openvpn"), f"tunnel client {client} to end",
                20)
 
 
 def page_through_the_tunnel(lab: Lab) -> str | None:
-    """The device's page as the relay gets it at the device's end of the tunnel."""
+    """The device's page as the relay gets it through the tunnel; None without a client."""
     address = lab.relay.client_address()
     return web.fetch(network.INTERNET, f"http://{address}/", seconds=2) if address else None
 
 
 def mapping_changes(lab: Lab) -> list[str]:
-    """What the gateway forwarded and ceased to forward, in order."""
+    """What the gateway began and ceased to forward, in order."""
     return [event.what for event in lab.timeline.events
             if event.who == "gateway" and "forwards TCP" in event.what]
 
 
 def wait_for_mapping_changes(lab: Lab, changes: Sequence[str], since: int = 0) -> None:
-    """Wait until the lab has heard of these changes, and no other, after the first `since`."""
+    """Wait until exactly these changes have been seen after the first `since`."""
     lab.wait_for(lambda: mapping_changes(lab)[since:] == list(changes), f"{changes}", 10)
 
 
-def assert_told_in_order(lab: Lab) -> None:
-    """The service hears: here I am, clean slate, may I, test my port, publish; each once."""
+def assert_reported_in_order(lab: Lab) -> None:
+    """The service gets, once each: status, withdrawal, permission request, port test, record."""
     device_id, auth, _ = lab.account.secrets
     forward = f"/api/1.0/rest/{PORT_FORWARD}/{device_id}?external_ip="
     assert [(request.scheme, request.url) for request in lab.central.requests] == [
@@ -156,7 +162,7 @@ def assert_told_in_order(lab: Lab) -> None:
 def assert_published(lab: Lab, http_port: int = 9091, https_port: int = 9444,
                      others: Sequence[Mapping] = (), local_ip: str = network.DEVICE_ADDRESS,
                      external_ip: str = network.GATEWAY_WAN_ADDRESS) -> None:
-    """Both ports are open at the gateway, beside those of `others`, and everybody knows them."""
+    """Both ports are open at the gateway, in addition to `others`, and published everywhere."""
     internal = [int(lab.device.setting(f"INTERNAL_{kind}_PORT")) for kind in ("HTTP", "HTTPS")]
     assert lab.gateway.mappings() == sorted([
         *(Mapping("TCP", port, local_ip, inside)
@@ -172,9 +178,9 @@ def assert_published(lab: Lab, http_port: int = 9091, https_port: int = 9444,
 
 def assert_stops_clean(lab: Lab, number: signal.Signals = signal.SIGTERM,
                        left: Sequence[Mapping] = ()) -> None:
-    """One signal ends the daemon by that signal and takes everything down that it put up.
+    """One signal ends the daemon, which first removes everything it has set up.
 
-    The mappings in `left` are not its own, or it does not know them any more.
+    The mappings in `left` are not its own, or it has lost track of them.
     """
     withdrawals = lab.central.withdrawals
     assert lab.stop_daemon(number) == number.name
@@ -189,7 +195,7 @@ def assert_stops_clean(lab: Lab, number: signal.Signals = signal.SIGTERM,
 
 
 def assert_log_is_proper(lab: Lab) -> None:
-    """Every line is the daemon's and tells no secret."""
+    """Every line comes from the daemon and reveals no secret."""
     assert {(message.ident, message.facility) for message in lab.device.messages.all} == {
         ("Pelorus", _LOCAL0)}
     lines = lab.device.messages.texts()

@@ -13,15 +13,14 @@ _REFUSED_SIGNAL = Path("/run/lab/refused_signal")
 
 
 def fast_clock(factor: int, ahead: float = 0) -> list[str]:
-    """Environment in which a program's time runs that much faster, from `ahead` seconds on."""
+    """Environment in which a program's time runs `factor` times as fast, `ahead` seconds ahead."""
     return _faketime(factor, ahead) if factor != 1 else []
 
 
 def fast_pauses(factor: int, hasty: bool) -> list[str]:
-    """`fast_clock` for a program that talks to real servers: its waits for them are no shorter
-    than they can stand.
+    """`fast_clock` for a program that talks to real servers and must give them time to answer.
 
-    The time limit of its transfers is real time, unless it is `hasty`: libcurl measures it by the
+    The time limit of its transfers stays real time unless `hasty`: libcurl measures it by the
     monotonic clock.
     """
     if factor == 1:
@@ -34,7 +33,7 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
 
 
 def refuse_signal(number: int) -> None:
-    """Let programs with fast pauses fail to send this signal from now on; 0 for none."""
+    """Make programs with fast pauses fail to send this signal from now on; 0 for none."""
     _REFUSED_SIGNAL.write_text(f"{number}\n")
 
 

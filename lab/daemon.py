@@ -18,13 +18,13 @@ OUTPUT = device.HOME / "pelorus.out"
 
 
 class Daemon:
-    """One run of the daemon, from its start to the wait status it leaves."""
+    """One run of the daemon, from its start to its wait status."""
 
     def __init__(self, options: tuple[str, ...], clock: int, hasty: bool) -> None:
-        """Start it and return when it has detached; `clock` makes its time run that much faster.
+        """Start it and return once it has detached; its time runs `clock` times as fast.
 
-        The time limit of its transfers is real time, unless it is `hasty`. It becomes a child of
-        the sandbox's first process, which is the one that runs this code.
+        The time limit of its transfers stays real time unless `hasty`. Once detached it is a child
+        of the sandbox's first process, which is this one.
         """
         PID_FILE.unlink(missing_ok=True)
         environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
@@ -54,7 +54,7 @@ class Daemon:
 
     @contextmanager
     def held(self) -> Iterator[None]:
-        """Let it stand still meanwhile: it sees a change as a whole, and what is looked at stays.
+        """Stop it meanwhile, so that it sees several changes at once and checks see no movement.
 
         Its clock runs on: a pause that is over by then ends at once.
         """
@@ -78,5 +78,5 @@ def running(program: str) -> list[int]:
             if entry.name.isdigit() and Path(os.readlink(entry / "exe")).name == program:
                 found.append(int(entry.name))
         except OSError:
-            continue  # gone, or only waiting to be reaped
+            continue  # gone, or a zombie
     return found

@@ -1,7 +1,7 @@
-"""Shows the daemon at work on one machine, in a lab of its own.
+"""Shows the daemon at work on this machine, in a lab of its own.
 
-Without a name: the main job at its real speed, a device behind a home router becomes reachable.
-With the name of a scenario: that story, with the device's clock sped up and everything checked.
+Without a name: the main job at real speed, a device behind a home router becomes reachable.
+With a name: that scenario, with the device's clock sped up and the results checked.
 """
 
 from __future__ import annotations
@@ -31,7 +31,7 @@ _MAIN_JOB = Situation(gateway=GatewaySetup(upnp=True, natpmp=True))
 
 
 def main() -> int:
-    """Outside: build the daemon and open a sandbox for the demo. Inside: play it."""
+    """Outside a sandbox: build the daemon and open one. Inside: play the demo."""
     arguments = _parse()
     if arguments.list:
         width = max(map(len, SCENARIOS))
@@ -59,13 +59,13 @@ def _parse() -> argparse.Namespace:
                                      formatter_class=argparse.RawDescriptionHelpFormatter)
     parser.add_argument("scenario", nargs="?", metavar="SCENARIO",
                         help="a name from --list")
-    parser.add_argument("--list", action="store_true", help="name the scenarios, one line each")
-    parser.add_argument("--svg", metavar="FILE", help="save the timeline as a picture")
+    parser.add_argument("--list", action="store_true", help="list the scenarios, one per line")
+    parser.add_argument("--svg", metavar="FILE", help="save the timeline as an SVG picture")
     parser.add_argument("--stay", action="store_true",
-                        help="keep the lab up until Ctrl-C, to look around in it")
+                        help="keep the lab up until Ctrl-C, to look around")
     arguments = parser.parse_args()
     if arguments.scenario and arguments.scenario not in SCENARIOS:
-        parser.error(f"there is no scenario {arguments.scenario!r}; --list names them")
+        parser.error(f"no scenario {arguments.scenario!r}; see --list")
     return arguments
 
 
@@ -73,7 +73,7 @@ def _obstacle(name: str | None) -> str:
     """Why this machine cannot play it; empty when it can."""
     reason = sandbox.why_forbidden()
     if reason:
-        return f"this machine does not let us make network namespaces ({reason})"
+        return f"this machine does not allow network namespaces ({reason})"
     if name and SCENARIOS[name].situation.relay and not TUNNEL_DEVICE.exists():
         return f"{name} needs a tunnel, and there is no {TUNNEL_DEVICE}"
     return ""
@@ -92,7 +92,7 @@ def _build() -> bool:
 
 
 def _show(name: str | None, stay: bool) -> int:
-    """Play in the sandbox, telling what happens as it happens."""
+    """Play in the sandbox, printing events as they happen."""
     signal.signal(signal.SIGINT, signal.default_int_handler)
     timeline = Timeline()
     timeline.listen(lambda event: print(event, flush=True))
@@ -103,10 +103,10 @@ def _show(name: str | None, stay: bool) -> int:
         if stay:
             _look_around()
     except (LabError, AssertionError) as failure:
-        print(f"\nFAILED: {failure or 'not as it must be:'}")
+        print(f"\nFAILED: {failure or 'a check did not hold'}")
         return 1
     except KeyboardInterrupt:
-        print("\ninterrupted, the lab is gone")
+        print("\ninterrupted, the lab has been removed")
         return _INTERRUPTED
     finally:
         _save_picture(title, timeline)
@@ -116,7 +116,7 @@ def _show(name: str | None, stay: bool) -> int:
 def _play(name: str | None, timeline: Timeline) -> None:
     story: Callable[[Lab], None] = SCENARIOS[name].play if name else _reach_the_device
     lab = Lab(SCENARIOS[name].situation if name else _MAIN_JOB, timeline)
-    timeline.add("lab", "device, gateway, central service and name server answer")
+    timeline.add("lab", "device, gateway, central service and name server are up")
     try:
         story(lab)
     except (LabError, AssertionError):
@@ -124,11 +124,11 @@ def _play(name: str | None, timeline: Timeline) -> None:
         print(f"\n{traceback.format_exc(limit=-2)}")
         raise
     if name:
-        print("\neverything was as it must be")
+        print("\nall checks passed")
 
 
 def _save_picture(title: str, timeline: Timeline) -> None:
-    """Write the story to the file of the machine outside that was opened for it."""
+    """Write the timeline to the file that was opened outside the sandbox."""
     if _PICTURE in os.environ:
         with os.fdopen(int(os.environ[_PICTURE]), "w") as file:
             file.write(picture.svg(title, timeline.events))
@@ -142,7 +142,7 @@ def _reach_the_device(lab: Lab) -> None:
 
 
 def _close(lab: Lab) -> None:
-    """Show the result from every side; fail unless the service really reached the device."""
+    """Print the result from every side; fail unless the service really reached the device."""
     record = lab.central.record
     if record is None or not any(test.passed(lab.account) for test in lab.central.port_tests):
         raise LabError("the status says portforwarded, but the central service did not get through")
@@ -163,7 +163,7 @@ def _close(lab: Lab) -> None:
 
 
 def _look_around() -> None:
-    """Say how to get into the lab, and keep it up until Ctrl-C."""
+    """Print how to enter the lab, and keep it up until Ctrl-C."""
     enter = (f"nsenter --preserve-credentials -U -m -n -p -u -t {sandbox.pid_outside()} "
              "ip netns exec")
     try:
@@ -174,9 +174,9 @@ The lab stays up until Ctrl-C. From another terminal, as the same user:
   the gateway's rules     {enter} {network.GATEWAY} nft list ruleset
   the view from outside   {enter} {network.INTERNET} sh""", flush=True)
         while True:
-            time.sleep(1)  # bounded: a signal in the moment before a wait does not end it
+            time.sleep(1)  # short: a signal just before the sleep does not end it
     except KeyboardInterrupt:
-        print("\nthe lab is gone")
+        print("\nthe lab has been removed")
 
 
 if __name__ == "__main__":

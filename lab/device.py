@@ -28,11 +28,11 @@ PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 _LAN_PORT = "eth0"
 _TUNNEL = HOME / "openvpn"
 _DRIVE_STATE = HOME / "drive_state"
-# File times for what the lab writes: a month ago, where no `touch` comes.
+# Modification times for the files the lab writes: a month ago, unlike those of any other writer.
 _SECONDS = itertools.count(int(time.time()) - 30 * 24 * 3600)
 _HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {_DRIVE_STATE})\"\n"
 
-# The tunnel's other end lives in real time, so the client must too when the device's clock is fast.
+# The relay runs in real time, so the tunnel client must too, however fast the device's clock is.
 _STATIC = {
     "DYNAMIC_CONFIG": str(DYNAMIC_FILE.parent),
     "DYNAMIC_CONFIG_TMP": str(DYNAMIC_COPY),
@@ -61,7 +61,7 @@ _STATIC = {
 
 
 class Device:
-    """What the daemon finds on its machine, and what its machine shows to others."""
+    """The machine the daemon runs on, and the pages that it serves."""
 
     def __init__(self, account: Account, authority: Authority, timeline: Timeline) -> None:
         self.messages = Messages(HOME / "messages")
@@ -73,7 +73,7 @@ class Device:
         self._lock = threading.Lock()
 
     def start(self, static: Mapping[str, str], dynamic: Mapping[str, str]) -> None:
-        """Write the configuration (the arguments win over the usual values) and serve pages."""
+        """Write the configuration (the arguments override the defaults) and serve pages."""
         self._write_system_files()
         self._write_tunnel_files()
         _write_settings(STATIC_FILE, {**_STATIC, **static})
@@ -85,9 +85,9 @@ class Device:
                       int(self.setting("INTERNAL_HTTPS_PORT")))
 
     def serve_on(self, http_port: int, https_port: int) -> None:
-        """Serve on these two ports and no longer elsewhere; only the device knows its certificate.
+        """Serve on these two ports only, with a self-signed certificate.
 
-        The configuration is left to whoever moves the web server.
+        The configuration is left to the caller.
         """
         for server in self._servers:
             server.close()
@@ -101,7 +101,7 @@ class Device:
 
     @property
     def status(self) -> str:
-        """The communication status as the device's dynamic configuration has it."""
+        """The communication status in the device's dynamic configuration."""
         return self.setting("COMMUNICATION_STATUS")
 
     def setting(self, key: str) -> str:
@@ -109,36 +109,36 @@ class Device:
         return _read_settings(DYNAMIC_FILE).get(key, "")
 
     def change(self, **settings: str) -> None:
-        """Write settings the way other programs on the device do: both files, at once."""
+        """Write settings as other programs on the device do: to both files, each in one step."""
         self._change(**settings)
-        told = ", ".join(f"{key}={value}" for key, value in settings.items())
-        self._timeline.add("device", f"settings now: {told}")
+        changes = ", ".join(f"{key}={value}" for key, value in settings.items())
+        self._timeline.add("device", f"settings changed: {changes}")
 
     def move_to(self, address: str) -> None:
-        """Get another address on the LAN, as from a DHCP server that forgot the old one."""
+        """Get a new LAN address, as from a DHCP server that forgot the old one."""
         network.ip("-n", network.DEVICE, "-4", "address", "flush", "dev", _LAN_PORT)
         network.ip("-n", network.DEVICE, "address", "add", f"{address}/24", "dev", _LAN_PORT)
         network.ip("-n", network.DEVICE, "route", "add", "default", "via",
                    network.GATEWAY_LAN_ADDRESS)
-        self._timeline.add("device", f"has the LAN address {address} from now on")
+        self._timeline.add("device", f"now has the LAN address {address}")
 
     def disk_sleeps(self) -> None:
-        """Let the disk be in standby."""
+        """Put the disk into standby."""
         _DRIVE_STATE.write_text("standby")
         self._timeline.add("device", "the disk goes to sleep")
 
     def disk_wakes(self) -> None:
-        """Let the disk turn again."""
+        """Spin the disk up again."""
         _DRIVE_STATE.write_text("active/idle")
         self._timeline.add("device", "the disk wakes up")
 
     def minutes_since_disk_access(self, count: int) -> None:
-        """Let the disk be unused for so long, which the device's own watcher counts."""
+        """Set how long the disk has been unused, as the device's own watcher counts it."""
         SLEEP_COUNT.write_text(f"{count}\n")
-        self._timeline.add("device", f"the disk is unused for {count} minutes")
+        self._timeline.add("device", f"the disk has been unused for {count} minutes")
 
-    def statuses_told(self) -> list[str]:
-        """The status words the local back end was told, in order."""
+    def statuses_sent(self) -> list[str]:
+        """The status words sent to the local back end, in order."""
         return [request.argument("status") for request in self.local_requests
                 if request.path == "/local/comm_status"]
 
@@ -148,7 +148,7 @@ class Device:
 
     def _change(self, **settings: str) -> None:
         with self._lock:
-            # Last the one that `setting` reads: what it tells then stands in both.
+            # The file that `setting` reads comes last: what it shows is then in both.
             for path in (DYNAMIC_COPY, DYNAMIC_FILE):
                 if path.exists():
                     _write_settings(path, {**_read_settings(path), **settings})
@@ -181,7 +181,7 @@ class Device:
         return self._local_back_end(request)
 
     def _local_back_end(self, request: Request) -> Reply:
-        """Write what the daemon tells into the device's configuration."""
+        """Store what the daemon reports in the device's configuration."""
         with self._lock:
             self.local_requests.append(request)
         operation = request.path.removeprefix("/local/")
@@ -210,8 +210,8 @@ def _read_settings(path: Path) -> dict[str, str]:
 def _write_settings(path: Path, settings: Mapping[str, str]) -> None:
     """Replace the file in one step, so that the daemon never reads half of it.
 
-    The daemon takes a file for changed when the second of its time is another: each change gets
-    one of its own.
+    The daemon detects a change by the modification time in whole seconds, so each change gets its
+    own second.
     """
     new = path.with_suffix(".new")
     new.write_text("".join(f"{key}={value}\n" for key, value in settings.items()),

@@ -33,8 +33,8 @@ _LISTED = re.compile(r"^ *\d+ (TCP|UDP) +(\d+)->([\d.]+):(\d+) +'(.*)' '.*' (\d+
 class GatewaySetup:
     """What a home router offers; with neither protocol it only masquerades.
 
-    `secure` lets clients map to themselves only. With `grant`, NAT-PMP is spoken by the lab's own
-    server, which grants that.
+    `secure` lets clients map to themselves only. With `grant`, the lab's own NAT-PMP server answers
+    and grants that.
     """
 
     upnp: bool = True
@@ -50,13 +50,13 @@ class GatewaySetup:
 
     def __str__(self) -> str:
         protocols = [name for name, on in (("UPnP", self.upnp), ("NAT-PMP", self.natpmp)) if on]
-        rules = "as it pleases" if self.grant else ", ".join(self.permissions)
+        rules = "ports of its own choice" if self.grant else ", ".join(self.permissions)
         return f"{' and '.join(protocols) or 'no protocol'} ({rules})"
 
 
 @dataclass(frozen=True)
 class Listed:
-    """A mapping as the router tells it through UPnP; `lease` is what is left, in seconds."""
+    """A mapping as the router lists it through UPnP; `lease` is what is left, in seconds."""
 
     mapping: Mapping
     description: str
@@ -64,7 +64,7 @@ class Listed:
 
 
 class Gateway:
-    """The router and its real state. Its leases are in device time, `clock` times ours."""
+    """The router and its actual state. Its leases run in device time, `clock` times ours."""
 
     def __init__(self, folder: Path, setup: GatewaySetup, timeline: Timeline,
                  clock: int = 1) -> None:
@@ -93,19 +93,18 @@ class Gateway:
         return f"http://{self.lan_address}:{self._http_port}/rootDesc.xml"
 
     def start(self) -> None:
-        """Route and masquerade; offer the protocols of the setup and wait for their answers."""
+        """Route and masquerade; offer the protocols of the setup and wait until they answer."""
         threading.Thread(target=packet_filter.watch, args=(self._tell_change,),
                          daemon=True).start()
-        with network.inside(network.GATEWAY):
-            Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
+        network.enable_forwarding(network.GATEWAY)
         packet_filter.load()
         self._serve()
 
     def become(self, setup: GatewaySetup) -> None:
         """Offer something else from now on, as after a change in the router's settings.
 
-        What is forwarded stays. miniupnpd comes back at another TCP port, and it ends leases from
-        before only when it looks for one that it gave since.
+        Existing forwardings stay. miniupnpd comes back on another TCP port, and expires older
+        leases only when it checks one that it has granted since.
         """
         self._stop()
         self._setup = setup
@@ -113,9 +112,9 @@ class Gateway:
         self._timeline.add("gateway", f"now offers {setup}")
 
     def reboot(self, lan_address: str | None = None) -> None:
-        """Forget every mapping and come back, if wanted under another LAN address.
+        """Forget every mapping and come back, optionally at another LAN address.
 
-        The hosts at home then get their default route anew. What the user typed in stays.
+        The hosts at home then get a new default route. Forwardings made by hand stay.
         """
         self._stop()
         packet_filter.flush(packet_filter.ASKED_FOR)
@@ -123,19 +122,26 @@ class Gateway:
         if lan_address:
             self._take_lan_address(lan_address)
         self._serve()
-        self._timeline.add("gateway", f"rebooted, is at {self.lan_address}, every mapping is lost")
+        self._timeline.add("gateway", f"rebooted at {self.lan_address}, all mappings lost")
 
     def fall_silent(self) -> None:
-        """Answer nobody at home any more until `become` or `reboot`; what is forwarded stays."""
+        """Stop answering on the LAN until `become` or `reboot`; existing forwardings stay."""
         packet_filter.change("add rule inet lab silence meta l4proto { tcp, udp } drop\n")
         self._stop()
         self._timeline.add("gateway", "no longer answers the mapping protocols")
 
-    def lose(self, *external_ports: int) -> None:
-        """Drop the forwardings of these ports, or all, without telling anybody.
+    def hang_once(self, seconds: float) -> None:
+        """Let the lab's NAT-PMP server hang when the device next asks for a mapping."""
+        if not self._natpmp:
+            raise LabError("only the lab's own NAT-PMP server can be told to hang")
+        self._natpmp.hang_once(seconds)
+        self._timeline.add("gateway", f"will hang for {seconds} s at the next request")
 
-        miniupnpd looks at its rules again only after a change of its own, or when it starts; so it
-        is started anew, and at the same place.
+    def lose(self, *external_ports: int) -> None:
+        """Drop the forwardings of these ports, or all, without notice.
+
+        miniupnpd reads its rules again only after a change of its own or at its start, so it is
+        restarted, on the same port.
         """
         lost = [mapping for mapping in self.mappings()
                 if not external_ports or mapping.external_port in external_ports]
@@ -154,13 +160,13 @@ class Gateway:
     def move_to(self, wan_address: str) -> None:
         """Get another address from the internet provider."""
         self.take_wan_address(wan_address, network.SERVICE_ADDRESS)
-        self._timeline.add("gateway", f"has the internet address {wan_address} now")
+        self._timeline.add("gateway", f"now has the internet address {wan_address}")
 
     def take_wan_address(self, address: str, router: str) -> None:
-        """Be at another address on the WAN side, with another next router.
+        """Take another WAN address, with `router` as the next hop.
 
-        miniupnpd tells the interface's present address, and its rules name the interface only, so
-        every mapping holds for the new address at once.
+        miniupnpd reports the interface's current address, and its rules name only the interface,
+        so every mapping applies to the new address at once.
         """
         network.ip_batch(f"address del {self.wan_address}/24 dev wan",
                          f"address add {address}/24 dev wan",
@@ -169,7 +175,7 @@ class Gateway:
         self.wan_address = address
 
     def block(self, external_port: int) -> None:
-        """Let nothing from the internet through to this port; the mapping stays listed."""
+        """Drop everything from the internet to this port; the mapping stays listed."""
         packet_filter.change(f"add element inet lab blocked {{ {external_port} }}\n")
         self._timeline.add("gateway", f"external port {external_port} is blocked")
 
@@ -180,34 +186,34 @@ class Gateway:
 
     def forward_by_hand(self, external_port: int, internal_port: int,
                         address: str = network.DEVICE_ADDRESS) -> None:
-        """Forward a TCP port because the user typed it into the router's own pages."""
+        """Forward a TCP port as the user would on the router's own pages."""
         mapping = Mapping("TCP", external_port, address, internal_port)
         packet_filter.forward(mapping, BY_HAND)
         self._timeline.add("gateway", f"the user forwards {mapping}")
 
     def stop_forwarding_by_hand(self) -> None:
-        """Forget what the user typed in."""
+        """Remove the forwardings made by hand."""
         packet_filter.flush(BY_HAND)
         self._timeline.add("gateway", "the user removes the forwardings made by hand")
 
     def by_hand(self) -> list[Mapping]:
-        """The forwardings that the user typed in, read from the packet filter."""
+        """The forwardings made by hand, read from the packet filter."""
         return packet_filter.mappings(BY_HAND)
 
     def mappings(self) -> list[Mapping]:
-        """The forwardings that clients asked for, read from the packet filter."""
+        """The forwardings that clients requested, read from the packet filter."""
         return packet_filter.mappings()
 
     def listing(self) -> list[Listed]:
-        """What the router itself tells a UPnP client about its mappings."""
-        told = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
-        if "Found valid IGD" not in told:
-            raise LabError(f"the gateway does not list its mappings: {told}")
+        """The mappings as the router lists them to a UPnP client."""
+        listing = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
+        if "Found valid IGD" not in listing:
+            raise LabError(f"the gateway does not list its mappings: {listing}")
         return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
-                for protocol, external, address, internal, words, lease in _LISTED.findall(told)]
+                for protocol, external, address, internal, words, lease in _LISTED.findall(listing)]
 
     def requests(self) -> int:
-        """How often the device asked; the questions of the lab and the neighbour do not count."""
+        """The device's requests; those of the lab and the neighbour do not count."""
         return self.upnp_requests() + self.natpmp_requests()
 
     def upnp_requests(self) -> int:
@@ -230,7 +236,7 @@ class Gateway:
             wait_until(self._answers, "the lab's NAT-PMP server to answer", 5)
 
     def _stop(self) -> None:
-        """End the mapping protocols; the rules in force stay in force."""
+        """Stop the mapping protocols; the rules stay in force."""
         if self.server.running:
             self.server.stop()
             self._http_port += 1
@@ -239,7 +245,7 @@ class Gateway:
             self._natpmp = None
 
     def _forget_leases(self, lost: list[Mapping]) -> None:
-        """Take mappings out of the file from which miniupnpd makes them again when it starts."""
+        """Remove mappings from the file from which miniupnpd restores them at its start."""
         if self._leases.exists():
             gone = tuple(f"{mapping.protocol}:{mapping.external_port}:" for mapping in lost)
             kept = [line for line in self._leases.read_text().splitlines(keepends=True)
@@ -261,7 +267,7 @@ class Gateway:
             "upnp_nat_postrouting_chain=postrouting_miniupnpd", *self._setup.permissions, ""])
 
     def _answers(self) -> bool:
-        """True when a client on the LAN gets through to every protocol on offer."""
+        """True when every protocol on offer answers a client on the LAN."""
         return ((not self._setup.upnp or _description_is_served())
                 and (not self._setup.natpmp or self._public_address_is_told()))
 
@@ -282,7 +288,7 @@ class Gateway:
 
 
 def _udp_exchange(message: bytes, address: str, port: int) -> bytes | None:
-    """One datagram from the neighbour and what came back, if anything did."""
+    """Send one datagram from the neighbour; the answer, or None."""
     with network.inside(network.NEIGHBOUR):
         asking = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
     with asking:

@@ -1,4 +1,4 @@
-"""The device's system log: everything that is sent to /dev/log, kept with its priority."""
+"""The device's system log: everything sent to /dev/log, with its priority."""
 
 from __future__ import annotations
 
@@ -33,7 +33,7 @@ class Message:
 class Messages:
     """Receives and keeps the log; `file` holds the same lines for a human reader.
 
-    Whoever asks gets every line that was sent before, however busy the receiving thread is.
+    A reader gets every line sent before its call, however busy the receiving thread is.
     """
 
     def __init__(self, file: Path) -> None:
@@ -44,7 +44,7 @@ class Messages:
         self._receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
 
     def start(self) -> None:
-        """Open the log socket of this machine's programs."""
+        """Open the log socket."""
         self._receiver.bind(_LOG_SOCKET)
         Path(_LOG_SOCKET).chmod(0o666)
         self.file.parent.mkdir(parents=True, exist_ok=True)
@@ -75,7 +75,7 @@ class Messages:
             self._take_waiting()
 
     def _take_waiting(self) -> None:
-        """Keep the lines that wait in the socket."""
+        """Store the lines waiting in the socket."""
         with self._lock, self.file.open("a", errors="replace") as file:
             while True:
                 try:
@@ -90,7 +90,7 @@ class Messages:
 
 
 def _read(datagram: str) -> Message:
-    """The message in a datagram, which counts as received now."""
+    """Parse a datagram that has just been received."""
     parts = _DATAGRAM.match(datagram)
     if not parts:
         return Message(0, 7, "(unreadable)", datagram, time.monotonic())

@@ -36,29 +36,28 @@ class Names:
             f"--addn-hosts={self._hosts}", f"--pid-file={folder}/pid"], folder / "log")
 
     def start(self) -> None:
-        """Start the server; it must answer a question, if only with 'no such name'."""
+        """Start the server and wait until it answers, if only with 'no such name'."""
         self.server.start(lambda: self._ask("nobody.example") is not None)
 
     def set(self, table: dict[str, str]) -> None:
-        """Add or change names, and return once the server answers so; a pinned name stays."""
+        """Add or change names and wait until the server serves them; a pinned name stays."""
         with self._lock:
             self._table.update(table)
             self._publish(table)
 
     def pin(self, name: str, address: str | None) -> None:
-        """Answer for a name with this address, with None not at all, whatever else is set."""
+        """Resolve a name to this address, or not at all with None, whatever else is set."""
         with self._lock:
             self._pins[name] = address
             self._publish([name])
-        self._timeline.add("names", f"{name} is {address or 'unknown'} from now on, whatever the "
-                                    "service sets")
+        self._timeline.add("names", f"{name} is pinned to {address or 'no address'}")
 
     def unpin(self, name: str) -> None:
-        """Answer for a name again as it was last set."""
+        """Resolve a name again as it was last set."""
         with self._lock:
             del self._pins[name]
             self._publish([name])
-        self._timeline.add("names", f"{name} is again what the service sets")
+        self._timeline.add("names", f"{name} is no longer pinned")
 
     def resolve(self, name: str) -> str:
         """The address a program on the device gets for a name; empty when there is none."""
@@ -66,14 +65,14 @@ class Names:
         return answer[0] if answer else ""
 
     def _publish(self, names: Iterable[str]) -> None:
-        """Give the server its table, and return once it answers for these names accordingly."""
-        table = {**self._table, **self._pins}
+        """Write the server's table and wait until it answers accordingly for these names."""
+        table: dict[str, str | None] = {**self._table, **self._pins}
         self._hosts.write_text("".join(f"{address} {name}\n"
                                        for name, address in table.items() if address))
         self.server.send_signal(signal.SIGHUP)
         for name in names:
             wanted = [table[name]] if table.get(name) else []
-            wait_until(lambda name=name, wanted=wanted: self._ask(name) == wanted,
+            wait_until(lambda: self._ask(name) == wanted,
                        f"dnsmasq to answer {wanted} for {name}", 5, pause=0.01)
 
     def _ask(self, name: str) -> list[str] | None:
@@ -91,7 +90,7 @@ class Names:
                 reply = asking.recv(512)
             except OSError:
                 return None
-        # Each record is 16 bytes: its head, the name compressed to a pointer, and the address.
+        # Each record is 16 bytes: the name as a pointer, the fixed fields, and the address.
         count = struct.unpack(">H", reply[6:8])[0]
         body = reply[len(query):]
         return [socket.inet_ntoa(body[16 * i + 12:16 * i + 16]) for i in range(count)]

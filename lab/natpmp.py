@@ -1,4 +1,4 @@
-"""A NAT-PMP gateway of the lab's own, for what no well-behaved router can be told to do."""
+"""The lab's own NAT-PMP gateway, for behaviour that miniupnpd cannot be made to show."""
 
 from __future__ import annotations
 
@@ -14,7 +14,7 @@ from lab.packet_filter import Mapping
 
 PORT = 5351
 
-_UNSUPPORTED_VERSION, _UNSUPPORTED_OPCODE = 1, 5
+_UNSUPPORTED_VERSION, _NOT_AUTHORIZED, _UNSUPPORTED_OPCODE = 1, 2, 5
 _PROTOCOLS = {1: "UDP", 2: "TCP"}
 _REPLY = 128
 _LOOK_SECONDS = 0.05
@@ -22,26 +22,34 @@ _LOOK_SECONDS = 0.05
 
 @dataclass(frozen=True)
 class Grant:
-    """What the router makes of a request for a mapping.
+    """How the router answers a request for a mapping.
 
-    `port` gives the external port that is granted for the one asked for; a port that somebody
-    else holds is passed over for the next free one. `lease` is the longest lease in seconds.
+    `port` gives the external port granted for a requested one; if that is taken, the next free
+    port is granted. `lease` is the longest lease in seconds. The external ports in `refused` are
+    never granted. From its first request for a mapping on, the device gets each answer `delay`
+    seconds late, in real time.
     """
 
     port: Callable[[int], int]
     lease: int
+    refused: frozenset[int] = frozenset()
+    delay: float = 0
 
 
 class NatPmp:
-    """The server on the router's LAN side; its mappings are rules of the router."""
+    """The server on the router's LAN side; its mappings are rules in the router's packet filter."""
 
     def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str]) -> None:
-        """Leases are in a time that runs `clock` times as fast as ours."""
+        """Leases run in a time that is `clock` times as fast as ours."""
         self._grant = grant
         self._clock = clock
         self._public_address = public_address
         self._born = time.monotonic()
         self._ends: dict[Mapping, float] = {}
+        self._delay = 0.0
+        self._hang_length = 0.0
+        self._hung_until = 0.0
+        self._outgoing: list[tuple[float, bytes, tuple[str, int]]] = []
         self._stopping = threading.Event()
         self._thread = threading.Thread(target=self._serve, daemon=True)
 
@@ -53,8 +61,12 @@ class NatPmp:
         self._socket.bind((address, PORT))
         self._thread.start()
 
+    def hang_once(self, seconds: float) -> None:
+        """Hang for `seconds` at the next request for a mapping, then answer everything."""
+        self._hang_length = seconds
+
     def stop(self) -> None:
-        """Answer no more; what is forwarded stays forwarded."""
+        """Stop answering; existing forwardings stay."""
         self._stopping.set()
         self._thread.join()
 
@@ -62,20 +74,41 @@ class NatPmp:
         with self._socket:
             while not self._stopping.is_set():
                 self._expire()
+                self._send_due()
                 try:
                     request, client = self._socket.recvfrom(1500)
                 except TimeoutError:
                     continue
                 answer = self._answer(request, client[0])
                 if answer:
-                    self._socket.sendto(answer, client)
+                    self._outgoing.append((self._time_to_answer(request, client[0]),
+                                           answer, client))
+                self._send_due()
+
+    def _time_to_answer(self, request: bytes, client: str) -> float:
+        """When the answer is sent, in real time."""
+        now = time.monotonic()
+        if client != network.DEVICE_ADDRESS:
+            return now
+        if request[1] in _PROTOCOLS:
+            self._delay = self._grant.delay
+            if self._hang_length:
+                self._hung_until, self._hang_length = now + self._hang_length, 0.0
+        return max(now + self._delay, self._hung_until)
+
+    def _send_due(self) -> None:
+        now = time.monotonic()
+        for due, answer, client in self._outgoing:
+            if due <= now:
+                self._socket.sendto(answer, client)
+        self._outgoing = [waiting for waiting in self._outgoing if waiting[0] > now]
 
     def _expire(self) -> None:
         for mapping in [mapping for mapping, end in self._ends.items() if end <= self._now()]:
             self._close(mapping)
 
     def _answer(self, request: bytes, client: str) -> bytes:
-        """The answer to a datagram; nothing for one that is no request."""
+        """The answer to a datagram; empty if it is not a request."""
         if len(request) < 2 or request[1] >= _REPLY:
             return b""
         version, operation = request[:2]
@@ -88,6 +121,9 @@ class NatPmp:
         internal, external, lease = struct.unpack_from(">HHI", request, 4)
         if lease == 0:
             return self._unmap(operation, client, internal)
+        if external in self._grant.refused:
+            return (self._head(operation, _NOT_AUTHORIZED)
+                    + struct.pack(">HHI", internal, external, 0))
         return self._map(operation, client, internal, external, lease)
 
     def _map(self, operation: int, client: str, internal: int, external: int,

@@ -1,4 +1,4 @@
-"""Another computer at home, which wants ports of the router for itself."""
+"""Another computer at home, which takes ports of the router."""
 
 from __future__ import annotations
 
@@ -18,7 +18,7 @@ class Neighbour:
         self._timeline = timeline
 
     def hold(self, external_port: int, internal_port: int) -> None:
-        """Take a TCP port of the router, and fail when it does not give exactly this one."""
+        """Map a TCP port of the router; LabError unless it grants exactly this one."""
         if self._gateway.setup.upnp:
             self._ask(f"external {self._gateway.wan_address}:{external_port} TCP is redirected",
                       "upnpc", "-u", self._gateway.description_url, "-e", "neighbour", "-a",
@@ -30,6 +30,6 @@ class Neighbour:
         self._timeline.add("neighbour", f"holds the gateway's TCP port {external_port}")
 
     def _ask(self, success: str, *argv: str) -> None:
-        told = network.output(network.NEIGHBOUR, *argv)
-        if success not in told:
-            raise LabError(f"the gateway refused the neighbour ({' '.join(argv)}):\n{told}")
+        answer = network.output(network.NEIGHBOUR, *argv)
+        if success not in answer:
+            raise LabError(f"the gateway refused the neighbour ({' '.join(argv)}):\n{answer}")

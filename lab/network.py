@@ -1,4 +1,4 @@
-"""Hosts as network namespaces, the cables between them, and ways to act inside a host."""
+"""Hosts as network namespaces, the cables between them, and means to act inside a host."""
 
 from __future__ import annotations
 
@@ -19,8 +19,8 @@ DEVICE_ADDRESS, NEIGHBOUR_ADDRESS = "192.168.77.10", "192.168.77.20"
 GATEWAY_LAN_ADDRESS = "192.168.77.1"
 GATEWAY_WAN_ADDRESS, SERVICE_ADDRESS, RELAY_ADDRESS = "44.128.0.20", "44.128.0.1", "44.128.0.2"
 
-# Switches that pass everything on at once. A hardware address of their own keeps the hosts' ARP
-# tables right when a cable is plugged in or out.
+# Switches that forward from the start. A fixed hardware address keeps the hosts' ARP tables valid
+# when a cable is plugged in or pulled out.
 _SWITCH = "link add {} address {} type bridge stp_state 0 forward_delay 0 mcast_snooping 0"
 _SWITCHES = {
     GATEWAY: (_SWITCH.format("lan", "02:00:00:00:77:01"),
@@ -54,7 +54,7 @@ def output(host: str, *argv: str) -> str:
 
 @contextmanager
 def inside(host: str) -> Iterator[None]:
-    """Let the calling thread live on a host: sockets and threads made here belong to it."""
+    """Move the calling thread to a host: sockets and threads created meanwhile belong to it."""
     here = os.open(f"/proc/self/task/{_libc.gettid()}/ns/net", os.O_RDONLY)
     there = os.open(f"/run/netns/{host}", os.O_RDONLY)
     try:
@@ -67,10 +67,10 @@ def inside(host: str) -> Iterator[None]:
 
 
 def raise_home_network(own_router: bool = False) -> None:
-    """Make the hosts at home, the gateway and the internet, with addresses and default routes.
+    """Create the hosts at home, the gateway and the internet, with addresses and default routes.
 
-    With `own_router` the device is the router of its home: it has the gateway's internet address
-    and the LAN on its other side. The gateway is there, but its way to the internet is unplugged.
+    With `own_router` the device routes its home: it has the gateway's internet address, and the
+    LAN on its other side. The gateway exists, but its internet cable is unplugged.
     """
     hosts = (DEVICE, NEIGHBOUR, GATEWAY, INTERNET)
     ip_batch(*(f"netns add {host}" for host in hosts))
@@ -95,11 +95,17 @@ def raise_home_network(own_router: bool = False) -> None:
 
 
 def plug(host: str, port: str, switch_host: str, switch: str) -> None:
-    """Lay a cable from a new port of a host to a switch on another host."""
+    """Connect a new port of a host to a switch on another host."""
     end = cable_end(host, port)
     ip_batch(f"link add {port} netns {host} type veth peer name {end} netns {switch_host}")
     ip_batch(f"link set {end} master {switch} up", host=switch_host)
     ip_batch(f"link set {port} up", host=host)
+
+
+def enable_forwarding(host: str) -> None:
+    """Make a host pass packets on between its networks."""
+    with inside(host):
+        Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
 
 
 def cable_end(host: str, port: str) -> str:

@@ -1,15 +1,13 @@
-"""A device that is itself the home's router, of the same maker: its scripts and their effect."""
+"""A device that is itself the home router, by the same maker: its scripts and their effect."""
 
 from __future__ import annotations
 
-import json
-import subprocess
 import threading
 from pathlib import Path
+from typing import Any
 
-from lab import network
+from lab import network, nft
 from lab.packet_filter import Mapping
-from lab.support import run_tool
 from lab.timeline import Timeline
 
 _FOLDER = Path("/run/own_router")
@@ -40,7 +38,7 @@ echo "getip.sh $1" >>{_CALLS}
 cat "{_FOLDER}/$1"
 """
 
-# An external port is forwarded once, and only what was added can be removed.
+# An external port is forwarded only once, and only an added forward can be removed.
 _HELPER = f"""#!/bin/sh
 # The router's port forwards: tavik_helper.sh list
 #   tavik_helper.sh add PROTOCOL,PORT,LANADDRESS,INTERNALPORT,DESCRIPTION
@@ -65,7 +63,7 @@ esac
 
 
 class OwnRouter:
-    """The router in the device; it lets nobody in from the internet but through its forwards."""
+    """The router in the device; its forwards are the only way in from the internet."""
 
     def __init__(self, timeline: Timeline) -> None:
         self._timeline = timeline
@@ -81,31 +79,31 @@ class OwnRouter:
             file.write_text(text)
         _install("getip.sh", _GET_IP)
         _install("tavik_helper.sh", _HELPER)
-        run_tool(*network.command(network.DEVICE, "nft", "-f", "-"), text=_RULES)
+        nft.change(network.DEVICE, _RULES)
         threading.Thread(target=self._watch, daemon=True).start()
 
     def predefine(self, first: int, last: int, internal_port: int, owner: str = "BRENVIK",
                   lan_address: str | None = None) -> None:
-        """Forward TCP ports on the router's own account; the scripts cannot take that away.
+        """Add pre-defined TCP forwards, which the scripts cannot remove.
 
-        Without `lan_address` to the device itself; owner OTHER stands for another LAN device.
+        They lead to the device itself unless `lan_address` is given; owner OTHER is another LAN
+        device.
         """
         address = lan_address or self._lan_address
         ports = str(first) if first == last else f"{first}-{last}"
         elements = ", ".join(f"{port} : {address} . {internal_port}"
                              for port in range(first, last + 1))
-        run_tool(*network.command(network.DEVICE, "nft", "create", "element", "inet", "router",
-                                  "TCP", f"{{ {elements} }}"))
+        nft.change(network.DEVICE, f"create element inet router TCP {{ {elements} }}\n")
         with _PREDEFINED.open("a") as file:
             file.write(f"{owner},TCP,{ports},{address},{internal_port},pre-defined\n")
 
     def go_offline(self) -> None:
-        """Have no address on the internet side to tell."""
+        """Report no internet address from now on."""
         _WAN_ADDRESS.write_text("\n")
         self._timeline.add("router", "has no internet address")
 
     def go_online(self) -> None:
-        """Have the address on the internet side again."""
+        """Report the internet address again."""
         _WAN_ADDRESS.write_text(f"{self._wan_address}\n")
         self._timeline.add("router", f"has the internet address {self._wan_address}")
 
@@ -117,32 +115,27 @@ class OwnRouter:
         """The forwards in force, read from the packet filter."""
         found: list[Mapping] = []
         for protocol in ("TCP", "UDP"):
-            answer = network.output(network.DEVICE, "nft", "-j", "list", "map", "inet", "router",
-                                    protocol)
-            held = next(entry["map"] for entry in json.loads(answer)["nftables"] if "map" in entry)
+            listed = nft.listed(network.DEVICE, "map", "inet", "router", protocol)
+            held = next(entry["map"] for entry in listed if "map" in entry)
             found += [_mapping(protocol, element) for element in held.get("elem", [])]
         return sorted(found)
 
     def calls(self) -> list[str]:
-        """The scripts' names with their arguments, in the order in which they were run."""
+        """The script calls with their arguments, in order."""
         return _CALLS.read_text().splitlines()
 
     def _watch(self) -> None:
-        """Tell the timeline of every change of the forwards, whoever made it."""
+        """Record every change of the forwards in the timeline, whoever made it."""
         words = {"add": "forwards", "create": "forwards", "delete": "no longer forwards"}
-        monitor = subprocess.Popen(
-            network.command(network.DEVICE, "nft", "-j", "monitor", "elements"),
-            stdout=subprocess.PIPE, text=True)
-        for line in monitor.stdout:
-            for change, subject in json.loads(line).items():
-                changed = subject.get("element", {})
-                if change in words and changed.get("table") == "router":
-                    for element in changed["elem"]["set"]:
-                        mapping = _mapping(changed["name"], element)
-                        self._timeline.add("router", f"{words[change]} {mapping}")
+        for verb, subject in nft.monitor(network.DEVICE, "elements"):
+            changed = subject.get("element", {})
+            if verb in words and changed.get("table") == "router":
+                for element in changed["elem"]["set"]:
+                    mapping = _mapping(changed["name"], element)
+                    self._timeline.add("router", f"{words[verb]} {mapping}")
 
 
-def _mapping(protocol: str, element: list) -> Mapping:
+def _mapping(protocol: str, element: list[Any]) -> Mapping:
     """Read one element of a map; the filter gives it as [port, {"concat": [address, port]}]."""
     external_port, target = element
     return Mapping(protocol, external_port, *target["concat"])

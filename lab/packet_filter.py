@@ -2,21 +2,19 @@
 
 from __future__ import annotations
 
-import json
 import socket
-import subprocess
 from collections.abc import Callable
 from dataclasses import dataclass
+from typing import Any
 
-from lab import network
-from lab.support import run_tool
+from lab import network, nft
 
 _PROTOCOLS = {6: "TCP", 17: "UDP"}
 # miniupnpd compares protocol and target as raw bits of the IPv4 header, at these offsets.
 _PROTOCOL_BIT, _TARGET_BIT = 72, 128
 
-# Closed towards the internet except for what a mapping or the user opens. The table "lab" is no
-# part of the router: it counts what the device asks the router, and makes the router fail.
+# Closed towards the internet except for what a mapping or the user opens. The table "lab" is not
+# part of the router: it counts the device's requests to the router and makes the router fail.
 _RULES = f"""
 table inet gate {{
     chain miniupnpd {{ }}
@@ -82,7 +80,7 @@ class Mapping:
 
 @dataclass(frozen=True)
 class Chains:
-    """The two chains of one source of forwardings: one redirects, the other lets in."""
+    """The two chains of one source of forwardings: one redirects packets, the other admits them."""
 
     redirect: str
     admit: str
@@ -93,12 +91,12 @@ BY_HAND = Chains("prerouting_by_hand", "by_hand")
 
 
 def change(rules: str) -> None:
-    """Let the router's packet filter read some lines of nft's language."""
-    run_tool(*network.command(network.GATEWAY, "nft", "-f", "-"), text=rules)
+    """Apply rules to the router's packet filter."""
+    nft.change(network.GATEWAY, rules)
 
 
 def load() -> None:
-    """Give the router its rules, with nothing forwarded yet."""
+    """Load the router's rules, with nothing forwarded yet."""
     change(_RULES)
 
 
@@ -108,7 +106,7 @@ def mappings(chains: Chains = ASKED_FOR) -> list[Mapping]:
 
 
 def forward(mapping: Mapping, chains: Chains = ASKED_FOR) -> None:
-    """Forward, with rules that miniupnpd reads as its own."""
+    """Add a forwarding, with rules that miniupnpd takes for its own."""
     number = {name: number for number, name in _PROTOCOLS.items()}[mapping.protocol]
     protocol = f'iif "wan" meta l4proto {number} @nh,{_PROTOCOL_BIT},8 {number}'
     change(f"add rule inet gate {chains.redirect} {protocol} th dport {mapping.external_port} "
@@ -118,7 +116,7 @@ def forward(mapping: Mapping, chains: Chains = ASKED_FOR) -> None:
 
 
 def remove(mapping: Mapping) -> None:
-    """Take out both rules of a forwarding that somebody asked for."""
+    """Delete both rules of a forwarding that a client requested."""
     let_in = {_PROTOCOL_BIT: mapping.protocol, "dport": mapping.internal_port,
               _TARGET_BIT: _number(mapping.internal_address)}
     unwanted = [rule for rule in _rules(ASKED_FOR.redirect) if _mapping(rule["expr"]) == mapping]
@@ -128,40 +126,32 @@ def remove(mapping: Mapping) -> None:
 
 
 def flush(chains: Chains) -> None:
-    """Take out every forwarding of one source."""
+    """Delete every forwarding of one source."""
     change(f"flush chain inet gate {chains.redirect}\nflush chain inet gate {chains.admit}\n")
 
 
 def counted(name: str) -> int:
     """The packets that one of the lab's counters saw."""
-    return _listed("counter", "inet", "lab", name)[-1]["counter"]["packets"]
+    found = nft.listed(network.GATEWAY, "counter", "inet", "lab", name)
+    return int(found[-1]["counter"]["packets"])
 
 
 def watch(tell: Callable[[str, Mapping], None]) -> None:
-    """Tell of every forwarding that is added ("add") or deleted ("delete"), for ever."""
-    monitor = subprocess.Popen(
-        network.command(network.GATEWAY, "nft", "-j", "monitor", "rules"),
-        stdout=subprocess.PIPE, text=True)
-    for line in monitor.stdout:
-        for what, subject in json.loads(line).items():
-            rule = subject.get("rule", {})
-            if what in ("add", "delete") and rule.get("chain") == ASKED_FOR.redirect:
-                tell(what, _mapping(rule["expr"]))
+    """Call `tell` for each forwarding that is added ("add") or deleted ("delete"), for ever."""
+    for verb, subject in nft.monitor(network.GATEWAY, "rules"):
+        rule = subject.get("rule", {})
+        if verb in ("add", "delete") and rule.get("chain") == ASKED_FOR.redirect:
+            tell(verb, _mapping(rule["expr"]))
 
 
-def _listed(*what: str) -> list[dict]:
-    found = network.output(network.GATEWAY, "nft", "-j", "-a", "list", *what)
-    return json.loads(found)["nftables"]
-
-
-def _rules(chain: str) -> list[dict]:
-    listed = _listed("chain", "inet", "gate", chain)
+def _rules(chain: str) -> list[nft.Object]:
+    listed = nft.listed(network.GATEWAY, "chain", "inet", "gate", chain)
     return [entry["rule"] for entry in listed if "rule" in entry]
 
 
-def _compared(expressions: list[dict]) -> dict[str | int, str | int]:
-    """What a rule compares with what, by the name of the field or its offset in the header."""
-    found = {}
+def _compared(expressions: list[nft.Object]) -> dict[str | int, Any]:
+    """The values a rule matches, by the name of the header field or its bit offset."""
+    found: dict[str | int, Any] = {}
     for expression in expressions:
         match = expression.get("match", {})
         payload = match.get("left", {}).get("payload")
@@ -171,7 +161,7 @@ def _compared(expressions: list[dict]) -> dict[str | int, str | int]:
     return found
 
 
-def _mapping(expressions: list[dict]) -> Mapping:
+def _mapping(expressions: list[nft.Object]) -> Mapping:
     fields = _compared(expressions)
     target = next(part["dnat"] for part in expressions if "dnat" in part)
     return Mapping(fields[_PROTOCOL_BIT], fields["dport"], target["addr"], target["port"])

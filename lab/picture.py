@@ -29,7 +29,7 @@ _UNPRINTABLE = re.compile("[^\t\n\r\x20-\ud7ff\ue000-\ufffd\U00010000-\U0010ffff
 
 @dataclass
 class _Entry:
-    """An event of the list, with every moment at which its actor told it again."""
+    """An event in the list, with the times at which its actor repeated it."""
 
     number: int
     event: Event
@@ -37,9 +37,9 @@ class _Entry:
 
     @property
     def colour(self) -> str:
-        """A status has its own colour, everything else its actor's."""
+        """A status has its own colour, any other event its actor's."""
         status = self.event.what.removeprefix(_STATUS)
-        return STATUS_COLOURS.get(status) or _ACTOR_COLOURS.get(self.event.who, _OTHER)
+        return STATUS_COLOURS.get(status, _ACTOR_COLOURS.get(self.event.who, _OTHER))
 
     def lines(self) -> list[str]:
         """The text, cut to fit a column."""
@@ -49,13 +49,13 @@ class _Entry:
         return textwrap.wrap(text, _LIST_LETTERS) or [""]
 
     def height(self) -> int:
-        """Room in the list; a heading stands off from what is above."""
+        """Height in the list; a heading has some space above it."""
         return _LINE * len(self.lines()) + (10 if self.event.who == STORY else 3)
 
 
 @dataclass
 class _Mark:
-    """The number of an entry in its lane, or of the first and last that are too close."""
+    """The number of an entry in its lane, or a range where entries are too close."""
 
     left: float
     first: int
@@ -66,12 +66,12 @@ class _Mark:
 
     @property
     def width(self) -> int:
-        """Room for the numbers."""
+        """Width of the box around the numbers."""
         return len(str(self)) * _LETTER + 10
 
 
 class _Scale:
-    """Seconds to places; the last status finds room for its word, late headings for some words."""
+    """Seconds to pixels, with space left for the last status and the start of late headings."""
 
     def __init__(self, events: Sequence[Event]) -> None:
         words = [(event.when, _LEAST_LETTERS) for event in events if event.who == STORY]
@@ -82,11 +82,11 @@ class _Scale:
             if when > 0])
 
     def x(self, when: float) -> float:
-        """Where a moment is."""
+        """The horizontal position of a moment."""
         return _LEFT + when * self._unit
 
     def ticks(self) -> list[float]:
-        """Round seconds at some distance from each other."""
+        """Round numbers of seconds, at least 60 pixels apart."""
         steps = (base * 10 ** power for power in range(-1, 9) for base in (1, 2, 5))
         step = next(step for step in steps if step * self._unit >= 60)
         return [count * step for count in range(int((_RIGHT - _LEFT) / self._unit / step) + 1)]
@@ -110,7 +110,8 @@ class _Sheet:
 
     def write(self, text: str, x: float, y: float, **attributes: str | float) -> None:
         """Add a line of text."""
-        self.draw("text", text, **{"x": x, "y": y, "font_size": 14, **attributes})
+        placed: dict[str, str | float] = {"x": x, "y": y, "font_size": 14}
+        self.draw("text", text, **placed | attributes)
 
     def mark(self, mark: _Mark, y: float, colour: str) -> None:
         """Add numbers in a box with round corners."""
@@ -148,7 +149,7 @@ def svg(title: str, events: Sequence[Event]) -> str:
 
 
 def _entries(events: Sequence[Event]) -> list[_Entry]:
-    """Within a step of the story, an actor's repetition of its last words makes no new entry."""
+    """Merge what an actor repeats within a step into one entry."""
     entries: list[_Entry] = []
     latest: dict[str, _Entry] = {}
     number = 0
@@ -167,14 +168,14 @@ def _entries(events: Sequence[Event]) -> list[_Entry]:
 
 
 def _statuses(events: Sequence[Event]) -> list[tuple[float, str]]:
-    """When the device's status became what."""
+    """The device's status changes, with their times."""
     told = [(event.when, event.what.removeprefix(_STATUS)) for event in events
             if event.who == "device" and event.what.startswith(_STATUS)]
     return [change for before, change in zip([(0.0, ""), *told], told) if change[1] != before[1]]
 
 
 def _heading(step: Event, scale: _Scale) -> str:
-    """The words of a step as far as there is room; the list has them all."""
+    """The text of a step, cut to the available width; the list has it in full."""
     letters = int((_RIGHT - scale.x(step.when)) / _LETTER)
     return textwrap.shorten(step.what, min(_HEADING_LETTERS, letters), placeholder=" \u2026")
 
@@ -192,7 +193,7 @@ def _step_rows(events: Sequence[Event], scale: _Scale) -> list[tuple[Event, int]
 
 
 def _marks(entries: Sequence[_Entry], scale: _Scale) -> list[_Mark]:
-    """Marks that do not overlap: moved to the right a little, else joined with the one before."""
+    """Marks that do not overlap: moved to the right a little, else merged into the previous one."""
     marks: list[_Mark] = []
     for entry in entries:
         mark = _Mark(0, entry.number, entry.number)
@@ -233,12 +234,13 @@ def _draw_steps(sheet: _Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]]
     for step, row in steps:
         x, y = scale.x(step.when), _HEADINGS_TOP + row * _HEADING
         sheet.draw("line", x1=x, x2=x, y1=y + 2, y2=end + 6, stroke=_STORY, stroke_dasharray="4 3")
-        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13, font_weight="bold")
+        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13,
+                    font_weight="bold")
 
 
 def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],
                  y: float) -> None:
-    """A bar from each change to the next, the last one as far as the picture goes."""
+    """A bar from each change to the next, the last one up to the right edge."""
     sheet.write("status", _COLUMNS[0], y + 24, font_weight="bold")
     places = [scale.x(when) for when, _ in changes] + [_RIGHT]
     for (_, word), x, end in zip(changes, places, places[1:]):
@@ -249,7 +251,7 @@ def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, st
 
 
 def _draw_lane(sheet: _Sheet, scale: _Scale, entries: Sequence[_Entry], y: float) -> None:
-    """A stroke at every moment, and above the strokes the marks."""
+    """A tick at every event, and the marks above the ticks."""
     who, base = entries[0].event.who, y + _LANE - 3
     colour = _ACTOR_COLOURS.get(who, _OTHER)
     sheet.write(who, _COLUMNS[0], y + 24, fill=colour, font_weight="bold")

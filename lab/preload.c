@@ -1,12 +1,11 @@
 /* Loaded into the daemon and its shell commands before libfaketime.
  *
- * libfaketime makes pauses and the clock run faster. Waiting for the network is another matter: the
- * other side answers in real time however fast the device's clock runs. So poll waits a part of
- * what it is asked for, enough for hosts on one machine, whatever the clock's factor.
- * libnatpmp waits with select and counts its tries by gettimeofday. Both are real, or it asks again
- * before a busy machine has answered, and takes the answer for that of its next question.
+ * libfaketime speeds up pauses and the clock. Network peers still answer in real time, so poll
+ * waits a fixed fraction of the requested time, whatever the clock's factor: enough for hosts on one
+ * machine. libnatpmp waits with select and times its retries with gettimeofday. Both stay in real
+ * time; otherwise it would repeat a request before a busy machine has answered.
  *
- * kill refuses the signal whose number stands in REFUSED_SIGNAL, as a system under duress might.
+ * kill fails with EPERM for the signal whose number is in the file REFUSED_SIGNAL.
  */
 #define _GNU_SOURCE
 #include <errno.h>

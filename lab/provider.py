@@ -1,12 +1,9 @@
-"""The internet provider that puts its customers behind a NAT of its own."""
+"""An internet provider that puts its customers behind its own NAT."""
 
 from __future__ import annotations
 
-from pathlib import Path
-
-from lab import network
+from lab import network, nft
 from lab.gateway import Gateway
-from lab.support import run_tool
 from lab.timeline import Timeline
 
 HOST = "provider"
@@ -14,7 +11,7 @@ ADDRESS, CUSTOMER_ADDRESS = "44.128.0.21", "44.128.1.20"
 _ROUTER_ADDRESS = "44.128.1.1"
 _CABLE = network.cable_end(network.GATEWAY, "wan")
 
-# Nobody on the internet reaches a customer who did not call first.
+# The internet cannot open a connection to a customer.
 _RULES = """
 table inet carrier {
     chain forward {
@@ -35,7 +32,7 @@ table inet carrier {
 
 
 class Provider:
-    """The box between the router and the internet, once it is inserted."""
+    """The provider's NAT between the router and the internet, once inserted."""
 
     def __init__(self, gateway: Gateway, timeline: Timeline) -> None:
         self._gateway = gateway
@@ -43,14 +40,13 @@ class Provider:
         self._direct_address = ""
 
     def insert(self) -> None:
-        """Plug the router into the provider's box instead of the internet."""
+        """Plug the router into the provider's NAT instead of the internet."""
         network.ip_batch(f"netns add {HOST}")
         network.plug(HOST, "net", network.INTERNET, "net")
         network.ip_batch(f"address add {ADDRESS}/24 dev net",
                          f"route add default via {network.SERVICE_ADDRESS}", host=HOST)
-        with network.inside(HOST):
-            Path("/proc/sys/net/ipv4/ip_forward").write_text("1")
-        run_tool(*network.command(HOST, "nft", "-f", "-"), text=_RULES)
+        network.enable_forwarding(HOST)
+        nft.change(HOST, _RULES)
         network.ip_batch(f"link set {_CABLE} nomaster netns {HOST}", host=network.INTERNET)
         network.ip_batch(f"address add {_ROUTER_ADDRESS}/24 dev {_CABLE}",
                          f"link set {_CABLE} up", host=HOST)
@@ -60,10 +56,11 @@ class Provider:
                            f"puts the gateway, now {CUSTOMER_ADDRESS}, behind {ADDRESS}")
 
     def remove(self) -> None:
-        """Plug the router into the internet again, under its address of before."""
+        """Plug the router into the internet again, with its previous address."""
         network.ip_batch(f"link set {_CABLE} netns {network.INTERNET}", "link delete net",
                          host=HOST)
         network.ip_batch(f"link set {_CABLE} master net up", host=network.INTERNET)
         network.ip_batch(f"netns delete {HOST}")
         self._gateway.take_wan_address(self._direct_address, network.SERVICE_ADDRESS)
-        self._timeline.add("provider", f"gives the gateway {self._direct_address} of its own")
+        self._timeline.add("provider",
+                           f"gives the gateway its own address {self._direct_address} again")

@@ -1,4 +1,4 @@
-"""The relay: an openvpn server that lets the device in by its credentials."""
+"""The relay: an openvpn server that admits the device by its credentials."""
 
 from __future__ import annotations
 
@@ -34,7 +34,7 @@ tmp-dir {folder}
 management {folder}/management unix
 verb 3
 """
-# openvpn hands over a file of two lines, user name and password.
+# openvpn passes a file of two lines, user name and password.
 _CHECK = """#!/bin/sh
 exec cmp -s "$1" {folder}/credentials
 """
@@ -67,15 +67,15 @@ class Relay:
                              ["openvpn", "--config", str(folder / "server.conf")], folder / "log")
 
     def start(self) -> None:
-        """Start the server; its management console must answer and its tunnel device stand."""
+        """Start the server and wait until its tunnel is up and its management console answers."""
         if not self._folder.exists():
             self._write_files()
-        before = self._told(_READY)
-        self.server.start(lambda: self._told(_READY) > before and self._status())
+        before = self._logged(_READY)
+        self.server.start(lambda: self._logged(_READY) > before and self._status())
 
     def connections(self) -> int:
-        """How often a client was let in since the first start, the same one again included."""
-        return self._told(_LET_IN)
+        """How many logins the server has accepted since its first start."""
+        return self._logged(_LET_IN)
 
     def _write_files(self) -> None:
         self._folder.mkdir(parents=True)
@@ -89,13 +89,13 @@ class Relay:
         check.write_text(_CHECK.format(folder=self._folder))
         check.chmod(0o755)
 
-    def _told(self, words: str) -> int:
-        """How often the server's log has these words."""
+    def _logged(self, words: str) -> int:
+        """How often the server's log contains these words."""
         log = self.server.log
         return log.read_text(errors="replace").count(words) if log.exists() else 0
 
     def client_address(self) -> str:
-        """The address inside the tunnel of the connected device; empty when there is none."""
+        """The connected device's address inside the tunnel; empty when it is not connected."""
         for line in self._status().splitlines():
             fields = line.split(",")
             if fields[0] == "CLIENT_LIST" and fields[1] == self._account.device_id:
@@ -103,7 +103,7 @@ class Relay:
         return ""
 
     def _status(self) -> str:
-        """What the management console says about the clients; empty when it does not answer."""
+        """What the management console reports about clients; empty when it does not answer."""
         console = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
         with console:
             console.settimeout(2)

@@ -1,8 +1,8 @@
-"""The closed world a lab runs in: own network, processes, mounts, users and host name.
+"""The sandbox a lab runs in: its own network, processes, mounts, users and host name.
 
-`run` starts a Python module as the first process of fresh namespaces. When that process or the
-one that called `run` goes away, for whatever reason, the kernel ends everything inside and drops
-the namespaces with their mounts, so nothing has to be cleaned up by hand.
+`run` starts a Python module as the first process of new namespaces. When that process or the caller
+of `run` ends, for whatever reason, the kernel kills everything inside and drops the namespaces with
+their mounts, so nothing is left to clean up.
 """
 
 from __future__ import annotations
@@ -23,7 +23,7 @@ FORBIDDEN = 77
 PROJECT = Path(__file__).resolve().parent.parent
 PYTHON = "/usr/bin/python3"
 
-# unshare outlives a killed parent unless it is told not to; its child then dies with it.
+# Without setpriv, unshare would outlive a killed parent; unshare's own child dies with it.
 _UNSHARE = ["setpriv", "--pdeathsig", "KILL", "unshare", "--user", "--map-root-user", "--net",
             "--mount", "--pid", "--uts", "--fork", "--mount-proc", "--kill-child"]
 _PROBE = "mount -t tmpfs probe /run && ip netns add probe && nft add table inet probe"
@@ -46,7 +46,7 @@ def is_inside() -> bool:
 
 @functools.cache
 def why_forbidden() -> str | None:
-    """None where this machine lets us make namespaces, else the reason in one line."""
+    """None where this machine allows namespaces, else the reason in one line."""
     try:
         probe = subprocess.run([*_UNSHARE, "sh", "-c", _PROBE], capture_output=True, text=True,
                                check=False)
@@ -54,16 +54,16 @@ def why_forbidden() -> str | None:
         return f"{missing.filename} is not installed"
     if probe.returncode == 0:
         return None
-    return (probe.stderr.strip().splitlines() or ["unshare failed without a word"])[-1]
+    return (probe.stderr.strip().splitlines() or ["unshare failed without a message"])[-1]
 
 
 def run(module: str, arguments: list[str], timeout: float | None = None, capture: bool = False,
         keep_open: tuple[int, ...] = ()) -> subprocess.CompletedProcess[str]:
     """Run `python -m module arguments` as process 1 of a new sandbox and wait for its end.
 
-    It finds the descriptors of `keep_open` under the same numbers: files of the machine outside.
-    Ctrl-C reaches the module through the terminal and is left to it; a SIGTERM or SIGHUP for the
-    caller, a second Ctrl-C and the timeout end the sandbox at once.
+    The descriptors of `keep_open`, files outside the sandbox, keep their numbers inside. Ctrl-C
+    reaches the module through the terminal and is left to it; a SIGTERM or SIGHUP for the caller, a
+    second Ctrl-C and the timeout end the sandbox at once.
     """
     read_end, write_end = os.pipe()
     environment = dict(os.environ, PYTHONPATH=str(PROJECT), PYTHONDONTWRITEBYTECODE="1",
@@ -85,13 +85,13 @@ def run(module: str, arguments: list[str], timeout: float | None = None, capture
 
 
 def pid_outside() -> int:
-    """Number of this sandbox's first process as the machine outside sees it; readable once."""
+    """Pid of this sandbox's first process as seen from outside; can be read once."""
     with os.fdopen(int(os.environ[_PID_PIPE])) as pipe:
         return int(pipe.read())
 
 
 def _tell_pid(process: subprocess.Popen[str], write_end: int) -> None:
-    """Send the first process its own outside number, which it cannot see from in there."""
+    """Send the first process its outside pid, which it cannot see itself."""
     with os.fdopen(write_end, "w") as pipe:
         while process.poll() is None:
             found = subprocess.run(["pgrep", "-P", str(process.pid)], capture_output=True,
@@ -103,7 +103,7 @@ def _tell_pid(process: subprocess.Popen[str], write_end: int) -> None:
 
 @contextmanager
 def _ending_with(process: subprocess.Popen[str]) -> Iterator[None]:
-    """Let the signals that end this process end the sandbox first."""
+    """Make the signals that end this process end the sandbox first."""
     received: list[int] = []
 
     def on_signal(number: int, _frame: object) -> None:
@@ -124,14 +124,14 @@ def _mount(*arguments: str) -> None:
     run_tool("mount", *arguments)
 
 
-def _hold(paths: list[Path]) -> list[tuple[int, Path]]:
-    """Open what the private folders would cover, so that it can be shown again afterwards."""
+def _open_hidden(paths: list[Path]) -> list[tuple[int, Path]]:
+    """Open the paths that the private folders will hide, so that they can be mounted again."""
     covered = tuple(f"{folder}/" for folder in _PRIVATE)
     return [(os.open(path, os.O_PATH), path) for path in paths
             if str(path).startswith(covered) and path.exists()]
 
 
-def _show_again(held: list[tuple[int, Path]]) -> None:
+def _remount(held: list[tuple[int, Path]]) -> None:
     for number, path in held:
         folder = path if stat.S_ISDIR(os.fstat(number).st_mode) else path.parent
         folder.mkdir(parents=True, exist_ok=True)
@@ -142,7 +142,7 @@ def _show_again(held: list[tuple[int, Path]]) -> None:
 
 
 def _private_devices() -> None:
-    """A /dev of our own with only what the servers need, so that /dev/log is ours too."""
+    """Mount a private /dev with only what the servers need, and with a /dev/log of its own."""
     host = Path("/mnt/dev")
     host.mkdir()
     _mount("--rbind", "/dev", str(host))
@@ -157,7 +157,7 @@ def _private_devices() -> None:
 
 
 def _private_etc() -> None:
-    """An /etc that shows the host's files and can take the folders the lab adds."""
+    """Mount an /etc that shows the host's files and lets the lab add folders."""
     host = Path("/mnt/etc")
     host.mkdir()
     _mount("--rbind", "/etc", str(host))
@@ -174,20 +174,20 @@ def _private_etc() -> None:
     Path("/etc/ssl/openssl.cnf").symlink_to(host / "ssl/openssl.cnf")
 
 
-def _furnish() -> None:
-    """Replace every place a server or the daemon writes to by a private one."""
-    held = _hold([PROJECT, binary()])
+def _set_up() -> None:
+    """Mount a private folder over each one that a server or the daemon writes to."""
+    held = _open_hidden([PROJECT, binary()])
     _mount("-t", "tmpfs", "lab", "/mnt")
     _private_devices()
     _private_etc()
     _mount("-t", "tmpfs", "-o", "mode=755", "lab-run", "/run")
     _mount("-t", "tmpfs", "-o", "mode=1777", "lab-tmp", "/tmp")
-    _show_again(held)
+    _remount(held)
 
 
 def main() -> None:
-    """Furnish the sandbox, then become the wanted module (still process 1)."""
-    _furnish()
+    """Set up the sandbox, then become the wanted module (still process 1)."""
+    _set_up()
     os.chdir(PROJECT)
     os.execv(PYTHON, [PYTHON, "-m", *sys.argv[1:]])
 

@@ -1,4 +1,4 @@
-"""A situation, stated in a few words, and the lab raised to play it."""
+"""A situation, stated in a few words, and the lab set up for it."""
 
 from __future__ import annotations
 
@@ -29,11 +29,11 @@ _LOG_LINES = 150
 
 @dataclass(frozen=True)
 class Situation:
-    """What is special about a run; everything else is as usual.
+    """How a run differs from the default.
 
-    `static` and `dynamic` are settings of the device's two files; `clock` makes the device's time
-    run faster by that factor, and `hasty` the time limit of its transfers with it. With
-    `own_router` the device is itself the router of its home.
+    `static` and `dynamic` are settings of the device's two files. The device's time runs `clock`
+    times as fast, with `hasty` also the time limit of its transfers. With `own_router` the device
+    is itself the home router.
     """
 
     gateway: GatewaySetup = GatewaySetup()
@@ -46,13 +46,13 @@ class Situation:
 
 
 class Lab:
-    """The raised network with everything in it. It lives as long as its sandbox, one per run."""
+    """The network with everything in it; there is one per sandbox, and it ends with it."""
 
     def __init__(self, situation: Situation, timeline: Timeline) -> None:
         self.situation = situation
         self.timeline = timeline
         self.account = Account()
-        self.daemon: Daemon | None = None
+        self._daemon: Daemon | None = None
         socket.sethostname(self.account.host_name)
         network.raise_home_network(situation.own_router)
         authority = Authority(_FOLDER / "authority")
@@ -69,7 +69,7 @@ class Lab:
         self._start()
 
     def _start(self) -> None:
-        """Start what answers first, so that each can be asked from where its clients are."""
+        """Start servers before their clients, so that each can be checked from a client's host."""
         self.device.messages.start()
         self.names.start()
         self.gateway.start()
@@ -83,40 +83,46 @@ class Lab:
     def start_daemon(self, *options: str) -> Daemon:
         """Run the daemon on the device."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
-        self.daemon = Daemon(options, self.situation.clock, self.situation.hasty)
-        return self.daemon
+        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty)
+        return self._daemon
+
+    @property
+    def daemon(self) -> Daemon:
+        """The daemon that was started last; LabError before the first start."""
+        if self._daemon is None:
+            raise LabError("no daemon was started")
+        return self._daemon
 
     def step(self, heading: str) -> None:
-        """Begin the next part of the story; a failure report shows the device's log from here."""
+        """Begin the next step; a failure report shows the device's log from here on."""
         self.timeline.step(heading)
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""
-        assert self.daemon is not None
-        self.timeline.add("device", f"pelorus gets {signal.Signals(number).name}")
+        self.timeline.add("device", f"pelorus receives {signal.Signals(number).name}")
         how = self.daemon.stop(number)
-        self.timeline.add("device", f"pelorus ended by {how}")
+        self.timeline.add("device", f"pelorus ended with {how}")
         return how
 
     def wait_for(self, condition: Callable[[], Seen], what: str, seconds: float) -> Seen:
-        """Wait for a state while the daemon runs; its death ends the waiting at once."""
+        """Wait for a state; LabError at once if the daemon ends meanwhile."""
 
         def seen() -> Seen:
-            if self.daemon and self.daemon.ended():
-                raise LabError(f"the daemon ended ({self.daemon.ended()}) before {what}")
+            if self._daemon and self._daemon.ended():
+                raise LabError(f"the daemon ended ({self._daemon.ended()}) before {what}")
             return condition()
 
         return wait_until(seen, what, seconds)
 
     def report(self) -> str:
-        """Everything one needs to see when a run went wrong."""
+        """Everything needed to see why a run failed."""
         log = [str(message) for message in self.device.messages.all
                if message.when >= self.timeline.last_step]
         sections = {
             "timeline": str(self.timeline),
-            f"device log of the last part, {min(len(log), _LOG_LINES)} of {len(log)} lines":
+            f"device log of the last step, {min(len(log), _LOG_LINES)} of {len(log)} lines":
                 "\n".join(log[-_LOG_LINES:]),
-            "daemon": f"{self.daemon.ended() or 'running' if self.daemon else 'not started'}, "
+            "daemon": f"{self._daemon.ended() or 'running' if self._daemon else 'not started'}, "
                       f"output:\n{last_lines(daemon.OUTPUT)}",
             "servers": "\n".join(server.state() for server in (
                 self.names.server, self.gateway.server, self.relay.server)),

@@ -11,14 +11,14 @@ from lab import network
 from lab.clock import fast_clock
 from lab.support import LabError, last_lines, wait_until
 
-# The log socket is the device's; a server elsewhere must not be heard on it.
+# The log socket is the device's; a server on another host must not write to it.
 _NO_SYSLOG = ("sh", "-c", 'mount --bind /dev/null /dev/log && exec "$@"', "sh")
 
 
 class Server:
-    """One server process; its output goes to `log`. `clock` makes its time run faster.
+    """One server process; its output goes to `log`. Its time runs `clock` times as fast.
 
-    A fast clock goes on from where it would be when the server is started again.
+    A restarted server's clock continues from where it would have been.
     """
 
     def __init__(self, name: str, host: str, argv: list[str], log: Path, clock: int = 1) -> None:
@@ -31,7 +31,7 @@ class Server:
         self._process: subprocess.Popen[bytes] | None = None
 
     def start(self, answers: Callable[[], object], seconds: float = 15) -> None:
-        """Start the process and return once `answers` holds; fail with its last words if never."""
+        """Start the process and wait until `answers` holds; LabError with its log if never."""
         self.log.parent.mkdir(parents=True, exist_ok=True)
         ahead = (time.monotonic() - self._made) * (self._clock - 1)
         with self.log.open("ab") as log:
@@ -49,7 +49,7 @@ class Server:
                            f"before it answered; end of its log:\n{last_lines(self.log)}")
 
     def stop(self) -> None:
-        """End the process as its operator would and wait for it."""
+        """Terminate the process and wait for its end."""
         assert self._process is not None
         self._process.terminate()
         self._process.wait(10)
@@ -60,7 +60,7 @@ class Server:
         return self._process is not None and not self._ended()
 
     def send_signal(self, number: int) -> None:
-        """Pass a signal to the running process."""
+        """Send a signal to the process."""
         assert self._process is not None
         self._process.send_signal(number)
 

@@ -1,4 +1,4 @@
-"""What every part of the lab uses: waiting for a state, running a tool, failing with evidence."""
+"""Helpers for every part of the lab: wait for a state, run a tool, fail with evidence."""
 
 from __future__ import annotations
 
@@ -12,19 +12,19 @@ Seen = TypeVar("Seen")
 
 
 class LabError(Exception):
-    """Something in the lab is not as it must be; the text says what and shows the evidence."""
+    """The lab or the daemon in it failed; the text says how and shows the evidence."""
 
 
 def wait_until(condition: Callable[[], Seen], what: str, seconds: float,
                pause: float = 0.05) -> Seen:
-    """Ask `condition` until it holds and return what it gave; the last answer is told if never."""
+    """Poll `condition` until it holds and return its value; LabError with the last if never."""
     deadline = time.monotonic() + seconds
     while True:
         seen = condition()
         if seen:
             return seen
         if time.monotonic() > deadline:
-            raise LabError(f"waited {seconds:g} s in vain for {what}; last seen: {seen!r}")
+            raise LabError(f"waited {seconds:g} s for {what}; last seen: {seen!r}")
         time.sleep(pause)
 
 

@@ -1,4 +1,4 @@
-"""What happened in a run, in order, told by everybody who took part."""
+"""What happened in a run, in order, as reported by every part of the lab."""
 
 from __future__ import annotations
 
@@ -10,28 +10,28 @@ from dataclasses import dataclass
 
 STORY = "story"
 
-# What the device's log tells about things that no other part of the lab sees: a line, the words
-# for it, and its subject where only news is to be told, because the line comes in every cycle or
-# for every port. A row without words ends the news of its subject: the next words are told again.
-_TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject in (
+# Events that only the device's log shows: a pattern, the text to report, and a subject if the line
+# recurs in every cycle or for every port. For a subject a text is reported only when it changes; a
+# row without text resets the subject.
+_LOG_EVENTS = tuple((re.compile(line), text, subject) for line, text, subject in (
     (r"createConnection\(\) - Deviceid and DeviceAuth is empty",
      "credentials are missing, the daemon idles", "credentials"),
     (r"createDirectConnection - Current Status", None, "credentials"),
 
     (r"Router::upnp_discover - IGD found at: ([^,]+),", "gateway found through UPnP: {}", "UPnP"),
     (r"Router::upnp_discover - Unconnected IGD found at: (\S+)",
-     "gateway without connection found through UPnP: {}", "UPnP"),
+     "unconnected gateway found through UPnP: {}", "UPnP"),
     (r"Router::upnp_discover - UPnP Discover failed", "no gateway answers UPnP", "UPnP"),
     (r"CMnatpmp::retrieveExternalIP  fetched", "gateway found through NAT-PMP", "NAT-PMP"),
     (r"CMnatpmp::retrieveExternalIP  failed", "no gateway answers NAT-PMP", "NAT-PMP"),
     (r"Router's external IP address: (\S+)", "external address: {}", "address"),
     (r"due to external or local IP change: \[([1-9]\d*)\]",
-     "mapping of port {} no longer fits and is dropped", None),
-    (r"Ports are still open, remaining", "ports are kept without the gateway", "gateway"),
+     "mapping of port {} is outdated and dropped", None),
+    (r"Ports are still open, remaining", "open ports are kept without a gateway", "gateway"),
     (r"Router is initialized", None, "gateway"),
 
     (r"Router::mapPort\(\) - fail", "gateway refuses a port", "refusal"),
-    (r"already mapped to another IP: (\S+)", "gateway maps a wanted port to {}", "other device"),
+    (r"already mapped to another IP: (\S+)", "gateway maps the port to {}", "other device"),
     (r"Router::mapPort\(\) - success", None, "refusal"),
     (r"Router::mapPort\(\) - success", None, "other device"),
     (r"PORTFORWARDED (\w+): mapPort returncode\[1\], internalPort\[\d+\], new externalPort\[(\d+)",
@@ -40,7 +40,7 @@ _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject
      "{} mapping could not be renewed", None),
 
     (r"pollServerForSleepTime - (?:missing action|malformed|received garbage)",
-     "answer to the question for permission is not understood", "permission"),
+     "answer to the permission request is malformed", "permission"),
     (r"central server gave permission to proceed|sleep time from server is", None, "permission"),
     (r"testPort - hard disk is asleep", "port test skipped: the disk is asleep", "no test"),
     (r"testPort - server has requested sleep", "port test skipped: the server asks to wait",
@@ -49,7 +49,7 @@ _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject
      "port test skipped: it is not due yet", "no test"),
     (r"testPort\[1-3\] - Port Test URL", None, "no test"),
     (r"Running port test for manually forwarded", "manually forwarded ports are tested", None),
-    (r"bad value for manually configured (\w+) Port", "manual {} port is no port", "manual port"),
+    (r"bad value for manually configured (\w+) Port", "manual {} port is invalid", "manual port"),
     (r"manualPortForward - allocatedHttpPort", None, "manual port"),
     (r"testPort - port map check success", "port test passed", None),
     (r"testPort - port map check failed", "port test failed", None),
@@ -59,20 +59,20 @@ _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject
 
     (r"(?:no|to get) response from central server", "central service does not answer", "central"),
     (r"httpGet (?:got|Response)", None, "central"),
-    (r"response (?:received )?from local(?:host| server)", "web back end does not take it",
+    (r"response (?:received )?from local(?:host| server)", "web back end does not accept it",
      "back end"),
     (r"Successful update status", None, "back end"),
     (r"failed to update (?:mapping info|port mapping)", "mapping could not be published", None),
 
     (r"relay servers and other settings", "tunnel client is started", None),
-    (r"openVPN will not be started", "tunnel waits, as the server asked", "tunnel"),
+    (r"openVPN will not be started", "tunnel is put off: the server asks to wait", "tunnel"),
     (r"openVPN initialization did not complete", "tunnel is not up yet", "tunnel"),
     (r"openVPN has started successfully", "tunnel is up", None),
     (r"closeVPNConnection\(\) - attempting to stop", "tunnel is told to stop", None),
     (r"closeVPNConnection\(\) - attempting to SIGKILL", "tunnel is killed", None),
     (r"closeVPNConnection\(\) - (?:attempting|openVPN process is not)|relay servers and", None,
      "tunnel"),
-    (r"failed to create VPN connection", "tunnel does not come up, the attempt ends", None),
+    (r"failed to create VPN connection", "tunnel did not come up, the attempt ends", None),
 
     (r"checkDNS - DNS matches local value .* address is (\S+)",
      "public names point to the right address, {}", "names"),
@@ -86,7 +86,7 @@ _TOLD_BY_LOG = tuple((re.compile(line), words, subject) for line, words, subject
 
 @dataclass(frozen=True)
 class Event:
-    """One thing that happened, in seconds since the lab was raised."""
+    """One event; `when` is in seconds since the lab was set up."""
 
     when: float
     who: str
@@ -107,7 +107,7 @@ class Timeline:
         self._lock = threading.Lock()
         self._events: list[Event] = []
         self._listeners: list[Callable[[Event], None]] = []
-        self._last_told: dict[str, str | None] = {}
+        self._last_text: dict[str, str | None] = {}
 
     @property
     def events(self) -> list[Event]:
@@ -117,7 +117,7 @@ class Timeline:
 
     @property
     def last_step(self) -> float:
-        """When the story's last step began (time.monotonic()), at first the lab's start."""
+        """When the last step began (time.monotonic()); at first when the lab was set up."""
         return self._last_step
 
     def listen(self, listener: Callable[[Event], None]) -> None:
@@ -125,7 +125,7 @@ class Timeline:
         self._listeners.append(listener)
 
     def add(self, who: str, what: str) -> None:
-        """Note that something happened just now."""
+        """Record something that happened just now."""
         with self._lock:
             event = Event(time.monotonic() - self._start, who, what)
             self._events.append(event)
@@ -133,21 +133,21 @@ class Timeline:
                 listener(event)
 
     def step(self, text: str) -> None:
-        """Head what happens from now on; say it before it is done."""
+        """Begin a step; call this before the step's first action."""
         self._last_step = time.monotonic()
         self.add(STORY, text)
 
     def read_log(self, line: str) -> None:
-        """Note what a line of the device's log tells, unless it is no news."""
-        for pattern, words, subject in _TOLD_BY_LOG:
+        """Record what a line of the device's log shows, unless it is a repetition."""
+        for pattern, text, subject in _LOG_EVENTS:
             found = pattern.search(line)
             if not found:
                 continue
-            news = words and words.format(*found.groups())
-            if news and (subject is None or self._last_told.get(subject) != news):
-                self.add("device", news)
+            shown = text and text.format(*found.groups())
+            if shown and (subject is None or self._last_text.get(subject) != shown):
+                self.add("device", shown)
             if subject is not None:
-                self._last_told[subject] = news
+                self._last_text[subject] = shown
 
     def __str__(self) -> str:
         return "\n".join(map(str, self.events)) or "(nothing happened)"

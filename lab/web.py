@@ -1,4 +1,4 @@
-"""Small web servers on the lab's hosts, and a client to look at them."""
+"""Small web servers on the lab's hosts, and a client for them."""
 
 from __future__ import annotations
 
@@ -18,7 +18,7 @@ from lab.certificates import KeyPair
 from lab.support import wait_until
 
 _ANSWER_SECONDS = 10
-# On, for no seconds: closing discards what is on its way and resets the connection.
+# On, with zero seconds: closing discards unsent data and resets the connection.
 _NO_LINGERING = struct.pack("ii", 1, 0)
 
 
@@ -44,9 +44,9 @@ class Request:
 
 @dataclass(frozen=True)
 class Reply:
-    """What goes back; no body means that the connection ends without an answer.
+    """The reply to a request; without a body the connection ends without an answer.
 
-    It is then closed in good order, or with `reset` torn down at once.
+    It is then closed normally or, with `reset`, reset.
     """
 
     body: bytes | None
@@ -75,7 +75,7 @@ class WebServer(ThreadingHTTPServer):
             threading.Thread(target=self.serve_forever, args=(0.1,), daemon=True).start()
 
     def show_certificate(self, identity: KeyPair) -> None:
-        """Use this certificate for connections that come from now on."""
+        """Use this certificate for new connections."""
         context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
         context.load_cert_chain(identity.certificate, identity.key)
         self._tls = context
@@ -89,12 +89,12 @@ class WebServer(ThreadingHTTPServer):
                                                do_handshake_on_connect=False)
         return connection, peer
 
-    def shutdown_request(self, request: socket.socket) -> None:
-        """Close only: a connection that is to be reset must not say goodbye first."""
+    def shutdown_request(self, request: socket.socket | tuple[bytes, socket.socket]) -> None:
+        """Close without a shutdown: a connection to be reset must not be ended normally first."""
         self.close_request(request)
 
     def handle_error(self, request: object, client_address: object) -> None:
-        """A client that goes away or refuses our certificate is the client's affair."""
+        """Ignore clients that disconnect or reject the certificate."""
 
     def reply_to(self, peer: str, url: str) -> Reply:
         """The answer to one request."""
@@ -109,7 +109,7 @@ class WebServer(ThreadingHTTPServer):
 class _Handler(BaseHTTPRequestHandler):
     server: WebServer
 
-    def do_GET(self) -> None:  # noqa: N802 (the name is the base class's)
+    def do_GET(self) -> None:
         reply = self.server.reply_to(self.client_address[0], self.path)
         if reply.body is None:
             if reply.reset:
@@ -123,15 +123,15 @@ class _Handler(BaseHTTPRequestHandler):
         self.wfile.write(reply.body)
 
     def log_message(self, *_arguments: object) -> None:
-        """Requests are recorded by those who answer them."""
+        """Stay silent: requests are recorded where they are answered."""
 
 
 def fetch(host: str, url: str, trust: str | None = None, name: str | None = None,
           seconds: float = 5) -> str | None:
     """GET `url` as a client on `host`; None when no answer came.
 
-    The host must take the connection within `seconds`. Its server may need longer to answer. With
-    `trust` (a file of authorities) the server must prove to be `name`.
+    The connection must be accepted within `seconds`; the answer may take longer. With `trust` (a
+    file of authorities) the server must present a certificate for `name`.
     """
     with network.inside(host):
         return fetch_from_here(url, trust, name, seconds)
@@ -139,7 +139,7 @@ def fetch(host: str, url: str, trust: str | None = None, name: str | None = None
 
 def fetch_from_here(url: str, trust: str | None = None, name: str | None = None,
                     seconds: float = 5) -> str | None:
-    """`fetch` for a thread that already lives on the right host."""
+    """`fetch` for a thread that is already on the right host."""
     parts = urlsplit(url)
     try:
         with socket.create_connection((parts.hostname, parts.port or _port(parts.scheme)),
@@ -157,7 +157,7 @@ def fetch_from_here(url: str, trust: str | None = None, name: str | None = None,
 
 def expect_answer(server: str, host: str, url: str, trust: str | None = None,
                   name: str | None = None) -> None:
-    """Return once `server` answers a client on `host`; fail naming it if it never does."""
+    """Wait until `server` answers a client on `host`; LabError naming it if it never does."""
     wait_until(lambda: fetch(host, url, trust, name, 1), f"{server} to answer {url}", 10)
 
 

@@ -1,12 +1,13 @@
-"""The situations the daemon exists for, each played against the lab and checked on real state.
+"""The situations the daemon exists for, each played in the lab and checked against real state.
 
-A scenario is a function that changes the lab and looks at what becomes of it. The system tests
-play them all, `scripts/demo NAME` plays one of them for a reader.
+A scenario is a function that changes the lab and checks the outcome. The system tests play all of
+them, `scripts/demo NAME` plays and shows one.
 """
 
-# Importing a module registers its scenarios, in the order in which a reader finds them listed.
-from lab.scenarios import direct  # noqa: F401, I001
-from lab.scenarios import changes, leases, relay, manual, service, settings  # noqa: F401
+# Importing a module registers its scenarios; --list shows them in this order.
+from lab.scenarios import direct  # noqa: F401
+from lab.scenarios import changes, leases, slow_gateway  # noqa: F401
+from lab.scenarios import relay, manual, service, settings  # noqa: F401
 from lab.scenarios import own_router, lifecycle  # noqa: F401
 from lab.scenarios.registry import SCENARIOS, Scenario
 

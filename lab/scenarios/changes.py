@@ -1,4 +1,4 @@
-"""The home network changes under a device that is reached directly."""
+"""The home network changes while the device is reached directly."""
 
 from __future__ import annotations
 
@@ -7,7 +7,7 @@ import re
 from lab import network
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT
 from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PAUSE, SILENT, asked, assert_published,
-                        assert_stops_clean, page_through_the_tunnel, pages_from_outside,
+                        assert_stops_clean, page_through_the_tunnel, pages_from_outside, start,
                         start_direct, wait_for_cycle, wait_for_log, wait_for_mapping_changes,
                         wait_for_next_cycle, wait_for_status)
 from lab.gateway import GatewaySetup
@@ -21,7 +21,7 @@ _SINCE_LAST_TEST = re.compile(r"createDirectConnection - Elapsed time (\d+), por
 
 @scenario(Situation(clock=FAST))
 def gateway_reboots(lab: Lab) -> None:
-    """The gateway reboots and moves within the home: the next port test finds out and maps anew."""
+    """The gateway reboots at a new address: the next port test fails, the ports are remapped."""
     start_direct(lab)
     before = len(lab.central.requests)
 
@@ -29,24 +29,24 @@ def gateway_reboots(lab: Lab) -> None:
     with lab.daemon.held():
         lab.gateway.reboot("192.168.77.254")
         assert pages_from_outside() == [None, None]
-    lab.wait_for(lambda: lab.device.statuses_told().count("portforwarded") == 2,
+    lab.wait_for(lambda: lab.device.statuses_sent().count("portforwarded") == 2,
                  "the device to be published again", 60)
     assert_published(lab)
     assert pages_from_outside() == PAGES
     assert asked(lab, before) == [WAIT, *[PORT_TEST] * 4, PORT_FORWARD]
     _assert_in_one_cycle(lab, "testPort - port map check failed",
                          "createDirectConnection() - success")
-    # The test that fails and the search run in the first cycle in which a test is due.
+    # The failing test and the search run in the first cycle in which a test is due.
     *_, earlier, at_the_test = _seconds_since_last_test(lab)
     assert earlier <= 240 < at_the_test
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def internet_address_changes(lab: Lab) -> None:
-    """The internet address changes: mapped, tested and published anew in the next cycle."""
+    """The internet address changes: mapped, tested and published again in the next cycle."""
     start_direct(lab, "-d", "300")
     before = len(lab.central.requests)
 
@@ -59,12 +59,12 @@ def internet_address_changes(lab: Lab) -> None:
     wait_for_log(lab, f"{_NAMES_MATCH} for device domain names, IP address is {_NEW_WAN_ADDRESS}")
     assert lab.device.messages.count("ConnectionManager::checkDNS - forceDNSCheck or exceeded") == 2
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def internet_address_changes_before_check(lab: Lab) -> None:
-    """The internet address changes and the names are checked first: torn down, up in that cycle."""
+    """The internet address changes just before a check of the names: rebuilt in the same cycle."""
     start_direct(lab, "-d", "60")
     before = len(lab.central.requests)
 
@@ -77,13 +77,13 @@ def internet_address_changes_before_check(lab: Lab) -> None:
                          f"address is {_NEW_WAN_ADDRESS}", "createDirectConnection() - success")
     wait_for_log(lab, f"{_NAMES_MATCH} for device domain names, IP address is {_NEW_WAN_ADDRESS}")
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def device_address_changes(lab: Lab) -> None:
-    """The device gets another LAN address: it uses other ports, the old mappings stay behind."""
+    """The device gets a new LAN address: it maps other ports, and the old mappings remain."""
     start_direct(lab)
     _move_device(lab)
     # A gateway in secure mode lets nobody touch mappings to another address, not even to the
@@ -98,7 +98,7 @@ def device_address_changes(lab: Lab) -> None:
 
 @scenario(Situation(gateway=GatewaySetup(secure=False), clock=FAST))
 def device_address_changes_trusting_gateway(lab: Lab) -> None:
-    """At a gateway without secure mode the mappings follow the device to its new LAN address."""
+    """On a gateway without secure mode the mappings follow the device to its new LAN address."""
     start_direct(lab)
     _move_device(lab)
     assert_published(lab, local_ip=_NEW_LAN_ADDRESS)
@@ -108,23 +108,22 @@ def device_address_changes_trusting_gateway(lab: Lab) -> None:
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=FAST))
 def relayed_device_address_changes(lab: Lab) -> None:
-    """A relayed device gets another LAN address: the service and the back end are told of it."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    """A relayed device gets a new LAN address: it tells the service and the back end."""
+    start(lab, "relayed")
     wait_for_next_cycle(lab)
-    before, told = len(lab.central.requests), len(lab.device.local_requests)
+    before, sent = len(lab.central.requests), len(lab.device.local_requests)
 
-    lab.step("the device gets another address at home")
+    lab.step("the device gets a new LAN address")
     with lab.daemon.held():
         lab.device.move_to(_NEW_LAN_ADDRESS)
-    lab.wait_for(lambda: lab.central.local_ip == _NEW_LAN_ADDRESS, "the service to know it", 60)
+    lab.wait_for(lambda: lab.central.local_ip == _NEW_LAN_ADDRESS, "the service to learn it", 60)
     wait_for_next_cycle(lab)
     assert asked(lab, before) == [COMM_STATUS]
-    assert [request.url for request in lab.device.local_requests[told:]] == [
+    assert [request.url for request in lab.device.local_requests[sent:]] == [
         f"/local/local_ip?address={_NEW_LAN_ADDRESS}"]
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the page to come through", 20)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(relay=True, clock=FAST))
@@ -132,20 +131,20 @@ def gateway_falls_silent(lab: Lab) -> None:
     """The gateway no longer answers: direct while the ports are open, relayed when they close."""
     lab.start_daemon(*OPTIONS)
     wait_for_cycle(lab, 1)
-    before, told = len(lab.central.requests), len(lab.device.local_requests)
+    before, sent = len(lab.central.requests), len(lab.device.local_requests)
 
-    lab.step("the gateway answers no mapping protocol: each cycle tests the port, nothing changes")
+    lab.step("the gateway stops answering: each cycle tests the port, nothing changes")
     with lab.daemon.held():
-        lab.device.disk_sleeps()  # these tests are made whatever the disk does
+        lab.device.disk_sleeps()  # these tests run even so
         lab.gateway.fall_silent()
     wait_for_cycle(lab, 3)
     assert lab.device.messages.count("Ports are still open, remaining in Port Forwarded Mode") == 2
     assert asked(lab, before) == [WAIT, PORT_TEST] * 2
     assert [request.argument("external_ip") for request in lab.central.requests_for(PORT_TEST)] \
         == [network.GATEWAY_WAN_ADDRESS, "", ""]
-    assert len(lab.device.local_requests) == told
+    assert len(lab.device.local_requests) == sent
     wait_for_mapping_changes(lab, [f"forwards {mapping}" for mapping in BOTH_MAPPED])
-    # The gateway cannot tell the address any more: the last port test's answer stands in.
+    # The gateway no longer reports the address, so the last port test's answer is used.
     wait_for_log(lab, "use most recent remote external IP in test port response = 44.128.0.20")
     with lab.daemon.held():
         assert_published(lab)
@@ -168,7 +167,7 @@ def gateway_falls_silent(lab: Lab) -> None:
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed", "relayed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed", "relayed",
                                           "portforwarded", "disabled"]
 
 
@@ -185,16 +184,16 @@ def _wait_for_new_internet_address(lab: Lab) -> None:
 
 
 def _move_device(lab: Lab) -> None:
-    """Give the device another address, and see that everybody is told, once."""
-    before, told = len(lab.central.requests), len(lab.device.local_requests)
-    lab.step("the device gets another address at home")
+    """Give the device a new address, and check that it is reported once."""
+    before, sent = len(lab.central.requests), len(lab.device.local_requests)
+    lab.step("the device gets a new LAN address")
     with lab.daemon.held():
         lab.device.move_to(_NEW_LAN_ADDRESS)
     lab.wait_for(lambda: lab.device.setting("LOCAL_IP") == _NEW_LAN_ADDRESS,
-                 "the back end to know the new address", 60)
+                 "the back end to learn the new address", 60)
     wait_for_next_cycle(lab)
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
-    assert [request.path for request in lab.device.local_requests[told:]] == ["/local/port_forward"]
+    assert [request.path for request in lab.device.local_requests[sent:]] == ["/local/port_forward"]
     assert lab.device.status == "portforwarded"
 
 

@@ -13,9 +13,9 @@ from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, Fault
 from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, SILENT,
                         TUNNEL_PID_FILE, asked, assert_log_is_proper, assert_published,
                         assert_stops_clean, mapping_changes, page_through_the_tunnel,
-                        pages_from_outside, tunnel_client, wait_for_client_end, wait_for_cycle,
-                        wait_for_log, wait_for_next_cycle, wait_for_status)
-from lab.gateway import Mapping
+                        pages_from_outside, start, tunnel_client, wait_for_client_end,
+                        wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 from lab.support import wait_until
@@ -28,25 +28,24 @@ _LOOKS_AT_THE_TUNNEL = 4 * 7
 
 @scenario(Situation(clock=FAST))
 def unmap_all(lab: Lab) -> None:
-    """What a killed daemon left at the gateway and the service, `pelorus -u` takes down."""
+    """`pelorus -u` removes what a killed daemon left at the gateway and the service."""
     neighbours = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 80)
     lab.neighbour.hold(neighbours.external_port, neighbours.internal_port)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
-    lab.step("kill -9 leaves everything as it is")
+    lab.step("kill -9 leaves everything in place")
     _kill(lab)
     assert lab.gateway.mappings() == [neighbours, *BOTH_MAPPED]
     assert lab.central.record == PUBLISHED
     assert lab.device.status == "portforwarded"
-    requests, told = len(lab.central.requests), len(lab.device.local_requests)
+    requests, sent = len(lab.central.requests), len(lab.device.local_requests)
 
-    lab.step("pelorus -u clears up and ends")
-    _clear_up(lab)
+    lab.step("pelorus -u cleans up and exits")
+    _clean_up(lab)
     assert lab.gateway.mappings() == [neighbours]
     assert lab.central.record is None
     assert asked(lab, requests) == [COMM_STATUS, PORT_FORWARD]
-    assert [request.url for request in lab.device.local_requests[told:]] == [
+    assert [request.url for request in lab.device.local_requests[sent:]] == [
         "/local/comm_status?status=disabled",
         "/local/local_ip?address=192.168.77.10",
         "/local/port_forward_delete?internal_port=80"]
@@ -54,66 +53,65 @@ def unmap_all(lab: Lab) -> None:
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def unmap_all_while_relayed(lab: Lab) -> None:
-    """A tunnel that outlived its daemon serves on until `pelorus -u` stops it."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    """A tunnel that outlives its daemon keeps working until `pelorus -u` stops it."""
+    start(lab, "relayed")
     client = tunnel_client()
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
 
-    lab.step("pelorus -u clears up and ends")
-    _clear_up(lab)
+    lab.step("pelorus -u cleans up and exits")
+    _clean_up(lab)
     wait_for_client_end(client)
     assert not TUNNEL_PID_FILE.exists()
 
 
 @scenario(Situation(gateway=SILENT, clock=FAST))
 def stopped_in_discovery(lab: Lab) -> None:
-    """SIGTERM, SIGINT or SIGQUIT while a gateway is looked for: it ends, and nothing is tried."""
-    # Refused at once, the search through NAT-PMP would take no time.
+    """SIGTERM, SIGINT or SIGQUIT during gateway discovery: it ends without trying anything else."""
+    # A refusal would end the NAT-PMP search at once.
     lab.gateway.fall_silent()
-    for time in _until_each_signal(lab, "while a gateway is looked for"):
+    for time in _until_each_signal(lab, "during gateway discovery"):
         wait_for_log(lab, "setting localIP to: [192.168.77.10]", time)
     assert lab.device.messages.count(_CYCLE) == 0
-    assert lab.device.statuses_told() == ["connecting", "disabled"] * len(_SIGNALS)
+    assert lab.device.statuses_sent() == ["connecting", "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(clock=FAST))
 def stopped_in_a_port_test(lab: Lab) -> None:
-    """SIGTERM, SIGINT or SIGQUIT in a slow port test: published after it, then withdrawn again."""
+    """SIGTERM, SIGINT or SIGQUIT during a slow port test: published after it, then withdrawn."""
     lab.central.misbehave(PORT_TEST, Fault(delay=2))
     for time in _until_each_signal(lab, "while the service tests the port"):
-        lab.wait_for(lambda time=time: len(lab.central.requests_for(PORT_TEST)) == time,
+        lab.wait_for(lambda: len(lab.central.requests_for(PORT_TEST)) == time,
                      "the port test", 60)
         assert lab.gateway.mappings() == BOTH_MAPPED[:1]
     assert len(lab.central.port_tests) == len(_SIGNALS)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
 
 
-# With a back end that does not take the ports the relay is tried while both are mapped.
+# When the back end does not accept the ports, the relay is tried while both are mapped.
 @scenario(Situation(static={"LOCAL_SETFORWARDURL": "http://127.0.0.1:1/",
                             "STARTCMD": "touch openvpn.out"}, clock=FAST))
 def stopped_in_the_relay_start(lab: Lab) -> None:
-    """SIGTERM, SIGINT or SIGQUIT while no tunnel comes up: it tries on for its five minutes."""
+    """SIGTERM, SIGINT or SIGQUIT while no tunnel comes up: it keeps trying for five minutes."""
     for time in _until_each_signal(lab, "while the tunnel does not come up"):
         wait_for_log(lab, _TUNNEL_NOT_UP, (time - 1) * _LOOKS_AT_THE_TUNNEL + 1)
         assert lab.gateway.mappings() == BOTH_MAPPED
     assert lab.device.messages.count(_TUNNEL_NOT_UP) == len(_SIGNALS) * _LOOKS_AT_THE_TUNNEL
-    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
+    assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def stopped_as_the_tunnel_starts(lab: Lab) -> None:
-    """SIGTERM while the tunnel's client starts: relayed for a moment, then all is torn down."""
+    """SIGTERM while the tunnel client starts: briefly relayed, then everything is torn down."""
     lab.start_daemon(*OPTIONS)
     lab.wait_for(lab.device.tunnel_output().exists, "the client", 60)
     lab.step("SIGTERM before the daemon knows that the tunnel is up")
     assert_stops_clean(lab)
     assert lab.relay.connections() == 1
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
     assert not TUNNEL_PID_FILE.exists()
-    wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay itself to be left", 20)
+    wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay's own process", 20)
 
 
 @scenario(Situation(clock=FAST))
@@ -125,26 +123,26 @@ def stopped_in_its_sleep(lab: Lab) -> None:
             assert_published(lab)
         wait_for_cycle(lab, time)
     assert lab.device.messages.count(_CYCLE) == len(_SIGNALS)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
 
 
 @scenario(Situation(dynamic={"COMMUNICATION_STATUS": "portforwarded"}, clock=FAST))
 def power_cut(lab: Lab) -> None:
-    """Cut off at any moment: the next start removes what was left, and the device is reachable."""
+    """Power is cut at any moment: the next start cleans up and makes the device reachable."""
     lab.start_daemon(*OPTIONS)
     wait_for_next_cycle(lab)
     lines, chance = len(lab.device.messages.all), random.Random(9091)
     for fifth in range(5):
         cut = round((fifth + chance.random()) * lines / 5)
-        lab.step(f"power cut in the sleep, and again at line {cut} of {lines} after the next start")
+        lab.step(f"power cut in the pause, and again at line {cut} of {lines} after the next start")
         _kill(lab)
         assert pages_from_outside() == PAGES
         end = len(lab.device.messages.all) + cut
         lab.start_daemon(*OPTIONS)
-        wait_until(lambda end=end: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
+        wait_until(lambda: len(lab.device.messages.all) >= end, f"line {cut}", 60, 0.001)
         _kill(lab)
-        # When the gateway has answered that, it has done what the daemon had asked for.
+        # Once the gateway answers this, it has handled every request of the daemon.
         lab.gateway.listing()
         left = lab.gateway.mappings()
         lab.step(f"the power is back; left behind: {', '.join(map(str, left)) or 'no mapping'}")
@@ -154,31 +152,30 @@ def power_cut(lab: Lab) -> None:
             assert_published(lab)
             changes = [*(f"no longer forwards {mapping}" for mapping in left),
                        *(f"forwards {mapping}" for mapping in BOTH_MAPPED)]
-            wait_until(lambda changes=changes: mapping_changes(lab)[-len(changes):] == changes,
-                       f"the gateway to tell {changes}", 5)
+            wait_until(lambda: mapping_changes(lab)[-len(changes):] == changes,
+                       f"the changes {changes}", 5)
     assert_stops_clean(lab)
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def killed_while_relayed(lab: Lab) -> None:
-    """A killed daemon's tunnel is forgotten by the next, and fights its tunnel until stopped."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    """The next daemon forgets a killed one's tunnel, which fights the new one until stopped."""
+    start(lab, "relayed")
     old = tunnel_client()
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
 
-    lab.step("the next daemon starts a client of its own")
+    lab.step("the next daemon starts its own client")
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, "openVPN has started successfully", 2)
     new = tunnel_client()
     assert new != old and old in daemon.running("openvpn")
 
-    # A relay has one tunnel for a device: who logs in throws the other out, who then comes back.
-    lab.step("the old client is thrown out and comes back")
+    # A relay has one tunnel per device: a login disconnects the other client, which reconnects.
+    lab.step("the old client is disconnected and reconnects")
     lab.wait_for(lambda: lab.relay.connections() >= 3, "the old client to be back", 60)
 
-    # Ended by SIGTERM, it would remove the pid file, and the daemon would forget the new one too.
+    # On SIGTERM it would remove the pid file, and the daemon would forget the new client too.
     lab.step("the old client is stopped by hand, with kill -9")
     os.kill(old, signal.SIGKILL)
     wait_for_client_end(old)
@@ -192,8 +189,8 @@ def killed_while_relayed(lab: Lab) -> None:
 def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
     """Start the daemon once for each signal, let the caller wait for the phase, and stop it.
 
-    One signal must do. It would be lost while a shell command of the daemon runs, for which the C
-    library ignores SIGINT and SIGQUIT; in none of the phases there is one.
+    One signal must be enough. While the daemon runs a shell command, the C library ignores SIGINT
+    and SIGQUIT; it runs none in these phases.
     """
     # SIGQUIT would leave a core file in the machine's root folder.
     resource.setrlimit(resource.RLIMIT_CORE, (0, 0))
@@ -205,12 +202,12 @@ def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
 
 
 def _kill(lab: Lab) -> None:
-    """End the daemon as a power cut does, but for the tunnel's client, which lives on."""
+    """Kill the daemon as a power cut would, except that the tunnel client lives on."""
     assert lab.stop_daemon(signal.SIGKILL) == "SIGKILL"
 
 
-def _clear_up(lab: Lab) -> None:
-    """Run `pelorus -u`, which ends by itself and leaves the device reported as disabled."""
+def _clean_up(lab: Lab) -> None:
+    """Run `pelorus -u`, which exits by itself and leaves the device reported as disabled."""
     assert wait_until(lab.start_daemon("-u", *OPTIONS).ended, "pelorus -u to end", 60) == "exit 0"
     assert lab.device.status == "disabled"
     assert daemon.running("pelorus") == []

@@ -5,10 +5,10 @@ from __future__ import annotations
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES,
-                        PUBLISHED, SILENT, assert_published, assert_stops_clean,
-                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
-                        wait_for_log, wait_for_status)
-from lab.gateway import Mapping
+                        PUBLISHED, SILENT, assert_logged_by_next_cycle, assert_published,
+                        assert_stops_clean, pages_from_outside, ports_tested, start, wait_for_log,
+                        wait_for_status)
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
@@ -26,10 +26,9 @@ _CLOCK, _INTERVAL = 100, 500
 
 @scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
 def manual_ports(lab: Lab) -> None:
-    """Ports forwarded by hand are proven and published; with a wrong port configured it fails."""
+    """Ports forwarded by hand are tested and published; with a wrong port configured it fails."""
     _forward_by_hand(lab)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     device_id, auth, _ = lab.account.secrets
     assert [request.url for request in lab.central.requests_for(PORT_TEST)] == [
         f"/api/1.0/rest/{PORT_TEST}/{device_id}?external_ip=&port=8081&protocol=HTTP&auth={auth}"]
@@ -38,41 +37,40 @@ def manual_ports(lab: Lab) -> None:
     with lab.daemon.held():
         _assert_published_by_hand(lab)
 
-        lab.step("the device's settings name an HTTP port that nobody forwards")
+        lab.step("the device's settings name an HTTP port that is not forwarded")
         lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8082")
     wait_for_log(lab, NOT_RELAYED)
     assert lab.device.status == "failed"
     assert ports_tested(lab) == [8081, 8082, 8082, 8082]
     assert lab.central.record is None
 
-    lab.step("as long as it is wrong, every cycle tests it, due or not, and whatever the disk does")
+    lab.step("while it is wrong, every cycle tests it, due or not, even with the disk asleep")
     lab.device.disk_sleeps()
     wait_for_log(lab, NOT_RELAYED, 2)
     assert ports_tested(lab)[1:] == [8082] * 6
     lab.device.disk_wakes()
 
-    lab.step("the settings are right again")
+    lab.step("the settings are correct again")
     lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
     wait_for_status(lab, "portforwarded")
     _assert_published_by_hand(lab)
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
     assert lab.gateway.by_hand() == _BY_HAND
 
 
 @scenario(Situation(static=NO_TUNNEL, clock=FAST))
 def manual_ports_that_are_none(lab: Lab) -> None:
-    """A manual port that is no port stops everything; what was mapped before stays open."""
+    """An invalid manual port stops everything; what was mapped before stays open."""
     lab.gateway.forward_by_hand(65535, 80)
     lab.gateway.forward_by_hand(1, 443)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     for http, https, kind in (("0", "1", "HTTP"), ("65536", "1", "HTTP"), ("http", "1", "HTTP"),
                               ("65535", "", "HTTPS")):
-        lab.step(f"the user wants the ports '{http}' and '{https}'")
+        lab.step(f"the user enters the ports '{http}' and '{https}'")
         line = ("ConnectionManager::manualPortForward - bad value for manually configured "
                 f"{kind} Port.")
         before = lab.device.messages.texts().count(line)
@@ -81,13 +79,13 @@ def manual_ports_that_are_none(lab: Lab) -> None:
                           MANUAL_EXTERNAL_HTTPS_PORT=https)
         wait_for_log(lab, NOT_RELAYED, failures + 1)
         assert lab.device.messages.texts().count(line) == before + 1
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed"]
     assert ports_tested(lab) == [9091]
     assert lab.central.record is None
-    # The relay withdraws the record but leaves the gateway alone.
+    # Switching to the relay withdraws the record but leaves the gateway alone.
     assert lab.gateway.mappings() == BOTH_MAPPED
 
-    lab.step("both ports are valid, and the automatic ones go")
+    lab.step("both ports are valid, and the automatic ones are removed")
     lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
     wait_for_status(lab, "portforwarded")
     assert lab.gateway.mappings() == []
@@ -106,17 +104,16 @@ def manual_and_back(lab: Lab) -> None:
     network.output(network.DEVICE, "upnpc", "-u", lab.gateway.description_url, "-e", "camera",
                    "-a", network.DEVICE_ADDRESS, "80", "7000", "tcp")
     lab.neighbour.hold(9092, 80)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
 
-    lab.step("the user forwards ports by hand and tells the device")
+    lab.step("the user forwards ports by hand and configures the device")
     with lab.daemon.held():
         _forward_by_hand(lab)
         lab.device.change(**_SETTINGS)
         changed = len(lab.device.messages.all)
-    _wait_until_told(lab, 8081)
-    assert_told_by_the_next_cycle(lab, changed, _BEGIN)
+    _wait_for_port(lab, 8081)
+    assert_logged_by_next_cycle(lab, changed, _BEGIN)
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
@@ -131,7 +128,7 @@ def manual_and_back(lab: Lab) -> None:
 
         lab.step("the user's ports are gone, and the next test makes the daemon map its own")
         lab.gateway.stop_forwarding_by_hand()
-    _wait_until_told(lab, 9091)
+    _wait_for_port(lab, 9091)
     wait_for_status(lab, "portforwarded")
     assert ports_tested(lab) == [9091, 8081, 8081, 8081, 8081, 9091]
     assert lab.gateway.mappings() == sorted([*BOTH_MAPPED, *others])
@@ -140,33 +137,32 @@ def manual_and_back(lab: Lab) -> None:
     assert [request.argument("http_port") for request in lab.central.requests_for(PORT_FORWARD)
             ] == ["0", "9091", "8081", "9091"]
 
-    lab.step("the end leaves the others their ports")
+    lab.step("stopping leaves the other ports alone")
     assert_stops_clean(lab, left=others)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
-# Two discoveries in a cycle wait in vain: it lasts about 280 s.
+# Two discoveries per cycle time out, so it lasts about 280 s.
 @scenario(Situation(gateway=SILENT, dynamic=_SETTINGS, clock=_CLOCK))
 def manual_without_protocol(lab: Lab) -> None:
-    """No mapping protocol: the service is asked for the address now and then, a new one is told."""
+    """No mapping protocol: the service is asked for the address at times, a new one published."""
     _forward_by_hand(lab)
-    lab.start_daemon(*OPTIONS, "-p", f"{_INTERVAL}")
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded", "-p", f"{_INTERVAL}")
     _assert_published_by_hand(lab)
-    told = list(lab.device.local_requests)
+    sent = list(lab.device.local_requests)
 
-    lab.step("once the interval has passed, the service is asked; the address is what it was")
+    lab.step("after the interval the service is asked; the address has not changed")
     wait_for_log(lab, f"NetworkAddrs::getMyIP - external IP address {_HERE}")
     lab.wait_for(lambda: lab.device.messages.count(_BEGIN) == lab.device.messages.count(_END),
                  "the attempt to end", 60)
 
-    lab.step("the provider gives another address: the ports pass their test there as well")
+    lab.step("the provider assigns another address: the ports pass their test there as well")
     lab.gateway.move_to(_ELSEWHERE)
     lab.wait_for(lambda: lab.central.port_tests[-1].address == _ELSEWHERE, "a test there", 60)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
 
-    lab.step("the next question for the address is due, but the service wants it a minute later")
+    lab.step("the next request for the address is due, but the service asks to wait a minute")
     lab.central.wait_seconds = 60
     wait_for_log(lab, "NetworkAddrs::getMyIP - wait 60 seconds")
     lab.central.wait_seconds = 0
@@ -177,34 +173,33 @@ def manual_without_protocol(lab: Lab) -> None:
     assert lab.central.record == Record(_ELSEWHERE, network.DEVICE_ADDRESS, 8081, 8444)
     _assert_asked_in_intervals(lab)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
     assert lab.gateway.by_hand() == _BY_HAND
 
 
 @scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
 def manual_behind_second_nat(lab: Lab) -> None:
-    """A second NAT closes ports forwarded by hand: the test just fails, and passes without it."""
+    """A second NAT blocks ports forwarded by hand: the test just fails, and passes without it."""
     lab.provider.insert()
     _forward_by_hand(lab)
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
-    assert lab.device.statuses_told() == ["connecting", "failed"]
+    assert lab.device.statuses_sent() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
 
-    lab.step("the provider's box is gone")
+    lab.step("the provider's NAT is gone")
     with lab.daemon.held():
         lab.provider.remove()
     wait_for_status(lab, "portforwarded")
-    assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP",
-                                                      lab.account.device_id)
+    assert lab.central.port_tests[-1] == PortTest(_HERE, 8081, "HTTP", lab.account.device_id)
     _assert_published_by_hand(lab)
     assert_stops_clean(lab)
 
 
 @scenario(Situation(static=NO_TUNNEL, clock=FAST))
 def manual_after_second_nat(lab: Lab) -> None:
-    """A second NAT that the automatic test met rules out manual ports even when it is gone."""
+    """A second NAT found by the automatic test rules out manual ports even after it is gone."""
     lab.provider.insert()
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
@@ -224,7 +219,7 @@ def manual_after_second_nat(lab: Lab) -> None:
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     lab.device.change(MANUAL_PORT_FORWARD="TRUE")
-    _wait_until_told(lab, 8081)
+    _wait_for_port(lab, 8081)
     _assert_published_by_hand(lab)
     assert_stops_clean(lab)
 
@@ -234,13 +229,13 @@ def _forward_by_hand(lab: Lab) -> None:
     lab.gateway.forward_by_hand(8444, 443)
 
 
-def _wait_until_told(lab: Lab, http_port: int) -> None:
+def _wait_for_port(lab: Lab, http_port: int) -> None:
     lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == str(http_port),
-                 f"the device to be told the port {http_port}", 60)
+                 f"the device to be published on port {http_port}", 60)
 
 
 def _assert_published_by_hand(lab: Lab) -> None:
-    """Everybody knows the user's ports, which lead to the device and are as the user made them."""
+    """The user's ports are published, lead to the device, and are unchanged."""
     assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 8081, 8444)
     assert lab.device.setting("EXTERNAL_IP") == _HERE
     assert lab.device.setting("EXTERNAL_HTTP_PORT") == "8081"
@@ -250,10 +245,10 @@ def _assert_published_by_hand(lab: Lab) -> None:
 
 
 def _assert_asked_in_intervals(lab: Lab) -> None:
-    """Twice, each time when the interval since the publication or the last question had passed."""
+    """Twice, each time an interval or more after the publication or the previous request."""
     published, *_ = lab.central.requests_for(PORT_FORWARD)
     first, second = lab.central.requests_for(MY_IP)
     assert {(asking.scheme, asking.url) for asking in (first, second)} == {
         ("http", "/api/1.0/rest/myip")}
     shortest = min(first.when - published.when, second.when - first.when)
-    assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts full seconds
+    assert shortest * _CLOCK > _INTERVAL - 2  # the daemon counts whole seconds

@@ -5,9 +5,9 @@ from __future__ import annotations
 from lab import network
 from lab.central import COMM_STATUS, PORT_TEST, Fault, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES, PUBLISHED,
-                        assert_stops_clean, pages_from_outside, wait_for_log, wait_for_next_cycle,
-                        wait_for_status)
-from lab.gateway import Mapping
+                        assert_stops_clean, pages_from_outside, start, wait_for_log,
+                        wait_for_next_cycle, wait_for_status)
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
@@ -19,26 +19,25 @@ _ADDRESSES = ["getip.sh wan", "getip.sh lan"]
 _OFFLINE = ("Router::initIpAddrBrenvik - Not connected to internet. "
             "Please check network connectivity.")
 _ERROR = 3
-# The clean slate of a start, whose last word to the service needs the local address.
+# The clean-up at a start, which ends with a withdrawal that needs the local address.
 _START = [_LIST, *_ADDRESSES]
 
 
-# At its real speed: the pause after each removal is to be seen.
+# In real time, so that the pause after each removal shows.
 @scenario(Situation(own_router=True, static=_TYPE))
 def own_router(lab: Lab) -> None:
-    """The device is itself the home's router: it opens its own ports and closes them at the end."""
+    """The device is itself the home router: it opens its own ports and closes them at the end."""
     assert pages_from_outside() == [None, None]
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     _assert_own_ports_published(lab)
     assert lab.own_router.calls() == [
         *_START, *_ADDRESSES, _LIST, _LIST, _add(9091, 80, "Kavra"),
         _LIST, _LIST, _add(9444, 443, "KavraSSL")]
-    # The service hears of the local address with the record, not before.
+    # The service learns the local address with the record, not before.
     assert lab.central.requests_for(COMM_STATUS) == []
     assert lab.central.port_tests == [PortTest(_HERE, 9091, "HTTP", lab.account.device_id)]
 
-    lab.step("the end removes both, a second after each")
+    lab.step("stopping removes both, and pauses a second after each")
     before = len(lab.own_router.calls())
     assert_stops_clean(lab)
     assert lab.own_router.calls()[before:] == [_LIST, _remove(9091, 80), _remove(9444, 443)]
@@ -49,15 +48,14 @@ def own_router(lab: Lab) -> None:
 
 @scenario(Situation(own_router=True, static=_TYPE, clock=FAST))
 def own_router_predefined(lab: Lab) -> None:
-    """The router forwards ports to the device already: the first HTTP one that works is used."""
+    """The router already forwards ports to the device: the first HTTP port that works is used."""
     for first, last, internal_port in ((2222, 2223, 22), (8080, 8081, 80), (8443, 8443, 443)):
         lab.own_router.predefine(first, last, internal_port)
     forwards, entries = lab.own_router.mappings(), lab.own_router.entries()
-    # Start and end ask for the first port of each; the router keeps what the daemon did not add.
+    # Start and end try to remove the first port of each; the router keeps pre-defined ports.
     in_vain = [_LIST, _remove(2222, 22), _remove(8080, 80), _remove(8443, 443)]
     lab.central.misbehave(PORT_TEST, Fault(drop=True, times=3))
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     assert [request.argument("port") for request in lab.central.requests_for(PORT_TEST)] == [
         *["8080"] * 3, "8081"]
     calls = lab.own_router.calls()
@@ -66,18 +64,18 @@ def own_router_predefined(lab: Lab) -> None:
     assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 8081, 8443)
     assert pages_from_outside(8081, 8443) == PAGES
 
-    lab.step("the ports are kept and tested again, without a look at the list")
+    lab.step("the ports are kept and tested again, without reading the list")
     lab.wait_for(lambda: len(lab.central.port_tests) == 2, "another port test", 60)
     wait_for_next_cycle(lab)
     calls = lab.own_router.calls()[before:]
     assert calls == _ADDRESSES * (len(calls) // 2)
     assert (lab.own_router.mappings(), lab.own_router.entries()) == (forwards, entries)
 
-    lab.step("the end leaves them to the router")
+    lab.step("stopping leaves them in place")
     assert_stops_clean(lab)
     assert lab.own_router.calls()[-len(in_vain):] == in_vain
     assert (lab.own_router.mappings(), lab.own_router.entries()) == (forwards, entries)
-    assert lab.device.statuses_told() == ["connecting", "failed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(own_router=True, static=_TYPE, clock=FAST))
@@ -86,8 +84,7 @@ def own_router_port_taken(lab: Lab) -> None:
     for port, internal_port in ((9091, 80), (9444, 443)):
         lab.own_router.predefine(port, port, internal_port, "OTHER", network.NEIGHBOUR_ADDRESS)
     foreign, entries = lab.own_router.mappings(), lab.own_router.entries()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     own = [Mapping("TCP", 9092, network.DEVICE_ADDRESS, 80),
            Mapping("TCP", 9445, network.DEVICE_ADDRESS, 443)]
     assert lab.own_router.mappings() == sorted([*foreign, *own])
@@ -95,7 +92,7 @@ def own_router_port_taken(lab: Lab) -> None:
     assert pages_from_outside(9092, 9445) == PAGES
     assert _changes(lab) == [_add(9092, 80, "Kavra"), _add(9445, 443, "KavraSSL")]
 
-    lab.step("the end leaves the other device its ports")
+    lab.step("stopping leaves the other device its ports")
     assert_stops_clean(lab)
     assert _changes(lab)[2:] == [_remove(9092, 80), _remove(9445, 443)]
     assert (lab.own_router.mappings(), lab.own_router.entries()) == (foreign, entries)
@@ -107,19 +104,19 @@ def own_router_offline(lab: Lab) -> None:
     lab.own_router.go_offline()
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
-    assert lab.device.statuses_told() == ["connecting", "failed"]
-    # Once for the clean slate, once for the attempt.
+    assert lab.device.statuses_sent() == ["connecting", "failed"]
+    # Once for the clean-up, once for the attempt.
     assert [message.severity for message in lab.device.messages.all
             if message.text == _OFFLINE] == [_ERROR, _ERROR]
     assert lab.own_router.calls() == [*_START, *_ADDRESSES]
     assert lab.central.port_tests == []
 
-    lab.step("it has an address")
+    lab.step("the router gets an address")
     lab.own_router.go_online()
     wait_for_status(lab, "portforwarded")
     _assert_own_ports_published(lab)
 
-    lab.step("it has none any more: what the daemon opened is closed and withdrawn")
+    lab.step("it loses the address: what the daemon opened is closed and withdrawn")
     lab.own_router.go_offline()
     wait_for_log(lab, NOT_RELAYED, 2)
     assert lab.device.status == "failed"
@@ -127,23 +124,22 @@ def own_router_offline(lab: Lab) -> None:
     assert lab.own_router.mappings() == []
     assert lab.central.record is None
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "failed", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "failed", "portforwarded", "failed",
                                           "disabled"]
 
 
 @scenario(Situation(own_router=True, static=_TYPE, clock=FAST))
 def own_router_disk_asleep(lab: Lab) -> None:
-    """On the maker's router a disk in standby puts off a port test, a long disuse does not."""
+    """On the maker's router a disk in standby delays a port test, a long time unused does not."""
     lab.device.minutes_since_disk_access(99)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
-    lab.step("the ports are to be tested again, but the disk is in standby")
+    lab.step("the next port test is due, but the disk is in standby")
     lab.device.disk_sleeps()
     wait_for_log(lab, "testPort - hard disk is asleep.")
     assert len(lab.central.port_tests) == 1
 
-    lab.step("the disk turns, though nobody used it: the test is made up for")
+    lab.step("the disk spins up, though unused for long: the test is made up for")
     lab.device.disk_wakes()
     lab.wait_for(lambda: len(lab.central.port_tests) == 2, "the second port test", 60)
     assert lab.device.messages.count("checking sleep count") == 0
@@ -152,7 +148,7 @@ def own_router_disk_asleep(lab: Lab) -> None:
 
 
 def _assert_own_ports_published(lab: Lab) -> None:
-    """Both ports are open at the device itself, and everybody knows them."""
+    """Both ports are open at the device itself and published everywhere."""
     assert lab.own_router.mappings() == BOTH_MAPPED
     assert lab.central.record == PUBLISHED
     assert lab.device.setting("EXTERNAL_IP") == _HERE
@@ -161,7 +157,7 @@ def _assert_own_ports_published(lab: Lab) -> None:
 
 
 def _assert_pauses_after_removals(lab: Lab) -> None:
-    """A second after each of the two; how long the lab takes to hear of a removal varies."""
+    """A second after each of the two; how soon the lab notices a removal varies."""
     removed = [event.when for event in lab.timeline.events
                if event.who == "router" and event.what.startswith("no longer forwards")]
     withdrawn = [event.when for event in lab.timeline.events

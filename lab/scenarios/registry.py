@@ -1,4 +1,4 @@
-"""How a situation becomes a scenario that has a name and can be played."""
+"""The scenarios by name, and how a function becomes one."""
 
 from __future__ import annotations
 
@@ -12,7 +12,7 @@ Play = Callable[[Lab], None]
 
 @dataclass(frozen=True)
 class Scenario:
-    """One story: where it starts, what happens, what must be seen. `play` raises when it is not."""
+    """One story: where it starts, what happens, what to expect. `play` raises on a failure."""
 
     name: str
     title: str
@@ -24,7 +24,7 @@ SCENARIOS: dict[str, Scenario] = {}
 
 
 def scenario(situation: Situation) -> Callable[[Play], Play]:
-    """Register a function as a scenario, named and titled after it and its docstring."""
+    """Register a function as a scenario; its name and docstring become name and title."""
 
     def register(play: Play) -> Play:
         name = play.__name__.replace("_", "-")

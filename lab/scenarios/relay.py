@@ -1,4 +1,4 @@
-"""No direct way: the device is reached through the relay, and directly again when it can be."""
+"""No direct path: the device is reached through the relay, and directly once possible."""
 
 from __future__ import annotations
 
@@ -9,8 +9,8 @@ from lab import daemon, network, packet_filter, provider
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault, PortTest
 from lab.checks import (BOTH_MAPPED, IMPATIENT, OPTIONS, PAGES, RELAYED, SILENT, TUNNEL_PID_FILE,
                         asked, assert_log_is_proper, assert_published, assert_stops_clean,
-                        page_through_the_tunnel, start_direct, tunnel_client, wait_for_client_end,
-                        wait_for_log, wait_for_next_cycle, wait_for_status)
+                        page_through_the_tunnel, start, start_direct, tunnel_client,
+                        wait_for_client_end, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.clock import refuse_signal
 from lab.gateway import NO_PORT, GatewaySetup
 from lab.scenario import Lab, Situation
@@ -24,11 +24,11 @@ _STOPS = "closeVPNConnection() - attempting to stop process with PID"
 _KILLS = "closeVPNConnection() - attempting to SIGKILL process with PID"
 _DOUBLE_NAT = "testPort - Enforce connection as RELAY (double-NAT detected"
 
-# The usual start, counted.
+# The usual start command, which also counts.
 _COUNTED = {"STARTCMD": "echo start >> starts; env -u LD_PRELOAD openvpn --config client.conf"
                         " --writepid openvpn.pid > openvpn.out 2>&1 &"}
 
-# The gateway goes on to call the address that it has on its port its own.
+# The gateway keeps reporting the address of its WAN port.
 _OTHER_EXIT = f"""
 table inet lab {{
     chain other_exit {{
@@ -51,28 +51,28 @@ def no_gateway_protocol(lab: Lab) -> None:
     assert [lab.names.resolve(name) for name in lab.account.names] == [network.RELAY_ADDRESS] * 3
 
     lab.step("the next cycle checks the public names and keeps the tunnel")
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
     wait_for_log(lab, "ConnectionManager::checkDNS - DNS matches local value for device domain "
                       f"names, IP address is {network.RELAY_ADDRESS}")
     wait_for_next_cycle(lab)
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert (tunnel_client(), lab.relay.connections()) == (client, 1)
 
     lab.step("the tunnel ends with the daemon")
     assert_stops_clean(lab)
     wait_for_client_end(client)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(permissions=NO_PORT), relay=True, clock=RELAYED))
 def gateway_gives_in(lab: Lab) -> None:
-    """A gateway refuses every port, then gives in: the relay goes once the direct path stands."""
+    """A gateway refuses every port, then gives in: the tunnel ends once the direct path works."""
     client = _start_relayed(lab)
     assert lab.gateway.mappings() == []
     assert lab.central.requests_for(PORT_TEST) == []
     before = len(lab.central.requests)
 
-    lab.step("the gateway allows ports; the service takes its time with the publication")
+    lab.step("the gateway allows ports; the service is slow to publish")
     lab.central.misbehave(PORT_FORWARD, Fault(delay=3, times=1))
     lab.gateway.become(GatewaySetup())
     lab.wait_for(lambda: PORT_FORWARD in asked(lab, before), "the publication", 60)
@@ -85,15 +85,14 @@ def gateway_gives_in(lab: Lab) -> None:
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert lab.device.messages.count(_STOPS) == 1
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, static=_COUNTED, clock=IMPATIENT))
 def relay_down_at_first(lab: Lab) -> None:
-    """The relay does not answer: four starts, status failed, nothing left; later it is used."""
+    """The relay does not answer: four starts, status failed, nothing left; it is used later."""
     lab.relay.server.stop()
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "failed")
+    start(lab, "failed")
     assert _STARTS.read_text().split() == ["start"] * 4
     assert lab.device.messages.count(_NOT_UP) == 28
     assert lab.device.messages.count(_STOPS) == 4
@@ -104,22 +103,22 @@ def relay_down_at_first(lab: Lab) -> None:
     client = _wait_for_relayed(lab)
     assert_stops_clean(lab)
     wait_for_client_end(client)
-    assert lab.device.statuses_told() == ["connecting", "failed", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def tunnel_client_dies(lab: Lab) -> None:
-    """The tunnel's client is killed: the next cycle starts another."""
+    """The tunnel client is killed: the next cycle starts another."""
     client = _start_relayed(lab)
 
-    lab.step("the client is killed; until the next cycle the status says relayed all the same")
+    lab.step("the client is killed; until the next cycle the status still says relayed")
     with lab.daemon.held():
         os.kill(client, signal.SIGKILL)
         wait_for_client_end(client)
         assert page_through_the_tunnel(lab) is None
         assert lab.device.status == "relayed"
 
-    lab.step("the next cycle sees it and starts the tunnel anew")
+    lab.step("the next cycle notices and restarts the tunnel")
     wait_for_log(lab, f"isVPNRunning() - unlink stale openVPN pid file {TUNNEL_PID_FILE}")
     wait_for_log(lab, "openVPNConnection() - openVPN has started successfully", 2)
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 20)
@@ -127,15 +126,15 @@ def tunnel_client_dies(lab: Lab) -> None:
     second = tunnel_client()
     assert_stops_clean(lab)
     wait_for_client_end(second)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
-    """The tunnel's client cannot be told to end: after three tries it is killed."""
+    """SIGTERM cannot be sent to the tunnel client: after three tries it is killed."""
     client = _start_relayed(lab)
 
-    lab.step("SIGTERM is refused, and a gateway appears")
+    lab.step("sending SIGTERM fails, and a gateway appears")
     refuse_signal(signal.SIGTERM)
     lab.gateway.become(GatewaySetup())
     _wait_for_direct(lab, client)
@@ -151,22 +150,21 @@ def tunnel_client_cannot_be_stopped(lab: Lab) -> None:
                     static=_COUNTED, clock=RELAYED))
 def relay_refuses(lab: Lab) -> None:
     """The relay refuses the device's credentials: status failed, nothing is left running."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "failed")
+    start(lab, "failed")
     assert (_FOLDER / "auth.txt").read_text() == f"{lab.account.device_id}\nnot-its-own\n"
     assert "AUTH_FAILED" in lab.device.tunnel_output().read_text()
     assert _STARTS.read_text().split() == ["start"] * 4
     assert lab.device.messages.count(_NOT_UP) == 28
     assert lab.device.messages.count("not-its-own") == 0
-    wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay itself to be left", 20)
+    wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay's own process", 20)
     assert lab.stop_daemon() == "SIGTERM"
-    assert lab.device.statuses_told() == ["connecting", "failed", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"]
     assert_log_is_proper(lab)
 
 
 @scenario(Situation(relay=True, clock=RELAYED))
 def second_nat(lab: Lab) -> None:
-    """A second NAT before the gateway: relayed after one port test, direct again without it."""
+    """A second NAT in front of the gateway: relayed after one port test, direct without it."""
     lab.provider.insert()
     client = _start_relayed(lab)
     assert lab.central.port_tests == [PortTest(provider.CUSTOMER_ADDRESS, 9091, "HTTP", "")]
@@ -179,7 +177,7 @@ def second_nat(lab: Lab) -> None:
         lab.provider.remove()
     _wait_for_direct(lab, client)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded", "disabled"]
 
 
 @scenario(Situation(relay=True, clock=IMPATIENT))
@@ -202,17 +200,17 @@ def second_nat_appears(lab: Lab) -> None:
         lab.provider.remove()
     _wait_for_direct(lab, client)
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "relayed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "relayed",
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(relay=True, clock=IMPATIENT))
 def address_behind_the_gateways_back(lab: Lab) -> None:
-    """The service sees another address than the gateway tells: relayed, a mapping stays behind."""
+    """The service sees another address than the gateway reports: relayed, a mapping remains."""
     start_direct(lab)
     before = len(lab.central.requests)
 
-    lab.step("the gateway's traffic leaves by another address, nothing comes in by its own")
+    lab.step("the gateway's traffic leaves from another address, nothing gets in through its own")
     with lab.daemon.held():
         network.ip_batch(f"address add {provider.ADDRESS}/24 dev wan", host=network.GATEWAY)
         packet_filter.change(_OTHER_EXIT)
@@ -221,17 +219,17 @@ def address_behind_the_gateways_back(lab: Lab) -> None:
     with lab.daemon.held():
         assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
         assert lab.device.messages.count(_DOUBLE_NAT) == 1
-        # The gateway still forwards, but nobody is told of the ports.
+        # The gateway still forwards, but the ports are not published.
         assert lab.gateway.mappings() == BOTH_MAPPED
         assert lab.central.record is None
 
-    lab.step("the next cycle maps and tests the HTTP port anew, and takes only that one back")
+    lab.step("the next cycle maps and tests the HTTP port again, and removes only that one")
     wait_for_log(lab, "createConnection() - connection type 2 un-changed")
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD, WAIT, PORT_TEST]
     assert lab.gateway.mappings() == BOTH_MAPPED[1:]
     assert tunnel_client() == client
 
-    lab.step("the gateway's own address is the one that counts again")
+    lab.step("the gateway's own address is back in use")
     lab.gateway.unblock(9091)
     packet_filter.change("delete chain inet lab other_exit\n")
     _wait_for_direct(lab, client)
@@ -239,7 +237,7 @@ def address_behind_the_gateways_back(lab: Lab) -> None:
 
 
 def _wait_for_direct(lab: Lab, client: int) -> None:
-    """Wait until the device is reached directly and the tunnel's client is gone."""
+    """Wait until the device is reached directly and the tunnel client is gone."""
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     wait_for_client_end(client)
@@ -254,7 +252,7 @@ def _start_relayed(lab: Lab) -> int:
 def _wait_for_relayed(lab: Lab) -> int:
     """Wait until a cycle first ends relayed and the page comes through; the client's pid."""
     wait_for_status(lab, "relayed")
-    # The status comes before the cycle's last words.
+    # The status changes before the cycle's last log line.
     wait_for_log(lab, "createConnection() - connection type changed to 2")
     assert page_through_the_tunnel(lab) == PAGES[0]
     return tunnel_client()

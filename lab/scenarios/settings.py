@@ -1,4 +1,4 @@
-"""What other programs on the device change: credentials, ports, switches, a sleeping disk."""
+"""Changes by other programs on the device: credentials, ports, switches, a sleeping disk."""
 
 from __future__ import annotations
 
@@ -6,12 +6,13 @@ import random
 
 from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
-from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_published, assert_stops_clean,
-                        assert_told_by_the_next_cycle, pages_from_outside, ports_tested,
-                        tunnel_client, wait_for_client_end, wait_for_cycle, wait_for_log,
+from lab.checks import (FAST, OPTIONS, PAGES, RELAYED, asked, assert_logged_by_next_cycle,
+                        assert_published, assert_stops_clean, pages_from_outside, ports_tested,
+                        start, tunnel_client, wait_for_client_end, wait_for_cycle, wait_for_log,
                         wait_for_next_cycle, wait_for_status)
 from lab.device import DYNAMIC_COPY, DYNAMIC_FILE
-from lab.gateway import NO_PORT, GatewaySetup, Mapping
+from lab.gateway import NO_PORT, GatewaySetup
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
@@ -23,25 +24,24 @@ _STARTED = "main - pelorus daemon starting up"
 @scenario(Situation(clock=FAST))
 def disk_asleep(lab: Lab) -> None:
     """A sleeping disk is not woken for a port test, and the device stays port forwarded."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    start(lab, "portforwarded")
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
 
-    lab.step("the ports are to be tested again, but the disk is in standby")
+    lab.step("the next port test is due, but the disk is in standby")
     lab.device.disk_sleeps()
     wait_for_log(lab, "drive is in standby, port test is suspended")
 
-    lab.step("the disk turns, but nobody has used it for two minutes")
+    lab.step("the disk spins up, but has not been used for two minutes")
     lab.device.minutes_since_disk_access(2)
     lab.device.disk_wakes()
     wait_for_log(lab, "sleep count > 1, port testing SKIP.")
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
 
     lab.step("the disk is in use again, so the test is made up for")
     lab.device.minutes_since_disk_access(1)
     lab.wait_for(lambda: len(lab.central.port_tests) == 2, "the second port test", 60)
     wait_for_next_cycle(lab)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
     assert_published(lab)
     assert_stops_clean(lab)
 
@@ -61,20 +61,19 @@ def disk_asleep_at_the_start(lab: Lab) -> None:
         assert_published(lab)
         assert_stops_clean(lab)
         first = ["connecting"] if word == "disabled" else []
-        assert lab.device.statuses_told() == [*first, "portforwarded", "disabled"]
+        assert lab.device.statuses_sent() == [*first, "portforwarded", "disabled"]
     assert lab.device.messages.count("checkHddStandByMode") == 0
 
 
 @scenario(Situation(clock=FAST))
 def disk_asleep_and_names_wrong(lab: Lab) -> None:
-    """Public names that lead elsewhere are worth waking the disk: everything is built anew."""
+    """Wrong public names justify waking the disk: everything is rebuilt."""
     lab.device.disk_sleeps()
     lab.names.pin(lab.account.names[0], network.SERVICE_ADDRESS)
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
 
     lab.step("the next cycle finds the names wrong")
-    lab.wait_for(lambda: lab.device.statuses_told().count("portforwarded") == 2,
+    lab.wait_for(lambda: lab.device.statuses_sent().count("portforwarded") == 2,
                  "the device to be published again", 60)
     lab.names.unpin(lab.account.names[0])
     wait_for_next_cycle(lab)
@@ -82,35 +81,34 @@ def disk_asleep_and_names_wrong(lab: Lab) -> None:
     assert lab.central.withdrawals == 2
     assert_published(lab)
 
-    lab.step("with nothing forced any more the disk is left asleep")
+    lab.step("once nothing is forced, the disk is left asleep")
     wait_for_log(lab, "testPort - hard disk is asleep.")
     assert len(lab.central.port_tests) == 2
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "failed",
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
 
 @scenario(Situation(gateway=GatewaySetup(permissions=NO_PORT), relay=True, clock=RELAYED))
 def disk_asleep_while_relayed(lab: Lab) -> None:
     """A sleeping disk keeps a device relayed, until another program says "connecting"."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "relayed")
+    start(lab, "relayed")
     client = tunnel_client()
 
-    lab.step("the gateway maps ports now, but they cannot be proven")
+    lab.step("the gateway maps ports now, but they cannot be tested")
     lab.device.disk_sleeps()
     lab.gateway.become(GatewaySetup())
     wait_for_log(lab, "Skipped port test, unmapped HTTP port 9091, leaving forwardPort()")
     assert lab.gateway.mappings() == []
     assert lab.central.port_tests == []
-    assert lab.device.statuses_told() == ["connecting", "relayed"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed"]
     assert tunnel_client() == client
 
-    lab.step("another program wants the connection built anew")
+    lab.step("another program requests a new connection")
     lab.device.change(COMMUNICATION_STATUS="connecting")
     wait_for_status(lab, "portforwarded")
     assert len(lab.central.port_tests) == 1
-    assert lab.device.statuses_told() == ["connecting", "relayed", "portforwarded"]
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded"]
     wait_for_client_end(client)
     assert_published(lab)
     assert_stops_clean(lab)
@@ -118,7 +116,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
 
 @scenario(Situation(dynamic={"DEVICEID": "", "DEVICEAUTH": ""}, clock=FAST))
 def credentials_missing(lab: Lab) -> None:
-    """Without credentials the daemon idles in silence; it starts to work as soon as they appear."""
+    """Without credentials the daemon idles silently; it starts working as soon as they appear."""
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, _IDLE, 2)
 
@@ -134,20 +132,19 @@ def credentials_missing(lab: Lab) -> None:
         lab.device.change(DEVICEAUTH=lab.account.auth)
         changed = len(lab.device.messages.all)
     wait_for_status(lab, "portforwarded")
-    assert_told_by_the_next_cycle(lab, changed, "createDirectConnection() - success")
-    # The service gets the local address with the record; it is told of it alone only at a start.
+    assert_logged_by_next_cycle(lab, changed, "createDirectConnection() - success")
+    # The service gets the local address with the record; it is sent alone only at a start.
     assert asked(lab) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert lab.device.messages.count(_STARTED) == 1
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["disabled", "connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["disabled", "connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def internal_ports_change(lab: Lab) -> None:
-    """The device's web server moves to other ports; the gateway is led there by the next test."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    """The device's web server moves to other ports; the next port test has them remapped."""
+    start(lab, "portforwarded")
     wait_for_cycle(lab, 1)
     requests = len(lab.device.local_requests)
 
@@ -168,31 +165,31 @@ def internal_ports_change(lab: Lab) -> None:
     assert lab.gateway.mappings() == [Mapping("TCP", 9092, network.DEVICE_ADDRESS, 8080),
                                       Mapping("TCP", 9444, network.DEVICE_ADDRESS, 8443)]
     assert ports_tested(lab) == [9091, 9091, 9091, 9091, 9092]
-    assert lab.central.record.http_port == 9092
+    assert lab.central.record and lab.central.record.http_port == 9092
     assert pages_from_outside(9092, 9444) == PAGES
     assert_stops_clean(lab)
 
 
 @scenario(Situation(clock=FAST))
 def default_ports_only_later(lab: Lab) -> None:
-    """Other ports than 9091 are forbidden while 9092 is used: closed at once, 9091 only later."""
+    """Only 9091 is allowed while 9092 is in use: 9092 closes at once, 9091 opens only later."""
     lab.neighbour.hold(9091, 80)
     others = lab.gateway.mappings()
     lab.start_daemon(*OPTIONS)
     wait_for_cycle(lab, 1)
     assert_published(lab, 9092, others=others)
-    requests, told = list(lab.central.requests), list(lab.device.local_requests)
+    requests, sent = list(lab.central.requests), list(lab.device.local_requests)
 
     lab.step("only the default ports are allowed, and 9091 is free: no search is due yet")
     with lab.daemon.held():
         lab.gateway.lose(9091)
         lab.device.change(DEFAULT_PORTS_ONLY="TRUE")
         changed = len(lab.device.messages.all)
-    assert_told_by_the_next_cycle(lab, changed, "Skip testing port due to interval")
-    # Clients are sent to closed ports until the search; nobody is told of it.
+    assert_logged_by_next_cycle(lab, changed, "Skip testing port due to interval")
+    # Clients are sent to closed ports until the search; nothing is reported.
     assert lab.gateway.mappings() == []
-    assert (lab.central.requests, lab.device.local_requests) == (requests, told)
-    assert lab.central.record.http_port == 9092
+    assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
+    assert lab.central.record and lab.central.record.http_port == 9092
     assert lab.device.status == "portforwarded"
 
     lab.step("the next search is due")
@@ -201,12 +198,12 @@ def default_ports_only_later(lab: Lab) -> None:
     assert_published(lab)
     assert pages_from_outside() == PAGES
     assert_stops_clean(lab)
-    assert lab.device.statuses_told() == ["connecting", "portforwarded", "disabled"]
+    assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
 
 @scenario(Situation(clock=FAST))
 def rubbish_in_place_of_settings(lab: Lab) -> None:
-    """A dynamic configuration that is all rubbish: the daemon idles until it is mended."""
+    """A dynamic configuration that is all rubbish: the daemon idles until it is repaired."""
     proper = DYNAMIC_FILE.read_bytes()
     DYNAMIC_FILE.write_bytes(_RUBBISH)
     lab.start_daemon(*OPTIONS)
@@ -214,7 +211,7 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
     assert lab.central.requests == []
     assert lab.gateway.mappings() == []
 
-    lab.step("the configuration is mended")
+    lab.step("the configuration is repaired")
     for path in (DYNAMIC_FILE, DYNAMIC_COPY):
         path.write_bytes(proper)
     wait_for_status(lab, "portforwarded")
@@ -226,18 +223,17 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def rubbish_amid_settings(lab: Lab) -> None:
     """Rubbish among the settings of a running daemon changes nothing."""
-    lab.start_daemon(*OPTIONS)
-    wait_for_status(lab, "portforwarded")
+    start(lab, "portforwarded")
     wait_for_next_cycle(lab)
-    told = list(lab.device.local_requests)
+    sent = list(lab.device.local_requests)
     proper = DYNAMIC_COPY.read_bytes()
     reloads = lab.device.messages.count("Reload dynamicconfig.ini file.")
 
-    lab.step("another program spoils the file")
+    lab.step("another program corrupts the file")
     DYNAMIC_COPY.write_bytes(_RUBBISH + b"\n" + proper)
     wait_for_log(lab, "Reload dynamicconfig.ini file.", reloads + 1)
     wait_for_next_cycle(lab)
-    assert lab.device.local_requests == told
+    assert lab.device.local_requests == sent
     assert lab.central.withdrawals == 1
     assert_published(lab)
     DYNAMIC_COPY.write_bytes(proper)

@@ -1,4 +1,4 @@
-// What a web server answered, and how the local one is asked.
+// The answer of a web server, and the request to the local one.
 #ifndef PELORUS_CLOUD_ANSWER_H
 #define PELORUS_CLOUD_ANSWER_H
 
@@ -7,17 +7,17 @@
 
 namespace pelorus {
 
-/// The body of an answer. Answers are read as C strings: what follows a NUL byte is not seen.
+/// The body of an answer. It is read as a C string: what follows a NUL byte is ignored.
 struct Answer {
-    /// Copies what was received; a null @p data or a negative count is an empty body.
+    /// Copies @p bytes received; null @p data or a count that is not positive is an empty body.
     Answer(const char* data, int bytes);
 
     std::string text;
-    int size;  ///< bytes received, those behind a NUL included
+    int size;  ///< bytes received, including those behind a NUL
 };
 
-/// Asks the device's own web back end, in plain HTTP. Nothing when it did not answer, which holds
-/// for an empty URL too.
+/// Asks the device's own web back end, in plain HTTP. Nothing when there was no answer, nor for an
+/// empty URL.
 [[nodiscard]] std::optional<Answer> fetchLocal(const std::string& url);
 
 }  // namespace pelorus

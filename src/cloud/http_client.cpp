@@ -18,9 +18,6 @@
 
 namespace pelorus {
 
-std::map<std::string, std::string> Status2LogState;
-std::map<std::string, std::string> Status2LogType;
-
 namespace {
 
 constexpr std::size_t kReceiveBlockSize = 10240;  // bytes
@@ -45,7 +42,7 @@ void setOptions(CURL* handle, const char* url, CurlRcvBuffer& buffer) {
     curl_easy_setopt(handle, CURLOPT_SSL_VERIFYPEER, kVerifyPeer);
 }
 
-// The address field of the entry's own family; null for families without one.
+// Null for families without an address.
 const void* addressOf(const addrinfo& entry) {
     const void* address = entry.ai_addr;
     if (entry.ai_family == AF_INET) return &static_cast<const sockaddr_in*>(address)->sin_addr;
@@ -70,7 +67,7 @@ std::string firstAddress(const addrinfo* list) {
 std::size_t curlRcvData(void* data, std::size_t elemSize, std::size_t count, void* context) try {
     auto& buffer = *static_cast<CurlRcvBuffer*>(context);
     if (buffer.data == nullptr) {
-        // The block leaves through httpGet, whose callers release it with free.
+        // httpGet hands the block to its callers, who release it with free.
         buffer.data = static_cast<char*>(std::malloc(kReceiveBlockSize));  // NOLINT(*-no-malloc)
         if (buffer.data == nullptr) {
             logError(
@@ -95,20 +92,6 @@ std::size_t curlRcvData(void* data, std::size_t elemSize, std::size_t count, voi
     return 0;
 }
 
-TavikClient::TavikClient() {
-    Status2LogState["disabled"] = "connecting";
-    Status2LogState["connecting"] = "connecting";
-    Status2LogState["portforwarded"] = "connected";
-    Status2LogState["relayed"] = "connected";
-    Status2LogState["failed"] = "failed";
-
-    Status2LogType["disabled"] = "disabled";
-    Status2LogType["connecting"] = "disabled";
-    Status2LogType["portforwarded"] = "portforwarded";
-    Status2LogType["relayed"] = "relayed";
-    Status2LogType["failed"] = "disabled";
-}
-
 TavikClient::~TavikClient() {
     cleanup();
 }
@@ -129,7 +112,9 @@ TavikClient* TavikClient::getInstance() {
 
 bool TavikClient::initialize() {
     portMapCheckSuccess = true;
-    const bool complete = !getDeviceID().empty() && !getDeviceAuth().empty();
+    const std::string deviceId = getDeviceID();
+    const std::string deviceAuth = getDeviceAuth();
+    const bool complete = !deviceId.empty() && !deviceAuth.empty();
     if (!complete) {
         logError(
             "TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file\n");
@@ -152,7 +137,8 @@ std::string TavikClient::getDeviceAuth() const {
     return setting("DEVICEAUTH");
 }
 
-// Only the host part of the setting counts: both schemes are offered whatever it names.
+// The scheme of the setting is dropped: both are offered. False, with the cause logged, when no
+// host of at least two characters is left.
 bool TavikClient::deriveServerUrls() {
     const std::string base = setting("SERVER_BASE_URL");
     const std::size_t slash = base.find('/');
@@ -185,6 +171,7 @@ std::string TavikClient::getRestUrl(const std::string& urn, HttpType type) {
         logInfo("TavikClient::getRestUrl - Invalid http type %d. Use only the input urn.\n",
                 static_cast<int>(type));
     }
+    // Still a template: the log shows its placeholders as "_s".
     std::string logged = scrubSecrets(url);
     replaceAll(logged, "%", "_");
     logInfo("TavikClient::getRestUrl - restURL %s.\n", logged.c_str());
@@ -202,6 +189,7 @@ char* TavikClient::httpGet(const char* url, int& size) {
         if (handle) {
             setOptions(handle.get(), url, rcvBuffer);
             const CURLcode result = curl_easy_perform(handle.get());
+            // What arrived before the failure is returned all the same.
             if (result != CURLE_OK) {
                 logError("TavikClient::httpGet  Error: [%s]\n", curl_easy_strerror(result));
             }
@@ -240,13 +228,6 @@ void TavikClient::ReplaceStringInPlace(std::string& subject,
                                        const std::string& search,
                                        const std::string& replace) const {
     replaceAll(subject, search, replace);
-}
-
-// NOLINTNEXTLINE(performance-unnecessary-value-param): the interface takes a copy
-bool TavikClient::validateIpAddress(std::string address) const {
-    in_addr parsed{};
-    const bool isText = std::strlen(address.c_str()) == address.size();
-    return isText && inet_pton(AF_INET, address.c_str(), &parsed) != 0;
 }
 
 }  // namespace pelorus

@@ -15,7 +15,7 @@ constexpr const char* kLocalDeleteKey = "LOCAL_DELFORWARDURL";
 constexpr const char* kNoAddress = "NULL";  // withdraws a record
 constexpr const char* kLocalSuccess = "success";
 
-// What the local back end is told; its objections are logged and do not count.
+// True when the back end answered; a refusal is only logged.
 bool updateLocalRecord(const MaskedUrl& url) {
     logInfo("TavikClient::updateServerMapping - update local config url: %s\n", url.logged.c_str());
     const auto answer = fetchLocal(url.request);
@@ -34,6 +34,7 @@ bool updateLocalRecord(const MaskedUrl& url) {
     return true;
 }
 
+// True only when the back end reported success.
 bool deleteLocalRecord(const std::string& url) {
     const auto answer = fetchLocal(url);
     if (!answer) {
@@ -91,7 +92,7 @@ bool TavikClient::updateServerMapping(const std::string& externalIp,
     }
     logNotice("TavikClient::updateServerMapping - httpGet got %s, %d bytes.\n",
               scrubSecrets(answer->text).c_str(), answer->size);
-    // The local back end expects the internal HTTP port in the last place too.
+    // The back end expects the internal HTTP port in the last place, too, not the HTTPS one.
     return updateLocalRecord(fillMaskedTemplate(kLocalSetKey, setting(kLocalSetKey),
                                                 {internalHttpPort, externalIp, externalHttpPort,
                                                  externalHttpsPort, localIp, internalHttpPort}));

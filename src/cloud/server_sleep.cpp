@@ -1,10 +1,10 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "cloud/sleep_answer.h"
 #include "cloud/tavik_client.h"
 #include "common/log.h"
 #include "common/masks.h"
-#include "common/text.h"
 #include "config/scrub.h"
 
 namespace pelorus {
@@ -12,10 +12,6 @@ namespace pelorus {
 namespace {
 
 constexpr const char* kRemoteStatusPath = "/api/1.0/rest/remote_access_status/%s";
-constexpr const char* kWaitAction = "<action>wait</action>";
-constexpr const char* kProceedAction = "<action>proceed</action>";
-const std::string kWaitTimeTag = "<wait_time>";
-
 constexpr int kShortestPause = 120;  // seconds between two cycles
 
 }  // namespace
@@ -42,7 +38,7 @@ int TavikClient::pollServerForSleepTime() {
         if (const auto answer = fetchCentral(url)) {
             logInfo("TavikClient::pollServerForSleepTime - httpGet got %s, %d bytes.\n",
                     scrubSecrets(answer->text).c_str(), answer->size);
-            applySleepAnswer(answer->text);
+            applySleepAnswer(readSleepAnswer(answer->text));
         } else {
             logError(
                 "TavikClient::pollServerForSleepTime - httpGet for %s, failed to get response from central server. Therefore using sleep time %d secs.\n",
@@ -58,42 +54,35 @@ int TavikClient::pollServerForSleepTime() {
     return serverSleepTime;
 }
 
-// An answer that is not understood leaves the wait as it is, so that the device proceeds.
-void TavikClient::applySleepAnswer(const std::string& answer) {
-    const std::size_t wait = answer.find(kWaitAction);
-    if (wait != std::string::npos) {
-        readWaitTime(answer, wait);
-    } else if (contains(answer, kProceedAction)) {
-        serverSleepTime = 0;
-        logInfo(
-            "TavikClient::pollServerForSleepTime - central server gave permission to proceed. Sleep time is %d secs.\n",
-            serverSleepTime);
-    } else {
-        logInfo(
-            "TavikClient::pollServerForSleepTime - missing action from central server. Therefore using sleep time %d secs.\n",
-            serverSleepTime);
+void TavikClient::applySleepAnswer(const SleepAnswer& answer) {
+    // 0 since the cycle began: after an answer that is not understood the device proceeds.
+    serverSleepTime = answer.seconds.value_or(serverSleepTime);
+    switch (answer.kind) {
+        case SleepAnswer::WAIT:
+            logInfo("TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
+                    serverSleepTime);
+            break;
+        case SleepAnswer::PROCEED:
+            logInfo(
+                "TavikClient::pollServerForSleepTime - central server gave permission to proceed. Sleep time is %d secs.\n",
+                serverSleepTime);
+            break;
+        case SleepAnswer::BAD_TIME:
+            logInfo(
+                "TavikClient::pollServerForSleepTime - received garbage sleep time from central server. Therefore using sleep time %d secs.\n",
+                serverSleepTime);
+            break;
+        case SleepAnswer::NO_TIME:
+            logInfo(
+                "TavikClient::pollServerForSleepTime - malformed wait_time from central server. Therefore using sleep time %d secs.\n",
+                serverSleepTime);
+            break;
+        case SleepAnswer::NO_ACTION:
+            logInfo(
+                "TavikClient::pollServerForSleepTime - missing action from central server. Therefore using sleep time %d secs.\n",
+                serverSleepTime);
+            break;
     }
-}
-
-// The time counts only behind the action.
-void TavikClient::readWaitTime(const std::string& answer, std::size_t action) {
-    const std::size_t tag = answer.find(kWaitTimeTag, action);
-    if (tag == std::string::npos) {
-        logInfo(
-            "TavikClient::pollServerForSleepTime - malformed wait_time from central server. Therefore using sleep time %d secs.\n",
-            serverSleepTime);
-        return;
-    }
-    int seconds = 0;
-    if (!scanInt(answer.c_str() + tag + kWaitTimeTag.size(), seconds) || seconds < 0) {
-        logInfo(
-            "TavikClient::pollServerForSleepTime - received garbage sleep time from central server. Therefore using sleep time %d secs.\n",
-            serverSleepTime);
-        return;
-    }
-    serverSleepTime = seconds;
-    logInfo("TavikClient::pollServerForSleepTime - sleep time from server is %d secs.\n",
-            serverSleepTime);
 }
 
 bool TavikClient::serverRequestedSleep() {

@@ -16,8 +16,26 @@
 
 namespace pelorus {
 
+std::map<std::string, std::string> Status2LogState;
+std::map<std::string, std::string> Status2LogType;
 const std::array<const char*, 5> ConnType2LogType{"disabled", "portforwarded", "relayed",
                                                   "disabled", "disabled"};
+
+// Only fills the tables, so it stands with them. A failure has no type of its own: sendAnalytics
+// takes that of the connection that failed.
+TavikClient::TavikClient() {
+    Status2LogState["disabled"] = "connecting";
+    Status2LogState["connecting"] = "connecting";
+    Status2LogState["portforwarded"] = "connected";
+    Status2LogState["relayed"] = "connected";
+    Status2LogState["failed"] = "failed";
+
+    Status2LogType["disabled"] = "disabled";
+    Status2LogType["connecting"] = "disabled";
+    Status2LogType["portforwarded"] = "portforwarded";
+    Status2LogType["relayed"] = "relayed";
+    Status2LogType["failed"] = "disabled";
+}
 
 namespace {
 
@@ -26,10 +44,12 @@ constexpr const char* kLocalStatusKey = "LOCAL_SETCOMMSTATUSURL";
 constexpr const char* kLocalAddressKey = "LOCAL_SETLOCALIPURL";
 constexpr const char* kRemoteStatusKey = "REMOTE_SETCOMMSTATUSURL";
 
+// The two sides spell it differently.
 constexpr const char* kLocalSuccess = "success";
 constexpr const char* kCentralSuccess = "Success";
 
 constexpr unsigned kLocalUpdatePause = 1;  // seconds the local back end is given to write
+// A new time stamp makes GlobalConfig read what the back end has written.
 constexpr const char* kTouchDynamicConfig = "touch /tmp/dynamicconfig.ini";
 
 constexpr const char* kDiskStateCommand = "hdparm -C /dev/sda";
@@ -38,7 +58,7 @@ constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 constexpr int kMostIdleMinutes = 1;
 constexpr std::size_t kShortLineSize = 80;  // bytes, terminator included
 
-// Of the library's event format.
+// Values of the event log library.
 constexpr int kEventLevel = 3;
 constexpr int kTextValue = 3;
 
@@ -70,7 +90,7 @@ bool tellBackEndLocalIp(const std::string& localIp) {
 }
 
 void emitEvent(const char* state, const char* type) {
-    // The library holds the log's lock too: a termination signal's own lines must not meet it.
+    // The library may hold the log's lock, and the termination handler logs, too.
     const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
     __qvlog_kvp(kEventLevel, "cloudConnectivity", "state", kTextValue, state, "type", kTextValue,
                 type, __QVLOG_END);
@@ -89,7 +109,7 @@ int firstNumber(std::FILE* file) {
     return std::fgets(line.data(), line.size(), file) == nullptr ? 0 : leadingInt(line.data());
 }
 
-// 1 when the disk has been idle for so long that it may be asleep by now, 0 when not.
+// 1 when the disk has been idle for so long that it may be asleep, or nobody knows; 0 otherwise.
 int checkIdleMinutes() {
     const FileHandle file = openFile(kIdleMinutesFile, "re");
     if (!file) {
@@ -131,7 +151,7 @@ std::string logTypeOf(const std::string& status) {
 
 void TavikClient::updateLocalCommStatus(const std::string& status) try {
     if (!lastLocalCommStatus.empty() && lastLocalCommStatus == status) return;
-    // Remembered before it is sent: a failed update waits for the next change of status.
+    // Stored first: a failed update is not repeated before the status changes.
     lastLocalCommStatus = status;
     const std::string url =
         fillTemplate(kLocalStatusKey, setting(kLocalStatusKey), {internalPort(), status});
@@ -171,7 +191,7 @@ bool TavikClient::updateRemoteCommStatus(const std::string& localIp) try {
     return false;
 }
 
-// True when the server answered; what it said is only logged.
+// True when the server answered; its answer is only logged.
 bool TavikClient::tellServerLocalIp(const std::string& localIp) {
     const MaskedUrl url =
         fillMaskedTemplate(kRemoteStatusKey, getRestUrl(setting(kRemoteStatusKey), HTTPS),
@@ -207,7 +227,7 @@ void TavikClient::sendAnalytics(const std::string& status,
         status.c_str(), static_cast<int>(type), static_cast<int>(subType));
     const std::string logState = logStateOf(status);
     std::string logType = logTypeOf(status);
-    // A failure or an attempt counts for the kind of connection that failed or is tried.
+    // A failure or an attempt is reported under the kind of connection that failed or is tried.
     const auto kind = static_cast<std::size_t>(type);
     if ((status == "failed" || status == "connecting") && kind < ConnType2LogType.size()) {
         logType = ConnType2LogType[kind];

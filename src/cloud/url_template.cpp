@@ -12,7 +12,7 @@ namespace {
 
 enum class Secrets { REAL, MASKED };
 
-// The text of one argument; nothing when it is not of the kind the placeholder asks for.
+// Nothing when the argument is not of the kind the placeholder asks for.
 std::optional<std::string> argumentText(const TemplateArgument& argument,
                                         char placeholder,
                                         Secrets secrets) {
@@ -48,7 +48,7 @@ std::optional<std::string> format(const std::string& urlTemplate,
         if (!text) return std::nullopt;
         url += *text;
     }
-    // The template and the texts come from configuration and from the server.
+    // Before the cut, which could leave half a secret behind.
     if (secrets == Secrets::MASKED) url = scrubSecrets(url);
     url.resize(std::min(url.size(), kUrlBufferSize - 1));
     return url;

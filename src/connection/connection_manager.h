@@ -2,6 +2,7 @@
 #ifndef PELORUS_CONNECTION_CONNECTION_MANAGER_H
 #define PELORUS_CONNECTION_CONNECTION_MANAGER_H
 
+#include <cstdint>
 #include <ctime>
 #include <memory>
 #include <string>
@@ -13,8 +14,8 @@
 namespace pelorus {
 
 /// Chooses between a direct connection through forwarded ports and a relayed one, proves it,
-/// publishes it, keeps it up and tears it down. The members are implemented by subject, one
-/// source each.
+/// publishes it, keeps it up and tears it down. Holds what lasts from one cycle to the next; each
+/// attempt is an object of its own (DirectAttempt, ForwardSearch, ManualAttempt, DnsCheck).
 class ConnectionManager {
 public:
     static constexpr int MAX_CHECK_DNS_TRIES = 3;
@@ -41,36 +42,36 @@ public:
 
     // --- settings ------------------------------------------------------------------------------
 
-    /// Least time between two checks of the public names, seconds.
-    [[nodiscard]] long getDNSCheckInterval() const { return dnsCheckInterval; }
-    void setDNSCheckInterval(long seconds) { dnsCheckInterval = seconds; }
+    /// Minimum time between two checks of the public names, seconds.
+    [[nodiscard]] std::int64_t getDNSCheckInterval() const { return dnsCheckInterval; }
+    void setDNSCheckInterval(std::int64_t seconds) { dnsCheckInterval = seconds; }
 
     /// Leases to ask for, seconds. Until the gateway object exists both read as
     /// Router::INVALID_LEASE_DURATION.
     void setReqPortMappingLifetime(unsigned upnp, unsigned natpmp);
     void getReqPortMappingLifetime(unsigned& upnp, unsigned& natpmp) const;
 
-    /// Checks the public names at the next chance, whatever the interval.
+    /// Checks the public names at the next opportunity, whatever the interval.
     void setForceDNSCheck(bool force) { forceDNSCheck = force; }
-    /// Tests the port in the next attempt, whatever the interval and the disk.
+    /// Tests the port in the next attempt, whatever the interval and the disk state.
     void setForceConnect(bool force);
     /// Records the address the server saw in a passed port test.
     void setResponseExternalIP(const std::string& ip) { responseExternalIP = ip; }
     /// Time of the last check of the public names, seconds since the epoch.
-    void setPrevDNSCheckTime(long time) { prevDNSCheckTime = time; }
-    /// Stretches the time between port tests by two minutes, up to sixteen.
+    void setPrevDNSCheckTime(std::int64_t time) { prevDNSCheckTime = time; }
+    /// Adds two minutes to the time between port tests, up to sixteen minutes.
     void increasePortTestInterval();
 
-    // --- the stages of an attempt, each usable on its own -----------------------------------------
+    // --- the parts of a cycle, each usable on its own ---------------------------------------------
 
-    /// Makes or keeps a direct connection. PORTFORWARDED, FAILED, or the connection type of
-    /// before when nothing was due.
+    /// Makes or keeps a direct connection. Returns PORTFORWARDED, FAILED, or the previous
+    /// connection type when nothing was due.
     ConnectionType createDirectConnection();
 
     /// Finds, maps and (HTTP only) tests an external port for @p internalPort: @p startPort first,
     /// then 99 ports from @p extendedStartPort unless @p defaultPortsOnly. Returns the port, or 0.
-    /// A double NAT found on a pre-defined port of the maker's router returns 4, which callers
-    /// take for a port until they look at the double-NAT flag.
+    /// A double NAT found on a pre-defined port of the maker's router returns 4, which looks like
+    /// a port: callers check the double-NAT flag before they use the result.
     int forwardPort(int internalPort,
                     int startPort,
                     int extendedStartPort,
@@ -80,8 +81,8 @@ public:
                     bool defaultPortsOnly,
                     bool checkSleep);
 
-    /// Proves and publishes ports that the user forwarded by hand. PORTFORWARDED, FAILED, or the
-    /// connection type of before.
+    /// Proves and publishes ports that the user forwarded by hand. Returns PORTFORWARDED, FAILED,
+    /// or the previous connection type when no test was due or it was skipped.
     ConnectionType manualPortForward(int internalHttpPort,
                                      int internalHttpsPort,
                                      std::string localIp);
@@ -91,27 +92,29 @@ public:
     ConnectionType createRelayConnection();
 
     /// Whether the device's public names resolve to it. True also when no check was due or there
-    /// is nothing to compare with. May block for 30 seconds and the lookups.
+    /// is nothing to compare with. May block for 30 seconds plus the lookups.
     bool checkDNS(ConnectionType type);
 
-    /// Builds the device's names. 1, or 0 when @p hostname or @p deviceId is missing.
+    /// Builds the device's names. Returns 1, or 0 when @p hostname or @p deviceId is missing.
     int buildDeviceDomainName(char* hostname,
                               const std::string& deviceId,
                               std::string& fourLevel,
                               std::string& threeLevel,
                               std::string& threeLevelHashed);
 
-    /// The address the names must resolve to: the gateway's or the relay's. 1 when it is known.
+    /// The address the names must resolve to: the gateway's or the relay's. Returns 1 when it is
+    /// known, else 0.
     int fetchLocalDeviceDomainIPAddr(ConnectionType type, std::string& ip);
 
     /// The status word of @p type.
     [[nodiscard]] static std::string convertEnumConnectionType(ConnectionType type);
 
 private:
-    struct DirectAttempt;
-    struct ForwardSearch;
-    struct ManualAttempt;
-    struct DeviceNames;
+    // The attempts work on the lasting state below.
+    friend class DirectAttempt;
+    friend class DnsCheck;
+    friend class ForwardSearch;
+    friend class ManualAttempt;
 
     ConnectionManager();
     ~ConnectionManager() = default;
@@ -119,70 +122,39 @@ private:
     Router& router();
     void noteConnectionType();
     void clearMappedFlags();
+    void forgetPorts();
     void unmapDevicePort(int internalPort, int externalPort);
-    int testHttpPort(std::string& requestedIp, int port, bool checkSleep, bool skipDoubleNatCheck);
+    int testHttpPort(std::string& requestedIp,
+                     int externalPort,
+                     bool checkSleep,
+                     bool skipDoubleNatCheck);
 
-    // Stages of createDirectConnection().
-    bool checkGateway(DirectAttempt& attempt);
-    bool testPortsWithoutGateway(DirectAttempt& attempt);
-    void readStatusFile(DirectAttempt& attempt);
-    void dropOutdatedMappings(const DirectAttempt& attempt);
-    void unmapAllocatedPorts(const DirectAttempt& attempt);
-    void decideSleepCheck(DirectAttempt& attempt);
-    bool retestMappedPorts(DirectAttempt& attempt);
-    bool searchIsDue(const DirectAttempt& attempt);
-    bool searchPorts(DirectAttempt& attempt);
-    ConnectionType publishMapping(const DirectAttempt& attempt);
-    ConnectionType giveUpMapping(const DirectAttempt& attempt);
-
-    // Stages of forwardPort().
-    bool tryPredefinedPorts(ForwardSearch& search, int& result);
-    void mapCandidate(ForwardSearch& search);
-    void mapInExtendedRange(ForwardSearch& search);
-    bool mapDevicePort(const ForwardSearch& search, int& externalPort);
-    bool testCandidate(ForwardSearch& search, int& result);
-    [[nodiscard]] bool isBadPort(int port) const;
-
-    // Stages of manualPortForward().
-    void leaveAutomaticForwarding();
-    void noticeManualChanges(ManualAttempt& attempt) const;
-    void testManualPorts(ManualAttempt& attempt);
-    void publishManualPorts(ManualAttempt& attempt);
-    [[nodiscard]] ConnectionType endManualAttempt(const ManualAttempt& attempt) const;
-
-    // Stages of createRelayConnection() and killConnection().
     ConnectionType startRelay();
     void removeMappings();
     void withdrawMappingRecord();
-
-    // Stages of checkDNS().
-    bool buildOwnNames(DeviceNames& names);
-    bool namesLeadHere(const DeviceNames& names, ConnectionType type);
-    void fetchExternalIp(std::string& ip);
-    void fetchRelayIp(std::string& ip);
 
     std::unique_ptr<Router> pRouter;
     int allocatedHttpPort = 0;   // external; 0: none
     int allocatedHttpsPort = 0;  // external; 0: none
     int connTypeUnchangedCount = 0;
     int deviceType = 0;
-    bool doubleNatDetected = false;
-    time_t lastPortTestTime = 0;
-    long portTestInterval;  // seconds
-    bool httpPortMapped = false;
-    bool httpsPortMapped = false;
+    bool doubleNatDetected = false;  // by the last port test
+    time_t lastPortTestTime = 0;     // 0: none yet
+    std::int64_t portTestInterval;   // seconds
+    bool httpPortMapped = false;     // in the current attempt
+    bool httpsPortMapped = false;    // in the current attempt
     bool lastManualPortForward = false;
     ConnectionType connectionType = FAILED;
-    ConnectionType prevConnectionType = FAILED;
-    std::vector<int> badPorts;
-    long dnsCheckInterval;  // seconds
-    time_t prevDNSCheckTime;
+    ConnectionType prevConnectionType = FAILED;  // when the cycle began
+    std::vector<int> badPorts;                   // external ports a search passes over
+    std::int64_t dnsCheckInterval;               // seconds
+    std::int64_t prevDNSCheckTime;               // seconds since the epoch
     bool forceDNSCheck = false;
     bool forceConnect = false;
     std::string responseExternalIP;
 };
 
-/// Records that a check of the public names was made, on every way out of it.
+/// Records on every return path that a check of the public names was made.
 class ClearDNSCheck {
 public:
     explicit ClearDNSCheck(ConnectionManager* manager) : pManager(manager) {}

@@ -1,5 +1,6 @@
 #include "connection/network_addrs.h"
 
+#include <cstdint>
 #include <ctime>
 
 #include "cloud/tavik_client.h"
@@ -38,7 +39,7 @@ void NetworkAddrs::setNetworkAddrs(const std::string& externalIp, const std::str
     localIP = localIp;
     interval.StartTheInterval();
     logInfo(
-        "NetworkAddrs::setNetworkAddrs - external IP [%s], local IP [%s], interval start time [%ld], interval duration [%d] \n",
+        "NetworkAddrs::setNetworkAddrs - external IP [%s], local IP [%s], interval start time [%jd], interval duration [%d] \n",
         scrubSecrets(externalIP).c_str(), localIP.c_str(), interval.GetIntervalStartTime(),
         static_cast<int>(interval.GetIntervalDuration()));
 }
@@ -51,45 +52,47 @@ int NetworkAddrs::discoverNetworkAddrs() {
     if (!pRouter) pRouter = std::make_unique<Router>();
     pRouter->discover();
     const std::string discoveredLocal = pRouter->getLocalIp();
-    std::string discoveredExternal;
-    if (!findExternalIp(discoveredExternal)) return 0;
+    const auto discoveredExternal = findExternalIp();
+    if (!discoveredExternal) return 0;
 
-    externalIPChanged = externalIP != discoveredExternal;
+    externalIPChanged = externalIP != *discoveredExternal;
     internalIPChanged = localIP != discoveredLocal;
     logInfo(
         "NetworkAddrs::discoverNetworkAddrs - externalIPChanged [%d], external IP [%s], discovered external IP [%s], internalIPChanged [%d], internal IP [%s], discovered internal IP [%s]\n",
         externalIPChanged, scrubSecrets(externalIP).c_str(),
-        scrubSecrets(discoveredExternal).c_str(), internalIPChanged, localIP.c_str(),
+        scrubSecrets(*discoveredExternal).c_str(), internalIPChanged, localIP.c_str(),
         discoveredLocal.c_str());
     return 1;
 }
 
-// From the gateway, or else from the server as often as the interval allows.
-bool NetworkAddrs::findExternalIp(std::string& discovered) {
+// From the gateway, or else from the server when the interval allows a query.
+std::optional<std::string> NetworkAddrs::findExternalIp() {
     if (pRouter->isInitialized()) {
-        discovered = pRouter->getExternalIp();
+        std::string discovered = pRouter->getExternalIp();
         logInfo(
             "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [1], discovered external IP [%s]\n",
             scrubSecrets(discovered).c_str());
-        return true;
+        return discovered;
     }
     if (!interval.hasExpired()) {
         logInfo("NetworkAddrs::discoverNetworkAddrs - interval not expired.\n");
-        return false;
+        return std::nullopt;
     }
     logInfo(
-        "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [0], interval expired.  Interval start time [%ld], interval duration [%d], current time [%ld]\n",
+        "NetworkAddrs::discoverNetworkAddrs - pRouter->isInitialized [0], interval expired.  Interval start time [%jd], interval duration [%d], current time [%jd]\n",
         interval.GetIntervalStartTime(), static_cast<int>(interval.GetIntervalDuration()),
-        static_cast<long>(time(nullptr)));
+        static_cast<std::int64_t>(time(nullptr)));
+    std::string discovered;
     if (getMyIP(discovered) != 1) {
-        logInfo("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
-        return false;
+        // The interval is not restarted: the next call asks again.
+        logError("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n");
+        return std::nullopt;
     }
     interval.StartTheInterval();
     logInfo(
-        "NetworkAddrs::discoverNetworkAddrs - discovered external IP [%s], reset interval start time [%ld]\n",
+        "NetworkAddrs::discoverNetworkAddrs - discovered external IP [%s], reset interval start time [%jd]\n",
         discovered.c_str(), interval.GetIntervalStartTime());
-    return true;
+    return discovered;
 }
 
 bool NetworkAddrs::haveNetworkAddrsChanged() const {
@@ -109,14 +112,14 @@ int NetworkAddrs::getMyIP(std::string& out) {
     while (!found && waitSeconds > 0 && !terminationRequested()) {
         logInfo("NetworkAddrs::getMyIP - wait %d seconds\n", waitSeconds);
         pauseUnlessTerminated(waitSeconds);
-        // The server's answer is kept for a cycle; without this, that answer would be asked.
+        // The server's answer is kept for the cycle and would be read again.
         client->resetServerSleepTime();
         if (terminationRequested()) break;
         waitSeconds = 0;
         found = client->getMyIP(ip, waitSeconds);
     }
     if (!found) {
-        logInfo("NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
+        logError("NetworkAddrs::getMyIP - failed to retrieve external IP address\n");
         return 0;
     }
     out = ip;

@@ -3,6 +3,7 @@
 #define PELORUS_CONNECTION_NETWORK_ADDRS_H
 
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "router/lease_tracking.h"
@@ -10,9 +11,8 @@
 
 namespace pelorus {
 
-/// Remembers the published addresses and tells whether they have changed since. Without a gateway
-/// that can be asked, the external address comes from the central server, at most once per
-/// interval.
+/// Remembers the published addresses and tells whether they have changed since. When no gateway
+/// answers, the external address comes from the central server, at most once per interval.
 class NetworkAddrs {
 public:
     static constexpr int kDefaultInterval = 720;  ///< seconds
@@ -21,16 +21,16 @@ public:
     NetworkAddrs(const NetworkAddrs&) = delete;
     NetworkAddrs& operator=(const NetworkAddrs&) = delete;
 
-    /// Forgets both addresses and both changes. The interval goes on.
+    /// Clears both addresses and change flags; the interval keeps running.
     void init();
-    /// Least time between two questions to the server, seconds.
+    /// Minimum time between two queries to the server, seconds.
     void SetIntervalDuration(int seconds);
-    /// Records what was published, clears the changes and starts the interval.
+    /// Records what was published, clears the change flags and restarts the interval.
     void setNetworkAddrs(const std::string& externalIp, const std::string& localIp);
 
-    /// Finds the present addresses and compares them with the recorded ones, which stay as they
-    /// are. 1 when that was done; 0 when nothing is recorded yet, the interval has not passed or
-    /// the server gave no address, with the change flags as they were.
+    /// Finds the current addresses and compares them with the recorded ones, which do not change.
+    /// Returns 1 when that was done; 0, with the change flags untouched, when nothing is recorded
+    /// yet, the interval has not passed or the server gave no address.
     int discoverNetworkAddrs();
 
     [[nodiscard]] bool haveNetworkAddrsChanged() const;
@@ -42,15 +42,15 @@ public:
     [[nodiscard]] const std::string& getExternalIp() const { return externalIP; }
     [[nodiscard]] const std::string& getLocalIp() const { return localIP; }
 
-    /// The external address as the server sees it. 1 and @p out on success, else 0. Waits as long
-    /// as the server asks for a pause, without a bound; only a termination signal ends that.
+    /// The external address as the server sees it. Returns 1 and sets @p out, or 0. Waits, without
+    /// a limit, for as long as the server asks for a pause; only a termination signal ends that.
     int getMyIP(std::string& out);
 
 private:
     NetworkAddrs();
     ~NetworkAddrs() = default;
 
-    bool findExternalIp(std::string& discovered);
+    std::optional<std::string> findExternalIp();
 
     std::string externalIP;
     std::string localIP;

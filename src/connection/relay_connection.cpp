@@ -3,18 +3,10 @@
 #include "common/text.h"
 #include "config/global_config.h"
 #include "connection/connection_manager.h"
-#include "connection/mapping_names.h"
+#include "connection/port_forwarding.h"
 #include "relay/vpn_manager.h"
 
 namespace pelorus {
-
-namespace {
-
-void reportAnalytics(const char* status) {
-    TavikClient::getInstance()->sendAnalytics(status, RELAYED, SUBTYPE_NONE);
-}
-
-}  // namespace
 
 ConnectionType ConnectionManager::createRelayConnection() {
     if (httpPortMapped && httpsPortMapped) return PORTFORWARDED;
@@ -41,11 +33,11 @@ ConnectionType ConnectionManager::createRelayConnection() {
     return result;
 }
 
-// Withdraws the direct path from the server and starts the tunnel. Mappings on the gateway stay.
+// Withdraws the direct path from the server and starts the tunnel. The gateway keeps its mappings.
 ConnectionType ConnectionManager::startRelay() {
     auto* client = TavikClient::getInstance();
     logInfo("ConnectionManager::createRelayConnection() - creating VPN connection.\n");
-    reportAnalytics("connecting");
+    client->sendAnalytics("connecting", RELAYED, SUBTYPE_NONE);
     const int internalHttpPort = leadingInt(setting("INTERNAL_HTTP_PORT"));
     if (client->deleteServerMapping(internalHttpPort, router().getLocalIp())) {
         logInfo(
@@ -54,17 +46,16 @@ ConnectionType ConnectionManager::startRelay() {
         logError(
             "ConnectionManager:createRelayConnection() - failed to delete port mapping info.\n");
     }
-    allocatedHttpPort = 0;
-    allocatedHttpsPort = 0;
+    forgetPorts();
     logInfo(
         "ConnectionManager::createRelayConnection() - attempting to open VPN relay connection.\n");
     if (!VPNManager::getInstance()->openVPNConnection()) {
-        reportAnalytics("failed");
+        client->sendAnalytics("failed", RELAYED, SUBTYPE_NONE);
         client->updateLocalCommStatus("failed");
         logError("ConnectionManager::createRelayConnection() - failed to create VPN connection.\n");
         return FAILED;
     }
-    reportAnalytics("relayed");
+    client->sendAnalytics("relayed", RELAYED, SUBTYPE_NONE);
     client->updateLocalCommStatus("relayed");
     setForceConnect(false);
     return RELAYED;
@@ -92,11 +83,11 @@ void ConnectionManager::removeMappings() {
         router().unmapAllPorts(kTcp, kHttpDescription);
         router().unmapAllPorts(kTcp, kHttpsDescription);
     } else {
-        // Also where no gateway was found: without the router's script this does nothing.
+        // On purpose also on other devices whose gateway is gone: without the maker's script the
+        // list is empty and nothing happens.
         router().unmapAllPortBrenvik(kTcp);
     }
-    allocatedHttpsPort = 0;
-    allocatedHttpPort = 0;
+    forgetPorts();
     withdrawMappingRecord();
 }
 

@@ -14,6 +14,7 @@
 #include "common/text.h"
 #include "config/global_config.h"
 #include "config/scrub.h"
+#include "relay/client_output.h"
 
 namespace pelorus {
 
@@ -31,14 +32,17 @@ constexpr std::size_t kOutputLineSize = 1024;  // bytes
 constexpr std::size_t kPidLineSize = 81;       // bytes: 80 characters and the terminator
 constexpr std::size_t kStopPidLineSize = 128;  // bytes
 constexpr std::size_t kLinkTargetSize = 512;   // bytes
-constexpr int kAddressParts = 4;
-constexpr const char* kPeerText = "Peer Connection Initiated with [AF_INET]";
 
 int runShell(const std::string& command) {
     return std::system(command.c_str());
 }
 
-// Works in another directory until the end of the scope.
+// 0, or the errno of a failure.
+int removeFile(const std::string& path) {
+    return unlink(path.c_str()) == 0 ? 0 : errno;
+}
+
+// Changes the working directory until the end of the scope.
 class WorkingDirectory {
 public:
     explicit WorkingDirectory(const std::string& path) {
@@ -50,7 +54,7 @@ public:
     WorkingDirectory& operator=(const WorkingDirectory&) = delete;
 
 private:
-    // A directory that is not there shows when the client does not come up.
+    // A missing directory has no line of its own: the client does not come up.
     static bool change(const char* path) { return chdir(path) == 0; }
 
     std::array<char, kPathSize> saved{};
@@ -125,9 +129,11 @@ bool VPNManager::writeCredentials() {
 bool VPNManager::startClient() {
     for (int start = 0; start < kMaxStarts; ++start) {
         runShell(setting("STARTCMD"));
-        bool isUp = false;
-        if (!waitUntilUp(isUp)) return false;
-        if (isUp) return true;
+        const StartState state = waitUntilUp();
+        if (state == StartState::UP) return true;
+        if (state == StartState::UNREADABLE) return false;
+        // After the last start, too: a client left running would count as "relayed" in the next
+        // cycle although its tunnel never came up.
         closeVPNConnection();
     }
     logError(
@@ -147,24 +153,22 @@ bool holdsSuccessText(std::FILE* output, const std::string& successText) {
 
 }  // namespace
 
-// False when the client's output cannot be read, which ends all attempts.
-bool VPNManager::waitUntilUp(bool& isUp) {
-    for (int check = 0; check < kChecksPerStart && !isUp; ++check) {
+VPNManager::StartState VPNManager::waitUntilUp() {
+    for (int check = 0; check < kChecksPerStart; ++check) {
         sleep(kStartCheckDelay);
         const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
         if (!output) {
             logError("VPNManager::openVPNConnection() - failed to open openVPN stdout file!\n");
-            return false;
+            return StartState::UNREADABLE;
         }
-        isUp = holdsSuccessText(output.get(), setting("LOG_SUCCESS_TEXT"));
-        if (isUp) {
+        if (holdsSuccessText(output.get(), setting("LOG_SUCCESS_TEXT"))) {
             logInfo("VPNManager::openVPNConnection() - openVPN has started successfully\n");
-        } else {
-            logInfo(
-                "VPNManager::openVPNConnection() - openVPN initialization did not complete, waiting...\n");
+            return StartState::UP;
         }
+        logInfo(
+            "VPNManager::openVPNConnection() - openVPN initialization did not complete, waiting...\n");
     }
-    return true;
+    return StartState::NOT_YET;
 }
 
 bool VPNManager::isVPNRunning() {
@@ -182,10 +186,10 @@ bool VPNManager::isVPNRunning() {
         return true;
     }
     logWarning("VPNManager::isVPNRunning() - unlink stale openVPN pid file %s\n", pidFile.c_str());
-    if (unlink(pidFile.c_str()) != 0) {
+    if (const int error = removeFile(pidFile); error != 0) {
         logWarning(
             "VPNManager::isVPNRunning() - failed to unlink stale openVPN pid file %s, errno %d.\n",
-            pidFile.c_str(), errno);
+            pidFile.c_str(), error);
     }
     return false;
 }
@@ -194,28 +198,32 @@ bool VPNManager::pidIsOpenVPNProcess(char* line, std::string& pid) {
     pid = line;
     trim(pid);
     const std::string exePath = "/proc/" + pid + "/exe";
-    // The pid file is a configured path: it may name any file, the credentials file included.
+    // The path of the pid file is configured: it may name any file, the one with the credentials
+    // included.
     const std::string shownPid = scrubSecrets(pid);
     const std::string shownPath = "/proc/" + shownPid + "/exe";
     logInfo("VPNManager::pidIsOpenVPNProcess() - openvpn proc_pid_exe path %s\n",
             shownPath.c_str());
     struct stat status {};
     if (stat(exePath.c_str(), &status) != 0) {
+        const int error = errno;
         logWarning("VPNManager::pidIsOpenVPNProcess() - stat %s failed, errno %d\n",
-                   shownPath.c_str(), errno);
+                   shownPath.c_str(), error);
         return false;
     }
     std::array<char, kLinkTargetSize> target{};
     if (readlink(exePath.c_str(), target.data(), target.size() - 1) < 0) {
+        const int error = errno;
         logWarning("VPNManager::pidIsOpenVPNProcess() - readlink %s failed, errno %d\n",
-                   shownPath.c_str(), errno);
+                   shownPath.c_str(), error);
         return false;
     }
     logInfo("VPNManager::pidIsOpenVPNProcess() - readlink %s succeeded, symlink %s\n",
             shownPath.c_str(), target.data());
 
     const std::string pidFile = setting("OPENVPN_PID_FILE");
-    // The text ends up in a shell command: whatever /proc makes of it, only a number is a pid.
+    // The text becomes part of a shell command, so only a number is a pid: /proc also resolves
+    // "123/task/123".
     if (isNumber(pid) && strcasestr(target.data(), "openvpn") != nullptr) {
         logInfo("VPNManager::pidIsOpenVPNProcess() - pid %s in %s matches %s symlink %s\n",
                 shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
@@ -240,7 +248,7 @@ bool VPNManager::closeVPNConnection() {
     return false;
 }
 
-// One pass. False when the pid file cannot be read, so that another pass has no use.
+// False when the pid file cannot be read: another pass would be pointless.
 bool VPNManager::stopOnce(int pass) {
     const std::string pidFile = setting("OPENVPN_PID_FILE");
     logInfo("VPNManager::closeVPNConnection() - openVPN process is running\n");
@@ -259,11 +267,12 @@ bool VPNManager::stopOnce(int pass) {
         }
         sleep(kStopDelay);
     }
-    // Without the file the client counts as stopped, even if it is still on its way out.
-    if (allStopped && unlink(pidFile.c_str()) != 0) {
+    if (!allStopped) return true;
+    // Without the file the client counts as stopped, even while it is still exiting.
+    if (const int error = removeFile(pidFile); error != 0) {
         logError(
             "VPNManager::closeVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
-            pidFile.c_str(), errno);
+            pidFile.c_str(), error);
     }
     return true;
 }
@@ -272,31 +281,13 @@ bool VPNManager::cleanupVPNConnection() {
     const std::string pidFile = setting("OPENVPN_PID_FILE");
     struct stat status {};
     if (stat(pidFile.c_str(), &status) != 0) return true;
-    if (unlink(pidFile.c_str()) == 0) return true;
+    const int error = removeFile(pidFile);
+    if (error == 0) return true;
     logError(
         "VPNManager::cleanupVPNConnection() - failed to unlink openVPN pid file %s, errno %d.\n",
-        pidFile.c_str(), errno);
+        pidFile.c_str(), error);
     return false;
 }
-
-namespace {
-
-// The dotted address at the start of @p text. False when four numbers cannot be read.
-bool readAddress(const char* text, std::string& address) {
-    std::string dotted;
-    for (int part = 0; part < kAddressParts; ++part) {
-        if (part > 0 && *text++ != '.') return false;
-        int number = 0;
-        if (!scanInt(text, number) || number < 0) return false;
-        dotted += (part > 0 ? "." : "") + std::to_string(number);
-        text += std::strspn(text, " \t\n\v\f\r+-");
-        text += std::strspn(text, "0123456789");
-    }
-    address = dotted;
-    return true;
-}
-
-}  // namespace
 
 bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
     const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
@@ -306,9 +297,10 @@ bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
     }
     std::array<char, kOutputLineSize> line{};
     while (std::fgets(line.data(), line.size(), output.get()) != nullptr) {
-        const char* peer = std::strstr(line.data(), kPeerText);
-        if (peer == nullptr) continue;
-        if (readAddress(peer + std::strlen(kPeerText), ip)) {
+        const auto peer = readRelayPeer(line.data());
+        if (!peer) continue;
+        if (peer->address) {
+            ip = *peer->address;
             logInfo("VPNManager::fetchOpenVPN_IPAddr - found openVPN AF_INET IP address %s.\n",
                     ip.c_str());
         } else {

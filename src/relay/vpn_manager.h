@@ -6,51 +6,58 @@
 
 namespace pelorus {
 
-/// Starts, recognises and stops the openvpn client. The client is a process of its own, started
-/// by a configured shell command and known by its pid file; this class keeps no state.
+/// Starts, recognises and stops the openvpn client, a separate process that a configured shell
+/// command starts and a pid file identifies. This class keeps no state.
 class VPNManager {
 public:
     static VPNManager* getInstance();
     VPNManager(const VPNManager&) = delete;
     VPNManager& operator=(const VPNManager&) = delete;
 
-    /// Starts the client and waits until its output tells that the tunnel is up. True when it is,
-    /// now or already. Blocks for up to four starts of 70 seconds each, plus the time to stop a
-    /// client that did not come up. Changes the working directory meanwhile.
+    /// Starts the client, unless it is running, and waits until its output says that the tunnel is
+    /// up; true when it is. A client that does not come up in time is stopped. Blocks for up to
+    /// four starts of 70 seconds each, plus the stops. Changes the working directory meanwhile.
     bool openVPNConnection();
 
-    /// Stops the client: SIGTERM, from the fourth pass on SIGKILL. True when none is left running;
-    /// a client that took the signal and is still on its way out counts as stopped.
+    /// Stops the client: SIGTERM in the first three passes, SIGKILL in two more, 3 seconds each.
+    /// True when none is left running; a client that was signalled and is still exiting counts as
+    /// stopped.
     bool closeVPNConnection();
 
-    /// Removes a pid file that an earlier run left; does not stop a running client. False only
-    /// when the file could not be removed.
+    /// Removes the pid file an earlier run left behind; a running client is not stopped. False only
+    /// when the file cannot be removed.
     bool cleanupVPNConnection();
 
-    /// True when the pid file names a live openvpn process. A pid file that does not is removed.
+    /// True when the pid file names a live openvpn process; any other pid file is removed.
     bool isVPNRunning();
 
     /// The tunnel has no health check of its own: always true.
     [[nodiscard]] bool isVPNHealthy() const { return true; }
 
-    /// The relay's IPv4 address from the client's output; the last one when there are several. Pass
-    /// @p ip empty: the result is whether it holds an address at the end.
+    /// Reads the relay's IPv4 address from the client's output, the last one when there are
+    /// several. Pass @p ip empty: the result says only that it is not empty at the end.
     bool fetchOpenVPN_IPAddr(std::string& ip);
 
-    /// Whether @p line, a line of the pid file, names a live openvpn process; its trimmed text is
-    /// returned in @p pid.
+    /// True when @p line of the pid file names a live openvpn process. @p pid becomes the trimmed
+    /// line in either case.
     bool pidIsOpenVPNProcess(char* line, std::string& pid);
 
-    /// Removes blanks, tabs and line ends behind the text, and blanks and tabs in front of it.
+    /// Removes trailing blanks, tabs and line ends, and leading blanks and tabs.
     void trim(std::string& text);
 
 private:
+    enum class StartState {
+        UP,
+        NOT_YET,     // not within the time of one start
+        UNREADABLE,  // its output cannot be opened: further starts would be pointless
+    };
+
     VPNManager() = default;
     ~VPNManager() = default;
 
     bool writeCredentials();
     bool startClient();
-    bool waitUntilUp(bool& isUp);
+    StartState waitUntilUp();
     bool stopOnce(int pass);
 };
 

@@ -16,7 +16,6 @@
 #include "common/miniupnpc_api.h"
 #include "common/text.h"
 #include "config/scrub.h"
-#include "router/reply_text.h"
 #include "router/router.h"
 
 namespace pelorus {
@@ -193,9 +192,11 @@ bool Router::upnp_discover() {
 bool Router::useGateway(UPNPDev& gateways) {
     UPNPUrls urls{};
     IGDdatas data{};
-    ReplyText<64> lanAddress;
+    constexpr int kLanAddressSize = 64;
+    // The library may fill all of it; the byte beyond ends the text.
+    std::array<char, kLanAddressSize + 1> lanAddress{};
     const int state =
-        miniupnpc::getValidIgd(&gateways, urls, data, lanAddress.buffer(), lanAddress.documented());
+        miniupnpc::getValidIgd(&gateways, urls, data, lanAddress.data(), kLanAddressSize);
     if (state == miniupnpc::NO_IGD) {
         logInfo("Router::upnp_discover - invalid device type \n");
         return false;
@@ -204,27 +205,25 @@ bool Router::useGateway(UPNPDev& gateways) {
     const char* const type = data.first.servicetype;
     controlUrl = textOf(urls.controlURL);
     serviceType.assign(type, strnlen(type, sizeof data.first.servicetype));
-    logChosenDevice(state, controlUrl, lanAddress.text());
+    logChosenDevice(state, controlUrl, lanAddress.data());
     const bool found = findExternalIp();
     logInfo("Router::upnp_discover - FreeUPNPUrls.\n");
     return found;
 }
 
 bool Router::findExternalIp() {
-    ReplyText<16> address;
-    const int status = miniupnpc::call(UPNP_GetExternalIPAddress, controlUrl.c_str(),
-                                       serviceType.c_str(), address.buffer());
-    if (status != 0 || address.empty()) {
+    const IgdAddress address = igd().externalAddress();
+    if (address.status != 0 || address.text.empty()) {
         logInfo(
             "Router::upnp_discover - failed to get External IP address, ipStatus: %d, value received: %s \n",
-            status, scrubSecrets(address.text()).c_str());
+            address.status, scrubSecrets(address.text).c_str());
         return false;
     }
-    if (takeExternalIp(address.text())) {
+    if (takeExternalIp(address.text)) {
         logNotice("Router::upnp_discover - Router's external IP address has changed!\n");
     }
     logInfo("Router::upnp_discover - Router's external IP address: %s \n",
-            scrubSecrets(address.text()).c_str());
+            scrubSecrets(address.text).c_str());
     initialized = true;
     return true;
 }

@@ -2,21 +2,24 @@
 #ifndef PELORUS_ROUTER_LEASE_TRACKING_H
 #define PELORUS_ROUTER_LEASE_TRACKING_H
 
+#include <cstdint>
+#include <optional>
+
 namespace pelorus {
 
-/// A start time (seconds since the epoch) and a duration (seconds). Starts as (0, 0), which is
-/// both past its half and expired.
+/// A start time (seconds since the epoch) and a duration (seconds). At first (0, 0), which is past
+/// halfway and expired.
 class TimeIntervalTrack {
 public:
-    void setParams(long start, long seconds);
-    void getParams(long& start, long& seconds) const;
+    void setParams(std::int64_t start, std::int64_t seconds);
+    void getParams(std::int64_t& start, std::int64_t& seconds) const;
 
     /// Starts the interval now; the duration stays.
     void StartTheInterval();
     /// Changes the duration (seconds); the start stays.
     void SetIntervalDuration(int seconds);
-    [[nodiscard]] long GetIntervalDuration() const { return duration; }
-    [[nodiscard]] long GetIntervalStartTime() const { return startTime; }
+    [[nodiscard]] std::int64_t GetIntervalDuration() const { return duration; }
+    [[nodiscard]] std::int64_t GetIntervalStartTime() const { return startTime; }
 
     /// True once more than half of the duration, rounded down, has passed.
     [[nodiscard]] bool pastHalfway() const;
@@ -24,8 +27,8 @@ public:
     [[nodiscard]] bool hasExpired() const;
 
 private:
-    long startTime = 0;
-    long duration = 0;
+    std::int64_t startTime = 0;
+    std::int64_t duration = 0;
 };
 
 /// What a PMTracker holds.
@@ -36,8 +39,8 @@ struct TrackedMapping {
     TimeIntervalTrack interval;
 };
 
-/// One port mapping and its lease. All zero means that nothing is tracked; such a tracker is past
-/// its half, so a renewal of it is attempted and has to be refused by the mapping call.
+/// One port mapping and its lease. All zero means that nothing is tracked. Such a tracker counts as
+/// due: its renewal is attempted, and the mapping call has to refuse port 0.
 class PMTracker {
 public:
     /// Records a mapping and starts its lease (@p leaseSeconds) now. (0, 0, 0) forgets it.
@@ -46,7 +49,7 @@ public:
                    int& external,
                    unsigned& leaseSeconds,
                    TimeIntervalTrack& leaseInterval) const;
-    /// The same four in one piece.
+    /// The same four as one value.
     [[nodiscard]] TrackedMapping read() const { return mapping; }
 
     /// True once more than half of the lease has passed: the mapping is due for renewal.
@@ -59,6 +62,26 @@ private:
 /// The lease to ask for, and the mappings of the device's two services.
 struct GWPortsTracker {
     static constexpr unsigned kDefaultLifetime = 172800;  ///< seconds, two days
+
+    enum class Service {
+        NONE,
+        HTTP,
+        HTTPS,
+    };
+    /// What forget() has dropped.
+    struct Forgotten {
+        Service service = Service::NONE;
+        TrackedMapping mapping;  ///< as it was; the HTTPS one when the service is NONE
+    };
+
+    /// Records a mapping, starts its lease (seconds) and returns what is tracked now.
+    TrackedMapping track(bool isHttps, int internalPort, int externalPort, unsigned lease);
+    /// Forgets the mapping of @p internalPort, HTTP before HTTPS. Port 0 stands for no mapping and
+    /// matches neither, idle trackers included.
+    Forgotten forget(int internalPort);
+    void forgetAll();
+    /// The mapping of a service once more than half of its lease has passed, else nothing.
+    [[nodiscard]] std::optional<TrackedMapping> due(bool isHttps) const;
 
     unsigned reqLifetime = kDefaultLifetime;
     PMTracker http;

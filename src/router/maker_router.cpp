@@ -5,6 +5,7 @@
 #include <array>
 #include <charconv>
 #include <cstdlib>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -63,24 +64,28 @@ std::string askForAddress(const char* command) {
     return isAddress(line) ? line : "";
 }
 
-bool parsePort(const std::string& text, int& port) {
+std::optional<int> parsePort(const std::string& text) {
     const char* const end = text.data() + text.size();
     int number = 0;
     const auto result = std::from_chars(text.data(), end, number);
-    if (result.ec != std::errc() || result.ptr != end) return false;
-    if (number < 1 || number > kHighestPort) return false;
-    port = number;
-    return true;
+    if (result.ec != std::errc() || result.ptr != end) return std::nullopt;
+    if (number < 1 || number > kHighestPort) return std::nullopt;
+    return number;
 }
 
-bool parsePortRange(const std::string& text, int& first, int& last) {
+struct PortRange {
+    int first = 0;
+    int last = 0;
+};
+
+// FIRST or FIRST-LAST.
+std::optional<PortRange> parsePortRange(const std::string& text) {
     const std::size_t dash = text.find('-');
-    if (!parsePort(trimmed(text.substr(0, dash)), first)) return false;
-    if (dash == std::string::npos) {
-        last = first;
-        return true;
-    }
-    return parsePort(trimmed(text.substr(dash + 1)), last) && first <= last;
+    const std::optional<int> first = parsePort(trimmed(text.substr(0, dash)));
+    const std::optional<int> last =
+        dash == std::string::npos ? first : parsePort(trimmed(text.substr(dash + 1)));
+    if (!first || !last || *first > *last) return std::nullopt;
+    return PortRange{*first, *last};
 }
 
 // Cuts @p line at its first commas; the last part is the description, commas and all.
@@ -98,17 +103,19 @@ std::vector<std::string> splitFields(const std::string& line) {
 }
 
 // OWNER,PROTOCOL,FIRST[-LAST],LANADDRESS,INTERNALPORT,DESCRIPTION
-bool parseEntry(const std::string& line, _BrenvikPortIp& entry) {
+std::optional<_BrenvikPortIp> parseEntry(const std::string& line) {
     const std::vector<std::string> fields = splitFields(line);
-    if (fields.size() <= kFieldsBeforeDescription) return false;
-    entry.owner = fields[0];
-    entry.protocol = fields[1];
-    entry.localIp = fields[3];
-    entry.description = fields[5];
-    return (entry.owner == kOwnerSelf || entry.owner == kOwnerOther) &&
-           (entry.protocol == "TCP" || entry.protocol == "UDP") &&
-           parsePortRange(fields[2], entry.firstExternal, entry.lastExternal) &&
-           isAddress(entry.localIp) && parsePort(fields[4], entry.internalPort);
+    if (fields.size() <= kFieldsBeforeDescription) return std::nullopt;
+    const std::string& owner = fields[0];
+    const std::string& protocol = fields[1];
+    const std::optional<PortRange> ports = parsePortRange(fields[2]);
+    const std::string& address = fields[3];
+    const std::optional<int> internalPort = parsePort(fields[4]);
+    const bool known =
+        (owner == kOwnerSelf || owner == kOwnerOther) && (protocol == "TCP" || protocol == "UDP");
+    if (!known || !ports || !isAddress(address) || !internalPort) return std::nullopt;
+    return _BrenvikPortIp{owner,   protocol,      ports->first, ports->last,
+                          address, *internalPort, fields[5]};
 }
 
 // Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
@@ -165,6 +172,7 @@ int Router::unmapPortBrenvik(int internalPort, int externalPort, const std::stri
 
 void Router::unmapAllPortBrenvik(const std::string& protocol) {
     for (const _BrenvikPortIp& entry : getPortListBrenvik(protocol)) {
+        // A removal names one port; the router knows an entry with a range by its first.
         unmapPortBrenvik(entry.internalPort, entry.firstExternal, protocol);
         sleep(kPauseAfterRemoval);
     }
@@ -187,8 +195,7 @@ void Router::loadPortListBrenvik() {
     if (!list) return;
     std::string line;
     while (readLine(list.get(), line)) {
-        _BrenvikPortIp entry;
-        if (parseEntry(line, entry)) brenvikPorts.push_back(entry);
+        if (const auto entry = parseEntry(line)) brenvikPorts.push_back(*entry);
     }
 }
 

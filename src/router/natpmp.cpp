@@ -2,15 +2,14 @@
 
 #include <arpa/inet.h>
 #include <fcntl.h>
-#include <poll.h>
 #include <sys/select.h>
-#include <sys/socket.h>
 
 #include <array>
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
 #include <ctime>
+#include <optional>
 
 #include "common/log.h"
 
@@ -20,7 +19,6 @@ namespace {
 
 constexpr int kMaxReads = 3;
 constexpr int kMaxLateAnswers = 100;
-constexpr int kLateAnswerWait = 1000;  // milliseconds
 constexpr int kSelectDescriptors = FD_SETSIZE;
 
 // The protocol's number for "TCP" or "UDP", 0 for anything else.
@@ -34,22 +32,6 @@ int protocolNumber(const std::string& protocol) {
 void closeOnExec(int socket) {
     const int flags = fcntl(socket, F_GETFD);
     if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));
-}
-
-// A gateway that is slow answers a request and each of its repetitions. What is not read then would
-// be taken for the answer to the next request, and every answer from then on for that to the next.
-// Answers to repetitions are on their way once the request itself was answered, so they are waited
-// for; a gateway that answered nothing owes nothing.
-void discardLateAnswers(const natpmp_t& client) {
-    int expected = client.has_pending_request != 0 ? 0 : client.try_number - 1;
-    std::array<char, sizeof(natpmpresp_t)> answer{};
-    for (int count = 0; count < kMaxLateAnswers; ++count) {
-        pollfd readable{client.s, POLLIN, 0};
-        if (poll(&readable, 1, expected > 0 ? kLateAnswerWait : 0) == 0) return;
-        // A refusal that waits here is taken away like an answer.
-        static_cast<void>(recv(client.s, answer.data(), answer.size(), MSG_DONTWAIT));
-        --expected;
-    }
 }
 
 void waitForAnswer(int socket, timeval timeout) {
@@ -86,13 +68,16 @@ bool CMnatpmp::close() {
         const int status = closenatpmp(&natpmp);
         if (status < 0) logError("CMnatpmp::close  closenatpmp failed %d\n", status);
         initialized = false;
+        answers = {};
     }
     return true;
 }
 
 int CMnatpmp::CheckNATPMPResponse() {
     int status = NATPMP_TRYAGAIN;
-    for (int reads = 0; status == NATPMP_TRYAGAIN && reads < kMaxReads; ++reads) {
+    int reads = 0;
+    int late = 0;
+    while (status == NATPMP_TRYAGAIN && reads < kMaxReads) {
         timeval timeout{};
         const int timeoutStatus = getnatpmprequesttimeout(&natpmp, &timeout);
         if (timeoutStatus < 0) {
@@ -102,7 +87,17 @@ int CMnatpmp::CheckNATPMPResponse() {
         }
         waitForAnswer(natpmp.s, timeout);
         status = readnatpmpresponseorretry(&natpmp, &response);
+        if (status >= 0 && late < kMaxLateAnswers && answers.isLate(response)) {
+            // The library takes any answer for the one it waits for; ours is still to come.
+            natpmp.has_pending_request = 1;
+            status = NATPMP_TRYAGAIN;
+            answers.countLate();
+            ++late;
+        } else {
+            ++reads;
+        }
     }
+    answers.end(natpmp, status);
     return status;
 }
 
@@ -111,7 +106,7 @@ bool CMnatpmp::retrieveExternalIP(std::string& ip) {
         logError("CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
-    discardLateAnswers(natpmp);
+    answers.begin(natpmp, {});
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
@@ -168,7 +163,7 @@ bool CMnatpmp::exchangeMapping(int protocol,
                                int internalPort,
                                int& externalPort,
                                unsigned& lifetime) {
-    discardLateAnswers(natpmp);
+    answers.begin(natpmp, {protocol, internalPort, lifetime == 0});
     const int sent =
         sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
                                   static_cast<std::uint16_t>(externalPort), lifetime);
@@ -187,6 +182,7 @@ bool CMnatpmp::exchangeMapping(int protocol,
         return false;
     }
     const auto& granted = response.pnu.newportmapping;
+    // The protocol in this line is the answer's type; the two have the same numbers.
     logInfo(
         "CMnatpmp::portMappingRequest  mapped public port %hu to localport %hu protocol %d, lifetime %u\n",
         granted.mappedpublicport, granted.privateport, static_cast<int>(response.type),
@@ -202,41 +198,39 @@ bool CMnatpmp::exchangeMapping(int protocol,
 }
 
 void CMnatpmp::trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime) {
-    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     const char* const label = isHttps ? "HTTPS" : "HTTP";
-    tracker.setParams(internalPort, externalPort, lifetime);
+    const TrackedMapping tracked = gwPorts.track(isHttps, internalPort, externalPort, lifetime);
     logInfo(
         "CMnatpmp::portMappingRequest  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
         label, internalPort, externalPort, lifetime);
-    const TrackedMapping tracked = tracker.read();
     logInfo(
         "CMnatpmp::portMappingRequest - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
 }
 
 void CMnatpmp::forgetMapping(int internalPort) {
-    const TrackedMapping http = gwPorts.http.read();
-    const TrackedMapping https = gwPorts.https.read();
-    if (http.internalPort == internalPort) {
-        gwPorts.http.setParams(0, 0, 0);
-        logInfo(
-            "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            http.internalPort, http.externalPort, http.lifetime);
-    } else if (https.internalPort == internalPort) {
-        gwPorts.https.setParams(0, 0, 0);
-        logInfo(
-            "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, https.externalPort, https.lifetime);
-    } else {
-        logInfo(
-            "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    const auto [service, mapping] = gwPorts.forget(internalPort);
+    switch (service) {
+        case GWPortsTracker::Service::HTTP:
+            logInfo(
+                "CMnatpmp::portMappingRequest  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::HTTPS:
+            logInfo(
+                "CMnatpmp::portMappingRequest  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::NONE:
+            logInfo(
+                "CMnatpmp::portMappingRequest  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, internalPort, mapping.externalPort, mapping.lifetime);
+            break;
     }
 }
 
 void CMnatpmp::forgetAllMappings(int internalPort, int externalPort, unsigned lifetime) {
-    gwPorts.http.setParams(0, 0, 0);
-    gwPorts.https.setParams(0, 0, 0);
+    gwPorts.forgetAll();
     logInfo(
         "CMnatpmp::portMappingRequest  destroyed all mappings. internal_port %d, external_port %d, lifetime %u\n",
         internalPort, externalPort, lifetime);
@@ -265,17 +259,16 @@ bool CMnatpmp::unmapAllPorts(const std::string& protocol, const std::string& des
 
 void CMnatpmp::renewPortMapping(const char* which) {
     const bool isHttps = std::strcmp(which, "HTTPS") == 0;
-    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
-    if (!tracker.pastHalfway()) return;
-    const unsigned requested = getReqPortMappingLifetime();
+    std::optional<TrackedMapping> due = gwPorts.due(isHttps);
+    if (!due) return;
     logInfo("CMnatpmp::renewPortMapping - pastHalfway() returned TRUE\n");
-    TrackedMapping tracked = tracker.read();
-    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    const bool renewed = mapPort(due->internalPort, due->externalPort, "TCP", "", isHttps);
+    const std::int64_t now = std::time(nullptr);
     logInfo(
-        "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
-        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
-        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
-        tracked.interval.GetIntervalDuration(), requested);
+        "CMnatpmp::renewPortMapping - Renew NAT-PMP port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%jd], previous start[%jd], previous lifetime[%jd], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), due->internalPort, due->externalPort, now,
+        due->interval.GetIntervalStartTime(), due->interval.GetIntervalDuration(),
+        getReqPortMappingLifetime());
 }
 
 void CMnatpmp::CheckExpiredMappings() {

@@ -7,13 +7,14 @@
 #include <string>
 
 #include "router/lease_tracking.h"
+#include "router/natpmp_answers.h"
 
 namespace pelorus {
 
-/// NAT-PMP client for the default gateway. Opened by the first request and kept open until it is
-/// destroyed. A request blocks for at most three reads of the library's retry schedule. One that
-/// follows a request whose answer needed repetitions first takes in what is still owed, and may wait
-/// a second for each. Every failure is logged and returned as false.
+/// NAT-PMP client for the default gateway. The first request opens it, the destructor closes it. A
+/// request blocks for at most three reads of the library's retry schedule (1.75 s), plus up to two
+/// seconds for answers that the gateway still owes to earlier requests. Every failure is logged and
+/// returned as false.
 class CMnatpmp {
 public:
     CMnatpmp() = default;
@@ -79,6 +80,7 @@ private:
     std::string externalIp;
     natpmp_t natpmp{};
     natpmpresp_t response{};
+    NatpmpAnswers answers;
     GWPortsTracker gwPorts;
 };
 

@@ -1,13 +1,12 @@
 #include <cstdint>
 #include <cstring>
 #include <ctime>
+#include <optional>
 #include <string>
 
 #include "common/log.h"
-#include "common/miniupnpc_api.h"
 #include "common/text.h"
 #include "config/scrub.h"
-#include "router/reply_text.h"
 #include "router/router.h"
 
 namespace pelorus {
@@ -15,40 +14,17 @@ namespace pelorus {
 namespace {
 
 constexpr int kReservedPorts = 10;  // ports up to this one are never mapped
-constexpr std::size_t kPortDigits = 5;
 constexpr int kEnumerationPasses = 2;
 constexpr int kNoPort = -1;
-
-// A mapping's index is a 16-bit number. A gateway that answers beyond it will answer for ever.
-constexpr int kLastMappingIndex = 65535;
-// One that lies or stalls may not hold the daemon, least of all at its end.
-constexpr long kLongestEnumeration = 60;  // seconds
 
 bool isKnownProtocol(const std::string& protocol) {
     return protocol == "TCP" || protocol == "UDP";
 }
 
-// The number as the UPnP library takes it.
-std::string portText(int port) {
-    return std::to_string(port).substr(0, kPortDigits);
-}
-
-int portNumber(const char* text) {
+int portNumber(const std::string& text) {
     int port = kNoPort;
-    return scanInt(text, port) ? port : kNoPort;
+    return scanInt(text.c_str(), port) ? port : kNoPort;
 }
-
-// One mapping as the gateway tells it.
-struct MappingReply {
-    ReplyText<6> externalPort;
-    ReplyText<16> internalClient;
-    ReplyText<6> internalPort;
-    ReplyText<4> protocol;
-    ReplyText<80> description;
-    ReplyText<4> enabled;
-    ReplyText<64> remoteHost;
-    ReplyText<16> duration;
-};
 
 // Whether an address names a host of its own: dotted, and not ending in 0.
 bool namesOneHost(const std::string& client) {
@@ -56,25 +32,6 @@ bool namesOneHost(const std::string& client) {
     if (dot == std::string::npos) return false;
     std::int64_t last = 0;
     return scanInt64(client.c_str() + dot + 1, last) && last != 0;
-}
-
-// Hands the gateway's mappings one by one to @p visit(entry), which returns false to stop. True
-// when neither the gateway nor the visitor ended the enumeration.
-template <typename Visitor>
-bool enumerateMappings(const std::string& controlUrl,
-                       const std::string& serviceType,
-                       Visitor visit) {
-    const std::time_t end = std::time(nullptr) + kLongestEnumeration;
-    for (int index = 0; index <= kLastMappingIndex && std::time(nullptr) <= end; ++index) {
-        MappingReply entry;
-        const int status = miniupnpc::call(
-            UPNP_GetGenericPortMappingEntry, controlUrl.c_str(), serviceType.c_str(),
-            portText(index).c_str(), entry.externalPort.buffer(), entry.internalClient.buffer(),
-            entry.internalPort.buffer(), entry.protocol.buffer(), entry.description.buffer(),
-            entry.enabled.buffer(), entry.remoteHost.buffer(), entry.duration.buffer());
-        if (status != 0 || !visit(entry)) return false;
-    }
-    return true;
 }
 
 }  // namespace
@@ -128,24 +85,20 @@ bool Router::mapThroughNatpmp(int internalPort,
 // Asks the gateway who has the external port. An entry counts whatever the status of the answer,
 // and one that leads to another port of this device counts as another's.
 bool Router::heldByAnother(int internalPort, int externalPort, const std::string& protocol) const {
-    MappingReply entry;
-    const int status = miniupnpc::getSpecificPortMappingEntry(
-        controlUrl.c_str(), serviceType.c_str(), portText(externalPort).c_str(), protocol.c_str(),
-        entry.internalClient.buffer(), entry.internalPort.buffer(), entry.description.buffer(),
-        entry.enabled.buffer(), entry.duration.buffer());
-    if (status == 0) {
+    const IgdEntry entry = igd().entry(externalPort, protocol);
+    if (entry.status == 0) {
         logInfo(
             "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d], intClient[%s], intPort[%s], desc[%s], enabled[%s], leaseDuration[%s]\n",
-            status, scrubSecrets(entry.internalClient.text()).c_str(), entry.internalPort.text(),
-            scrubSecrets(entry.description.text()).c_str(), entry.enabled.text(),
-            scrubSecrets(entry.duration.text()).c_str());
+            entry.status, scrubSecrets(entry.internalClient).c_str(), entry.internalPort.c_str(),
+            scrubSecrets(entry.description).c_str(), entry.enabled.c_str(),
+            scrubSecrets(entry.lease).c_str());
     } else {
         logInfo("Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
-                status);
+                entry.status);
     }
     if (entry.internalClient.empty()) return false;
-    const std::string client = entry.internalClient.text();
-    if (portNumber(entry.internalPort.text()) == internalPort && client == localIp) {
+    const std::string& client = entry.internalClient;
+    if (portNumber(entry.internalPort) == internalPort && client == localIp) {
         logInfo("Router::mapPort() - internal port: %d is already mapped to external port: %d\n",
                 internalPort, externalPort);
         return false;
@@ -162,10 +115,7 @@ bool Router::addMapping(int internalPort,
                         const std::string& description) const {
     logDebug("Router::mapPort() - lifetime %s\n", "0");
     // Without a lease the gateway keeps the mapping for good; the lease is this side's own.
-    const int status =
-        miniupnpc::call(UPNP_AddPortMapping, controlUrl.c_str(), serviceType.c_str(),
-                        portText(externalPort).c_str(), portText(internalPort).c_str(),
-                        localIp.c_str(), description.c_str(), protocol.c_str(), nullptr, nullptr);
+    const int status = igd().add(externalPort, internalPort, localIp, description, protocol);
     if (status != 0) {
         logInfo(
             "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d\n",
@@ -179,16 +129,12 @@ bool Router::addMapping(int internalPort,
 }
 
 void Router::trackMapping(int internalPort, int externalPort, bool isHttps) {
-    PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
     const char* const label = isHttps ? "HTTPS" : "HTTP";
-    unsigned upnpLease = 0;
-    unsigned natpmpLease = 0;
-    getReqPortMappingLifetime(upnpLease, natpmpLease);
-    tracker.setParams(internalPort, externalPort, upnpLease);
+    const unsigned lease = gwPorts.reqLifetime;
+    const TrackedMapping tracked = gwPorts.track(isHttps, internalPort, externalPort, lease);
     logInfo(
         "Router::mapPort  set %s PMTracker params. internal_port %d, external_port %d, lifetime %u\n",
-        label, internalPort, externalPort, upnpLease);
-    const TrackedMapping tracked = tracker.read();
+        label, internalPort, externalPort, lease);
     logInfo(
         "Router::mapPort - get after setting %s PMTracker params.   internalPort[%d], mappedExternalPort[%d], lifetime[%u]\n",
         label, tracked.internalPort, tracked.externalPort, tracked.lifetime);
@@ -205,7 +151,7 @@ bool Router::unmapPort(int internalPort, int externalPort, const std::string& pr
     }
     const bool natpmp = isNatPMPGateway();
     const bool removed = natpmp ? pNatpmp->unmapPort(internalPort, externalPort, protocol)
-                                : deleteMapping(externalPort, protocol);
+                                : igd().remove(externalPort, protocol) == 0;
     if (!removed) {
         logInfo("Router::unmapPort() - fail - failed to unmap external port: %d\n", externalPort);
         return false;
@@ -215,29 +161,24 @@ bool Router::unmapPort(int internalPort, int externalPort, const std::string& pr
     return true;
 }
 
-bool Router::deleteMapping(int externalPort, const std::string& protocol) const {
-    return miniupnpc::call(UPNP_DeletePortMapping, controlUrl.c_str(), serviceType.c_str(),
-                           portText(externalPort).c_str(), protocol.c_str(), nullptr) == 0;
-}
-
-// Port 0 stands for no mapping and belongs to no tracker, idle ones included.
 void Router::forgetMapping(int internalPort) {
-    const TrackedMapping http = gwPorts.http.read();
-    const TrackedMapping https = gwPorts.https.read();
-    if (internalPort != 0 && http.internalPort == internalPort) {
-        gwPorts.http.setParams(0, 0, 0);
-        logInfo(
-            "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            http.internalPort, http.externalPort, http.lifetime);
-    } else if (internalPort != 0 && https.internalPort == internalPort) {
-        gwPorts.https.setParams(0, 0, 0);
-        logInfo(
-            "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, https.externalPort, https.lifetime);
-    } else {
-        logInfo(
-            "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
-            https.internalPort, internalPort, https.externalPort, https.lifetime);
+    const auto [service, mapping] = gwPorts.forget(internalPort);
+    switch (service) {
+        case GWPortsTracker::Service::HTTP:
+            logInfo(
+                "Router::unmapPort()  destroyed HTTP port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::HTTPS:
+            logInfo(
+                "Router::unmapPort()  destroyed HTTPS port mapping. internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, mapping.externalPort, mapping.lifetime);
+            break;
+        case GWPortsTracker::Service::NONE:
+            logInfo(
+                "Router::unmapPort()  internal ports mismatch when destroying port mapping. tracked_internal_port %d, req_internal_port %d, external_port %d, lifetime %u\n",
+                mapping.internalPort, internalPort, mapping.externalPort, mapping.lifetime);
+            break;
     }
 }
 
@@ -260,8 +201,7 @@ bool Router::unmapAllPorts(const std::string& protocol, const std::string& descr
     }
     logInfo("Router::unmapAllPorts() - success\n");
     if (!natpmp) {
-        gwPorts.http.setParams(0, 0, 0);
-        gwPorts.https.setParams(0, 0, 0);
+        gwPorts.forgetAll();
         logInfo("Router::unmapAllPorts()  destroyed all mappings.\n");
     }
     return true;
@@ -272,20 +212,20 @@ bool Router::unmapAllPorts(const std::string& protocol, const std::string& descr
 // false on every gateway whose table ends.
 bool Router::removeOwnMappings(const std::string& protocol, const std::string& description) {
     bool removed = false;
-    const auto removeOwn = [&](const MappingReply& entry) {
-        if (localIp != entry.internalClient.text() || protocol != entry.protocol.text() ||
-            description != entry.description.text()) {
+    const auto removeOwn = [&](const IgdEntry& entry) {
+        if (localIp != entry.internalClient || protocol != entry.protocol ||
+            description != entry.description) {
             return true;
         }
-        const int port = portNumber(entry.externalPort.text());
+        const int port = portNumber(entry.externalPort);
         logInfo("Router::unmapAllPorts() - un-mapping port: %d for IP: %s \n", port,
-                entry.internalClient.text());
+                entry.internalClient.c_str());
         unmapPort(0, port, protocol);
         removed = true;
         return true;
     };
     for (int pass = 0; pass < kEnumerationPasses; ++pass) {
-        if (!enumerateMappings(controlUrl, serviceType, removeOwn)) removed = false;
+        if (!igd().forEach(removeOwn)) removed = false;
     }
     return removed;
 }
@@ -301,16 +241,16 @@ int Router::getMappedInternalPort(int externalPort, const std::string& protocol)
         return 0;
     }
     int internalPort = kNoPort;
-    const auto findPort = [&](const MappingReply& entry) {
-        if (localIp != entry.internalClient.text() || protocol != entry.protocol.text() ||
-            portNumber(entry.externalPort.text()) != externalPort) {
+    const auto findPort = [&](const IgdEntry& entry) {
+        if (localIp != entry.internalClient || protocol != entry.protocol ||
+            portNumber(entry.externalPort) != externalPort) {
             return true;
         }
-        internalPort = portNumber(entry.internalPort.text());
+        internalPort = portNumber(entry.internalPort);
         return false;
     };
     for (int pass = 0; pass < kEnumerationPasses && internalPort == kNoPort; ++pass) {
-        static_cast<void>(enumerateMappings(controlUrl, serviceType, findPort));
+        static_cast<void>(igd().forEach(findPort));
     }
     return internalPort;
 }
@@ -321,20 +261,17 @@ bool Router::isPortMapped(int externalPort, const std::string& protocol) {
 
 void Router::renewPortMapping(const char* which) {
     const bool isHttps = std::strcmp(which, "HTTPS") == 0;
-    const PMTracker& tracker = isHttps ? gwPorts.https : gwPorts.http;
-    if (!tracker.pastHalfway()) return;
-    unsigned upnpLease = 0;
-    unsigned natpmpLease = 0;
-    getReqPortMappingLifetime(upnpLease, natpmpLease);
+    std::optional<TrackedMapping> due = gwPorts.due(isHttps);
+    if (!due) return;
     logInfo("Router::renewPortMapping - pastHalfway() returned TRUE\n");
-    TrackedMapping tracked = tracker.read();
     // An idle tracker has port 0, which mapPort refuses.
-    const bool renewed = mapPort(tracked.internalPort, tracked.externalPort, "TCP", "", isHttps);
+    const bool renewed = mapPort(due->internalPort, due->externalPort, "TCP", "", isHttps);
+    const std::int64_t now = std::time(nullptr);
     logInfo(
-        "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%ld], previous start[%ld], previous lifetime[%ld], new lifetime[%u].\n",
-        which, static_cast<int>(renewed), tracked.internalPort, tracked.externalPort,
-        static_cast<long>(std::time(nullptr)), tracked.interval.GetIntervalStartTime(),
-        tracked.interval.GetIntervalDuration(), upnpLease);
+        "Router::renewPortMapping - Renew port mapping PORTFORWARDED %s: mapPort returncode[%d], internalPort[%d], new externalPort[%d], now[%jd], previous start[%jd], previous lifetime[%jd], new lifetime[%u].\n",
+        which, static_cast<int>(renewed), due->internalPort, due->externalPort, now,
+        due->interval.GetIntervalStartTime(), due->interval.GetIntervalDuration(),
+        gwPorts.reqLifetime);
 }
 
 void Router::CheckExpiredMappings() {

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "router/igd.h"
 #include "router/lease_tracking.h"
 #include "router/natpmp.h"
 
@@ -124,6 +125,7 @@ public:
     [[nodiscard]] std::vector<_BrenvikPortIp> getPortListBrenvik(const std::string& protocol);
 
 private:
+    [[nodiscard]] Igd igd() const { return {controlUrl, serviceType}; }
     void forgetSeenChanges();
     void takeLocalIp(const std::string& ipv4, const std::string& ipv6);
     bool useGateway(UPNPDev& gateways);
@@ -143,7 +145,6 @@ private:
                                   const std::string& protocol,
                                   const std::string& description) const;
     void trackMapping(int internalPort, int externalPort, bool isHttps);
-    [[nodiscard]] bool deleteMapping(int externalPort, const std::string& protocol) const;
     void forgetMapping(int internalPort);
     bool removeOwnMappings(const std::string& protocol, const std::string& description);
 

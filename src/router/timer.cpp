@@ -6,8 +6,8 @@ namespace pelorus {
 
 namespace {
 
-constexpr long kMicrosPerSecond = 1000000;
-constexpr long kMicrosPerMilli = 1000;
+constexpr int kMicrosPerSecond = 1000000;
+constexpr int kMicrosPerMilli = 1000;
 
 }  // namespace
 
@@ -21,29 +21,32 @@ void Timer::stop() {
     gettimeofday(&endCount, nullptr);
 }
 
-long Timer::getElapsedTimeInMicroSec() {
+std::int64_t Timer::getElapsedTimeInMicroSec() {
+    const std::int64_t endSeconds = endCount.tv_sec;
+    const std::int64_t endMicros = endCount.tv_usec;
+    const std::int64_t startSeconds = startCount.tv_sec;
+    const std::int64_t startMicros = startCount.tv_usec;
     logInfo(
-        "Timer::getElapsedTimeInMicroSec - end.sec[%ld] end.usec[%ld] start.sec[%ld] start.usec[%ld]\n",
-        static_cast<long>(endCount.tv_sec), static_cast<long>(endCount.tv_usec),
-        static_cast<long>(startCount.tv_sec), static_cast<long>(startCount.tv_usec));
+        "Timer::getElapsedTimeInMicroSec - end.sec[%jd] end.usec[%jd] start.sec[%jd] start.usec[%jd]\n",
+        endSeconds, endMicros, startSeconds, startMicros);
     if (stopped == 0) gettimeofday(&endCount, nullptr);
     if (endCount.tv_usec < startCount.tv_usec) {
         endCount.tv_usec += kMicrosPerSecond;
         endCount.tv_sec -= 1;
     }
-    return (endCount.tv_sec - startCount.tv_sec) * kMicrosPerSecond +
-           (endCount.tv_usec - startCount.tv_usec);
+    const std::int64_t seconds = endCount.tv_sec - startCount.tv_sec;
+    return seconds * kMicrosPerSecond + (endCount.tv_usec - startCount.tv_usec);
 }
 
-long Timer::getElapsedTimeInMilliSec() {
+std::int64_t Timer::getElapsedTimeInMilliSec() {
     return getElapsedTimeInMicroSec() / kMicrosPerMilli;
 }
 
-long Timer::getElapsedTimeInSec() {
+std::int64_t Timer::getElapsedTimeInSec() {
     return getElapsedTimeInMicroSec() / kMicrosPerSecond;
 }
 
-long Timer::getElapsedTime() {
+std::int64_t Timer::getElapsedTime() {
     return getElapsedTimeInSec();
 }
 

@@ -1,37 +1,29 @@
-// Answers of the central server to a port test, the sleep poll and the address question.
-#include "cloud/tavik_client.h"
+// The central server's answers: to a port test, the sleep poll and the address question.
+#include "cloud/port_test_answer.h"
+#include "cloud/public_address.h"
+#include "cloud/sleep_answer.h"
 #include "fuzz_world.h"
-#include "support/fake_files.h"
-#include "support/fake_web.h"
 
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     using namespace pelorus;
-    fuzz::begin({{"SERVER_BASE_URL", "https://cloud.kavra.example"},
-                 {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"}});
-    support::FakeFiles::get().reset();
-    auto& web = support::FakeWeb::get();
-    web.reset();
-    web.answer("/", fuzz::asText(data, size));
+    const std::string text = fuzz::asText(data, size);
 
-    auto* client = TavikClient::getInstance();
-    client->resetServerSleepTime();
-    for (std::string address : {"44.128.0.20", ""}) {
-        std::string remote;
-        bool relay = false;
-        const int result =
-            client->testPort(address, 9091, HTTP, false, false, &relay, false, remote);
-        fuzz::require(result >= SKIP_TEST && result <= PASS_TEST, "a result of a port test");
-        fuzz::require(!relay || result == FAIL_TEST, "a second NAT fails the test");
-        fuzz::require(remote.empty() || client->validateIpAddress(remote), "the address seen");
+    const PortTestAnswer test = readPortTestAnswer(text);
+    for (const auto& part : {test.remoteAddress, test.testedAddress}) {
+        if (!part || part->text.empty()) continue;
+        fuzz::require(text.substr(part->start, part->end - part->start) == part->text, "a place");
     }
-    fuzz::require(client->getServerSleepTime() >= 120, "the least pause");
+    for (const auto& device : {test.requestedDevice, test.respondingDevice}) {
+        fuzz::require(text.find(device) != std::string::npos, "a device of the answer");
+    }
 
-    std::string own;
-    int wait = 0;
-    if (client->getMyIP(own, wait)) {
-        fuzz::require(client->validateIpAddress(own), "an address is an address");
+    const SleepAnswer sleep = readSleepAnswer(text);
+    const bool settled = sleep.kind == SleepAnswer::WAIT || sleep.kind == SleepAnswer::PROCEED;
+    fuzz::require(sleep.seconds.has_value() == settled, "a wait when it is settled");
+    fuzz::require(sleep.seconds.value_or(0) >= 0, "no negative wait");
+
+    if (isIpv4Address(text)) {
+        fuzz::require(text.find_first_not_of("0123456789.") == std::string::npos, "an address");
     }
-    web.checkBalance();
-    fuzz::finish();
     return 0;
 }

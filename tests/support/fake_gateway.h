@@ -1,26 +1,26 @@
-// The home gateway of a test: the UPnP calls of miniupnpc, libnatpmp and select end here, in one
-// mapping table, and nothing is sent.
+// The home gateway of a test. The UPnP calls of miniupnpc, libnatpmp and select end here, in one
+// mapping table; nothing is sent.
 //
-// At first the gateway speaks UPnP, not NAT-PMP, is connected and has an empty table. No
-// answer takes time. Every call leaves one line, in order:
+// At first the gateway speaks UPnP but not NAT-PMP, is connected and has an empty table. UPnP takes
+// no time; NAT-PMP keeps a time of its own, which only the waits for answers move. Every call
+// leaves one line, in order:
 //
-//   discover 2000 ms                      natpmp open
-//   igd                                   natpmp address
-//   external ip                           natpmp map TCP 9091 -> 80 for 172800 s
-//   entry TCP 9091                        natpmp map TCP 0 -> 80 for 0 s     (a removal)
-//   entry #0                              natpmp wait 250 ms
-//   map TCP 9091 -> 192.168.77.10:80 Kavra            natpmp close
+//   discover 2000 ms                           natpmp open
+//   igd http://192.168.77.1:5000/rootDesc.xml  natpmp address
+//   external ip                                natpmp map TCP 9091 -> 80 for 172800 s
+//   entry TCP 9091                             natpmp map TCP 0 -> 80 for 0 s     (a removal)
+//   entry #0                                   natpmp wait 250 ms
+//   map TCP 9091 -> 192.168.77.10:80 Kavra     natpmp close
 //   unmap TCP 9091
 //
-// Fails the test by itself: a UPnP call while SIGPIPE could end the process, a NAT-PMP request on
-// a socket that a child process would inherit, a remote host or a lease with a UPnP mapping, a
-// release of what was not handed out.
+// Fails the test by itself: a UPnP call while SIGPIPE could end the process, a NAT-PMP request while
+// an answer is unread or on a socket that a child process would inherit, a remote host or a lease
+// with a UPnP mapping, a release of what was not handed out.
 #ifndef PELORUS_SUPPORT_FAKE_GATEWAY_H
 #define PELORUS_SUPPORT_FAKE_GATEWAY_H
 
 #include <miniupnpc/miniupnpc.h>
 #include <natpmp.h>
-#include <sys/select.h>
 
 #include <functional>
 #include <map>
@@ -74,24 +74,34 @@ public:
     };
 
     static FakeGateway& get();
+    void reset();
+    /// Fails the test when a device list or URLs were not released.
+    void checkReleased() const;
 
     // --- what the gateway is; each may change at any time --------------------------------
 
     void speakUpnp(bool on) { upnp = on; }
     /// Off: requests are refused at once, as where nothing listens.
     void speakNatpmp(bool on) { natpmp = on; }
-    /// NAT-PMP requests get no answer at all.
-    void keepSilent() { silent = true; }
-    /// Sends an answer that no request waits for any more.
-    void answerLate();
     /// The address both protocols tell, at first 44.128.0.20.
     void setExternalIp(const std::string& address) { externalIp = address; }
-    /// Lets the question for the external address fail with @p status (UPnP).
-    void failExternalIp(int status) { externalIpStatus = status; }
+    /// Status of the UPnP question for the external address.
+    int externalIpStatus = 0;
     /// The devices a search finds, at first one gateway.
-    void setDevices(std::vector<Device> list) { devices = std::move(list); }
+    std::vector<Device> devices;
     /// The library's choice: 0 none, 1 connected (as at first), 2 not connected, 3 no gateway.
-    void setIgdState(int state) { igdState = state; }
+    int igdState = 1;
+
+    // --- NAT-PMP in time -----------------------------------------------------------------
+
+    /// Requests from now on are lost.
+    bool silent = false;
+    /// Requests are answered so much later, milliseconds.
+    long answerDelay = 0;
+    /// What comes before this time is answered at it, milliseconds.
+    long hungUntil = 0;
+    /// Milliseconds spent waiting for answers.
+    long natpmpTime = 0;
 
     // --- its mapping table ---------------------------------------------------------------
 
@@ -103,15 +113,15 @@ public:
     void acceptPort(int port) { refused.erase(port); }
     void refuseAllPorts(bool on = true) { refuseAll = on; }
     /// Fails removals and keeps the mapping.
-    void refuseRemovals() { keepMappings = true; }
-    /// Answers every question for one mapping with @p reply, whatever the table says.
-    void lieAboutEntry(const Reply& reply) { specificLie = reply; }
-    /// Answers every index of the table with @p reply, so that a status of 0 never ends.
-    void lieAboutTable(const Reply& reply) { genericLie = reply; }
+    bool keepMappings = false;
+    /// The answer to every question for one mapping, whatever the table says.
+    std::optional<Reply> entryLie;
+    /// The answer for every index of the table, so that a status of 0 never ends.
+    std::optional<Reply> tableLie;
     /// NAT-PMP: grants differ from what was asked.
     void grant(const Grant& what) { granted = what; }
-    /// Lets one library call fail with @p status and errno @p error.
-    void failNatpmp(Natpmp call, int status, int error = 0) { failures[call] = {status, error}; }
+    /// Status and errno with which a library call fails.
+    std::map<Natpmp, std::pair<int, int>> failures;
 
     // --- what was asked ------------------------------------------------------------------
 
@@ -124,70 +134,50 @@ public:
     /// Runs @p action at each following call, before it is answered; gets its line.
     void onCall(std::function<void(const std::string&)> action) { hook = std::move(action); }
 
-    /// Fails the test when a device list or URLs were not released.
-    void checkReleased() const;
-    void reset();
+    // --- for the library calls -----------------------------------------------------------
 
-    // --- the far end of the calls --------------------------------------------------------
-
-    UPNPDev* discover(int delay);
-    void releaseDevices(UPNPDev* list);
-    int validIgd(UPNPDev* list, UPNPUrls* urls, IGDdatas* data, char* lanAddress, int size);
-    void releaseUrls(UPNPUrls* urls);
-    int tellExternalIp(const char* url, const char* service, char* address);
-    Reply specificEntry(const char* url, const char* service, const char* port, const char* proto);
-    Reply genericEntry(const char* url, const char* service, const char* index);
-    int addMapping(const char* url, const char* service, const Mapping& mapping);
-    int removeMapping(const char* url, const char* service, const char* port, const char* proto);
-
-    int openClient(natpmp_t* client);
-    int closeClient();
-    int sendAddressRequest();
-    int sendMappingRequest(int protocol, int privatePort, int publicPort, unsigned lifetime);
-    int requestTimeout(timeval* timeout);
-    int waitForAnswer(int count, const fd_set* readable, const timeval* timeout);
-    int readAnswer(natpmpresp_t* response);
-
-private:
-    struct DeviceList;
+    struct DeviceList {
+        std::vector<Device> texts;
+        std::vector<UPNPDev> nodes;
+    };
+    struct Datagram {
+        int status = 0;
+        natpmpresp_t response{};
+    };
+    /// A NAT-PMP request; protocol 0 asks for the address.
     struct Request {
-        int protocol = 0;  // 0 asks for the address
+        int protocol = 0;
         int privatePort = 0;
         int publicPort = 0;
         unsigned lifetime = 0;
     };
 
-    FakeGateway();
-
     void note(const std::string& line);
-    [[nodiscard]] bool isReached(const char* url, const char* service) const;
-    bool fails(Natpmp call, int& status);
-    [[nodiscard]] Reply replyFor(const Mapping& mapping) const;
-    std::vector<Mapping>::iterator find(int externalPort, const std::string& protocol);
-    int answerMapping(natpmpresp_t* response);
+    /// The status to fail with, errno set, or 0.
+    [[nodiscard]] int failure(Natpmp call) const;
+    [[nodiscard]] std::vector<Mapping>::iterator find(int externalPort,
+                                                      const std::string& protocol);
+    [[nodiscard]] bool refuses(int port) const { return refuseAll || refused.count(port) != 0; }
 
     bool upnp = true;
     bool natpmp = false;
-    bool silent = false;
-    std::string externalIp = "44.128.0.20";
-    int externalIpStatus = 0;
-    std::vector<Device> devices;
-    int igdState = 1;
+    std::string externalIp;
     std::vector<Mapping> table;
     std::set<int> refused;
     bool refuseAll = false;
-    bool keepMappings = false;
-    std::optional<Reply> specificLie;
-    std::optional<Reply> genericLie;
     Grant granted;
-    std::map<Natpmp, std::pair<int, int>> failures;
     Texts lines;
     std::function<void(const std::string&)> hook;
     std::map<UPNPDev*, std::unique_ptr<DeviceList>> lists;
     int urlSets = 0;
     int clients = 0;
-    std::optional<Request> pending;
-    int reads = 0;
+    Request pending;
+    long retryTime = 0;
+    bool connectionRefused = false;
+    std::multimap<long, Datagram> onTheWay;
+
+private:
+    FakeGateway() { reset(); }
 };
 
 bool operator==(const FakeGateway::Mapping& left, const FakeGateway::Mapping& right);

@@ -8,104 +8,51 @@
 #include <csignal>
 #include <cstdarg>
 #include <cstdlib>
-#include <memory>
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
-extern "C" {
-CURLcode __wrap_curl_global_init(long flags);
-void __wrap_curl_global_cleanup();
-CURL* __wrap_curl_easy_init();
-void __wrap_curl_easy_cleanup(CURL* handle);
-CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...);
-CURLcode __wrap_curl_easy_perform(CURL* handle);
-#if MINIUPNPC_API_VERSION >= 16
-void* __wrap_miniwget(const char* url, int* size, unsigned scopeId, int* statusCode);
-#else
-void* __wrap_miniwget(const char* url, int* size, unsigned scopeId);
-#endif
-}
-// NOLINTEND(bugprone-reserved-identifier)
 
 namespace pelorus::support {
 
 namespace {
 
+constexpr std::size_t kPieceSize = 1000;  // bytes
+
 bool holds(const std::string& url, const std::string& part) {
     return url.find(part) != std::string::npos;
 }
 
-FakeWeb::Answer plain(const std::string& body) {
-    FakeWeb::Answer answer;
-    answer.body = body;
-    return answer;
-}
-
 }  // namespace
 
-// Never destroyed: the client under test says goodbye to libcurl at the end of the process.
+// Never destroyed: the client under test cleans libcurl up at the end of the process.
 FakeWeb& FakeWeb::get() {
     static auto* const instance = new FakeWeb;
     return *instance;
-}
-
-FakeWeb::Answer FakeWeb::noAnswer(CURLcode result) {
-    Answer answer;
-    answer.result = result;
-    return answer;
 }
 
 void FakeWeb::answer(const std::string& part, Answer answer) {
     rules.emplace_back(part, std::move(answer));
 }
 
-void FakeWeb::answer(const std::string& part, const std::string& body) {
-    answer(part, plain(body));
-}
-
 void FakeWeb::answerOnce(const std::string& part, Answer answer) {
     once.emplace_back(part, std::move(answer));
 }
 
-void FakeWeb::answerOnce(const std::string& part, const std::string& body) {
-    answerOnce(part, plain(body));
-}
-
-std::vector<std::string> FakeWeb::urls() const {
-    std::vector<std::string> all;
-    for (const Request& request : asked) all.push_back(request.url);
-    return all;
-}
-
-std::vector<std::string> FakeWeb::urls(Side side) const {
-    std::vector<std::string> some;
-    for (const Request& request : asked) {
-        if (request.side == side) some.push_back(request.url);
-    }
-    return some;
-}
-
 int FakeWeb::count(const std::string& part) const {
-    return static_cast<int>(std::count_if(asked.begin(), asked.end(), [&](const Request& request) {
-        return holds(request.url, part);
-    }));
+    return static_cast<int>(std::count_if(
+        asked.begin(), asked.end(), [&](const std::string& url) { return holds(url, part); }));
 }
 
 void FakeWeb::checkBalance() const {
-    EXPECT_TRUE(handles.empty()) << "easy handles not cleaned up: " << handles.size();
+    EXPECT_FALSE(isOpen) << "easy handle not cleaned up";
 }
 
 void FakeWeb::reset() {
-    rules.clear();
-    once.clear();
-    asked.clear();
-    transfer = {};
-    handlesFail = false;
-    globalInitFails = false;
+    const int initialised = globalInits;
+    *this = FakeWeb{};
+    globalInits = initialised;
 }
 
-FakeWeb::Answer FakeWeb::take(const Request& request) {
-    asked.push_back(request);
-    const auto fits = [&](const auto& rule) { return holds(request.url, rule.first); };
+FakeWeb::Answer FakeWeb::take(const std::string& url) {
+    asked.push_back(url);
+    const auto fits = [&](const auto& rule) { return holds(url, rule.first); };
     const auto next = std::find_if(once.begin(), once.end(), fits);
     if (next != once.end()) {
         Answer found = std::move(next->second);
@@ -116,85 +63,49 @@ FakeWeb::Answer FakeWeb::take(const Request& request) {
     return rule == rules.rend() ? noAnswer() : rule->second;
 }
 
-CURLcode FakeWeb::globalInit() {
-    ++globalInitCount;
-    return globalInitFails ? CURLE_FAILED_INIT : CURLE_OK;
-}
-
-CURL* FakeWeb::openHandle() {
-    EXPECT_GT(globalInitCount, globalCleanupCount) << "libcurl is not initialised";
+CURL* FakeWeb::open() {
+    EXPECT_GT(globalInits, 0) << "libcurl is not initialised";
+    EXPECT_FALSE(isOpen) << "another easy handle is open";
     if (handlesFail) return nullptr;
     transfer = {};
-    auto handle = std::make_unique<char>();
-    CURL* address = handle.get();
-    handles.emplace(address, std::move(handle));
-    return address;
+    isOpen = true;
+    return &transfer;
 }
 
-void FakeWeb::checkHandle(CURL* handle) const {
-    EXPECT_EQ(handles.count(handle), 1U) << "not an open easy handle";
+FakeWeb::Transfer& FakeWeb::transferOf(CURL* handle) {
+    EXPECT_TRUE(isOpen && handle == &transfer) << "not an open easy handle";
+    return transfer;
 }
 
-void FakeWeb::closeHandle(CURL* handle) {
-    checkHandle(handle);
-    handles.erase(handle);
-}
-
-CURLcode FakeWeb::setNumber(CURL* handle, CURLoption option, long value) {
-    checkHandle(handle);
-    transfer.options.emplace_back(option, std::to_string(value));
-    return CURLE_OK;
-}
-
-CURLcode FakeWeb::setPointer(CURL* handle, CURLoption option, void* value) {
-    checkHandle(handle);
-    transfer.options.emplace_back(option, "");
-    if (option == CURLOPT_URL) {
-        transfer.url = static_cast<const char*>(value);
-        transfer.options.back().second = transfer.url;
-    }
-    if (option == CURLOPT_WRITEDATA) transfer.context = value;
-    return CURLE_OK;
-}
-
-CURLcode FakeWeb::setWriter(CURL* handle, CURLoption option, curl_write_callback writer) {
-    checkHandle(handle);
-    transfer.options.emplace_back(option, "");
-    if (option == CURLOPT_WRITEFUNCTION) transfer.writer = writer;
-    return CURLE_OK;
+void FakeWeb::close(CURL* handle) {
+    transferOf(handle);
+    isOpen = false;
 }
 
 CURLcode FakeWeb::perform(CURL* handle) {
-    checkHandle(handle);
-    if (transfer.url.empty()) return CURLE_URL_MALFORMAT;
-    Answer answer = take({Side::CENTRAL, transfer.url});
-    if (answer.action) answer.action(transfer.url);
-    return deliver(answer);
-}
-
-CURLcode FakeWeb::deliver(Answer& answer) const {
-    const std::size_t total = answer.body.size();
-    for (std::size_t at = 0; at < total;) {
-        const std::size_t piece = answer.chunk == 0 ? total : std::min(answer.chunk, total - at);
-        if (transfer.writer(answer.body.data() + at, 1, piece, transfer.context) != piece) {
+    const Transfer& now = transferOf(handle);
+    if (now.url.empty()) return CURLE_URL_MALFORMAT;
+    Answer answer = take(now.url);
+    if (answer.action) answer.action();
+    for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
+        const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
+        if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
             return CURLE_WRITE_ERROR;
         }
-        at += piece;
     }
     return answer.result;
 }
 
-void* FakeWeb::wget(const char* url, int* size) {
+void* FakeWeb::wget(const std::string& url, int* size) {
     sigset_t mask;
     pthread_sigmask(SIG_SETMASK, nullptr, &mask);
     EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
     *size = 0;
-    const std::string address = url;
-    if (address.empty()) return nullptr;
-    const Answer answer = take({Side::LOCAL, address});
-    if (answer.action) answer.action(address);
+    if (url.empty()) return nullptr;
+    const Answer answer = take(url);
+    if (answer.action) answer.action();
     if (answer.result != CURLE_OK) return nullptr;
-    // Exactly the body: whoever reads a terminator behind it is caught by the sanitizers.
+    // Without a terminator: the sanitizers catch whoever reads one.
     void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
     std::copy(answer.body.begin(), answer.body.end(), static_cast<char*>(block));
     *size = static_cast<int>(answer.body.size());
@@ -206,39 +117,45 @@ void* FakeWeb::wget(const char* url, int* size) {
 using pelorus::support::FakeWeb;
 
 // NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
+extern "C" {
 CURLcode __wrap_curl_global_init(long /*flags*/) {
-    return FakeWeb::get().globalInit();
+    ++FakeWeb::get().globalInits;
+    return FakeWeb::get().globalInitFails ? CURLE_FAILED_INIT : CURLE_OK;
 }
 
 void __wrap_curl_global_cleanup() {
-    FakeWeb::get().globalCleanup();
+    --FakeWeb::get().globalInits;
 }
 
 CURL* __wrap_curl_easy_init() {
-    return FakeWeb::get().openHandle();
+    return FakeWeb::get().open();
 }
 
 void __wrap_curl_easy_cleanup(CURL* handle) {
-    FakeWeb::get().closeHandle(handle);
+    FakeWeb::get().close(handle);
 }
 
 // An enum in front of the dots would be promoted, which va_start does not allow.
 CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
+    FakeWeb::Transfer& transfer = FakeWeb::get().transferOf(handle);
     const auto option = static_cast<CURLoption>(number);
+    std::string value;
     va_list argument;
     va_start(argument, number);
     // NOLINTBEGIN(clang-analyzer-valist.Uninitialized): a false alarm, see the line above
-    CURLcode result = CURLE_UNKNOWN_OPTION;
-    if (option < CURLOPTTYPE_OBJECTPOINT) {
-        result = FakeWeb::get().setNumber(handle, option, va_arg(argument, long));
-    } else if (option < CURLOPTTYPE_FUNCTIONPOINT) {
-        result = FakeWeb::get().setPointer(handle, option, va_arg(argument, void*));
-    } else if (option < CURLOPTTYPE_OFF_T) {
-        result = FakeWeb::get().setWriter(handle, option, va_arg(argument, curl_write_callback));
+    if (option == CURLOPT_WRITEFUNCTION) {
+        transfer.writer = va_arg(argument, curl_write_callback);
+    } else if (option == CURLOPT_WRITEDATA) {
+        transfer.context = va_arg(argument, void*);
+    } else if (option == CURLOPT_URL) {
+        value = transfer.url = va_arg(argument, const char*);
+    } else {
+        value = std::to_string(va_arg(argument, long));
     }
     // NOLINTEND(clang-analyzer-valist.Uninitialized)
     va_end(argument);
-    return result;
+    transfer.options.emplace_back(option, value);
+    return CURLE_OK;
 }
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
@@ -246,13 +163,11 @@ CURLcode __wrap_curl_easy_perform(CURL* handle) {
 }
 
 #if MINIUPNPC_API_VERSION >= 16
-void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* statusCode) {
-    if (statusCode != nullptr) *statusCode = 200;
-    return FakeWeb::get().wget(url, size);
-}
+void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* /*statusCode*/) {
 #else
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
+#endif
     return FakeWeb::get().wget(url, size);
 }
-#endif
+}
 // NOLINTEND(bugprone-reserved-identifier)

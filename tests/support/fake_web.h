@@ -1,17 +1,14 @@
 // The web of a test: libcurl's easy interface (the central server) and miniwget (the local web
 // back end) end here and nothing is sent.
 //
-// Fails the test by itself: a transfer before curl_global_init, a handle that is not an open one,
+// Standing checks: no transfer before curl_global_init, calls for the open easy handle only, no
 // miniwget while SIGPIPE could end the process.
 #ifndef PELORUS_SUPPORT_FAKE_WEB_H
 #define PELORUS_SUPPORT_FAKE_WEB_H
 
 #include <curl/curl.h>
 
-#include <cstddef>
 #include <functional>
-#include <map>
-#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -21,88 +18,69 @@ namespace pelorus::support {
 class FakeWeb {
 public:
     struct Answer {
-        std::string body{};
-        /// What curl_easy_perform returns after the body was taken; miniwget takes any error for
-        /// no answer.
+        Answer(const char* text) : body{text} {}            // NOLINT(google-explicit-constructor)
+        Answer(std::string text, CURLcode code = CURLE_OK)  // NOLINT(google-explicit-constructor)
+            : body{std::move(text)}, result{code} {}
+
+        std::string body;  ///< delivered in pieces of 1000 bytes
+        /// What curl_easy_perform returns after the body; any error is no answer of miniwget.
         CURLcode result = CURLE_OK;
-        std::size_t chunk = 0;  ///< bytes per call of the write function; 0: all at once
-        /// Runs before the body is delivered; gets the URL. May throw or move the clock.
-        std::function<void(const std::string&)> action{};
-    };
-    enum class Side { CENTRAL, LOCAL };
-    struct Request {
-        Side side;
-        std::string url;  ///< as it goes over the wire
+        std::function<void()> action{};  ///< runs before the body is delivered; may throw
     };
     /// Numbers in decimal, texts as they are, empty for pointers.
     using Options = std::vector<std::pair<CURLoption, std::string>>;
 
     static FakeWeb& get();
     /// A server that cannot be reached.
-    static Answer noAnswer(CURLcode result = CURLE_COULDNT_CONNECT);
+    static Answer noAnswer() { return {"", CURLE_COULDNT_CONNECT}; }
 
-    /// Answers every URL that holds @p part, on both sides. A later rule goes before an earlier
-    /// one. What nobody answers is not reachable.
+    /// Answers every URL that holds @p part; a later rule goes before an earlier one. What nobody
+    /// answers cannot be reached.
     void answer(const std::string& part, Answer answer);
-    void answer(const std::string& part, const std::string& body);
-    /// Answers the next request for a URL that holds @p part, once, before any standing rule.
-    /// Several for one part are used in the order in which they were given.
+    /// Answers one URL that holds @p part, before any standing rule; several in the order given.
     void answerOnce(const std::string& part, Answer answer);
-    void answerOnce(const std::string& part, const std::string& body);
 
-    /// Everything that was asked, central and local, in order. Empty URLs, which both libraries
-    /// refuse, are not among them.
-    [[nodiscard]] std::vector<std::string> urls() const;
-    [[nodiscard]] std::vector<std::string> urls(Side side) const;
+    /// All URLs asked for, central and local, in order, but for empty ones.
+    [[nodiscard]] const std::vector<std::string>& urls() const { return asked; }
     /// How many of them hold @p part.
     [[nodiscard]] int count(const std::string& part) const;
-    /// Forgets the requests, not the answers.
+    /// Forgets the URLs, not the answers.
     void clear() { asked.clear(); }
-
-    /// The options of the last transfer, in the order in which they were set.
+    /// The options of the last transfer in the order in which they were set.
     [[nodiscard]] const Options& options() const { return transfer.options; }
-    /// Lets curl_easy_init or curl_global_init fail from now on.
-    void failHandles() { handlesFail = true; }
-    void failGlobalInit() { globalInitFails = true; }
-    [[nodiscard]] int globalInits() const { return globalInitCount; }
 
-    /// Fails the test when an easy handle was not cleaned up.
+    /// Fails the test when the easy handle was not cleaned up.
     void checkBalance() const;
     /// Forgets everything but that libcurl was initialised.
     void reset();
 
-    CURLcode globalInit();
-    void globalCleanup() { ++globalCleanupCount; }
-    CURL* openHandle();
-    void closeHandle(CURL* handle);
-    CURLcode setNumber(CURL* handle, CURLoption option, long value);
-    CURLcode setPointer(CURL* handle, CURLoption option, void* value);
-    CURLcode setWriter(CURL* handle, CURLoption option, curl_write_callback writer);
-    CURLcode perform(CURL* handle);
-    void* wget(const char* url, int* size);
+    bool handlesFail = false;
+    bool globalInitFails = false;
+    int globalInits = 0;  ///< minus the clean-ups
 
-private:
     struct Transfer {
         Options options;
         std::string url;
         curl_write_callback writer = nullptr;
         void* context = nullptr;
     };
+    CURL* open();
+    void close(CURL* handle);
+    Transfer& transferOf(CURL* handle);
+    CURLcode perform(CURL* handle);
+    void* wget(const std::string& url, int* size);
+
+private:
+    using Rules = std::vector<std::pair<std::string, Answer>>;
 
     FakeWeb() = default;
-    Answer take(const Request& request);
-    CURLcode deliver(Answer& answer) const;
-    void checkHandle(CURL* handle) const;
+    Answer take(const std::string& url);
 
-    std::vector<std::pair<std::string, Answer>> rules;
-    std::vector<std::pair<std::string, Answer>> once;
-    std::vector<Request> asked;
+    Rules rules;
+    Rules once;
+    std::vector<std::string> asked;
     Transfer transfer;
-    std::map<CURL*, std::unique_ptr<char>> handles;
-    bool handlesFail = false;
-    bool globalInitFails = false;
-    int globalInitCount = 0;
-    int globalCleanupCount = 0;
+    bool isOpen = false;
 };
 
 }  // namespace pelorus::support

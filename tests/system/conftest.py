@@ -1,10 +1,11 @@
-"""Runs each system test alone in a sandbox of its own, so that several can run side by side."""
+"""Runs each system test in a sandbox of its own, so that several can run in parallel."""
 
 from __future__ import annotations
 
 import sys
-from collections.abc import Callable, Iterator
+from collections.abc import Callable, Generator
 from pathlib import Path
+from typing import Any
 
 import pytest
 
@@ -21,20 +22,20 @@ _raised: list[Lab] = []
 
 
 def pytest_configure(config: pytest.Config) -> None:
-    """Make our marker known."""
-    config.addinivalue_line("markers", "outside: starts a sandbox itself, so it runs in none")
+    """Register the marker."""
+    config.addinivalue_line("markers", "outside: runs outside a sandbox and starts its own")
 
 
 @pytest.hookimpl(tryfirst=True)
 def pytest_pyfunc_call(pyfuncitem: pytest.Function) -> bool | None:
-    """Outside, run the test by a pytest of its own as first process of a sandbox."""
+    """Outside a sandbox, run the test with its own pytest as the first process of a new one."""
     if sandbox.is_inside():
         return None
     reason = sandbox.why_forbidden()
     if reason:
-        pytest.skip(f"this machine does not let us make network namespaces ({reason})")
+        pytest.skip(f"this machine does not allow network namespaces ({reason})")
     if not sandbox.binary().exists():
-        pytest.fail(f"{sandbox.binary()} is not there; build it or set PELORUS", pytrace=False)
+        pytest.fail(f"{sandbox.binary()} does not exist; build it or set PELORUS", pytrace=False)
     if pyfuncitem.get_closest_marker("outside"):
         return None
     done = sandbox.run("pytest", ["-q", "--no-header", "-p", "no:cacheprovider",
@@ -47,7 +48,7 @@ def pytest_pyfunc_call(pyfuncitem: pytest.Function) -> bool | None:
 
 @pytest.fixture
 def play() -> Callable[[Situation], Lab]:
-    """Raises the lab in a situation; what it saw is shown when the test fails."""
+    """Sets up the lab for a situation; its report is shown when the test fails."""
 
     def raised(situation: Situation) -> Lab:
         lab = Lab(situation, Timeline())
@@ -58,7 +59,7 @@ def play() -> Callable[[Situation], Lab]:
 
 
 @pytest.hookimpl(hookwrapper=True)
-def pytest_runtest_makereport(item: pytest.Item) -> Iterator[None]:
+def pytest_runtest_makereport(item: pytest.Item) -> Generator[None, Any, None]:
     """Add the lab's own report to a failure."""
     outcome = yield
     report = outcome.get_result()

@@ -1,4 +1,4 @@
-"""The demo as its user meets it: what it says, how it ends, and that it leaves nothing behind."""
+"""The demo as its user sees it: its output, its end, and that it leaves nothing behind."""
 
 from __future__ import annotations
 
@@ -21,7 +21,7 @@ DAEMON_FILES = (Path("/tmp/tavik_cm_pid"), Path("/tmp/dynamicconfig.ini"))
 
 
 def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Popen[str]:
-    """The demo as a terminal runs it: a process group of its own, the daemon already built."""
+    """Start the demo as a terminal does, in its own process group, with a built daemon."""
     environment = dict(os.environ, PELORUS=str(binary))
     return subprocess.Popen([sandbox.PYTHON, "-m", "lab.demo", *options], env=environment,
                             cwd=sandbox.PROJECT, stdout=subprocess.PIPE, text=True,
@@ -29,7 +29,7 @@ def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Pop
 
 
 def traces() -> tuple[list[str], list[bool]]:
-    """The machine's mounts, and whether the daemon's files are there."""
+    """The machine's mounts, and whether the daemon's files exist."""
     mounts = sorted(Path("/proc/self/mountinfo").read_text().splitlines())
     return mounts, [file.exists() for file in DAEMON_FILES]
 
@@ -46,7 +46,7 @@ def processes_in(pid_namespace: str) -> list[str]:
     return found
 
 
-def test_demo_shows_the_way_and_ends_well():
+def test_demo_prints_each_step_and_succeeds() -> None:
     before = traces()
     demo = start_demo()
     text, _ = demo.communicate(timeout=90)
@@ -61,20 +61,20 @@ def test_demo_shows_the_way_and_ends_well():
     assert traces() == before
 
 
-def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path):
+def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path: Path) -> None:
     listed, _ = start_demo("--list").communicate(timeout=20)
     assert [line.split()[0] for line in listed.splitlines()] == list(SCENARIOS)
     picture = tmp_path / "ports-taken.svg"
     demo = start_demo("ports-taken", "--svg", str(picture))
     text, _ = demo.communicate(timeout=90)
     assert demo.returncode == 0, text
-    assert "== it holds 9444 as well" in text and "everything was as it must be" in text
+    assert "== it holds 9444 as well" in text and "all checks passed" in text
     words = " ".join(ElementTree.parse(picture).getroot().itertext())
     assert SCENARIOS["ports-taken"].title in words
     assert "forwards TCP 9445 -> 192.168.77.10:443" in words
 
 
-def test_demo_fails_with_a_daemon_that_does_nothing():
+def test_demo_fails_with_a_daemon_that_does_nothing() -> None:
     demo = start_demo(binary=Path("/bin/true"))
     text, _ = demo.communicate(timeout=60)
     assert demo.returncode == 1, text
@@ -83,17 +83,18 @@ def test_demo_fails_with_a_daemon_that_does_nothing():
 
 @pytest.mark.parametrize("end", [signal.SIGINT, signal.SIGTERM, signal.SIGKILL],
                          ids=["Ctrl-C", "kill", "kill-9"])
-def test_lab_that_stays_up_leaves_no_trace_after(end):
+def test_lab_that_stays_up_leaves_no_trace_after(end: signal.Signals) -> None:
     before = traces()
     demo = start_demo("--stay")
     said: list[str] = []
-    for line in demo.stdout:
+    for line in demo.stdout or ():
         said.append(line)
         if "the view from outside" in line:
             break
     assert "the view from outside" in said[-1], "".join(said)
-    first = re.search(r"-t (\d+) ", said[-1])[1]
-    namespace = os.readlink(f"/proc/{first}/ns/pid")
+    entry = re.search(r"-t (\d+) ", said[-1])
+    assert entry, said[-1]
+    namespace = os.readlink(f"/proc/{entry[1]}/ns/pid")
     assert len(processes_in(namespace)) >= 4
     if end == signal.SIGINT:
         os.killpg(demo.pid, end)

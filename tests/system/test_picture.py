@@ -1,4 +1,4 @@
-"""The picture of a timeline: everything is in it, to scale, readable, and nothing but drawing."""
+"""The picture of a timeline: complete, to scale, readable, and made of plain shapes only."""
 
 from __future__ import annotations
 
@@ -20,7 +20,12 @@ def drawn(events: list[Event]) -> ElementTree.Element:
 
 
 def texts(picture: ElementTree.Element) -> list[str]:
-    return [element.text for element in picture.iter(f"{SVG}text")]
+    return [element.text or "" for element in picture.iter(f"{SVG}text")]
+
+
+def measure(shape: ElementTree.Element, name: str) -> float:
+    """An attribute that the shape must have."""
+    return float(shape.attrib[name])
 
 
 def side_by_side(picture: ElementTree.Element, kind: str, **wanted: str) -> list[list[Box]]:
@@ -28,13 +33,13 @@ def side_by_side(picture: ElementTree.Element, kind: str, **wanted: str) -> list
     rows: dict[str, list[Box]] = {}
     for shape in picture.iter(SVG + kind):
         if all(shape.get(name.replace("_", "-")) == value for name, value in wanted.items()):
-            left = float(shape.get("x"))
+            left = measure(shape, "x")
             width = float(shape.get("width", 7 * len(shape.text or "")))
-            rows.setdefault(shape.get("y"), []).append((left, left + width))
+            rows.setdefault(shape.attrib["y"], []).append((left, left + width))
     return [sorted(row) for row in rows.values()]
 
 
-def test_story_of_a_log_is_told_in_few_and_harmless_words():
+def test_repeated_lines_become_one_entry_without_control_characters() -> None:
     timeline = Timeline()
     timeline.step("the gateway has <no> port & says \x1b[31mso\udc80")
     refusal = ("Router::mapPort() - fail - failed to map external port: {}, "
@@ -47,8 +52,8 @@ def test_story_of_a_log_is_told_in_few_and_harmless_words():
     timeline.add("relay", "a tunnel begins")
     timeline.add("relay", "a tunnel begins")
 
-    told = [(event.who, event.what) for event in timeline.events]
-    assert told[1:] == [("device", "gateway refuses a port")] * 2 + [("relay",
+    seen = [(event.who, event.what) for event in timeline.events]
+    assert seen[1:] == [("device", "gateway refuses a port")] * 2 + [("relay",
                                                                       "a tunnel begins")] * 2
     picture = drawn(timeline.events)
     assert {element.tag for element in picture.iter()} == {
@@ -60,14 +65,15 @@ def test_story_of_a_log_is_told_in_few_and_harmless_words():
     assert sum(word.startswith("a tunnel begins (2 times") for word in words) == 1
 
 
-def test_status_bars_are_to_scale_and_the_last_word_has_room():
-    told = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"), (80, "disabled")]
+def test_status_bars_are_to_scale() -> None:
+    changes = [(10, "connecting"), (40, "relayed"), (55, "relayed"), (70, "failed"),
+               (80, "disabled")]
     picture = drawn([Event(5, "lab", "is raised"), Event(81, "lab", "is gone"), *(
-        Event(when, "device", f"status: {word}") for when, word in told)])
+        Event(when, "device", f"status: {word}") for when, word in changes)])
     bars = {word: row for word, colour in STATUS_COLOURS.items()
             for row in side_by_side(picture, "rect", fill=colour, height="24")}
-    assert [len(bars[word]) for _, word in told] == [1] * 5 and "portforwarded" not in bars
-    ticks = {label: float(element.get("x")) for element in picture.iter(f"{SVG}text")
+    assert [len(bars[word]) for _, word in changes] == [1] * 5 and "portforwarded" not in bars
+    ticks = {label: measure(element, "x") for element in picture.iter(f"{SVG}text")
              for label in [element.text] if element.get("text-anchor") == "middle"}
     for word, seconds in (("connecting", 10), ("relayed", 40), ("failed", 70), ("disabled", 80)):
         assert bars[word][0][0] == pytest.approx(ticks[str(seconds)], abs=0.1)
@@ -75,7 +81,7 @@ def test_status_bars_are_to_scale_and_the_last_word_has_room():
     assert {"connecting", "relayed", "disabled"} <= set(texts(picture))
 
 
-def test_crowded_moments_stay_apart_and_on_the_paper():
+def test_crowded_marks_and_headings_do_not_overlap() -> None:
     moments = [Event(60 + number ** 2 / 50, who, f"event {number} of {who}")
                for number in range(40) for who in ("device", "gateway", "somebody")]
     steps = [Event(60 + number / 5, "story", f"and then, as step {number}, it goes on and on")
@@ -90,5 +96,5 @@ def test_crowded_moments_stay_apart_and_on_the_paper():
     for row in marks + headings:
         assert all(before[1] < after[0] for before, after in zip(row, row[1:]))
         assert 0 < row[0][0] and row[-1][1] < 1200
-    assert max(float(text.get("y")) for text in picture.iter(f"{SVG}text")) < float(
-        picture.get("height"))
+    lowest = max(measure(text, "y") for text in picture.iter(f"{SVG}text"))
+    assert lowest < measure(picture, "height")

@@ -1,4 +1,4 @@
-// The fixture of the cloud module: a configured client in front of the fake web.
+// A configured client in front of the fake web.
 #ifndef PELORUS_UNIT_CLOUD_FIXTURE_H
 #define PELORUS_UNIT_CLOUD_FIXTURE_H
 
@@ -13,32 +13,29 @@
 namespace pelorus {
 
 using support::expectLogged;
+using support::FakeCommands;
 using support::FakeWeb;
 using Urls = std::vector<std::string>;
 
 class CloudTest : public support::PelorusTest {
 protected:
-    CloudTest() {
-        web.reset();
-        files.reset();
-    }
-
     void TearDown() override {
         web.checkBalance();
         PelorusTest::TearDown();
     }
 
     TavikClient& givenClient() {
-        givenConfig(
-            {{"SERVER_BASE_URL", "https://web.kavra.example"},
-             {"INTERNAL_HTTP_PORT", "80"},
-             {"REMOTE_TESTPORTURL", "/test?id=%s&ip=%s&port=%d&type=%s&auth=%s"},
-             {"REMOTE_SETFORWARDURL", "/set?id=%s&ip=%s&lan=%s&p=%d&ps=%d&auth=%s"},
-             {"REMOTE_SETCOMMSTATUSURL", "/status?id=%s&auth=%s&lan=%s"},
-             {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/set?ip=%s&p=%d&ps=%d&lan=%s&i=%d"},
-             {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/del?i=%d"},
-             {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/status?is=%s"},
-             {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/ip?lan=%s"}});
+        // clang-format off
+        givenConfig({{"SERVER_BASE_URL", "https://web.kavra.example"},
+                     {"INTERNAL_HTTP_PORT", "80"},
+                     {"REMOTE_TESTPORTURL", "/test?id=%s&ip=%s&port=%d&type=%s&auth=%s"},
+                     {"REMOTE_SETFORWARDURL", "/set?id=%s&ip=%s&lan=%s&p=%d&ps=%d&auth=%s"},
+                     {"REMOTE_SETCOMMSTATUSURL", "/status?id=%s&auth=%s&lan=%s"},
+                     {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/set?ip=%s&p=%d&ps=%d&lan=%s&i=%d"},
+                     {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/del?i=%d"},
+                     {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/status?is=%s"},
+                     {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/ip?lan=%s"}});
+        // clang-format on
         TavikClient* client = TavikClient::getInstance();
         static_cast<void>(client->getRestUrl("", HTTP));
         log.clear();
@@ -47,7 +44,6 @@ protected:
     }
 
     FakeWeb& web = FakeWeb::get();
-    support::FakeFiles& files = support::FakeFiles::get();
 };
 
 }  // namespace pelorus

@@ -1,4 +1,4 @@
-// Mapping records, the local address and the status word.
+// Mapping records, the local address, the status word, analytics and the state of the disk.
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -33,52 +33,46 @@ const Report kAddress{
     "http://127.0.0.1:80/ip?lan=192.168.77.10"};
 // clang-format on
 
-class ReportsTest : public CloudTest {};
+class ReportsTest : public CloudTest {
+protected:
+    ReportsTest() { givenClient(); }
+};
 
 TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
-    givenClient();
-    // Part of the error line, empty for no failure; without a text nobody answers.
+    // Part of the error line, empty for no failure; "-" for nobody answers.
     const auto row = [&](const Report& report, const char* central, const char* local, bool result,
                          const std::string& error) {
         SCOPED_TRACE(error);
         web.reset();
         log.clear();
-        if (central != nullptr) web.answer("web.kavra.example", central);
-        if (local != nullptr) web.answer("127.0.0.1", local);
+        if (*central != '-') web.answer("web.kavra.example", central);
+        if (*local != '-') web.answer("127.0.0.1", local);
         EXPECT_EQ(report.send(), result);
-        EXPECT_EQ(web.urls(), central == nullptr ? Urls{report.centralUrl}
-                                                 : (Urls{report.centralUrl, report.localUrl}));
+        Urls asked{report.centralUrl};
+        if (*central != '-') asked.push_back(report.localUrl);
+        EXPECT_EQ(web.urls(), asked);
         EXPECT_EQ(log.countPart("fail"), error.empty() ? 0 : 1) << log.dump();
         EXPECT_GT(log.countPart(error), 0);
-        EXPECT_GT(log.countPart("auth=*AUTH_REMOVED*"), 0);
+        EXPECT_GT(log.countPart("?id=*ID_REMOVED*&"), 0);
+        EXPECT_GT(log.countPart("&auth=*AUTH_REMOVED*"), 0);
     };
     // clang-format off
     row(kUpdate, "any device-7350142", "a success", true, "");
-    row(kUpdate, "Success", "Success auth-91c2f0aa", true, "updateServerMapping - failure response received from localhost for url: [http://127.0.0.1:80/set?");
-    row(kUpdate, "Success", nullptr, false, "updateServerMapping - failed to get response from localhost for url: [");
-    row(kUpdate, nullptr, "success", false, "updateServerMapping - httpGet failed to get response from central server for url https");
+    row(kUpdate, "any", "Success auth-91c2f0aa", true, "failure response received from localhost for url: [http://127.0.0.1:80/set?");
+    row(kUpdate, "any", "-", false, "failed to get response from localhost for url: [");
+    row(kUpdate, "-", "", false, "httpGet failed to get response from central server for url https");
     row(kWithdraw, "any device-7350142", "a success", true, "");
-    row(kWithdraw, "Success", "Success auth-91c2f0aa", false, "deleteServerMapping - failure response received from localhost for url: [");
-    row(kWithdraw, "Success", nullptr, false, "deleteServerMapping - failed to get response from localhost for url: [");
-    row(kWithdraw, nullptr, "success", false, "deleteServerMapping - httpGet failed to get response from central server for url https");
-    row(kAddress, "Success", "", true, "");
+    row(kWithdraw, "any", "Success auth-91c2f0aa", false, "failure response received from localhost for url: [");
+    row(kWithdraw, "any", "-", false, "failed to get response from localhost for url: [");
+    row(kWithdraw, "-", "", false, "httpGet failed to get response from central server for url https");
+    row(kAddress, "Success", "no", true, "");
     row(kAddress, "success device-7350142", "no", true, "failure response received from central server for url:  https");
-    row(kAddress, "Success", nullptr, false, "failed to get response from local server for url:  http:");
-    row(kAddress, nullptr, "success", false, "updateRemoteCommStatus - httpGet failed to get response from central server for url https");
+    row(kAddress, "Success", "-", false, "failed to get response from local server for url:  http:");
+    row(kAddress, "-", "", false, "httpGet failed to get response from central server for url https");
     // clang-format on
 }
 
-TEST_F(ReportsTest, WithoutCredentialsNobodyIsToldAndExceptionsStayInside) {
-    givenClient();
-    const auto fail = [](const std::string&) { throw std::runtime_error{"broken"}; };
-    web.answer("", FakeWeb::Answer{"", CURLE_OK, 0, fail});
-    EXPECT_FALSE(kUpdate.send());
-    EXPECT_EQ(log.countPart("** TavikClient::httpGet - Throw exception error. **\n"), 1);
-    web.answer("web.kavra.example", "Success");
-    for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
-    client().updateLocalCommStatus("relayed");
-    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1);
-    web.clear();
+TEST_F(ReportsTest, WithoutCredentialsNobodyIsTold) {
     for (const char* const key : {"DEVICEAUTH", "DEVICEID"}) {
         setConfig(key, "");
         for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
@@ -88,12 +82,35 @@ TEST_F(ReportsTest, WithoutCredentialsNobodyIsToldAndExceptionsStayInside) {
     EXPECT_EQ(log.countPart("failed to get Device ID from DynamicConfig"), 3);
 }
 
-TEST_F(ReportsTest, OnlyAChangeOfStatusIsSentAndAnAnswerTouchesTheConfigurationAfterThePause) {
-    givenClient();
+TEST_F(ReportsTest, ExceptionsStayInside) {
+    FakeWeb::Answer broken{""};
+    broken.action = [] { throw std::runtime_error{"broken"}; };
+    web.answer("", broken);
+    EXPECT_FALSE(kUpdate.send());
+    EXPECT_EQ(log.countPart("** TavikClient::httpGet - Throw exception error. **\n"), 1);
+    web.answer("web.kavra.example", "Success");
+    for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
+    client().updateLocalCommStatus("relayed");
+    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1);
+}
+
+TEST_F(ReportsTest, ATemplateThatAsksForTooMuchIsNamed) {
+    web.answer("web.kavra.example", "Success");
+    for (const char* const key :
+         {"LOCAL_SETFORWARDURL", "LOCAL_DELFORWARDURL", "LOCAL_SETLOCALIPURL",
+          "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"}) {
+        setConfig(key, "%n");
+        for (const Report& report : {kUpdate, kWithdraw, kAddress}) EXPECT_FALSE(report.send());
+        client().updateLocalCommStatus(key);
+        EXPECT_GT(log.countPart(std::string{"URL template of "} + key + " asks for more"), 0);
+    }
+}
+
+TEST_F(ReportsTest, OnlyAChangeOfStatusIsSent) {
     const auto afterPause = [this](const std::string&) {
-        EXPECT_EQ(clock.pauses().size(), web.urls().size());
+        EXPECT_EQ(clock.pauses().size(), web.urls().size()) << "touched after the pause";
     };
-    commands.answer("touch", support::FakeCommands::Answer{"", 0, false, afterPause});
+    commands.answer("touch", FakeCommands::Answer{"", 0, false, afterPause});
     web.answer("is=relayed", "success");
     web.answer("is=failed", "no homecloud-smith");
     for (const char* word : {"relayed", "relayed", "failed", "connecting", "connecting", "relayed"})
@@ -106,6 +123,53 @@ TEST_F(ReportsTest, OnlyAChangeOfStatusIsSentAndAnAnswerTouchesTheConfigurationA
     EXPECT_EQ(log.countPart("Successful update status.\n\n"), 2);
     expectLogged(LOG_ERR, "Response: [no *SUBDOMAIN_REMOVED*].\n");
     EXPECT_EQ(log.countPart("failed to get response from localhost for url:  [" + url), 1);
+}
+
+TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
+    const auto row = [&](const char* name, const char* status, int type, const std::string& event) {
+        SCOPED_TRACE(name);
+        log.clear();
+        client().sendAnalytics(status, static_cast<ConnectionType>(type), SUBTYPE_AUTOMATIC);
+        EXPECT_EQ(log.lines().back().text, "cloudConnectivity state=" + event);
+    };
+    row("disabled is connecting", "disabled", 4, "connecting type=disabled");
+    row("an attempt names its kind", "connecting", 2, "connecting type=relayed");
+    row("forwarded", "portforwarded", 1, "connected type=portforwarded");
+    row("relayed ignores the kind", "relayed", 1, "connected type=relayed");
+    row("a failure names its kind", "failed", 1, "failed type=portforwarded");
+    row("an attempt is no kind", "failed", 3, "failed type=disabled");
+    row("a kind beyond the table is none", "failed", 5, "failed type=disabled");
+    row("an unknown status has failed", "odd", 2, "failed type=disabled");
+    EXPECT_EQ(log.countPart("[odd] = NOT_FOUND\n"), 2);
+}
+
+TEST_F(ReportsTest, ADiskAsleepOrUnknownSkipsTheTest) {
+    const auto row = [&](int skips, const std::string& state, const char* type,
+                         const std::string& last) {
+        log.clear();
+        const std::string output = "/dev/sda:\n drive state is:  " + state + "\n";
+        commands.answer("hdparm -C /dev/sda", FakeCommands::Answer{output, 0, state.empty(), {}});
+        setConfig("DEVICETYPE", type);
+        EXPECT_EQ(client().checkHddStandByMode(), skips) << last;
+        EXPECT_EQ(log.countPart("checkHddStandByMode - " + last + "\n"), 1) << log.dump();
+    };
+    const auto minutes = [&](const char* text) {
+        support::FakeFiles::get().redirect(support::kIdleMinutesFile, writeFile("minutes", text));
+    };
+    row(1, "idle", "", "failed to get open Ostrel sleep count file.");
+    minutes("2\n0\n");
+    row(1, "standby", "5", "drive is in standby, port test is suspended, port testing SKIP.");
+    row(1, "", "5",
+        "port test not performed - unable to check drive status, popen() returned NULL.");
+    row(1, "idle", "3", "sleep count > 1, port testing SKIP.");
+    minutes("1\n9\n");
+    row(0, "idle", "3", "checking sleep count.");
+    minutes("");
+    row(0, "idle", "3", "checking sleep count.");
+    log.clear();
+    setConfig("DEVICETYPE", "5");  // the maker's router counts nothing
+    EXPECT_EQ(client().checkHddStandByMode(), 0);
+    EXPECT_TRUE(log.lines().empty());
 }
 
 }  // namespace

@@ -1,10 +1,13 @@
-// The fixture of the connection module: the real classes of all modules below it, between a fake
+// The fixture of the connection module: the real classes of all modules it uses, between a fake
 // gateway, a fake web and a tunnel whose start command writes its output.
 #ifndef PELORUS_UNIT_CONNECTION_FIXTURE_H
 #define PELORUS_UNIT_CONNECTION_FIXTURE_H
 
-#include <unistd.h>
+#include <spawn.h>
+#include <sys/wait.h>
 
+#include <csignal>
+#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -21,11 +24,11 @@ namespace pelorus {
 
 using support::expectLogged;
 using support::expectLoggedInOrder;
-using support::expectNotLogged;
 using support::FakeGateway;
 using support::FakeWeb;
 using support::RowName;
 using support::Texts;
+using Ports = std::vector<int>;
 
 inline constexpr const char* kLanIp = "192.168.77.10";
 inline constexpr const char* kWanIp = "44.128.0.20";
@@ -44,10 +47,9 @@ protected:
         web.reset();
         gateway.reset();
         files.reset();
-        web.answer("/setstatus", "success");
-        web.answer("/setforward", "success");
-        web.answer("/delforward", "success");
-        web.answer("/setlanip", "success");
+        for (const char* part : {"/setstatus", "/setforward", "/delforward", "/setlanip"}) {
+            web.answer(part, "success");
+        }
         web.answer("/remote_access_status/", "<action>proceed</action>");
         web.answer("/forward?", "Success");
         web.answer("/lanip?", "Success");
@@ -67,10 +69,14 @@ protected:
                      {"STARTCMD_OUTFILE", path("client.out")},
                      {"LOG_SUCCESS_TEXT", "Completed"},
                      {"OPENVPN_PID_FILE", path("client.pid")}},
-                    {{"INTERNAL_HTTP_PORT", "80"}, {"INTERNAL_HTTPS_PORT", "443"}});
+                    {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
     }
 
     void TearDown() override {
+        if (client > 0) {
+            kill(client, SIGKILL);
+            waitpid(client, nullptr, 0);
+        }
         web.checkBalance();
         gateway.checkReleased();
         PelorusTest::TearDown();
@@ -93,6 +99,32 @@ protected:
         commands.answer("start-client", start);
     }
 
+    /// A client of the relay runs: a process whose executable has the right name.
+    void clientRuns() {
+        std::string program = path("openvpn");
+        std::string seconds = "600";
+        std::filesystem::copy_file("/bin/sleep", program);
+        char* const arguments[] = {program.data(), seconds.data(), nullptr};
+        ASSERT_EQ(posix_spawn(&client, program.c_str(), nullptr, nullptr, arguments, nullptr), 0);
+        writeFile("client.pid", std::to_string(client) + "\n");
+    }
+    void clientCannotBeStopped() { commands.answer("kill -", "", 1); }
+    /// The device is the maker's router; an empty @p wan: without a connection.
+    void givenMakersRouter(const std::string& wan, const std::string& list) {
+        setConfig("DEVICETYPE", "5");
+        commands.answer("getip.sh wan", wan);
+        commands.answer("getip.sh lan", "192.168.77.1\n");
+        commands.answer("tavik_helper.sh list", list);
+    }
+    void askToWait() {
+        web.answer("/remote_access_status/", "<action>wait</action><wait_time>300</wait_time>");
+    }
+    /// The next test of @p port fails, with all its attempts.
+    void failTest(int port) {
+        const std::string part = "&port=" + std::to_string(port) + "&";
+        for (int attempt = 0; attempt < 3; ++attempt) web.answerOnce(part, kNotReached);
+    }
+
     /// One pass of the main loop, without the check of the public names.
     ConnectionType cycle(long pause = 120) {
         const ConnectionType type = manager().createConnection();
@@ -101,7 +133,7 @@ protected:
         return type;
     }
     /// Starts as the main loop does, reaches PORTFORWARDED (through 9091 and 9444 when nothing
-    /// stands against it) and forgets what was asked and logged.
+    /// prevents it) and forgets what was asked and logged.
     void givenForwardedPorts() {
         manager().killConnection(PORTFORWARDED);
         ASSERT_EQ(cycle(), PORTFORWARDED);
@@ -116,16 +148,16 @@ protected:
     }
 
     /// The external ports that lead to this device, in order.
-    std::vector<int> mappedPorts() const {
-        std::vector<int> ports;
+    Ports mappedPorts() const {
+        Ports ports;
         for (const auto& mapping : gateway.mappings()) {
             if (mapping.client == kLanIp) ports.push_back(mapping.externalPort);
         }
         return ports;
     }
     /// The ports the server was asked to test, in order.
-    std::vector<int> testedPorts() const {
-        std::vector<int> ports;
+    Ports testedPorts() const {
+        Ports ports;
         for (const auto& url : web.urls()) {
             const auto at = url.find("&port=");
             if (at != std::string::npos) ports.push_back(std::stoi(url.substr(at + 6)));
@@ -158,6 +190,8 @@ protected:
     support::FakeFiles& files = support::FakeFiles::get();
 
 private:
+    pid_t client = 0;
+
     Texts tails(const std::string& part) const {
         Texts found;
         for (const auto& url : web.urls()) {

@@ -14,42 +14,47 @@ TEST_F(RelayConnectionTest, WithdrawsTheRecordBeforeTheTunnelStarts) {
     commands.answer("fetch-relays", update);
     gateway.speakUpnp(false);
     EXPECT_EQ(manager().createConnection(), RELAYED);
-    const std::string device = support::kDeviceId;
-    EXPECT_EQ(web.urls(),
-              (Texts{"http://cloud.kavra.example/api/1.0/rest/remote_access_status/" + device,
-                     "https://cloud.kavra.example/forward?" + device + "&NULL&192.168.77.10&0&0&" +
-                         support::kDeviceAuth,
-                     "http://127.0.0.1:80/delforward?80", "http://127.0.0.1:80/setstatus?relayed",
-                     "https://cloud.kavra.example/lanip?" + device + "&" + support::kDeviceAuth +
-                         "&192.168.77.10",
-                     "http://127.0.0.1:80/setlanip?192.168.77.10"}));
     EXPECT_EQ(requestsAtStart, 3U);
+    EXPECT_EQ(records(), (Texts{"NULL&192.168.77.10&0&0"}));
+    EXPECT_EQ(web.count("http://127.0.0.1:8080/delforward?8080"), 1);
+    EXPECT_EQ(web.count("/lanip?"), 1);  // the LAN address is new
+    EXPECT_EQ(statusWords(), (Texts{"relayed"}));
     EXPECT_EQ(events(), (Texts{"connecting/relayed", "connected/relayed"}));
-    expectLogged(
-        LOG_NOTICE,
-        "ConnectionManager::createRelayConnection() - local IP address has changed! Updating server with new address.\n");
 }
 
-TEST_F(RelayConnectionTest, UnreachableServerDoesNotKeepTheTunnelFromStarting) {
+TEST_F(RelayConnectionTest, RelayForgetsThePortsAndLeavesTheirMappings) {
+    givenForwardedPorts();
+    ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing
     relayWorks();
-    web.answer("/forward?", FakeWeb::noAnswer());
+    web.answer("/forward?", FakeWeb::noAnswer());  // the tunnel starts all the same
     EXPECT_EQ(manager().createRelayConnection(), RELAYED);
-    expectLogged(
-        LOG_ERR,
-        "ConnectionManager:createRelayConnection() - failed to delete port mapping info.\n");
+    EXPECT_EQ(mappedPorts(), (Ports{9091, 9444}));
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
+}
+
+TEST_F(RelayConnectionTest, RunningTunnelIsKeptAndEndsAForcedAttempt) {
+    clientRuns();
+    manager().setForceConnect(true);
+    EXPECT_EQ(manager().createRelayConnection(), RELAYED);
+    EXPECT_EQ(commands.count("start-client"), 0);
+    EXPECT_TRUE(records().empty());
+    EXPECT_EQ(statusWords(), (Texts{"relayed"}));
+    expectLogged(LOG_INFO, "ConnectionManager::setForceConnect = 0\n");
 }
 
 TEST_F(RelayConnectionTest, TunnelThatDoesNotComeUpIsReported) {
     writeFile("client.out", "");
+    manager().setForceConnect(true);
+    log.clear();
     EXPECT_EQ(manager().createRelayConnection(), FAILED);
     EXPECT_EQ(statusWords(), (Texts{"failed"}));
     EXPECT_EQ(events(), (Texts{"connecting/relayed", "failed/relayed"}));
-    expectLogged(LOG_ERR,
-                 "ConnectionManager::createRelayConnection() - failed to create VPN connection.\n");
+    EXPECT_EQ(log.countPart("setForceConnect"), 0);
 }
 
 TEST_F(RelayConnectionTest, ServerThatAsksForAWaitKeepsEverythingAsItIs) {
-    web.answer("/remote_access_status/", "<action>wait</action><wait_time>300</wait_time>");
+    askToWait();
     EXPECT_EQ(manager().createRelayConnection(), FAILED);
     EXPECT_TRUE(records().empty());
     EXPECT_TRUE(statusWords().empty());
@@ -57,10 +62,6 @@ TEST_F(RelayConnectionTest, ServerThatAsksForAWaitKeepsEverythingAsItIs) {
 }
 
 TEST_F(RelayConnectionTest, NothingIsDoneWhileBothPortsAreMapped) {
-    givenForwardedPorts();
-    forget();
-    manager().setForceConnect(true);  // so that the mapped flags of this attempt are set
-    gateway.setExternalIp("44.128.0.33");
     ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);
     forget();
     EXPECT_EQ(manager().createRelayConnection(), PORTFORWARDED);
@@ -71,20 +72,26 @@ TEST_F(RelayConnectionTest, NothingIsDoneWhileBothPortsAreMapped) {
 class KillConnectionTest : public ConnectionTest {};
 
 TEST_F(KillConnectionTest, DirectRemovesOwnMappingsAndTheRecordOnly) {
-    gateway.add({9091, kLanIp, 80, "Kavra"});
-    gateway.add({9092, kLanIp, 80, "Kavra"});
-    gateway.add({9444, kLanIp, 443, "KavraSSL"});
-    gateway.add({5000, kLanIp, 22, "ssh"});
-    gateway.add({9093, "192.168.77.66", 80, "Kavra"});
+    const FakeGateway::Mapping ssh{5000, kLanIp, 22, "ssh"};
+    const FakeGateway::Mapping theirs{9093, "192.168.77.66", 80, "Kavra"};
+    for (const auto& mapping : {FakeGateway::Mapping{9091, kLanIp, 8080, "Kavra"}, ssh, theirs,
+                                FakeGateway::Mapping{9444, kLanIp, 8443, "KavraSSL"}}) {
+        gateway.add(mapping);
+    }
     manager().killConnection(PORTFORWARDED);
-    EXPECT_EQ(gateway.mappings(),
-              (std::vector<FakeGateway::Mapping>{{5000, kLanIp, 22, "ssh"},
-                                                 {9093, "192.168.77.66", 80, "Kavra"}}));
+    EXPECT_EQ(gateway.mappings(), (std::vector<FakeGateway::Mapping>{ssh, theirs}));
     EXPECT_EQ(records(), (Texts{"NULL&192.168.77.10&0&0"}));
+    EXPECT_EQ(log.countPart("successfully deleted port mappings on central server.\n"), 1);
     EXPECT_EQ(web.count("/lanip?"), 1);  // the gateway object is new, so the address is
-    expectLogged(
-        LOG_NOTICE,
-        "ConnectionManager::killConnection() - successfully deleted port mappings on central server.\n");
+    manager().killConnection(PORTFORWARDED);
+    EXPECT_EQ(web.count("/lanip?"), 1);
+}
+
+TEST_F(KillConnectionTest, PortsOfTheConnectionAreForgotten) {
+    givenForwardedPorts();
+    manager().killConnection(PORTFORWARDED);
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
 }
 
 TEST_F(KillConnectionTest, WithoutAGatewayNothingIsChanged) {
@@ -108,30 +115,16 @@ TEST_F(KillConnectionTest, UnknownInternalPortLeavesTheRecord) {
     setConfig("INTERNAL_HTTP_PORT", "");
     manager().killConnection(PORTFORWARDED);
     EXPECT_TRUE(records().empty());
-    expectLogged(
-        LOG_ERR,
-        "ConnectionManager::killConnection() - failed to get internal port number from dynamicconfig.ini.\n");
-}
-
-TEST_F(KillConnectionTest, FailedWithdrawalIsSaid) {
-    web.answer("/delforward", "no");
-    manager().killConnection(PORTFORWARDED);
-    expectLogged(LOG_ERR,
-                 "ConnectionManager::killConnection() - failed to delete port mapping info.\n");
 }
 
 TEST_F(KillConnectionTest, OtherTypesDoNothing) {
     for (const auto type : {NONE, CONNECTING, FAILED}) manager().killConnection(type);
-    EXPECT_TRUE(web.urls().empty());
-    EXPECT_TRUE(gateway.calls().empty());
     EXPECT_TRUE(log.lines().empty());
 }
 
 TEST_F(KillConnectionTest, MakersRouterRemovesThroughItsScript) {
-    setConfig("DEVICETYPE", "5");
-    commands.answer("getip.sh lan", "192.168.77.1\n");
-    commands.answer("tavik_helper.sh list",
-                    "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n");
+    givenMakersRouter(
+        "", "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n");
     manager().killConnection(PORTFORWARDED);
     EXPECT_EQ(commands.count(" remove "), 1);
     EXPECT_EQ(commands.count("tavik_helper.sh remove \"TCP,9091,192.168.77.1,80\""), 1);

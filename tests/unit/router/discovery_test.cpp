@@ -42,8 +42,8 @@ class GatewayAnswer : public RouterTest, public ::testing::WithParamInterface<An
 
 TEST_P(GatewayAnswer, IsJudged) {
     const Answer& row = GetParam();
-    gateway.setIgdState(row.state);
-    gateway.failExternalIp(row.ipStatus);
+    gateway.igdState = row.state;
+    gateway.externalIpStatus = row.ipStatus;
     gateway.setExternalIp(row.ip);
     EXPECT_EQ(router.upnp_discover(), row.success);
     EXPECT_EQ(router.isInitialized(), row.success);
@@ -65,17 +65,17 @@ INSTANTIATE_TEST_SUITE_P(, GatewayAnswer, ::testing::Values(
 // clang-format on
 
 TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
-    gateway.setDevices(
-        {{std::string("http://192.168.77.3/") + support::kDeviceAuth, support::kSubdomain},
-         {"http://192.168.77.4/a.xml", "urn:schemas-upnp-org:service:WANPPPConnection:1"},
-         {"http://192.168.77.5/udhisapi.dll?content=1", kGatewayTarget},
-         {"http://192.168.77.6/b.xml", kGatewayTarget + "0"},
-         {"http://192.168.77.7/c.xml", "urn:schemas-upnp-org:service:WANIPConnection:1"}});
+    gateway.devices = {
+        {std::string("http://192.168.77.3/") + support::kDeviceAuth, support::kSubdomain},
+        {"http://192.168.77.4/a.xml", "urn:schemas-upnp-org:service:WANPPPConnection:1"},
+        {"http://192.168.77.5/udhisapi.dll?content=1", kGatewayTarget},
+        {"http://192.168.77.6/b.xml", kGatewayTarget + "0"},
+        {"http://192.168.77.7/c.xml", "urn:schemas-upnp-org:service:WANIPConnection:1"}};
     EXPECT_TRUE(router.upnp_discover());
     EXPECT_EQ(gateway.calls("igd"),
               (Texts{"igd http://192.168.77.4/a.xml http://192.168.77.7/c.xml"}));
     EXPECT_EQ(log.countPart("http://192.168.77.3/*AUTH_REMOVED*\n st: *SUBDOMAIN_REMOVED*\n"), 1);
-    gateway.setDevices({{"http://192.168.77.5/udhisapi.dll", kGatewayTarget}});
+    gateway.devices = {{"http://192.168.77.5/udhisapi.dll", kGatewayTarget}};
     EXPECT_FALSE(router.upnp_discover());
     EXPECT_EQ(gateway.count("igd"), 1);
 }

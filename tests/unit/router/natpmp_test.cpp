@@ -36,7 +36,7 @@ protected:
 TEST_F(NatpmpTest, OpensOnceAndClosesWhatIsOpen) {
     {
         CMnatpmp other;
-        gateway.failNatpmp(Call::CLOSE, NATPMP_ERR_CLOSEERR);
+        gateway.failures[Call::CLOSE] = {NATPMP_ERR_CLOSEERR, 0};
         EXPECT_TRUE(other.close() && other.init() && other.init() && other.close());
         EXPECT_TRUE(other.init());
     }
@@ -46,7 +46,7 @@ TEST_F(NatpmpTest, OpensOnceAndClosesWhatIsOpen) {
 }
 
 TEST_F(NatpmpTest, AGatewayThatKeepsSilentIsReadThreeTimes) {
-    gateway.keepSilent();
+    gateway.silent = true;
     EXPECT_FALSE(client.retrieveExternalIP(ip));
     EXPECT_EQ(ip, "");
     EXPECT_EQ(gateway.calls("natpmp wait"),
@@ -54,15 +54,74 @@ TEST_F(NatpmpTest, AGatewayThatKeepsSilentIsReadThreeTimes) {
     EXPECT_EQ(log.countPart("errno " + std::to_string(EAGAIN) + "\n"), 1);
 }
 
-TEST_F(NatpmpTest, AnswersThatComeTooLateAreNotTakenForThoseOfTheNextRequest) {
-    EXPECT_TRUE(client.retrieveExternalIP(ip));
-    gateway.answerLate();
-    gateway.answerLate();
-    EXPECT_TRUE(client.retrieveExternalIP(ip));
-    gateway.answerLate();
-    port = 9091;
-    EXPECT_TRUE(client.mapPort(80, port, "TCP", "", false));
-    EXPECT_EQ(port, 9091);
+struct Slow {
+    const char* name;
+    long delay;  // milliseconds, always
+    long hung;   // milliseconds, at the first request only
+};
+
+class SlowGateway : public NatpmpTest, public ::testing::WithParamInterface<Slow> {
+protected:
+    /// The gateway is known to answer, and slow from now on.
+    void slowDown() {
+        ASSERT_TRUE(client.retrieveExternalIP(ip));
+        gateway.answerDelay = GetParam().delay;
+        gateway.hungUntil = GetParam().hung;
+        gateway.natpmpTime = 0;
+    }
+    /// What succeeds carries its own values.
+    void expectOwn(int internalPort, int externalPort) {
+        unsigned lifetime = 600;
+        port = externalPort;
+        if (client.portMappingRequest(internalPort, port, "TCP", "", false, lifetime)) {
+            EXPECT_EQ(port, externalPort);
+            EXPECT_EQ(lifetime, 600U);
+        }
+        EXPECT_EQ(log.countPart("does not match"), 0);
+    }
+};
+
+TEST_P(SlowGateway, DoesNotMakeARequestSucceedWithTheValuesOfAnother) {
+    slowDown();
+    gateway.refusePort(9091);
+    EXPECT_FALSE(map(80, 9091));
+    expectOwn(80, 9092);
+    client.unmapPort(80, 9092, "TCP");
+    expectOwn(443, 9444);
+    client.unmapPort(443, 9444, "TCP");
+    expectOwn(443, 9444);
+    EXPECT_EQ(ip = client.retrieveExternalIP(ip) ? ip : "44.128.0.20", "44.128.0.20");
+    gateway.answerDelay = 0;
+    static_cast<void>(client.retrieveExternalIP(ip));
+    ASSERT_TRUE(map(443, 9444, true));
+    EXPECT_EQ(port, 9444);
+}
+
+TEST_P(SlowGateway, AnswersLateAlthoughItWasNeverHeardBefore) {
+    gateway.answerDelay = GetParam().delay;
+    gateway.hungUntil = GetParam().hung;
+    client.unmapPort(80, 9091, "TCP");
+    expectOwn(80, 9091);
+    expectOwn(443, 9444);
+}
+
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(, SlowGateway, ::testing::Values(
+    Slow{"Needs400Milliseconds", 400, 0}, Slow{"Needs900Milliseconds", 900, 0},
+    Slow{"HungOnceForTwoSeconds", 0, 2000}, Slow{"HungOnceForFiveSeconds", 0, 5000},
+    Slow{"IsAlwaysTwoSecondsLate", 2000, 0}, Slow{"IsAlwaysThreeSecondsLate", 3000, 0}),
+    RowName{});
+// clang-format on
+
+TEST_F(NatpmpTest, LostAnswersAreWaitedForOnceAndTwoSecondsAtMost) {
+    ASSERT_TRUE(client.retrieveExternalIP(ip));
+    gateway.silent = true;
+    EXPECT_FALSE(map(80, 9091));
+    EXPECT_EQ(gateway.natpmpTime, 1750);
+    gateway.silent = false;
+    EXPECT_TRUE(map(80, 9091));
+    EXPECT_TRUE(map(443, 9444, true));
+    EXPECT_EQ(gateway.natpmpTime, 1750 + 2000);
 }
 
 struct Failure {
@@ -77,7 +136,7 @@ class FailingCall : public NatpmpTest, public ::testing::WithParamInterface<Fail
 
 TEST_P(FailingCall, EndsTheRequest) {
     const Failure& row = GetParam();
-    for (const Call call : row.calls) gateway.failNatpmp(call, -9, EIO);
+    for (const Call call : row.calls) gateway.failures[call] = {-9, EIO};
     EXPECT_FALSE(client.retrieveExternalIP(ip));
     EXPECT_EQ(ip, row.addressKept ? "old" : "");
     EXPECT_FALSE(map(80, 9091));

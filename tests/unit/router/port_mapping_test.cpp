@@ -44,7 +44,7 @@ TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
     const Entry& row = GetParam();
     discovered();
     // The description stays out of the log.
-    gateway.lieAboutEntry({row.status, row.client, row.internalPort, support::kDeviceId});
+    gateway.entryLie = {row.status, row.client, row.internalPort, support::kDeviceId};
     EXPECT_EQ(map(80, 9091), row.holder == nullptr);
     EXPECT_EQ(gateway.count("map TCP"), row.holder == nullptr ? 1 : 0);
     const std::string line = "internal port: 80 is already mapped to another IP: ";
@@ -114,8 +114,9 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOwnEntriesOnlyKeepsTheTrackersAndRepo
 
 TEST_F(PortMappingTest, ATableWithoutEndOrBoundsIsReadToTheHighestIndexAndNotBeyondAText) {
     discovered();
-    gateway.lieAboutTable({0, "192.168.77.10.168.77.10", "80808080", std::string(200, 'K'),
-                           "90919091", "TCPTCP", "11111", std::string(40, '9')});
+    gateway.tableLie = {
+        0,       "192.168.77.10.168.77.10", "80808080", std::string(200, 'K'), "90919091", "TCPTCP",
+        "11111", std::string(40, '9')};
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(router.getMappedInternalPort(909190, "TCP"), -1);
     EXPECT_EQ(gateway.count("entry #"), 4 * 65536);
@@ -171,7 +172,7 @@ TEST_F(PortMappingTest, NatpmpGetsTheCallsAndTheGrantComesBack) {
     EXPECT_TRUE(router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(gateway.count("natpmp map TCP 0 -> 443 for 0 s"), 1);
     gateway.refuseAllPorts();
-    gateway.refuseRemovals();
+    gateway.keepMappings = true;
     EXPECT_FALSE(map(80, 9091));
     EXPECT_FALSE(router.unmapPort(80, 9091, "TCP"));
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));

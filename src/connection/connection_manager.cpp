@@ -1,19 +1,26 @@
+#include "connection/connection_manager.h"
+
 #include <algorithm>
+#include <utility>
 
 #include "cloud/tavik_client.h"
 #include "common/log.h"
 #include "common/text.h"
 #include "config/global_config.h"
-#include "connection/connection_manager.h"
+#include "connection/direct_attempt.h"
+#include "connection/dns_check.h"
+#include "connection/forward_search.h"
+#include "connection/manual_attempt.h"
+#include "connection/port_forwarding.h"
 
 namespace pelorus {
 
 namespace {
 
-constexpr long kShortestPortTestInterval = 240;        // seconds
-constexpr long kLongestPortTestInterval = 960;         // seconds
-constexpr long kPortTestIntervalStep = 120;            // seconds
-constexpr long kDefaultDnsCheckInterval = 24L * 3600;  // seconds
+constexpr std::int64_t kShortestPortTestInterval = 240;                     // seconds
+constexpr std::int64_t kLongestPortTestInterval = 960;                      // seconds
+constexpr std::int64_t kPortTestIntervalStep = 120;                         // seconds
+constexpr std::int64_t kDefaultDnsCheckInterval = std::int64_t{24} * 3600;  // seconds
 constexpr int kUnchangedCyclesPerStep = 3;
 
 }  // namespace
@@ -76,16 +83,16 @@ ConnectionType ConnectionManager::createConnection() {
     return connectionType;
 }
 
-// Counts the cycles in which a working connection stayed what it was.
+// Counts the cycles in which a working connection kept its type.
 void ConnectionManager::noteConnectionType() {
     if (connectionType != prevConnectionType) {
         setForceDNSCheck(true);
         connTypeUnchangedCount = 0;
         portTestInterval = kShortestPortTestInterval;
-        // The line says that the last port test time was set; it is only shown.
+        // The line says that the last port test time was set; it is only printed.
         logInfo(
-            "ConnectionManager::createConnection() - connection type changed to %d, port test interval reset to %ld, last port test time set to %ld, connTypeUnchangedCount %d, forceDNSCheck=true.\n",
-            connectionType, portTestInterval, static_cast<long>(lastPortTestTime),
+            "ConnectionManager::createConnection() - connection type changed to %d, port test interval reset to %jd, last port test time set to %jd, connTypeUnchangedCount %d, forceDNSCheck=true.\n",
+            connectionType, portTestInterval, static_cast<std::int64_t>(lastPortTestTime),
             connTypeUnchangedCount);
         return;
     }
@@ -96,7 +103,7 @@ void ConnectionManager::noteConnectionType() {
     connTypeUnchangedCount = 0;
     increasePortTestInterval();
     logInfo(
-        "ConnectionManager::createConnection() - connection type un-changed, increased port test interval to %ld.\n",
+        "ConnectionManager::createConnection() - connection type un-changed, increased port test interval to %jd.\n",
         portTestInterval);
 }
 
@@ -123,6 +130,34 @@ void ConnectionManager::getReqPortMappingLifetime(unsigned& upnp, unsigned& natp
     pRouter->getReqPortMappingLifetime(upnp, natpmp);
 }
 
+ConnectionType ConnectionManager::createDirectConnection() {
+    return DirectAttempt{*this}.run();
+}
+
+int ConnectionManager::forwardPort(int internalPort,
+                                   int startPort,
+                                   int extendedStartPort,
+                                   const std::string& externalIp,
+                                   HttpType type,
+                                   const std::string& description,
+                                   bool defaultPortsOnly,
+                                   bool checkSleep) {
+    return ForwardSearch{*this,
+                         {internalPort, startPort, extendedStartPort, externalIp, type, description,
+                          defaultPortsOnly, checkSleep}}
+        .run();
+}
+
+ConnectionType ConnectionManager::manualPortForward(int internalHttpPort,
+                                                    int internalHttpsPort,
+                                                    std::string localIp) {
+    return ManualAttempt{*this, internalHttpPort, internalHttpsPort, std::move(localIp)}.run();
+}
+
+bool ConnectionManager::checkDNS(ConnectionType type) {
+    return DnsCheck{*this, type}.run();
+}
+
 std::string ConnectionManager::convertEnumConnectionType(ConnectionType type) {
     switch (type) {
         case NONE:
@@ -137,6 +172,36 @@ std::string ConnectionManager::convertEnumConnectionType(ConnectionType type) {
             break;
     }
     return "failed";
+}
+
+void ConnectionManager::clearMappedFlags() {
+    httpPortMapped = false;
+    httpsPortMapped = false;
+}
+
+void ConnectionManager::forgetPorts() {
+    allocatedHttpPort = 0;
+    allocatedHttpsPort = 0;
+}
+
+void ConnectionManager::unmapDevicePort(int internalPort, int externalPort) {
+    if (deviceType == kMakersRouter) {
+        router().unmapPortBrenvik(internalPort, externalPort, kTcp);
+    } else {
+        router().unmapPort(internalPort, externalPort, kTcp);
+    }
+}
+
+int ConnectionManager::testHttpPort(std::string& requestedIp,
+                                    int externalPort,
+                                    bool checkSleep,
+                                    bool skipDoubleNatCheck) {
+    std::string response;
+    const int result =
+        TavikClient::getInstance()->testPort(requestedIp, externalPort, HTTP, true, checkSleep,
+                                             &doubleNatDetected, skipDoubleNatCheck, response);
+    if (result == PASS_TEST) setResponseExternalIP(response);
+    return result;
 }
 
 }  // namespace pelorus

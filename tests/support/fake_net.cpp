@@ -9,34 +9,42 @@
 #include <cstring>
 #include <deque>
 
+// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
+extern "C" {
+int __real_getaddrinfo(const char* name,
+                       const char* service,
+                       const addrinfo* hints,
+                       addrinfo** list);
+void __real_freeaddrinfo(addrinfo* list);
+}
+// NOLINTEND(bugprone-reserved-identifier)
+
 namespace pelorus::support {
 
 namespace {
 
-// An entry of libc's lists with what it points to.
-template <typename Entry>
+// An entry of getifaddrs with what it points to.
 struct Node {
-    Entry entry{};
+    ifaddrs entry{};
     std::string name;
     sockaddr_storage address{};
-
-    // Null when @p text is no address.
-    sockaddr* setAddress(const std::string& text) {
-        auto* result = reinterpret_cast<sockaddr*>(&address);
-        auto* v4 = reinterpret_cast<sockaddr_in*>(&address);
-        auto* v6 = reinterpret_cast<sockaddr_in6*>(&address);
-        if (text == "link") {
-            address.ss_family = AF_PACKET;
-        } else if (inet_pton(AF_INET, text.c_str(), &v4->sin_addr) == 1) {
-            address.ss_family = AF_INET;
-        } else if (inet_pton(AF_INET6, text.c_str(), &v6->sin6_addr) == 1) {
-            address.ss_family = AF_INET6;
-        } else {
-            return nullptr;
-        }
-        return result;
-    }
 };
+
+// Fills in the address; null when @p text is none.
+sockaddr* parse(const std::string& text, sockaddr_storage& address) {
+    auto* v4 = reinterpret_cast<sockaddr_in*>(&address);
+    auto* v6 = reinterpret_cast<sockaddr_in6*>(&address);
+    if (text == "link") {
+        address.ss_family = AF_PACKET;
+    } else if (inet_pton(AF_INET, text.c_str(), &v4->sin_addr) == 1) {
+        address.ss_family = AF_INET;
+    } else if (inet_pton(AF_INET6, text.c_str(), &v6->sin6_addr) == 1) {
+        address.ss_family = AF_INET6;
+    } else {
+        return nullptr;
+    }
+    return reinterpret_cast<sockaddr*>(&address);
+}
 
 }  // namespace
 
@@ -58,14 +66,14 @@ int FakeNet::takeInterfaces(ifaddrs** list) {
     errno = ENOMEM;
     *list = nullptr;
     if (interfacesFail) return -1;
-    const auto made = std::make_shared<std::deque<Node<ifaddrs>>>();
+    const auto made = std::make_shared<std::deque<Node>>();
     for (auto next = interfaces.rbegin(); next != interfaces.rend(); ++next) {
         auto& node = made->emplace_front();
         node.name = next->name;
         node.entry.ifa_next = *list;
         node.entry.ifa_name = node.name.data();
         node.entry.ifa_flags = next->flags;
-        node.entry.ifa_addr = node.setAddress(next->address);
+        node.entry.ifa_addr = parse(next->address, node.address);
         *list = &node.entry;
     }
     if (*list != nullptr) lists[*list] = made;
@@ -73,24 +81,16 @@ int FakeNet::takeInterfaces(ifaddrs** list) {
 }
 
 int FakeNet::lookUp(const char* name, const addrinfo* hints, addrinfo** list) {
-    const auto& addresses = names[asked.emplace_back(name)];
-    const addrinfo wanted = hints != nullptr ? *hints : addrinfo{};
-    const auto made = std::make_shared<std::deque<Node<addrinfo>>>();
+    addrinfo numeric = hints != nullptr ? *hints : addrinfo{};
+    numeric.ai_flags = AI_NUMERICHOST;
     *list = nullptr;
-    for (auto next = addresses.rbegin(); next != addresses.rend(); ++next) {
-        for (const int type : {SOCK_RAW, SOCK_DGRAM, SOCK_STREAM}) {
-            if (wanted.ai_socktype != 0 && wanted.ai_socktype != type) continue;
-            auto& node = made->emplace_front();
-            node.entry.ai_addr = node.setAddress(*next);
-            node.entry.ai_family = node.address.ss_family;
-            if (wanted.ai_family != AF_UNSPEC && wanted.ai_family != node.entry.ai_family) continue;
-            node.entry.ai_next = *list;
-            node.entry.ai_socktype = type;
-            *list = &node.entry;
-        }
+    addrinfo** end = list;
+    for (const std::string& address : names[asked.emplace_back(name)]) {
+        if (__real_getaddrinfo(address.c_str(), nullptr, &numeric, end) != 0) *end = nullptr;
+        while (*end != nullptr) end = &(*end)->ai_next;
     }
     if (*list == nullptr) return EAI_NONAME;
-    lists[*list] = made;
+    lists[*list] = nullptr;
     return 0;
 }
 
@@ -125,6 +125,7 @@ int __wrap_getaddrinfo(const char* name,
 
 void __wrap_freeaddrinfo(addrinfo* list) {
     FakeNet::get().release(list);
+    __real_freeaddrinfo(list);
 }
 
 int __wrap_gethostname(char* name, std::size_t size) {

@@ -1,11 +1,11 @@
 #include "daemon/command_line.h"
 
+#include <gtest/gtest.h>
+
 #include <iterator>
 #include <sstream>
 #include <string>
 #include <vector>
-
-#include "support/fixture.h"
 
 namespace pelorus {
 namespace {
@@ -35,70 +35,59 @@ std::string badSeverity(const std::string& value) {
 constexpr const char* kNoSeverity = "Severity level is missing. A default of 5 will be used.\n";
 
 struct Row {
-    const char* name;
     const char* arguments;
     const char* options;
     std::string message{};        // on stdout when the status is 0, else on stderr
-    std::optional<int> status{};  // none: the start goes on
+    std::optional<int> status{};  // none: the daemon starts
 };
 
-class CommandLine : public ::testing::TestWithParam<Row> {};
+const std::vector<Row> kRows{
+    {"", ""},
+    {"-f 31 -l 0 -u -d 1 -t 1 -p 1", "f31 l0 d1 t1 p1 log unmap "},
+    {"-check_frequency 900 -enable_log 7 -unmapall -dnscheckinterval 5000000000 "
+     "-portmaplifetime 4294967295 -publicipcheckinterval 60",
+     "f900 l7 d5000000000 t4294967295 p60 log unmap "},
+    {"-f 60 -f 29", "", badFrequency("29")},
+    {"-f 901", "", badFrequency("901")},
+    {"-f -u", "", badFrequency("-u")},
+    {"-f 60 -f", "", "Run frequency is missing. A default of 30 secs will be used.\n"},
+    {"-l 8", "log ", badSeverity("8")},
+    {"-l -1", "log ", badSeverity("-1")},
+    {"-l", "log ", kNoSeverity},
+    {"-lc 6", "l6 console "},
+    {"-enable_log_console x", "console ", badSeverity("x")},
+    {"-lc", "console ", kNoSeverity},
+    {"-d 9 -d 0", "",
+     "DNS check interval is 0 which is not valid.  A default of 86400 secs will be used.\n"},
+    {"-d", "", "DNS check interval is missing. A default of 86400 secs will be used.\n"},
+    {"-t -1", "t4294967295 "},
+    {"-t 9 -t 0", "t9 ", "NAT-PMP port mapping lifetime is 0 which is not valid.\n"},
+    {"-t", "", "NAT-PMP port mapping lifetime is missing.\n"},
+    {"-p 9 -p 0", "p9 ", "Manual port forward public IP check interval is 0 which is not valid.\n"},
+    {"-p", "", "Manual port forward public IP check interval is missing.\n"},
+    {"-f 60 -v -x", "f60 ", "Version: 1.7.0-54\n", 0},
+    {"-u --check_frequency -v", "unmap ",
+     "Invalid argument: --check_frequency, usage: -f nnn (seconds) or -check_frequency nnn (seconds) | -l or -enable_log nnn (log severity level) | -lc or -enable_log_console nnn (log severity level).\n",
+     1}};
 
-TEST_P(CommandLine, IsRead) {
-    std::istringstream stream{std::string{"pelorus "} + GetParam().arguments};
-    const std::vector<std::string> words{std::istream_iterator<std::string>{stream}, {}};
-    std::vector<const char*> argv;
-    for (const auto& word : words) argv.push_back(word.c_str());
-    Options options;
-    ::testing::internal::CaptureStdout();
-    ::testing::internal::CaptureStderr();
-    const auto status = parseCommandLine(static_cast<int>(argv.size()), argv.data(), options);
-    const std::string err = ::testing::internal::GetCapturedStderr();
-    const std::string out = ::testing::internal::GetCapturedStdout();
-    EXPECT_EQ(status, GetParam().status);
-    EXPECT_EQ(describe(options), GetParam().options);
-    EXPECT_EQ(status == 0 ? out : err, GetParam().message);
-    EXPECT_EQ(status == 0 ? err : out, "");
+TEST(CommandLine, SetsOptionsAndReportsWhatIsInvalid) {
+    for (const Row& row : kRows) {
+        std::istringstream stream{std::string{"pelorus "} + row.arguments};
+        const std::vector<std::string> words{std::istream_iterator<std::string>{stream}, {}};
+        std::vector<const char*> argv;
+        for (const auto& word : words) argv.push_back(word.c_str());
+        Options options;
+        ::testing::internal::CaptureStdout();
+        ::testing::internal::CaptureStderr();
+        const auto status = parseCommandLine(static_cast<int>(argv.size()), argv.data(), options);
+        const std::string err = ::testing::internal::GetCapturedStderr();
+        const std::string out = ::testing::internal::GetCapturedStdout();
+        EXPECT_EQ(status, row.status) << row.arguments;
+        EXPECT_EQ(describe(options), row.options) << row.arguments;
+        EXPECT_EQ(status == 0 ? out : err, row.message);
+        EXPECT_EQ(status == 0 ? err : out, "");
+    }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Rows,
-    CommandLine,
-    ::testing::Values(
-        Row{"NoArguments", "", ""},
-        Row{"ShortForms", "-f 31 -l 0 -u -d 1 -t 1 -p 1", "f31 l0 d1 t1 p1 log unmap "},
-        Row{"LongForms",
-            "-check_frequency 900 -enable_log 7 -unmapall -dnscheckinterval 5000000000 "
-            "-portmaplifetime 4294967295 -publicipcheckinterval 60",
-            "f900 l7 d5000000000 t4294967295 p60 log unmap "},
-        Row{"FrequencyTooShort", "-f 60 -f 29", "", badFrequency("29")},
-        Row{"FrequencyTooLong", "-f 901", "", badFrequency("901")},
-        Row{"AnOptionIsTakenForTheValue", "-f -u", "", badFrequency("-u")},
-        Row{"FrequencyMissing", "-f 60 -f", "",
-            "Run frequency is missing. A default of 30 secs will be used.\n"},
-        Row{"LogTooHigh", "-l 8", "log ", badSeverity("8")},
-        Row{"LogNegative", "-l -1", "log ", badSeverity("-1")},
-        Row{"LogMissing", "-l", "log ", kNoSeverity},
-        Row{"Console", "-lc 6", "l6 console "},
-        Row{"ConsoleNoNumber", "-enable_log_console x", "console ", badSeverity("x")},
-        Row{"ConsoleMissing", "-lc", "console ", kNoSeverity},
-        Row{"DnsZero", "-d 9 -d 0", "",
-            "DNS check interval is 0 which is not valid.  A default of 86400 secs will be used.\n"},
-        Row{"DnsMissing", "-d", "",
-            "DNS check interval is missing. A default of 86400 secs will be used.\n"},
-        Row{"ANegativeLifetimeWraps", "-t -1", "t4294967295 "},
-        Row{"ABadLifetimeKeepsTheEarlierOne", "-t 9 -t 0", "t9 ",
-            "NAT-PMP port mapping lifetime is 0 which is not valid.\n"},
-        Row{"LifetimeMissing", "-t", "", "NAT-PMP port mapping lifetime is missing.\n"},
-        Row{"PublicIpZero", "-p 9 -p 0", "p9 ",
-            "Manual port forward public IP check interval is 0 which is not valid.\n"},
-        Row{"PublicIpMissing", "-p", "",
-            "Manual port forward public IP check interval is missing.\n"},
-        Row{"VersionFirst", "-f 60 -v -x", "f60 ", "Version: 1.7.0-54\n", 0},
-        Row{"UnknownFirst", "-u --check_frequency -v", "unmap ",
-            "Invalid argument: --check_frequency, usage: -f nnn (seconds) or -check_frequency nnn (seconds) | -l or -enable_log nnn (log severity level) | -lc or -enable_log_console nnn (log severity level).\n",
-            1}),
-    support::RowName{});
 
 }  // namespace
 }  // namespace pelorus

@@ -110,9 +110,9 @@ bool ForwardSearch::mapExternalPort() {
                                     request.type == HTTPS);
 }
 
-// Removes what an earlier attempt left. Both removals name this search's own internal port, whichever
-// service the external port belonged to: UPnP goes by the external port alone, NAT-PMP by the
-// internal one, which the new candidate needs free.
+// Removes what an earlier attempt left. Both removals name this search's own internal port,
+// whichever service the external port belonged to: UPnP goes by the external port alone, NAT-PMP
+// by the internal one, which the new candidate needs free.
 void ForwardSearch::unmapEarlierPorts() {
     if (!manager.httpPortMapped) {
         manager.unmapDevicePort(request.internalPort, manager.allocatedHttpPort);

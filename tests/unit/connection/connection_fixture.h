@@ -158,30 +158,21 @@ protected:
     /// The ports the server was asked to test, in order.
     Ports testedPorts() const {
         Ports ports;
-        for (const auto& url : web.urls()) {
-            const auto at = url.find("&port=");
-            if (at != std::string::npos) ports.push_back(std::stoi(url.substr(at + 6)));
-        }
+        for (const auto& tail : tails(web.urls(), "&port=")) ports.push_back(std::stoi(tail));
         return ports;
     }
     /// The status words told to the local back end, in order.
-    Texts statusWords() const { return tails("/setstatus?"); }
+    Texts statusWords() const { return tails(web.urls(), "/setstatus?"); }
     /// The mapping records sent to the server: external address, LAN address, ports.
     Texts records() const {
-        Texts found = tails(std::string{"/forward?"} + support::kDeviceId + "&");
+        Texts found = tails(web.urls(), std::string{"/forward?"} + support::kDeviceId + "&");
         for (auto& text : found) text = text.substr(0, text.rfind('&'));
         return found;
     }
     /// The analytics events, as "state/type".
     Texts events() const {
-        Texts found;
-        for (const auto& text : log.texts()) {
-            const std::string start = "cloudConnectivity state=";
-            if (text.rfind(start, 0) != 0) continue;
-            std::string event = text.substr(start.size());
-            event.replace(event.find(" type="), 6, "/");
-            found.push_back(event);
-        }
+        Texts found = tails(log.texts(), "cloudConnectivity state=");
+        for (auto& event : found) event.replace(event.find(" type="), 6, "/");
         return found;
     }
 
@@ -192,11 +183,12 @@ protected:
 private:
     pid_t client = 0;
 
-    Texts tails(const std::string& part) const {
+    // What follows part in each line that holds it.
+    static Texts tails(const Texts& lines, const std::string& part) {
         Texts found;
-        for (const auto& url : web.urls()) {
-            const auto at = url.find(part);
-            if (at != std::string::npos) found.push_back(url.substr(at + part.size()));
+        for (const auto& line : lines) {
+            const auto at = line.find(part);
+            if (at != std::string::npos) found.push_back(line.substr(at + part.size()));
         }
         return found;
     }

@@ -149,6 +149,7 @@ TEST_F(DirectAttemptTest, HttpAloneIsNoConnectionAndIsRemoved) {
     for (int port = 9444; port <= 9543; ++port) gateway.refusePort(port);
     EXPECT_EQ(manager().createDirectConnection(), FAILED);
     EXPECT_EQ(gateway.count(" -> "), 1 + 100 + 99 + 99);
+    EXPECT_EQ(gateway.count("map TCP 9444 -> "), 3);  // once a cycle
     EXPECT_TRUE(mappedPorts().empty());
     EXPECT_TRUE(records().empty());
     EXPECT_EQ(events(), (Texts{"connecting/portforwarded", "failed/portforwarded"}));

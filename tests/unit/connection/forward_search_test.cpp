@@ -19,14 +19,6 @@ protected:
     }
 };
 
-TEST_F(ForwardSearchTest, PortOfAnotherHostIsLeftAloneAndTheNextTaken) {
-    givenGateway();
-    const FakeGateway::Mapping theirs{9091, "192.168.77.66", 80, "theirs"};
-    gateway.add(theirs);
-    EXPECT_EQ(search(), 9092);
-    EXPECT_EQ(gateway.mappings().front(), theirs);
-}
-
 TEST_F(ForwardSearchTest, GatewayThatRefusesAllIsAskedABoundedNumberOfTimes) {
     givenGateway();
     gateway.refuseAllPorts();

@@ -7,7 +7,7 @@ const std::string kGatewayTarget = "urn:schemas-upnp-org:device:InternetGatewayD
 
 class DiscoveryTest : public RouterTest {};
 
-TEST_F(DiscoveryTest, PrefersUpnpToNatpmpAndAFailureKeepsTheAddresses) {
+TEST_F(DiscoveryTest, UpnpIsPreferredToNatpmp) {
     net.failInterfaces();
     discoveredThroughNatpmp();
     EXPECT_TRUE(router.isNatPMPGateway());
@@ -80,7 +80,7 @@ TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
     EXPECT_EQ(gateway.count("igd"), 1);
 }
 
-TEST_F(DiscoveryTest, AChangeIsToldUntilItWasReadAndTheNextDiscoveryBegan) {
+TEST_F(DiscoveryTest, AChangeIsReportedUntilTheDiscoveryAfterItsReading) {
     EXPECT_FALSE(router.hasExternalIpChanged());
     router.discover();
     router.discover();  // nobody read the change in between

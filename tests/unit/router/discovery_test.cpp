@@ -15,6 +15,7 @@ TEST_F(DiscoveryTest, UpnpIsPreferredToNatpmp) {
     gateway.speakUpnp(true);
     EXPECT_TRUE(router.discover());
     EXPECT_FALSE(router.isNatPMPGateway());
+    EXPECT_EQ(log.countPart("external IP address has changed!"), 0);
     EXPECT_EQ(gateway.calls(), (Texts{"discover 2000 ms",
                                       "igd http://192.168.77.1:5000/rootDesc.xml", "external ip"}));
 
@@ -93,6 +94,7 @@ TEST_F(DiscoveryTest, AChangeIsReportedUntilTheDiscoveryAfterItsReading) {
     gateway.setExternalIp("44.128.0.99");
     router.discover();
     EXPECT_TRUE(router.hasExternalIpChanged());
+    EXPECT_EQ(log.countPart("external IP address has changed!"), 2);
     EXPECT_FALSE(router.hasLocalIpChanged());
 }
 

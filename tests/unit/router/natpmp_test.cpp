@@ -45,15 +45,6 @@ TEST_F(NatpmpTest, OnlyAnOpenClientIsClosed) {
     expectLogged(LOG_ERR, "CMnatpmp::close  closenatpmp failed -4\n");
 }
 
-TEST_F(NatpmpTest, ASilentGatewayIsReadThreeTimes) {
-    gateway.silent = true;
-    EXPECT_FALSE(client.retrieveExternalIP(ip));
-    EXPECT_EQ(ip, "");
-    EXPECT_EQ(gateway.calls("natpmp wait"),
-              (Texts{"natpmp wait 250 ms", "natpmp wait 500 ms", "natpmp wait 1000 ms"}));
-    EXPECT_EQ(log.countPart("errno " + std::to_string(EAGAIN) + "\n"), 1);
-}
-
 struct Slow {
     const char* name;
     long delay;  // milliseconds, always
@@ -118,8 +109,12 @@ INSTANTIATE_TEST_SUITE_P(, SlowGateway, ::testing::Values(
 TEST_F(NatpmpTest, LostAnswersAreWaitedForOnceAndTwoSecondsAtMost) {
     ASSERT_TRUE(client.retrieveExternalIP(ip));
     gateway.silent = true;
-    EXPECT_FALSE(map(80, 9091));
-    EXPECT_EQ(gateway.natpmpTime, 1750);
+    gateway.clear();
+    EXPECT_FALSE(client.retrieveExternalIP(ip));
+    EXPECT_EQ(ip, "");
+    EXPECT_EQ(gateway.calls("natpmp wait"),
+              (Texts{"natpmp wait 250 ms", "natpmp wait 500 ms", "natpmp wait 1000 ms"}));
+    EXPECT_EQ(log.countPart("errno " + std::to_string(EAGAIN) + "\n"), 1);
     gateway.silent = false;
     EXPECT_TRUE(map(80, 9091));
     EXPECT_TRUE(map(443, 9444, true));

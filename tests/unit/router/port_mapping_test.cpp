@@ -150,6 +150,7 @@ TEST_F(PortMappingTest, RenewsAfterHalfAWeek) {
     clock.advance(1);
     router.setReqPortMappingLifetime(600, 700);
     router.renewPortMapping("HTTPS");
+    EXPECT_EQ(log.countPart("previous lifetime[604800], new lifetime[600].\n"), 1);
     router.CheckExpiredMappings();  // the first one starts a new half, the other is still due
     EXPECT_EQ(gateway.calls("map TCP"),
               (Texts{"map TCP 9444 -> 192.168.77.10:443 ", "map TCP 9091 -> 192.168.77.10:80 "}));

@@ -8,7 +8,7 @@ from lab import network
 from lab.central import PortTest
 from lab.checks import (BOTH_MAPPED, FAST, NO_TUNNEL, OPTIONS, PAGES, assert_published,
                         assert_stops_clean, pages_from_outside, ports_tested, wait_for_cycle,
-                        wait_for_log, wait_for_status)
+                        wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.natpmp import Grant
 from lab.scenario import Lab, Situation

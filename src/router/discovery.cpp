@@ -26,10 +26,10 @@ constexpr int kDiscoverDelay = 2000;  // milliseconds
 
 using Interfaces = std::unique_ptr<ifaddrs, Releaser<freeifaddrs>>;
 using Devices = std::unique_ptr<UPNPDev, Releaser<freeUPNPDevlist>>;
-// What a UPNPUrls points at, released at the end of the scope; the struct itself is not owned.
+// Releases what a UPNPUrls points at; the struct itself is not owned.
 using UrlContents = std::unique_ptr<UPNPUrls, Releaser<FreeUPNPUrls>>;
 
-// A LAN interface that is in use: nothing local to this host, no tunnel, no container bridge.
+// A LAN interface in use: not local to this host, no tunnel, no container bridge.
 bool leadsToLan(const ifaddrs& entry) {
     constexpr unsigned kUnfit = IFF_LOOPBACK | IFF_POINTOPOINT | IFF_NOARP;
     constexpr unsigned kInUse = IFF_UP | IFF_RUNNING;
@@ -44,7 +44,7 @@ const void* addressBytes(const sockaddr* address) {
     return &static_cast<const sockaddr_in*>(raw)->sin_addr;
 }
 
-// The address text of one interface, empty when it cannot be had.
+// The address of one interface as text, empty on failure.
 std::string addressText(const ifaddrs& entry) {
     const int family = entry.ifa_addr->sa_family;
     const char* const familyName = family == AF_INET6 ? "AF_INET6" : "AF_INET";
@@ -75,7 +75,7 @@ void logDevices(const UPNPDev* device) {
     }
 }
 
-// Some hosts announce a gateway that their own "udhisapi.dll" only pretends to be.
+// A description at "udhisapi.dll" belongs to a host that only pretends to be a gateway.
 bool isGateway(const UPNPDev& device) {
     const std::string target = textOf(device.st);
     const bool wanted = target == "urn:schemas-upnp-org:device:InternetGatewayDevice:1" ||

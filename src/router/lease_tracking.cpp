@@ -8,7 +8,7 @@ namespace pelorus {
 
 namespace {
 
-// Configured durations may be anything; an instant beyond the range counts as its end.
+// A configured duration may be of any size; an instant out of range becomes the nearest limit.
 std::int64_t addSaturated(std::int64_t start, std::int64_t seconds) {
     std::int64_t sum = 0;
     if (!__builtin_add_overflow(start, seconds, &sum)) return sum;

@@ -28,7 +28,7 @@ int protocolNumber(const std::string& protocol) {
     return 0;
 }
 
-// The client's socket outlives many child processes (openvpn stays for weeks); none may hold it.
+// The client's socket outlives many child processes; openvpn runs for weeks. None may inherit it.
 void closeOnExec(int socket) {
     const int flags = fcntl(socket, F_GETFD);
     if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));

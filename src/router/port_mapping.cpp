@@ -26,7 +26,7 @@ int portNumber(const std::string& text) {
     return scanInt(text.c_str(), port) ? port : kNoPort;
 }
 
-// Whether an address names a host of its own: dotted, and not ending in 0.
+// Whether an address can be that of another host: it is dotted and does not end in 0.
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
@@ -207,8 +207,8 @@ bool Router::unmapAllPorts(const std::string& protocol, const std::string& descr
     return true;
 }
 
-// A removal moves the next entry into its place, where the first pass does not look again; the
-// second pass is for those. The end of the gateway's table counts as failure, so the result is
+// A removal moves the next entry into its place, which the first pass does not look at again; the
+// second pass finds those. The end of the gateway's table counts as a failure, so the result is
 // false on every gateway whose table ends.
 bool Router::removeOwnMappings(const std::string& protocol, const std::string& description) {
     bool removed = false;

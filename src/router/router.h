@@ -29,8 +29,8 @@ struct _BrenvikPortIp {
 /// Finds the gateway (UPnP IGD first, NAT-PMP second), learns the external and the device's own
 /// address, and makes, renews and removes port mappings through the protocol that answered.
 ///
-/// Each owner has a Router of its own: discovery and lease tracking are not shared. Results are
-/// booleans; every failure has been logged. Ports are 1 to 65535, protocols "TCP" or "UDP".
+/// Each owner has its own Router: discovery and lease tracking are not shared. Every failure has
+/// been logged when it is returned. Ports are 1 to 65535, protocols "TCP" or "UDP".
 ///
 /// The ...Brenvik operations are for a device that is itself the maker's router: they use its
 /// helper scripts and need no discovery.
@@ -49,9 +49,9 @@ public:
 
     // --- discovery -------------------------------------------------------------------------
 
-    /// Looks for the gateway anew. True when one answered with its external address; until then
-    /// the mapping operations refuse to work. Addresses of an earlier discovery are kept on
-    /// failure. Takes some seconds.
+    /// Looks for the gateway again. True when one answered with its external address; until then
+    /// the mapping operations fail. On failure the addresses of an earlier discovery are kept.
+    /// Takes some seconds.
     bool discover();
     /// Chooses the device's LAN address from its interfaces; IPv4 before IPv6, and the address in
     /// use stays as long as an interface has it.
@@ -65,16 +65,16 @@ public:
     /// The LAN address; asks the maker's router script when none is known yet.
     [[nodiscard]] std::string getLocalIp();
 
-    /// Whether the last discovery assigned a new address. Asking marks the change as seen: it is
-    /// cleared when the next discovery begins, and survives it once when nobody asked.
+    /// Whether the last discovery assigned a new address. A change that was asked for is cleared
+    /// when the next discovery begins; one that was not survives that discovery.
     [[nodiscard]] bool hasExternalIpChanged();
     [[nodiscard]] bool hasLocalIpChanged();
 
     /// True when the mappings go through NAT-PMP.
     [[nodiscard]] bool isNatPMPGateway() const { return isNatPMP && pNatpmp != nullptr; }
 
-    /// Requested leases in seconds. The UPnP one is only recorded and renewed by; no lease is
-    /// sent to a UPnP gateway.
+    /// Requested leases in seconds. No lease is sent to a UPnP gateway; the UPnP one only decides
+    /// when a mapping is renewed.
     void getReqPortMappingLifetime(unsigned& upnp, unsigned& natpmp) const;
     void setReqPortMappingLifetime(unsigned upnp, unsigned natpmp);
 

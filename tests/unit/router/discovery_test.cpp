@@ -7,7 +7,7 @@ const std::string kGatewayTarget = "urn:schemas-upnp-org:device:InternetGatewayD
 
 class DiscoveryTest : public RouterTest {};
 
-TEST_F(DiscoveryTest, PrefersUpnpToNatpmpAndAFailureKeepsTheAddresses) {
+TEST_F(DiscoveryTest, UpnpIsPreferredToNatpmp) {
     net.failInterfaces();
     discoveredThroughNatpmp();
     EXPECT_TRUE(router.isNatPMPGateway());
@@ -15,6 +15,7 @@ TEST_F(DiscoveryTest, PrefersUpnpToNatpmpAndAFailureKeepsTheAddresses) {
     gateway.speakUpnp(true);
     EXPECT_TRUE(router.discover());
     EXPECT_FALSE(router.isNatPMPGateway());
+    EXPECT_EQ(log.countPart("external IP address has changed!"), 0);
     EXPECT_EQ(gateway.calls(), (Texts{"discover 2000 ms",
                                       "igd http://192.168.77.1:5000/rootDesc.xml", "external ip"}));
 
@@ -80,7 +81,7 @@ TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
     EXPECT_EQ(gateway.count("igd"), 1);
 }
 
-TEST_F(DiscoveryTest, AChangeIsToldUntilItWasReadAndTheNextDiscoveryBegan) {
+TEST_F(DiscoveryTest, AChangeIsReportedUntilTheDiscoveryAfterItsReading) {
     EXPECT_FALSE(router.hasExternalIpChanged());
     router.discover();
     router.discover();  // nobody read the change in between
@@ -93,6 +94,7 @@ TEST_F(DiscoveryTest, AChangeIsToldUntilItWasReadAndTheNextDiscoveryBegan) {
     gateway.setExternalIp("44.128.0.99");
     router.discover();
     EXPECT_TRUE(router.hasExternalIpChanged());
+    EXPECT_EQ(log.countPart("external IP address has changed!"), 2);
     EXPECT_FALSE(router.hasLocalIpChanged());
 }
 

@@ -1,5 +1,6 @@
 #include "router/lease_tracking.h"
 
+#include <cstdint>
 #include <limits>
 
 #include "support/fixture.h"
@@ -7,12 +8,12 @@
 namespace pelorus {
 namespace {
 
-using Limits = std::numeric_limits<long>;
+using Limits = std::numeric_limits<std::int64_t>;
 
 struct Instant {
     const char* name;
-    long start;
-    long duration;
+    std::int64_t start;
+    std::int64_t duration;
     time_t now;
     bool pastHalfway;
     bool expired;
@@ -45,11 +46,23 @@ INSTANTIATE_TEST_SUITE_P(, IntervalAt, ::testing::Values(
 
 class LeaseTrackingTest : public support::PelorusTest {};
 
-TEST_F(LeaseTrackingTest, ALeaseStartsWhenItIsRecordedAndNothingIsDueFromTheNextSecondOn) {
+TEST_F(LeaseTrackingTest, ALeaseStartsWhenItIsRecorded) {
     PMTracker tracker;
     EXPECT_TRUE(tracker.pastHalfway());
     tracker.setParams(8080, 9091, 4294967295U);
-    EXPECT_EQ(tracker.read().interval.GetIntervalDuration(), 4294967295L);
+    int internalPort = 0;
+    int externalPort = 0;
+    unsigned lifetime = 0;
+    TimeIntervalTrack interval;
+    tracker.getParams(internalPort, externalPort, lifetime, interval);
+    EXPECT_EQ(internalPort, 8080);
+    EXPECT_EQ(externalPort, 9091);
+    EXPECT_EQ(lifetime, 4294967295U);
+    std::int64_t start = 0;
+    std::int64_t duration = 0;
+    interval.getParams(start, duration);
+    EXPECT_EQ(start, clock.now());
+    EXPECT_EQ(duration, 4294967295);
     EXPECT_FALSE(tracker.pastHalfway());
     tracker.setParams(0, 0, 0);
     EXPECT_FALSE(tracker.pastHalfway());

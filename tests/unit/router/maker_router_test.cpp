@@ -90,7 +90,7 @@ INSTANTIATE_TEST_SUITE_P(, MappingWithList, ::testing::Values(
     RowName{});
 // clang-format on
 
-TEST_F(MakerRouterTest, MappingNeedsAPortAndACommandThatCanBeRunAndNothingLeavesTheQuotes) {
+TEST_F(MakerRouterTest, ArgumentsStayInsideTheirQuotes) {
     EXPECT_EQ(router.mapPortBrenvik(80, 0, "TCP", "Kavra"), 0);
     EXPECT_EQ(router.unmapPortBrenvik(80, 0, "TCP"), 1);
     EXPECT_EQ(commands.lines(), Texts{});

@@ -17,7 +17,7 @@ protected:
     int port = 0;
 };
 
-TEST_F(PortMappingTest, WhatCannotBeMappedIsNotAskedOfTheGateway) {
+TEST_F(PortMappingTest, BadPortsAndProtocolsAreNotSent) {
     const auto refusal = [&](int internalPort, int externalPort, const char* protocol) {
         EXPECT_FALSE(router.mapPort(internalPort, externalPort, protocol, "Kavra", false));
         return log.lines().back().text.substr(0, 36);
@@ -59,14 +59,14 @@ INSTANTIATE_TEST_SUITE_P(, ExistingEntry, ::testing::Values(
     Entry{"OwnWithoutAPortIsForeign", 0, "192.168.77.10", "", "192.168.77.10"},
     Entry{"ForeignIsKept", 0, "192.168.77.7", "80", "192.168.77.7"},
     Entry{"CountsWhateverTheStatus", 501, "192.168.77.7", "80", "192.168.77.7"},
-    Entry{"LongerThanItsRoomIsForeign", 0, "%s%n.%s%n%s%n.7777", "808080", "%s%n.%s%n%s%n.77"},
+    Entry{"OverlongTextsAreForeign", 0, "%s%n.%s%n%s%n.7777", "808080", "%s%n.%s%n%s%n.77"},
     Entry{"OverlongNumberIsForeign", 0, "1.99999999999999", "80", "1.99999999999999"},
-    Entry{"NoHostOfItsOwnIsOverwritten", 0, "192.168.77.0", "80", nullptr},
+    Entry{"NetworkAddressIsOverwritten", 0, "192.168.77.0", "80", nullptr},
     Entry{"NameIsOverwritten", 0, "nobody", "80", nullptr}),
     RowName{});
 // clang-format on
 
-TEST_F(PortMappingTest, UnmappingForgetsTheTrackerOfTheInternalPort) {
+TEST_F(PortMappingTest, UnmappingForgetsTheLeaseOfTheInternalPort) {
     discovered();
     ASSERT_TRUE(map(80, 9091));
     ASSERT_TRUE(map(443, 9444, true));
@@ -80,7 +80,7 @@ TEST_F(PortMappingTest, UnmappingForgetsTheTrackerOfTheInternalPort) {
     EXPECT_EQ(gateway.calls("map TCP"), (Texts{"map TCP 9444 -> 192.168.77.10:443 "}));
 }
 
-TEST_F(PortMappingTest, WhatTheGatewayRefusesOrCannotBeAskedFails) {
+TEST_F(PortMappingTest, RefusalsAndMissingDiscoveryFail) {
     EXPECT_FALSE(router.unmapPort(80, 9091, "TCP"));
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(router.getMappedInternalPort(9091, "TCP"), 0);
@@ -97,7 +97,7 @@ TEST_F(PortMappingTest, WhatTheGatewayRefusesOrCannotBeAskedFails) {
     EXPECT_EQ(log.countPart("port: 9091, to internal port: 80, status: 718\n"), 1);
 }
 
-TEST_F(PortMappingTest, UnmappingAllRemovesOwnEntriesOnlyKeepsTheTrackersAndReportsFailure) {
+TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
     discovered();
     const Mappings others{{9003, "192.168.77.7", 80, "Kavra"},
                           {9002, "192.168.77.10", 80, "KavraSSL"},
@@ -112,7 +112,7 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOwnEntriesOnlyKeepsTheTrackersAndRepo
     EXPECT_EQ(gateway.calls("map TCP"), (Texts{"map TCP 9100 -> 192.168.77.10:80 "}));
 }
 
-TEST_F(PortMappingTest, ATableWithoutEndOrBoundsIsReadToTheHighestIndexAndNotBeyondAText) {
+TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     discovered();
     gateway.tableLie = {
         0,       "192.168.77.10.168.77.10", "80808080", std::string(200, 'K'), "90919091", "TCPTCP",
@@ -138,7 +138,7 @@ TEST_F(PortMappingTest, FindsTheInternalPortOfThisDevice) {
     EXPECT_FALSE(router.isPortMapped(9090, "TCP"));
 }
 
-TEST_F(PortMappingTest, RenewsAfterHalfAWeekWithoutTheDescription) {
+TEST_F(PortMappingTest, RenewsAfterHalfAWeek) {
     discovered();
     router.renewPortMapping("HTTP");  // tracks nothing, so the port is refused
     EXPECT_EQ(gateway.calls(), Texts{});
@@ -150,6 +150,7 @@ TEST_F(PortMappingTest, RenewsAfterHalfAWeekWithoutTheDescription) {
     clock.advance(1);
     router.setReqPortMappingLifetime(600, 700);
     router.renewPortMapping("HTTPS");
+    EXPECT_EQ(log.countPart("previous lifetime[604800], new lifetime[600].\n"), 1);
     router.CheckExpiredMappings();  // the first one starts a new half, the other is still due
     EXPECT_EQ(gateway.calls("map TCP"),
               (Texts{"map TCP 9444 -> 192.168.77.10:443 ", "map TCP 9091 -> 192.168.77.10:80 "}));
@@ -159,7 +160,7 @@ TEST_F(PortMappingTest, RenewsAfterHalfAWeekWithoutTheDescription) {
     EXPECT_EQ(gateway.count("map TCP"), 2);
 }
 
-TEST_F(PortMappingTest, NatpmpGetsTheCallsAndTheGrantComesBack) {
+TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
     router.setReqPortMappingLifetime(600, 700);
     discoveredThroughNatpmp();
     gateway.grant({40000});

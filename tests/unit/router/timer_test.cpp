@@ -7,7 +7,7 @@ namespace {
 
 class TimerTest : public support::PelorusTest {};
 
-TEST_F(TimerTest, ReadsOnUntilItIsStoppedBorrowsASecondOnceAndCutsTheCoarserReadings) {
+TEST_F(TimerTest, MeasuresUntilItIsStopped) {
     Timer timer;
     clock.set(10);
     static_cast<void>(clock.wait(900000, nullptr));

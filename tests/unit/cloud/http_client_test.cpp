@@ -59,6 +59,7 @@ TEST_F(HttpClientTest, WithoutCredentialsTheFirstUseReportsDisabledOnce) {
     EXPECT_EQ(web.urls(), (Urls{"http://127.0.0.1/0/disabled"}));
     EXPECT_EQ(web.globalInits, 1);
     expectLogged(LOG_ERR, "TavikClient::initialize() - CURL initialization failed.\n");
+    EXPECT_EQ(log.countPart("initialize() - failed to read DEVICEID, DEVICEAUTH from"), 1);
     EXPECT_EQ(log.countPart("initialize() returned false, set Comm Status to [disabled]\n"), 1);
 }
 
@@ -90,9 +91,7 @@ TEST_F(HttpClientTest, OnlyTheHostOfTheFirstUsableBaseCounts) {
 
 TEST_F(HttpClientTest, ALookupGivesTheFirstAddressAndMasksAnUnknownName) {
     TavikClient& client = givenClient();
-    net.setName("four", {"44.128.0.20", "2001:db8::1"});
     net.setName("six", {"2001:db8::1", "44.128.0.20"});
-    EXPECT_EQ(client.nsLookup("four"), "44.128.0.20");
     EXPECT_EQ(client.nsLookup("six"), "2001:db8::1");
     EXPECT_EQ(client.nsLookup("device-7350142.homecloud-smith.kavra.example"), "");
     EXPECT_EQ(log.countPart("hostname: *ID_REMOVED*.*SUBDOMAIN_REMOVED*.kavra.example\n"), 1);

@@ -54,6 +54,16 @@ TEST_F(DirectAttemptTest, RetestsTheHttpPortOnceTheIntervalHasPassed) {
     EXPECT_TRUE(gateway.calls(" -> ").empty());
 }
 
+TEST_F(DirectAttemptTest, MappingsPastHalfOfTheirLeaseAreRenewedHttpFirst) {
+    manager().killConnection(PORTFORWARDED);  // finds the gateway, as at the daemon's start
+    manager().setReqPortMappingLifetime(600, 600);
+    givenForwardedPorts();
+    clock.advance(300);
+    EXPECT_EQ(cycle(), PORTFORWARDED);
+    EXPECT_EQ(gateway.calls(" -> "), (Texts{"map TCP 9091 -> 192.168.77.10:8080 ",
+                                            "map TCP 9444 -> 192.168.77.10:8443 "}));
+}
+
 TEST_F(DirectAttemptTest, PortsCountAsOpenWhileTheDiskSleeps) {
     givenForwardedPorts();
     clock.advance(300);
@@ -200,6 +210,7 @@ TEST_P(FileStatusTest, IsKeptUntilTheNextSearch) {
     manager().killConnection(PORTFORWARDED);
     ASSERT_EQ(cycle(), FAILED);  // the HTTP port was tested, HTTPS refused, the relay is down
     setConfig("COMMUNICATION_STATUS", GetParam().word);
+    clock.set(support::VirtualClock::kStart + 240);  // the end of the interval
     forget();
     EXPECT_EQ(manager().createDirectConnection(), GetParam().kept);
     EXPECT_EQ(testedPorts().empty(), !GetParam().searches);
@@ -219,12 +230,12 @@ TEST_F(DirectAttemptTest, SearchesUntilItsPortIsTestedAndWhileRelayedOncePerInte
     manager().killConnection(PORTFORWARDED);
     clock.advance(300);
     diskIsAsleep();
-    for (const char* status : {"portforwarded", "relayed", "portforwarded"}) {
+    for (const char* status : {"portforwarded", "portforwarded", "relayed", "portforwarded"}) {
         setConfig("COMMUNICATION_STATUS", status);
         manager().createDirectConnection();
     }
     // A search for a connection that held does not wake the disk, so that its port stays untested.
-    EXPECT_EQ(gateway.count("map TCP 9091 -> "), 2);
+    EXPECT_EQ(gateway.count("map TCP 9091 -> "), 3);
     EXPECT_TRUE(testedPorts().empty());
 }
 

@@ -147,7 +147,9 @@ TEST_F(DirectAttemptTest, ChangedAddressDropsTheMappingsAndMakesThemAnew) {
 TEST_F(DirectAttemptTest, OtherPortIsGivenUpWhereOnlyTheDefaultIsAllowed) {
     gateway.refusePort(9091);
     givenForwardedPorts();
+    EXPECT_EQ(cycle(), PORTFORWARDED);
     ASSERT_EQ(mappedPorts(), (Ports{9092, 9444}));
+    EXPECT_EQ(gateway.count("map TCP"), 0);
     gateway.acceptPort(9091);
     setConfig("DEFAULT_PORTS_ONLY", "TRUE");
     clock.advance(300);
@@ -209,8 +211,10 @@ TEST_P(FileStatusTest, IsKeptUntilTheNextSearch) {
     for (int port = 9444; port <= 9543; ++port) gateway.refusePort(port);
     manager().killConnection(PORTFORWARDED);
     ASSERT_EQ(cycle(), FAILED);  // the HTTP port was tested, HTTPS refused, the relay is down
-    setConfig("COMMUNICATION_STATUS", GetParam().word);
     clock.set(support::VirtualClock::kStart + 240);  // the end of the interval
+    setConfig("COMMUNICATION_STATUS", "connecting");
+    EXPECT_EQ(manager().createDirectConnection(), CONNECTING);
+    setConfig("COMMUNICATION_STATUS", GetParam().word);
     forget();
     EXPECT_EQ(manager().createDirectConnection(), GetParam().kept);
     EXPECT_EQ(testedPorts().empty(), !GetParam().searches);
@@ -219,7 +223,6 @@ INSTANTIATE_TEST_SUITE_P(Words,
                          FileStatusTest,
                          testing::Values(FileStatus{"Forwarded", "portforwarded", PORTFORWARDED,
                                                     false},
-                                         FileStatus{"Connecting", "connecting", CONNECTING, false},
                                          FileStatus{"Failed", "failed", FAILED, false},
                                          FileStatus{"Relayed", "relayed", FAILED, true}),
                          RowName{});

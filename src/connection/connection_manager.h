@@ -62,7 +62,7 @@ public:
     /// Adds two minutes to the time between port tests, up to sixteen minutes.
     void increasePortTestInterval();
 
-    // --- the parts of a cycle, each usable on its own ---------------------------------------------
+    // --- the parts of a cycle, each usable on its own --------------------------------------------
 
     /// Makes or keeps a direct connection. Returns PORTFORWARDED, FAILED, or the previous
     /// connection type when nothing was due.

@@ -54,6 +54,16 @@ TEST_F(DirectAttemptTest, RetestsTheHttpPortOnceTheIntervalHasPassed) {
     EXPECT_TRUE(gateway.calls(" -> ").empty());
 }
 
+TEST_F(DirectAttemptTest, MappingsPastHalfOfTheirLeaseAreRenewedHttpFirst) {
+    manager().killConnection(PORTFORWARDED);  // finds the gateway, as at the daemon's start
+    manager().setReqPortMappingLifetime(600, 600);
+    givenForwardedPorts();
+    clock.advance(300);
+    EXPECT_EQ(cycle(), PORTFORWARDED);
+    EXPECT_EQ(gateway.calls(" -> "), (Texts{"map TCP 9091 -> 192.168.77.10:8080 ",
+                                            "map TCP 9444 -> 192.168.77.10:8443 "}));
+}
+
 TEST_F(DirectAttemptTest, PortsCountAsOpenWhileTheDiskSleeps) {
     givenForwardedPorts();
     clock.advance(300);
@@ -137,7 +147,9 @@ TEST_F(DirectAttemptTest, ChangedAddressDropsTheMappingsAndMakesThemAnew) {
 TEST_F(DirectAttemptTest, OtherPortIsGivenUpWhereOnlyTheDefaultIsAllowed) {
     gateway.refusePort(9091);
     givenForwardedPorts();
+    EXPECT_EQ(cycle(), PORTFORWARDED);
     ASSERT_EQ(mappedPorts(), (Ports{9092, 9444}));
+    EXPECT_EQ(gateway.count("map TCP"), 0);
     gateway.acceptPort(9091);
     setConfig("DEFAULT_PORTS_ONLY", "TRUE");
     clock.advance(300);
@@ -199,6 +211,9 @@ TEST_P(FileStatusTest, IsKeptUntilTheNextSearch) {
     for (int port = 9444; port <= 9543; ++port) gateway.refusePort(port);
     manager().killConnection(PORTFORWARDED);
     ASSERT_EQ(cycle(), FAILED);  // the HTTP port was tested, HTTPS refused, the relay is down
+    clock.set(support::VirtualClock::kStart + 240);  // the end of the interval
+    setConfig("COMMUNICATION_STATUS", "connecting");
+    EXPECT_EQ(manager().createDirectConnection(), CONNECTING);
     setConfig("COMMUNICATION_STATUS", GetParam().word);
     forget();
     EXPECT_EQ(manager().createDirectConnection(), GetParam().kept);
@@ -208,7 +223,6 @@ INSTANTIATE_TEST_SUITE_P(Words,
                          FileStatusTest,
                          testing::Values(FileStatus{"Forwarded", "portforwarded", PORTFORWARDED,
                                                     false},
-                                         FileStatus{"Connecting", "connecting", CONNECTING, false},
                                          FileStatus{"Failed", "failed", FAILED, false},
                                          FileStatus{"Relayed", "relayed", FAILED, true}),
                          RowName{});
@@ -219,12 +233,12 @@ TEST_F(DirectAttemptTest, SearchesUntilItsPortIsTestedAndWhileRelayedOncePerInte
     manager().killConnection(PORTFORWARDED);
     clock.advance(300);
     diskIsAsleep();
-    for (const char* status : {"portforwarded", "relayed", "portforwarded"}) {
+    for (const char* status : {"portforwarded", "portforwarded", "relayed", "portforwarded"}) {
         setConfig("COMMUNICATION_STATUS", status);
         manager().createDirectConnection();
     }
     // A search for a connection that held does not wake the disk, so that its port stays untested.
-    EXPECT_EQ(gateway.count("map TCP 9091 -> "), 2);
+    EXPECT_EQ(gateway.count("map TCP 9091 -> "), 3);
     EXPECT_TRUE(testedPorts().empty());
 }
 

@@ -204,7 +204,7 @@ TEST_F(ConfigTest, AFailedWriteIsLoggedAndTheValueKept) {
     commands.answer("sed", "", 1);
     EXPECT_EQ(config.setProperty("KEY", "new", true), "new");
     expectLogIs({notUpdated});
-    limitFiles(fs::file_size(file));
+    limitFiles(static_cast<rlim_t>(fs::file_size(file)));
     EXPECT_EQ(config.setProperty("A", "x", true), "x");
     limitFiles(RLIM_INFINITY);
     expectLogIs({notUpdated, notUpdated});

@@ -44,7 +44,7 @@ TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
     const Entry& row = GetParam();
     discovered();
     // The description stays out of the log.
-    gateway.entryLie = {row.status, row.client, row.internalPort, support::kDeviceId};
+    gateway.lie = {row.status, row.client, row.internalPort, support::kDeviceId};
     EXPECT_EQ(map(80, 9091), row.holder == nullptr);
     EXPECT_EQ(gateway.count("map TCP"), row.holder == nullptr ? 1 : 0);
     const std::string line = "internal port: 80 is already mapped to another IP: ";
@@ -114,7 +114,7 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
 
 TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     discovered();
-    gateway.tableLie = {
+    gateway.lie = {
         0,       "192.168.77.10.168.77.10", "80808080", std::string(200, 'K'), "90919091", "TCPTCP",
         "11111", std::string(40, '9')};
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));

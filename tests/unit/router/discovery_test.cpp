@@ -28,15 +28,19 @@ TEST_F(DiscoveryTest, UpnpIsPreferredToNatpmp) {
     expectLogged(LOG_INFO, "Router::natpmp_discover - failed to get External IP address\n");
 }
 
-struct Answer {
-    const char* name;
-    int state, ipStatus;
-    std::string ip;
-    bool success;
-    const char* logged;
-};
-
+// clang-format off
+struct Answer { const char* name; int state, ipStatus; std::string ip; bool success; const char* logged; };
 class GatewayAnswer : public RouterTest, public ::testing::WithParamInterface<Answer> {};
+INSTANTIATE_TEST_SUITE_P(, GatewayAnswer, ::testing::Values(
+    Answer{"NoUsableDeviceIsAFailure", 0, 0, "44.128.0.20", false, "invalid device type \n"},
+    Answer{"AConnectedGatewayIsUsed", 1, 0, "44.128.0.20", true, "IGD found at: http://192.168.77.1:5000/ctl/IPConn, local host IP address: 192.168.77.10 \n"},
+    Answer{"AnUnconnectedGatewayIsUsed", 2, 0, "44.128.0.20", true, "Unconnected IGD found at: http://192.168.77.1:5000/ctl/IPConn local host IP address: 192.168.77.10, proceeding anyway \n"},
+    Answer{"AnotherDeviceIsUsed", 3, 0, "44.128.0.20", true, "Non-IGD UPnP device found at: http://192.168.77.1:5000/ctl/IPConn local hostIP address: 192.168.77.10 , proceeding anyway \n"},
+    Answer{"AnUnknownKindIsUsed", 7, 0, "44.128.0.20", true, "Unknown device type found at: http://192.168.77.1:5000/ctl/IPConn local address: 192.168.77.10, proceeding anyway \n"},
+    Answer{"ARefusedAddressIsAFailure", 1, 501, "", false, "failed to get External IP address, ipStatus: 501, value received:  \n"},
+    Answer{"AnEmptyAddressIsAFailure", 1, 0, "", false, "failed to get External IP address, ipStatus: 0, value received:  \n"},
+    Answer{"AnEndlessAddressIsCut", 1, 0, "%n%s%n%s%n%s%n%s%n%s%n%s", true, "Router's external IP address: %n%s%n%s%n%s%n%s \n"}), RowName{});
+// clang-format on
 
 TEST_P(GatewayAnswer, IsJudged) {
     const Answer& row = GetParam();
@@ -49,19 +53,6 @@ TEST_P(GatewayAnswer, IsJudged) {
     expectLogged(LOG_INFO, std::string("Router::upnp_discover - ") + row.logged);
 }
 
-// clang-format off
-INSTANTIATE_TEST_SUITE_P(, GatewayAnswer, ::testing::Values(
-    Answer{"NoUsableDeviceIsAFailure", 0, 0, "44.128.0.20", false, "invalid device type \n"},
-    Answer{"AConnectedGatewayIsUsed", 1, 0, "44.128.0.20", true, "IGD found at: http://192.168.77.1:5000/ctl/IPConn, local host IP address: 192.168.77.10 \n"},
-    Answer{"AnUnconnectedGatewayIsUsed", 2, 0, "44.128.0.20", true, "Unconnected IGD found at: http://192.168.77.1:5000/ctl/IPConn local host IP address: 192.168.77.10, proceeding anyway \n"},
-    Answer{"AnotherDeviceIsUsed", 3, 0, "44.128.0.20", true, "Non-IGD UPnP device found at: http://192.168.77.1:5000/ctl/IPConn local hostIP address: 192.168.77.10 , proceeding anyway \n"},
-    Answer{"AnUnknownKindIsUsed", 7, 0, "44.128.0.20", true, "Unknown device type found at: http://192.168.77.1:5000/ctl/IPConn local address: 192.168.77.10, proceeding anyway \n"},
-    Answer{"ARefusedAddressIsAFailure", 1, 501, "", false, "failed to get External IP address, ipStatus: 501, value received:  \n"},
-    Answer{"AnEmptyAddressIsAFailure", 1, 0, "", false, "failed to get External IP address, ipStatus: 0, value received:  \n"},
-    Answer{"AnEndlessAddressIsCut", 1, 0, "%n%s%n%s%n%s%n%s%n%s%n%s", true, "Router's external IP address: %n%s%n%s%n%s%n%s \n"}),
-    RowName{});
-// clang-format on
-
 TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
     const std::string target = gateway.devices[0].second;
     gateway.devices = {
@@ -73,7 +64,7 @@ TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
     EXPECT_TRUE(router.upnp_discover());
     EXPECT_EQ(gateway.calls("igd"),
               (Texts{"igd http://192.168.77.4/a.xml http://192.168.77.7/c.xml"}));
-    EXPECT_EQ(log.countPart("http://192.168.77.3/*AUTH_REMOVED*\n st: *SUBDOMAIN_REMOVED*\n"), 1);
+    once("http://192.168.77.3/*AUTH_REMOVED*\n st: *SUBDOMAIN_REMOVED*\n");
     gateway.devices = {{"http://192.168.77.5/udhisapi.dll", target}};
     EXPECT_FALSE(router.upnp_discover());
     EXPECT_EQ(gateway.count("igd"), 1);
@@ -96,13 +87,20 @@ TEST_F(DiscoveryTest, AChangeIsReportedUntilTheDiscoveryAfterItsReading) {
     EXPECT_EQ(log.countPart("external IP address has changed!"), 2);
 }
 
-struct Interfaces {
-    const char* name;
-    std::vector<support::FakeNet::Interface> before, now;
-    std::string localIp;
-};
-
+// clang-format off
+struct Interfaces { const char* name; std::vector<support::FakeNet::Interface> before, now; std::string localIp; };
 class LocalAddress : public RouterTest, public ::testing::WithParamInterface<Interfaces> {};
+INSTANTIATE_TEST_SUITE_P(, LocalAddress, ::testing::Values(
+    Interfaces{"UnfitInterfacesAreLeftOut", {}, {
+        {"lo", "127.0.0.1", IFF_UP | IFF_RUNNING | IFF_LOOPBACK}, {"br-docker-2", "172.18.0.1"},
+        {"tun0", "10.8.0.2", IFF_UP | IFF_POINTOPOINT}, {"dummy0", "10.9.0.2", IFF_UP | IFF_NOARP},
+        {"eth9", "10.0.0.9", IFF_BROADCAST}, {"eth8", ""}, {"eth7", "link"}}, ""},
+    Interfaces{"UpOrRunningIsEnough", {}, {{"eth0", "10.0.0.5", IFF_RUNNING}, {"eth1", "10.0.0.6", IFF_UP}}, "10.0.0.5"},
+    Interfaces{"IPv4GoesBeforeIPv6", {}, {{"eth0", "fe80::1"}, {"eth0", "10.0.0.5"}}, "10.0.0.5"},
+    Interfaces{"IPv6IsTakenWhereThereIsNoOther", {}, {{"eth0", "fe80::1"}, {"eth1", "fe80::2"}}, "fe80::1"},
+    Interfaces{"AnIPv6AddressInUseStays", {{"eth0", "fe80::1"}}, {{"eth0", "10.0.0.5"}, {"eth0", "fe80::1"}}, "fe80::1"},
+    Interfaces{"AnAddressThatIsGoneIsReplaced", {{"eth0", "10.0.0.4"}}, {{"eth0", "10.0.0.5"}}, "10.0.0.5"}), RowName{});
+// clang-format on
 
 TEST_P(LocalAddress, IsChosen) {
     const Interfaces& row = GetParam();
@@ -117,20 +115,6 @@ TEST_P(LocalAddress, IsChosen) {
     // Only an unknown address is asked of the maker's router.
     EXPECT_EQ(commands.lines().empty(), !row.localIp.empty());
 }
-
-// clang-format off
-INSTANTIATE_TEST_SUITE_P(, LocalAddress, ::testing::Values(
-    Interfaces{"UnfitInterfacesAreLeftOut", {}, {
-        {"lo", "127.0.0.1", IFF_UP | IFF_RUNNING | IFF_LOOPBACK}, {"br-docker-2", "172.18.0.1"},
-        {"tun0", "10.8.0.2", IFF_UP | IFF_POINTOPOINT}, {"dummy0", "10.9.0.2", IFF_UP | IFF_NOARP},
-        {"eth9", "10.0.0.9", IFF_BROADCAST}, {"eth8", ""}, {"eth7", "link"}}, ""},
-    Interfaces{"UpOrRunningIsEnough", {}, {{"eth0", "10.0.0.5", IFF_RUNNING}, {"eth1", "10.0.0.6", IFF_UP}}, "10.0.0.5"},
-    Interfaces{"IPv4GoesBeforeIPv6", {}, {{"eth0", "fe80::1"}, {"eth0", "10.0.0.5"}}, "10.0.0.5"},
-    Interfaces{"IPv6IsTakenWhereThereIsNoOther", {}, {{"eth0", "fe80::1"}, {"eth1", "fe80::2"}}, "fe80::1"},
-    Interfaces{"AnIPv6AddressInUseStays", {{"eth0", "fe80::1"}}, {{"eth0", "10.0.0.5"}, {"eth0", "fe80::1"}}, "fe80::1"},
-    Interfaces{"AnAddressThatIsGoneIsReplaced", {{"eth0", "10.0.0.4"}}, {{"eth0", "10.0.0.5"}}, "10.0.0.5"}),
-    RowName{});
-// clang-format on
 
 }  // namespace
 }  // namespace pelorus

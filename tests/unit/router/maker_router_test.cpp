@@ -20,14 +20,14 @@ protected:
     }
 };
 
-struct Addresses {
-    const char* name;
-    std::string wan, lan;
-    bool connected;
-    std::string externalIp, localIp;
-};
-
+// clang-format off
+struct Addresses { const char* name; std::string wan, lan; bool connected; std::string externalIp, localIp; };
 class ScriptAnswer : public MakerRouterTest, public ::testing::WithParamInterface<Addresses> {};
+INSTANTIATE_TEST_SUITE_P(, ScriptAnswer, ::testing::Values(
+    Addresses{"WithoutAWanAddressThereIsNoInternet", "\n44.128.0.9\n", "10.0.0.1\n", false, "44.128.0.20", "10.0.0.1"},
+    Addresses{"AnEmptyLanAddressClearsNothing", "44.128.0.9", "", true, "44.128.0.9", "192.168.77.1"},
+    Addresses{"WhatIsNoAddressIsNotTaken", "getip.sh: no link", "10.0.0.1\"; reboot; \"", false, "44.128.0.20", "192.168.77.1"}), RowName{});
+// clang-format on
 
 TEST_P(ScriptAnswer, BecomesTheAddresses) {
     const Addresses& row = GetParam();
@@ -43,32 +43,8 @@ TEST_P(ScriptAnswer, BecomesTheAddresses) {
 }
 
 // clang-format off
-INSTANTIATE_TEST_SUITE_P(, ScriptAnswer, ::testing::Values(
-    Addresses{"WithoutAWanAddressThereIsNoInternet", "\n44.128.0.9\n", "10.0.0.1\n", false, "44.128.0.20", "10.0.0.1"},
-    Addresses{"AnEmptyLanAddressClearsNothing", "44.128.0.9", "", true, "44.128.0.9", "192.168.77.1"},
-    Addresses{"WhatIsNoAddressIsNotTaken", "getip.sh: no link", "10.0.0.1\"; reboot; \"", false, "44.128.0.20", "192.168.77.1"}),
-    RowName{});
-// clang-format on
-
-struct ListLine {
-    const char* name;
-    std::string line;
-    int result;
-    bool added;
-};
-
+struct ListLine { const char* name; std::string line; int result; bool added; };
 class MappingWithList : public MakerRouterTest, public ::testing::WithParamInterface<ListLine> {};
-
-TEST_P(MappingWithList, DecidesByTheEntryOfThePort) {
-    const ListLine& row = GetParam();
-    const std::string add = kHelper + "add \"TCP,9091,192.168.77.1,80,Kavra\"";
-    knowAddresses();
-    commands.answer(kList, row.line);
-    EXPECT_EQ(router.mapPortBrenvik(80, 9091, "TCP", "Kavra"), row.result);
-    EXPECT_EQ(commands.lines(), row.added ? (Texts{kList, add}) : (Texts{kList}));
-}
-
-// clang-format off
 INSTANTIATE_TEST_SUITE_P(, MappingWithList, ::testing::Values(
     ListLine{"OwnEntryStands", "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\n", 1, false},
     ListLine{"BlanksAreTrimmed", " BRENVIK , TCP , 9090 - 9092 , 192.168.77.1 , 80 , \r\n", 1, false},
@@ -80,9 +56,17 @@ INSTANTIATE_TEST_SUITE_P(, MappingWithList, ::testing::Values(
     ListLine{"PortBeyondTheHighestDoesNotParse", "OTHER,TCP,9091-65536,192.168.77.7,80,x\n", 1, true},
     ListLine{"MissingFieldDoesNotParse", "OTHER,TCP,9091,192.168.77.7,80\n", 1, true},
     ListLine{"NoAddressDoesNotParse", "OTHER,TCP,9091,,80,x\n", 1, true},
-    ListLine{"AnEndlessLineIsOneLineAndALineAfterGarbageCounts", ",,,\n\n" + std::string(5000, 'x') + "\nOTHER,TCP,9091,192.168.77.7,80,", 0, false}),
-    RowName{});
+    ListLine{"AnEndlessLineIsOneLineAndALineAfterGarbageCounts", ",,,\n\n" + std::string(5000, 'x') + "\nOTHER,TCP,9091,192.168.77.7,80,", 0, false}), RowName{});
 // clang-format on
+
+TEST_P(MappingWithList, DecidesByTheEntryOfThePort) {
+    const ListLine& row = GetParam();
+    const std::string add = kHelper + "add \"TCP,9091,192.168.77.1,80,Kavra\"";
+    knowAddresses();
+    commands.answer(kList, row.line);
+    EXPECT_EQ(router.mapPortBrenvik(80, 9091, "TCP", "Kavra"), row.result);
+    EXPECT_EQ(commands.lines(), row.added ? (Texts{kList, add}) : (Texts{kList}));
+}
 
 TEST_F(MakerRouterTest, ArgumentsStayInsideTheirQuotes) {
     EXPECT_EQ(router.mapPortBrenvik(80, 0, "TCP", "Kavra"), 0);

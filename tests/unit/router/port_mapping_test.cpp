@@ -38,17 +38,20 @@ TEST_F(PortMappingTest, RefusalsAndMissingDiscoveryFail) {
     expectLogged(LOG_INFO, "Router::unmapPort() - fail - failed to unmap external port: 9091\n");
     gateway.refusePort(9091);
     EXPECT_FALSE(map(80, 9091));
-    EXPECT_EQ(log.countPart("port: 9091, to internal port: 80, status: 718\n"), 1);
+    once("port: 9091, to internal port: 80, status: 718\n");
 }
 
-struct Entry {
-    const char* name;
-    int status;
-    std::string client, internalPort;
-    const char* holder;  // as it is logged, null when the port is mapped
-};
-
+// clang-format off
+struct Entry { const char* name; int status; std::string client, internalPort; const char* holder; };
 class ExistingEntry : public PortMappingTest, public ::testing::WithParamInterface<Entry> {};
+INSTANTIATE_TEST_SUITE_P(, ExistingEntry, ::testing::Values(
+    Entry{"OwnIsRefreshed", 0, "192.168.77.10", "80", nullptr},
+    Entry{"OwnWithAnotherPortIsForeign", 0, "192.168.77.10", "8080", "192.168.77.10"},
+    Entry{"CountsWhateverTheStatus", 501, "192.168.77.7", "80", "192.168.77.7"},
+    Entry{"OverlongTextsAreForeign", 0, "%s%n.%s%n%s%n.7777", "808080", "%s%n.%s%n%s%n.77"},
+    Entry{"NetworkAddressIsOverwritten", 0, "192.168.77.0", "80", nullptr},
+    Entry{"NameIsOverwritten", 0, "nobody", "80", nullptr}), RowName{});
+// clang-format on
 
 TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
     const Entry& row = GetParam();
@@ -63,34 +66,21 @@ TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
         expectLogged(LOG_INFO, "Router::mapPort() - " + line + row.holder + "\n");
 }
 
-// clang-format off
-INSTANTIATE_TEST_SUITE_P(, ExistingEntry, ::testing::Values(
-    Entry{"OwnIsRefreshed", 0, "192.168.77.10", "80", nullptr},
-    Entry{"OwnWithAnotherPortIsForeign", 0, "192.168.77.10", "8080", "192.168.77.10"},
-    Entry{"CountsWhateverTheStatus", 501, "192.168.77.7", "80", "192.168.77.7"},
-    Entry{"OverlongTextsAreForeign", 0, "%s%n.%s%n%s%n.7777", "808080", "%s%n.%s%n%s%n.77"},
-    Entry{"NetworkAddressIsOverwritten", 0, "192.168.77.0", "80", nullptr},
-    Entry{"NameIsOverwritten", 0, "nobody", "80", nullptr}), RowName{});
-// clang-format on
-
 TEST_F(PortMappingTest, UnmappingForgetsTheLeaseOfTheInternalPort) {
     discovered();
     mapBoth();
-    EXPECT_EQ(log.countPart("internalPort[443], mappedExternalPort[9444], lifetime[604800]"), 1);
+    once("internalPort[443], mappedExternalPort[9444], lifetime[604800]");
     gateway.add({7000, "192.168.77.10", 22});
     EXPECT_TRUE(router.unmapPort(22, 7000, "TCP"));
     EXPECT_TRUE(router.unmapPort(80, 9091, "TCP"));
     EXPECT_EQ(gateway.mappings(), (Mappings{{9444, "192.168.77.10", 443, "KavraSSL"}}));
-    EXPECT_EQ(log.countPart("tracked_internal_port 443, req_internal_port 22, external_port 9444"),
-              1);
-    EXPECT_EQ(log.countPart("destroyed HTTP port mapping. internal_port 80, external_port 9091"),
-              1);
+    once("tracked_internal_port 443, req_internal_port 22, external_port 9444");
+    once("destroyed HTTP port mapping. internal_port 80, external_port 9091");
     wait(302401);
     EXPECT_EQ(gateway.calls("map TCP"), (Texts{"map TCP 9444 -> 192.168.77.10:443 "}));
     EXPECT_TRUE(router.unmapPort(443, 9444, "TCP"));
-    EXPECT_EQ(log.countPart("destroyed HTTPS port mapping. internal_port 443, external_port 9444"),
-              1);
-    EXPECT_EQ(log.countPart("mismatch"), 1);
+    once("destroyed HTTPS port mapping. internal_port 443, external_port 9444");
+    once("mismatch");
 }
 
 TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
@@ -142,14 +132,14 @@ TEST_F(PortMappingTest, RenewsAfterHalfAWeek) {
     discovered();
     router.renewPortMapping("HTTP");  // tracks nothing, so the port is refused
     EXPECT_EQ(gateway.calls(), Texts{});
-    EXPECT_EQ(log.countPart("PORTFORWARDED HTTP: mapPort returncode[0], internalPort[0], new"), 1);
+    once("PORTFORWARDED HTTP: mapPort returncode[0], internalPort[0], new");
     mapBoth();
     wait(302400);
     EXPECT_EQ(gateway.calls(), Texts{});
     clock.advance(1);
     router.setReqPortMappingLifetime(600, 700);
     router.renewPortMapping("HTTPS");
-    EXPECT_EQ(log.countPart("previous lifetime[604800], new lifetime[600].\n"), 1);
+    once("previous lifetime[604800], new lifetime[600].\n");
     router.CheckExpiredMappings();  // the first one starts a new half, the other is still due
     EXPECT_EQ(gateway.calls("map TCP"),
               (Texts{"map TCP 9444 -> 192.168.77.10:443 ", "map TCP 9091 -> 192.168.77.10:80 "}));
@@ -173,7 +163,7 @@ TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
     gateway.keepMappings = true;
     EXPECT_FALSE(map(80, 9091) || router.unmapPort(80, 9091, "TCP"));
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));
-    EXPECT_EQ(log.countPart("port: 9091, to internal port: 80\n"), 1);
+    once("port: 9091, to internal port: 80\n");
 }
 
 }  // namespace

@@ -1,8 +1,9 @@
-#include "router/lease_tracking.h"
 
 #include <cstdint>
 #include <limits>
 
+#include "router/lease_tracking.h"
+#include "router/timer.h"
 #include "support/fixture.h"
 
 namespace pelorus {
@@ -10,9 +11,9 @@ namespace {
 
 using Limits = std::numeric_limits<std::int64_t>;
 
-class LeaseTrackingTest : public support::PelorusTest {};
+class TimeKeepingTest : public support::PelorusTest {};
 
-TEST_F(LeaseTrackingTest, AnIntervalIsJudgedByTheClock) {
+TEST_F(TimeKeepingTest, AnIntervalIsJudgedByTheClock) {
     struct Instant {
         std::int64_t start, duration;
         time_t now;
@@ -34,7 +35,7 @@ TEST_F(LeaseTrackingTest, AnIntervalIsJudgedByTheClock) {
     }
 }
 
-TEST_F(LeaseTrackingTest, ALeaseStartsWhenItIsRecorded) {
+TEST_F(TimeKeepingTest, ALeaseStartsWhenItIsRecorded) {
     PMTracker tracker;
     EXPECT_TRUE(tracker.pastHalfway());
     tracker.setParams(8080, 9091, 4294967295U);
@@ -47,6 +48,25 @@ TEST_F(LeaseTrackingTest, ALeaseStartsWhenItIsRecorded) {
     std::int64_t start = 0, duration = 0;
     interval.getParams(start, duration);
     EXPECT_TRUE(start == clock.now() && duration == 4294967295);
+}
+
+TEST_F(TimeKeepingTest, ATimerMeasuresUntilItIsStopped) {
+    Timer timer;
+    clock.set(10);
+    static_cast<void>(clock.wait(900000, nullptr));
+    timer.start();
+    clock.advance(2);
+    EXPECT_EQ(timer.getElapsedTimeInSec(), 2);
+    static_cast<void>(clock.wait(1700000, nullptr));
+    EXPECT_EQ(timer.getElapsedTimeInMilliSec(), 3700);
+    timer.stop();
+    clock.advance(30);
+    log.clear();
+    EXPECT_EQ(timer.getElapsedTimeInMicroSec(), 3700000);
+    EXPECT_EQ(timer.getElapsedTime(), 3);
+    EXPECT_EQ(
+        log.lines().front().text,
+        "Timer::getElapsedTimeInMicroSec - end.sec[14] end.usec[600000] start.sec[10] start.usec[900000]\n");
 }
 
 }  // namespace

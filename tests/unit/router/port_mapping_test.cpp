@@ -60,6 +60,7 @@ TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
     gateway.lie = {row.status, row.client, row.internalPort, support::kDeviceId};
     EXPECT_EQ(map(80, 9091), row.holder == nullptr);
     EXPECT_EQ(gateway.count("map TCP"), row.holder == nullptr ? 1 : 0);
+    once(row.status == 0 ? "returned status[0], intClient[" : "returned status[501]\n");
     const std::string line = "internal port: 80 is already mapped to another IP: ";
     EXPECT_EQ(log.countPart(line), row.holder == nullptr ? 0 : 1);
     if (row.holder != nullptr)
@@ -69,7 +70,8 @@ TEST_P(ExistingEntry, DecidesWhetherThePortIsFree) {
 TEST_F(PortMappingTest, UnmappingForgetsTheLeaseOfTheInternalPort) {
     discovered();
     mapBoth();
-    once("internalPort[443], mappedExternalPort[9444], lifetime[604800]");
+    once(
+        "setting HTTPS PMTracker params.   internalPort[443], mappedExternalPort[9444], lifetime[604800]");
     gateway.add({7000, "192.168.77.10", 22});
     EXPECT_TRUE(router.unmapPort(22, 7000, "TCP"));
     EXPECT_TRUE(router.unmapPort(80, 9091, "TCP"));
@@ -92,6 +94,11 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
     ASSERT_TRUE(map(80, 9100));
     gateway.add({9101, "192.168.77.10", 81, "Kavra"});
     for (const Mapping& mapping : others) gateway.add(mapping);
+    gateway.clear();
+    EXPECT_EQ(router.getMappedInternalPort(9101, "TCP"), 81);
+    EXPECT_EQ(gateway.calls(), (Texts{"entry #0", "entry #1"}));
+    EXPECT_EQ(router.getMappedInternalPort(9002, "TCP"), 80);
+    EXPECT_FALSE(router.isPortMapped(9003, "TCP"));
     EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(gateway.mappings(), others);
     wait(302401);
@@ -116,16 +123,6 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     EXPECT_EQ(log.countPart("destroyed HTTP"), 0);
     wait(302401);
     EXPECT_EQ(gateway.calls(), Texts{});
-}
-
-TEST_F(PortMappingTest, FindsTheInternalPortOfThisDevice) {
-    discovered();
-    gateway.add({9091, "192.168.77.10", 22, "", "UDP"});
-    gateway.add({9090, "192.168.77.7", 80});
-    gateway.add({9091, "192.168.77.10", 80});
-    EXPECT_EQ(router.getMappedInternalPort(9091, "TCP"), 80);
-    EXPECT_EQ(gateway.calls(), (Texts{"entry #0", "entry #1", "entry #2"}));
-    EXPECT_FALSE(router.isPortMapped(9090, "TCP"));
 }
 
 TEST_F(PortMappingTest, RenewsAfterHalfAWeek) {
@@ -157,6 +154,7 @@ TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
     EXPECT_EQ(port, 40000);
     wait(351);
     EXPECT_EQ(gateway.calls("40000"), (Texts{"natpmp map TCP 40000 -> 443 for 700 s"}));
+    EXPECT_EQ(log.countPart("Router::renewPortMapping"), 0);
     EXPECT_TRUE(router.unmapPort(443, 40000, "TCP") && router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(gateway.count("natpmp map TCP 0 -> 443 for 0 s"), 1);
     gateway.refuseAllPorts();

@@ -97,8 +97,7 @@ TEST_F(NatpmpTest, LostAnswersAreWaitedForOnceAndTwoSecondsAtMost) {
               (Texts{"natpmp wait 250 ms", "natpmp wait 500 ms", "natpmp wait 1000 ms"}));
     EXPECT_EQ(log.countPart("errno " + std::to_string(EAGAIN) + "\n"), 1);
     gateway.silent = false;
-    EXPECT_TRUE(map(80, 9091));
-    EXPECT_TRUE(map(443, 9444, true));
+    EXPECT_TRUE(map(80, 9091) && map(443, 9444, true));
     EXPECT_EQ(gateway.natpmpTime, 1750 + 2000);
 }
 
@@ -130,10 +129,8 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     expectLogged(LOG_ERR, kRequest + "invalid protocol string %s%n\n");
     EXPECT_TRUE(client.unmapPort(80, 9091, "UDP"));
     log.clear();
-    ASSERT_TRUE(map(80, 9091));
-    ASSERT_TRUE(map(443, 9444, true));
-    EXPECT_TRUE(client.unmapPort(22, 9444, "TCP"));
-    EXPECT_TRUE(client.unmapPort(80, 9444, "TCP"));
+    ASSERT_TRUE(map(80, 9091) && map(443, 9444, true));
+    EXPECT_TRUE(client.unmapPort(22, 9444, "TCP") && client.unmapPort(80, 9444, "TCP"));
     gateway.grant({{}, {}, 0});  // no time is a removal too
     EXPECT_TRUE(map(443, 9444, true));
     EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));

@@ -33,9 +33,9 @@ TEST_F(PortMappingTest, RefusalsAndMissingDiscoveryFail) {
     EXPECT_EQ(refusal(11, 11, "tcp"), "Router::mapPort() - protocol must be");
     EXPECT_EQ(router.getMappedInternalPort(9091, "udp"), 0);
     EXPECT_FALSE(router.unmapAllPorts("udp", "Kavra") || router.unmapPort(80, 9091, "Tcp"));
-    EXPECT_FALSE(router.unmapPort(80, 9091, "TCP"));
-    EXPECT_EQ(gateway.calls(), (Texts{"unmap TCP 9091"}));
-    expectLogged(LOG_INFO, "Router::unmapPort() - fail - failed to unmap external port: 9091\n");
+    EXPECT_FALSE(router.unmapPort(80, -12345, "TCP"));
+    EXPECT_EQ(gateway.calls(), (Texts{"unmap TCP -1234"}));  // as the library holds a port
+    expectLogged(LOG_INFO, "Router::unmapPort() - fail - failed to unmap external port: -12345\n");
     gateway.refusePort(9091);
     EXPECT_FALSE(map(80, 9091));
     once("port: 9091, to internal port: 80, status: 718\n");
@@ -107,10 +107,11 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
 
 TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     discovered();
-    mapBoth();
-    gateway.lie = {
-        0,       "192.168.77.10.168.77.10", "80808080", std::string(200, 'K'), "90919091", "TCPTCP",
-        "11111", std::string(40, '9')};
+    ASSERT_TRUE(map(443, 9444, true));
+    gateway.lie = {0, "192.168.77.10.168.77.10", "80808080", std::string(200, 'K')};
+    gateway.lie->externalPort = "90919091";
+    gateway.lie->protocol = "TCPTCP";
+    gateway.lie->enabled = gateway.lie->lease = std::string(40, '9');
     EXPECT_EQ(router.getMappedInternalPort(909190, "TCP"), -1);
     EXPECT_EQ(gateway.count("entry #"), 2 * 65536);
     EXPECT_EQ(gateway.calls().back(), "entry #65535");

@@ -45,7 +45,7 @@ protected:
         gateway.answerDelay = GetParam().delay;
         gateway.hungUntil = gateway.natpmpTime + GetParam().hung;
     }
-    /// What succeeds carries its own values.
+    // What succeeds carries its own values.
     void expectOwn(int internalPort, int externalPort) {
         unsigned lifetime = 600;
         port = externalPort;

@@ -139,6 +139,7 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     once("destroyed HTTPS port mapping. internal_port 443, external_port 9444");
     once("tracked_internal_port 443, req_internal_port 22, external_port 9444");
     once("destroyed all mappings");
+    once("destroyed HTTPS");
     once("mismatch");
     gateway.grant({});
     clock.advance(1);

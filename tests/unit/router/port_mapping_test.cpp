@@ -82,6 +82,7 @@ TEST_F(PortMappingTest, UnmappingForgetsTheLeaseOfTheInternalPort) {
     EXPECT_EQ(gateway.calls("map TCP"), (Texts{"map TCP 9444 -> 192.168.77.10:443 "}));
     EXPECT_TRUE(router.unmapPort(443, 9444, "TCP"));
     once("destroyed HTTPS port mapping. internal_port 443, external_port 9444");
+    once("destroyed HTTPS");
     once("mismatch");
 }
 

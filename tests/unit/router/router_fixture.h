@@ -36,6 +36,8 @@ protected:
         discovered();
     }
 
+    void once(const char* part) { EXPECT_EQ(log.countPart(part), 1) << part << log.dump(); }
+
     FakeGateway& gateway = FakeGateway::get();
     Router router;
 };

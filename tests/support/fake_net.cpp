@@ -9,15 +9,41 @@
 #include <cstring>
 #include <deque>
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
+using pelorus::support::FakeNet;
+
 extern "C" {
-int __real_getaddrinfo(const char* name,
-                       const char* service,
-                       const addrinfo* hints,
-                       addrinfo** list);
+// clang-format off
+int __real_getaddrinfo(const char* name, const char* service, const addrinfo* hints, addrinfo** list);
 void __real_freeaddrinfo(addrinfo* list);
+
+int __wrap_getifaddrs(ifaddrs** list) {
+    return FakeNet::get().takeInterfaces(list);
 }
-// NOLINTEND(bugprone-reserved-identifier)
+
+void __wrap_freeifaddrs(ifaddrs* list) {
+    FakeNet::get().release(list);
+}
+
+int __wrap_getaddrinfo(const char* name, const char* /*service*/, const addrinfo* hints, addrinfo** list) {
+    return FakeNet::get().lookUp(name, hints, list);
+}
+// clang-format on
+
+void __wrap_freeaddrinfo(addrinfo* list) {
+    FakeNet::get().release(list);
+    __real_freeaddrinfo(list);
+}
+
+int __wrap_gethostname(char* name, std::size_t size) {
+    return FakeNet::get().takeHostname(name, size);
+}
+
+// The one call of libcurl without a world behind it; a build without the library links too.
+const char* __wrap_curl_easy_strerror(int code) {
+    constexpr int kTimedOut = 28;
+    return code == kTimedOut ? "Timeout was reached" : "Another error";
+}
+}
 
 namespace pelorus::support {
 
@@ -47,11 +73,6 @@ sockaddr* parse(const std::string& text, sockaddr_storage& address) {
 }
 
 }  // namespace
-
-FakeNet& FakeNet::get() {
-    static FakeNet instance;
-    return instance;
-}
 
 void FakeNet::checkReleased() const {
     EXPECT_TRUE(lists.empty()) << "address lists kept: " << lists.size();
@@ -103,39 +124,3 @@ int FakeNet::takeHostname(char* name, std::size_t size) const {
 }
 
 }  // namespace pelorus::support
-
-using pelorus::support::FakeNet;
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
-extern "C" {
-int __wrap_getifaddrs(ifaddrs** list) {
-    return FakeNet::get().takeInterfaces(list);
-}
-
-void __wrap_freeifaddrs(ifaddrs* list) {
-    FakeNet::get().release(list);
-}
-
-int __wrap_getaddrinfo(const char* name,
-                       const char* /*service*/,
-                       const addrinfo* hints,
-                       addrinfo** list) {
-    return FakeNet::get().lookUp(name, hints, list);
-}
-
-void __wrap_freeaddrinfo(addrinfo* list) {
-    FakeNet::get().release(list);
-    __real_freeaddrinfo(list);
-}
-
-int __wrap_gethostname(char* name, std::size_t size) {
-    return FakeNet::get().takeHostname(name, size);
-}
-
-// The one call of libcurl without a world behind it; a build without the library links too.
-const char* __wrap_curl_easy_strerror(int code) {
-    constexpr int kTimedOut = 28;
-    return code == kTimedOut ? "Timeout was reached" : "Another error";
-}
-}
-// NOLINTEND(bugprone-reserved-identifier)

@@ -4,63 +4,20 @@
 #include <miniupnpc/miniupnpc.h>
 #include <miniupnpc/miniwget.h>
 
-#include <algorithm>
 #include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 
 namespace pelorus::support {
 
-namespace {
-
-constexpr std::size_t kPieceSize = 1000;  // bytes
-
-bool holds(const std::string& url, const std::string& part) {
-    return url.find(part) != std::string::npos;
-}
-
-}  // namespace
-
-// Never destroyed: the client under test cleans libcurl up at the end of the process.
-FakeWeb& FakeWeb::get() {
-    static auto* const instance = new FakeWeb;
-    return *instance;
-}
-
-void FakeWeb::answer(const std::string& part, Answer answer) {
-    rules.emplace_back(part, std::move(answer));
-}
-
-void FakeWeb::answerOnce(const std::string& part, Answer answer) {
-    once.emplace_back(part, std::move(answer));
-}
-
-int FakeWeb::count(const std::string& part) const {
-    return static_cast<int>(std::count_if(
-        asked.begin(), asked.end(), [&](const std::string& url) { return holds(url, part); }));
-}
-
 void FakeWeb::checkBalance() const {
     EXPECT_FALSE(isOpen) << "easy handle not cleaned up";
 }
 
-void FakeWeb::reset() {
-    const int initialised = globalInits;
-    *this = FakeWeb{};
-    globalInits = initialised;
-}
-
-FakeWeb::Answer FakeWeb::take(const std::string& url) {
-    asked.push_back(url);
-    const auto fits = [&](const auto& rule) { return holds(url, rule.first); };
-    const auto next = std::find_if(once.begin(), once.end(), fits);
-    if (next != once.end()) {
-        Answer found = std::move(next->second);
-        once.erase(next);
-        return found;
-    }
-    const auto rule = std::find_if(rules.rbegin(), rules.rend(), fits);
-    return rule == rules.rend() ? noAnswer() : rule->second;
+FakeWeb::Answer FakeWeb::ask(const std::string& url) {
+    const Answer answer = take(url, noAnswer());
+    if (answer.action) answer.action();
+    return answer;
 }
 
 CURL* FakeWeb::open() {
@@ -85,8 +42,8 @@ void FakeWeb::close(CURL* handle) {
 CURLcode FakeWeb::perform(CURL* handle) {
     const Transfer& now = transferOf(handle);
     if (now.url.empty()) return CURLE_URL_MALFORMAT;
-    Answer answer = take(now.url);
-    if (answer.action) answer.action();
+    Answer answer = ask(now.url);
+    constexpr std::size_t kPieceSize = 1000;  // bytes
     for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
         const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
         if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
@@ -102,8 +59,7 @@ void* FakeWeb::wget(const std::string& url, int* size) {
     EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
     *size = 0;
     if (url.empty()) return nullptr;
-    const Answer answer = take(url);
-    if (answer.action) answer.action();
+    const Answer answer = ask(url);
     if (answer.result != CURLE_OK) return nullptr;
     // Without a terminator: the sanitizers catch whoever reads one.
     void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
@@ -116,7 +72,6 @@ void* FakeWeb::wget(const std::string& url, int* size) {
 
 using pelorus::support::FakeWeb;
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 CURLcode __wrap_curl_global_init(long /*flags*/) {
     ++FakeWeb::get().globalInits;
@@ -170,4 +125,3 @@ void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
     return FakeWeb::get().wget(url, size);
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)

@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <array>
 #include <cstdarg>
 #include <cstdio>
@@ -15,11 +14,6 @@ bool operator==(const LogLine& left, const LogLine& right) {
 
 void PrintTo(const LogLine& line, std::ostream* out) {
     *out << "<" << line.priority << "> " << ::testing::PrintToString(line.text);
-}
-
-LogCapture& LogCapture::get() {
-    static LogCapture instance;
-    return instance;
 }
 
 std::vector<std::string> LogCapture::texts() const {
@@ -66,10 +60,6 @@ void expectLogged(int priority, const std::string& text) {
         << "never logged: <" << priority << "> " << text << LogCapture::get().dump();
 }
 
-void expectNotLogged(const std::string& part) {
-    EXPECT_EQ(LogCapture::get().countPart(part), 0) << part << "\n" << LogCapture::get().dump();
-}
-
 void expectLoggedInOrder(const std::vector<std::string>& texts) {
     const std::vector<std::string> all = LogCapture::get().texts();
     auto from = all.begin();
@@ -89,7 +79,6 @@ void expectLogIs(const std::vector<LogLine>& lines) {
 
 using pelorus::support::LogCapture;
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const char* format, ...) {
     std::array<char, 16384> text{};
@@ -101,13 +90,12 @@ __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const cha
 }
 
 void __wrap_openlog(const char* ident, int option, int facility) {
-    LogCapture::get().takeSetup(std::string{"openlog "} + ident + " " + std::to_string(option) +
-                                " " + std::to_string(facility));
+    LogCapture::get().setup.push_back(std::string{"openlog "} + ident + " " +
+                                      std::to_string(option) + " " + std::to_string(facility));
 }
 
 int __wrap_setlogmask(int mask) {
-    LogCapture::get().takeSetup("level " + std::to_string(mask));
+    LogCapture::get().setup.push_back("level " + std::to_string(mask));
     return 0xff;
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)

@@ -6,9 +6,8 @@
 
 #include <functional>
 #include <ostream>
-#include <string>
-#include <utility>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
@@ -21,10 +20,8 @@ void PrintTo(const LogLine& line, std::ostream* out);
 
 /// A line that holds a secret fails the test. So does one that is sent while another is being
 /// sent: with the real log it would wait for a lock for ever.
-class LogCapture {
+class LogCapture : public Single<LogCapture> {
 public:
-    static LogCapture& get();
-
     /// Since the last clear().
     [[nodiscard]] const std::vector<LogLine>& lines() const { return captured; }
     [[nodiscard]] std::vector<std::string> texts() const;
@@ -33,23 +30,16 @@ public:
     [[nodiscard]] int countPart(const std::string& part) const;
     /// All lines, for failure messages.
     [[nodiscard]] std::string dump() const;
-    /// "level MASK" and "openlog IDENT OPTION FACILITY", in the order of the calls.
-    [[nodiscard]] const std::vector<std::string>& setup() const { return setupCalls; }
-
     void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
     void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
     void addSecret(const std::string& secret);
-    void reset() { *this = LogCapture{}; }
-
     void take(const LogLine& line);
-    void takeSetup(const std::string& call) { setupCalls.push_back(call); }
+
+    std::vector<std::string> setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
 
 private:
-    LogCapture() = default;
-
     std::vector<LogLine> captured;
-    std::vector<std::string> setupCalls;
     std::vector<std::string> secrets;
     std::function<void(const LogLine&)> hook;
     int depth = 0;
@@ -57,8 +47,6 @@ private:
 
 /// Fails unless exactly this line came (text with its final newline).
 void expectLogged(int priority, const std::string& text);
-/// Fails when a line holds @p part.
-void expectNotLogged(const std::string& part);
 /// Fails unless these lines came in this order, others possibly between them.
 void expectLoggedInOrder(const std::vector<std::string>& texts);
 /// Fails unless the lines are exactly these.

@@ -20,11 +20,9 @@ SleepAnswer readSleepAnswer(const std::string& text) {
     }
     const std::size_t tag = text.find(kWaitTimeTag, action);
     if (tag == std::string::npos) return {SleepAnswer::NO_TIME};
-    int seconds = 0;
-    if (!scanInt(text.c_str() + tag + kWaitTimeTag.size(), seconds) || seconds < 0) {
-        return {SleepAnswer::BAD_TIME};
-    }
-    return {SleepAnswer::WAIT, seconds};
+    const auto seconds = scanInt(text.c_str() + tag + kWaitTimeTag.size());
+    if (seconds.value_or(-1) < 0) return {SleepAnswer::BAD_TIME};
+    return {SleepAnswer::WAIT, *seconds};
 }
 
 }  // namespace pelorus

@@ -18,39 +18,33 @@ void replaceAll(std::string& subject, const std::string& search, const std::stri
     }
 }
 
-bool scanInt64(const char* text, std::int64_t& value) {
+std::optional<std::int64_t> scanInt64(const char* text) {
+    if (text == nullptr) return std::nullopt;
     char* end = nullptr;
     errno = 0;
-    const long long number = std::strtoll(text, &end, 10);
-    if (end == text || errno == ERANGE) return false;
-    value = number;
-    return true;
+    const std::int64_t number = std::strtoll(text, &end, 10);
+    if (end == text || errno == ERANGE) return std::nullopt;
+    return number;
 }
 
-bool scanInt(const char* text, int& value) {
-    std::int64_t number = 0;
-    if (!scanInt64(text, number)) return false;
-    if (number < std::numeric_limits<int>::min() || number > std::numeric_limits<int>::max()) {
-        return false;
+std::optional<int> scanInt(const char* text) {
+    const auto number = scanInt64(text);
+    if (!number || *number < std::numeric_limits<int>::min() ||
+        *number > std::numeric_limits<int>::max()) {
+        return std::nullopt;
     }
-    value = static_cast<int>(number);
-    return true;
+    return static_cast<int>(*number);
 }
 
-bool scanUnsigned(const char* text, unsigned& value) {
-    char* end = nullptr;
-    errno = 0;
-    const long long number = std::strtoll(text, &end, 10);
-    if (end == text || errno == ERANGE) return false;
-    constexpr auto kMax = static_cast<long long>(std::numeric_limits<unsigned>::max());
-    if (number < -kMax || number > kMax) return false;
-    value = static_cast<unsigned>(number);
-    return true;
+std::optional<unsigned> scanUnsigned(const char* text) {
+    constexpr std::int64_t kMax = std::numeric_limits<unsigned>::max();
+    const auto number = scanInt64(text);
+    if (!number || *number < -kMax || *number > kMax) return std::nullopt;
+    return static_cast<unsigned>(*number);
 }
 
 int leadingInt(const std::string& text) {
-    int value = 0;
-    return scanInt(text.c_str(), value) ? value : 0;
+    return scanInt(text.c_str()).value_or(0);
 }
 
 }  // namespace pelorus

@@ -3,6 +3,7 @@
 #define PELORUS_COMMON_TEXT_H
 
 #include <cstdint>
+#include <optional>
 #include <string>
 
 namespace pelorus {
@@ -14,13 +15,13 @@ namespace pelorus {
 /// replaced text is not searched again. An empty @p search does nothing.
 void replaceAll(std::string& subject, const std::string& search, const std::string& replace);
 
-/// Reads the number at the start of @p text as scanf("%d") does: leading white space is skipped,
-/// what follows the digits is ignored. False, and @p value untouched, when there is no number or
-/// it does not fit. The same for scanInt64 ("%jd") and scanUnsigned ("%u", which accepts a minus
-/// sign and wraps).
-[[nodiscard]] bool scanInt(const char* text, int& value);
-[[nodiscard]] bool scanInt64(const char* text, std::int64_t& value);
-[[nodiscard]] bool scanUnsigned(const char* text, unsigned& value);
+/// The number at the start of @p text as scanf("%d") reads it: leading white space is skipped, what
+/// follows the digits is ignored. Nothing when @p text is null, holds no number, or one that does
+/// not fit. The same for scanInt64 ("%jd") and scanUnsigned ("%u", which accepts a minus sign and
+/// wraps).
+[[nodiscard]] std::optional<int> scanInt(const char* text);
+[[nodiscard]] std::optional<std::int64_t> scanInt64(const char* text);
+[[nodiscard]] std::optional<unsigned> scanUnsigned(const char* text);
 
 /// The number at the start of @p text, or 0, as atoi gives it.
 [[nodiscard]] int leadingInt(const std::string& text);

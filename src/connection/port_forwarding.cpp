@@ -7,8 +7,7 @@
 namespace pelorus {
 
 int readPort(const char* key, int defaultPort) {
-    int port = defaultPort;
-    return scanInt(setting(key).c_str(), port) ? port : defaultPort;
+    return scanInt(setting(key).c_str()).value_or(defaultPort);
 }
 
 void reportAnalytics(const char* status, ConnectionSubType subType) {

@@ -18,32 +18,32 @@ constexpr int kMaxSeverity = 7;     // LOG_DEBUG
 // One reader per option. A null value means that the option was the last argument.
 
 void readFrequency(const char* value, Options& options) {
-    int seconds = 0;
+    const auto seconds = scanInt(value);
     options.frequency = Options::kDefaultFrequency;
     if (value == nullptr) {
         std::fprintf(stderr, "Run frequency is missing. A default of %d secs will be used.\n",
                      Options::kDefaultFrequency);
-    } else if (!scanInt(value, seconds) || seconds < kMinFrequency || seconds > kMaxFrequency) {
+    } else if (!seconds || *seconds < kMinFrequency || *seconds > kMaxFrequency) {
         std::fprintf(
             stderr,
             "Run frequency is %s. It must be between %d and %d seconds. A default of %d secs will be used.\n",
             value, kMinFrequency, kMaxFrequency, Options::kDefaultFrequency);
     } else {
-        options.frequency = seconds;
+        options.frequency = *seconds;
     }
 }
 
 void readSeverity(const char* value, Options& options) {
-    int severity = 0;
+    const auto severity = scanInt(value);
     options.severity = Options::kDefaultSeverity;
     if (value == nullptr) {
         std::fprintf(stderr, "Severity level is missing. A default of %d will be used.\n",
                      Options::kDefaultSeverity);
-    } else if (!scanInt(value, severity) || severity < 0 || severity > kMaxSeverity) {
+    } else if (!severity || *severity < 0 || *severity > kMaxSeverity) {
         std::fprintf(stderr, "Invalid syslog severity %s. Default %d shall be used.\n", value,
                      Options::kDefaultSeverity);
     } else {
-        options.severity = severity;
+        options.severity = *severity;
     }
 }
 
@@ -62,42 +62,42 @@ void readUnmapAll(const char* /*value*/, Options& options) {
 }
 
 void readDnsCheckInterval(const char* value, Options& options) {
-    std::int64_t seconds = 0;
+    const auto seconds = scanInt64(value);
     options.dnsCheckInterval = Options::kDefaultDnsCheckInterval;
     if (value == nullptr) {
         std::fprintf(stderr, "DNS check interval is missing. A default of %jd secs will be used.\n",
                      Options::kDefaultDnsCheckInterval);
-    } else if (!scanInt64(value, seconds) || seconds <= 0) {
+    } else if (seconds.value_or(0) <= 0) {
         std::fprintf(
             stderr,
             "DNS check interval is %s which is not valid.  A default of %jd secs will be used.\n",
             value, Options::kDefaultDnsCheckInterval);
     } else {
-        options.dnsCheckInterval = seconds;
+        options.dnsCheckInterval = *seconds;
     }
 }
 
 void readPortMapLifetime(const char* value, Options& options) {
-    unsigned seconds = 0;
+    const auto seconds = scanUnsigned(value);
     if (value == nullptr) {
         std::fputs("NAT-PMP port mapping lifetime is missing.\n", stderr);
-    } else if (!scanUnsigned(value, seconds) || seconds == 0) {
+    } else if (seconds.value_or(0) == 0) {
         std::fprintf(stderr, "NAT-PMP port mapping lifetime is %s which is not valid.\n", value);
     } else {
-        options.portMapLifetime = seconds;
+        options.portMapLifetime = *seconds;
     }
 }
 
 void readPublicIpCheckInterval(const char* value, Options& options) {
-    int seconds = 0;
+    const auto seconds = scanInt(value);
     if (value == nullptr) {
         std::fputs("Manual port forward public IP check interval is missing.\n", stderr);
-    } else if (!scanInt(value, seconds) || seconds <= 0) {
+    } else if (seconds.value_or(0) <= 0) {
         std::fprintf(stderr,
                      "Manual port forward public IP check interval is %s which is not valid.\n",
                      value);
     } else {
-        options.publicIpCheckInterval = seconds;
+        options.publicIpCheckInterval = *seconds;
     }
 }
 

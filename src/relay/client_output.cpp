@@ -16,9 +16,9 @@ std::optional<std::string> readAddress(const char* text) {
     std::string address;
     for (int part = 0; part < kAddressParts; ++part) {
         if (part > 0 && *text++ != '.') return std::nullopt;
-        int number = 0;
-        if (!scanInt(text, number) || number < 0) return std::nullopt;
-        address += (part > 0 ? "." : "") + std::to_string(number);
+        const auto number = scanInt(text);
+        if (number.value_or(-1) < 0) return std::nullopt;
+        address += (part > 0 ? "." : "") + std::to_string(*number);
         text += std::strspn(text, " \t\n\v\f\r+-");
         text += std::strspn(text, "0123456789");
     }

@@ -23,7 +23,7 @@ template <std::size_t Size>
 class ReplyText {
 public:
     [[nodiscard]] char* buffer() { return bytes.data(); }
-    [[nodiscard]] std::string text() const { return bytes.data(); }
+    [[nodiscard]] std::string text() const { return std::string{bytes.data()}; }
 
 private:
     std::array<char, Size + 1> bytes{};

@@ -22,16 +22,14 @@ bool isKnownProtocol(const std::string& protocol) {
 }
 
 int portNumber(const std::string& text) {
-    int port = kNoPort;
-    return scanInt(text.c_str(), port) ? port : kNoPort;
+    return scanInt(text.c_str()).value_or(kNoPort);
 }
 
 // Whether an address can be that of another host: it is dotted and does not end in 0.
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
-    std::int64_t last = 0;
-    return scanInt64(client.c_str() + dot + 1, last) && last != 0;
+    return scanInt64(client.c_str() + dot + 1).value_or(0) != 0;
 }
 
 }  // namespace

@@ -6,24 +6,6 @@
 #include <cerrno>
 #include <csignal>
 
-using pelorus::support::FakeCommands;
-
-extern "C" {
-int __real_system(const char* command);
-
-int __wrap_system(const char* command) {
-    return FakeCommands::get().runSystem(command);
-}
-
-std::FILE* __wrap_popen(const char* command, const char* mode) {
-    return FakeCommands::get().openPipe(command, mode);
-}
-
-int __wrap_pclose(std::FILE* pipe) {
-    return FakeCommands::get().closePipe(pipe);
-}
-}
-
 namespace pelorus::support {
 
 FakeCommands::Answer FakeCommands::run(const char* command) {
@@ -38,33 +20,39 @@ FakeCommands::Answer FakeCommands::run(const char* command) {
     return answer;
 }
 
-int FakeCommands::runSystem(const char* command) {
-    const Answer answer = run(command);
-    if (std::string{command}.find(realPart) != std::string::npos) return __real_system(command);
+void FakeCommands::checkClosed() const {
+    EXPECT_TRUE(openPipes.empty()) << "pipes left open: " << openPipes.size();
+}
+
+extern "C" {
+int __real_system(const char* command);
+
+int __wrap_system(const char* command) {
+    FakeCommands& fake = FakeCommands::get();
+    const FakeCommands::Answer answer = fake.run(command);
+    if (std::string{command}.find(fake.realPart) != std::string::npos) {
+        return __real_system(command);
+    }
     return answer.fails ? -1 : W_EXITCODE(answer.exitStatus, 0);
 }
 
-std::FILE* FakeCommands::openPipe(const char* command, const char* mode) {
+std::FILE* __wrap_popen(const char* command, const char* mode) {
     EXPECT_STREQ(mode, "re") << "pipe of: " << command;
-    const Answer answer = run(command);
+    const FakeCommands::Answer answer = FakeCommands::get().run(command);
     errno = EMFILE;
     if (answer.fails) return nullptr;
     std::FILE* pipe = std::tmpfile();
     std::fwrite(answer.output.data(), 1, answer.output.size(), pipe);
     std::rewind(pipe);
-    openPipes.emplace(pipe, answer.exitStatus);
+    FakeCommands::get().openPipes.emplace(pipe, answer.exitStatus);
     return pipe;
 }
 
-int FakeCommands::closePipe(std::FILE* pipe) {
-    const int status = openPipes.at(pipe);
-    openPipes.erase(pipe);
+int __wrap_pclose(std::FILE* pipe) {
+    const auto open = FakeCommands::get().openPipes.extract(pipe);
     std::fclose(pipe);
-    return W_EXITCODE(status, 0);
+    return W_EXITCODE(open.mapped(), 0);
 }
-
-void FakeCommands::checkClosed() const {
-    EXPECT_TRUE(openPipes.empty()) << "pipes left open: " << openPipes.size();
 }
 
 }  // namespace pelorus::support

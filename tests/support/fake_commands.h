@@ -32,16 +32,10 @@ public:
     [[nodiscard]] const std::vector<std::string>& lines() const { return asked; }
     /// Fails the test when a pipe was not closed with pclose.
     void checkClosed() const;
-
-    int runSystem(const char* command);
-    std::FILE* openPipe(const char* command, const char* mode);
-    int closePipe(std::FILE* pipe);
-
-private:
     Answer run(const char* command);
 
-    std::map<std::FILE*, int> openPipes;  // with the exit status
-    std::string realPart = "\n";          // in no command
+    std::map<std::FILE*, int> openPipes;  ///< with the exit status
+    std::string realPart = "\n";          ///< in no command
 };
 
 }  // namespace pelorus::support

@@ -39,12 +39,6 @@ public:
     /// Fails the test when a list was not released.
     void checkReleased() const;
 
-    int takeInterfaces(ifaddrs** list);
-    int lookUp(const char* name, const addrinfo* hints, addrinfo** list);
-    void release(void* list);
-    int takeHostname(char* name, std::size_t size) const;
-
-private:
     std::vector<Interface> interfaces{{"lo", "127.0.0.1", IFF_UP | IFF_RUNNING | IFF_LOOPBACK},
                                       {"eth0", "192.168.77.10"}};
     bool interfacesFail = false;
@@ -52,7 +46,7 @@ private:
     bool hostnameFails = false;
     std::map<std::string, std::vector<std::string>> names;
     std::vector<std::string> asked;
-    std::map<void*, std::shared_ptr<void>> lists;  // by their first entry
+    std::map<void*, std::shared_ptr<void>> lists;  ///< not yet released, by their first entry
 };
 
 }  // namespace pelorus::support

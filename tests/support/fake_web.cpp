@@ -20,74 +20,34 @@ FakeWeb::Answer FakeWeb::ask(const std::string& url) {
     return answer;
 }
 
-CURL* FakeWeb::open() {
-    EXPECT_GT(globalInits, 0) << "libcurl is not initialised";
-    EXPECT_FALSE(isOpen) << "another easy handle is open";
-    if (handlesFail) return nullptr;
-    transfer = {};
-    isOpen = true;
-    return &transfer;
-}
-
 FakeWeb::Transfer& FakeWeb::transferOf(CURL* handle) {
     EXPECT_TRUE(isOpen && handle == &transfer) << "not an open easy handle";
     return transfer;
 }
 
-void FakeWeb::close(CURL* handle) {
-    transferOf(handle);
-    isOpen = false;
-}
-
-CURLcode FakeWeb::perform(CURL* handle) {
-    const Transfer& now = transferOf(handle);
-    if (now.url.empty()) return CURLE_URL_MALFORMAT;
-    Answer answer = ask(now.url);
-    constexpr std::size_t kPieceSize = 1000;  // bytes
-    for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
-        const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
-        if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
-            return CURLE_WRITE_ERROR;
-        }
-    }
-    return answer.result;
-}
-
-void* FakeWeb::wget(const std::string& url, int* size) {
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
-    *size = 0;
-    if (url.empty()) return nullptr;
-    const Answer answer = ask(url);
-    if (answer.result != CURLE_OK) return nullptr;
-    // Without a terminator: the sanitizers catch whoever reads one.
-    void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
-    std::copy(answer.body.begin(), answer.body.end(), static_cast<char*>(block));
-    *size = static_cast<int>(answer.body.size());
-    return block;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeWeb;
-
 extern "C" {
 CURLcode __wrap_curl_global_init(long /*flags*/) {
-    ++FakeWeb::get().globalInits;
+    ++FakeWeb::globalInits;
     return FakeWeb::get().globalInitFails ? CURLE_FAILED_INIT : CURLE_OK;
 }
 
 void __wrap_curl_global_cleanup() {
-    --FakeWeb::get().globalInits;
+    --FakeWeb::globalInits;
 }
 
 CURL* __wrap_curl_easy_init() {
-    return FakeWeb::get().open();
+    FakeWeb& web = FakeWeb::get();
+    EXPECT_GT(web.globalInits, 0) << "libcurl is not initialised";
+    EXPECT_FALSE(web.isOpen) << "another easy handle is open";
+    if (web.handlesFail) return nullptr;
+    web.transfer = {};
+    web.isOpen = true;
+    return &web.transfer;
 }
 
 void __wrap_curl_easy_cleanup(CURL* handle) {
-    FakeWeb::get().close(handle);
+    FakeWeb::get().transferOf(handle);
+    FakeWeb::get().isOpen = false;
 }
 
 // An enum in front of the dots would be promoted, which va_start does not allow.
@@ -114,7 +74,17 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
 }
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
-    return FakeWeb::get().perform(handle);
+    const FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
+    if (now.url.empty()) return CURLE_URL_MALFORMAT;
+    FakeWeb::Answer answer = FakeWeb::get().ask(now.url);
+    constexpr std::size_t kPieceSize = 1000;  // bytes
+    for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
+        const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
+        if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
+            return CURLE_WRITE_ERROR;
+        }
+    }
+    return answer.result;
 }
 
 #if MINIUPNPC_API_VERSION >= 16
@@ -122,6 +92,19 @@ void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* /*s
 #else
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
 #endif
-    return FakeWeb::get().wget(url, size);
+    sigset_t mask;
+    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
+    *size = 0;
+    if (*url == '\0') return nullptr;
+    const FakeWeb::Answer answer = FakeWeb::get().ask(url);
+    if (answer.result != CURLE_OK) return nullptr;
+    // Without a terminator: the sanitizers catch whoever reads one.
+    void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
+    std::copy(answer.body.begin(), answer.body.end(), static_cast<char*>(block));
+    *size = static_cast<int>(answer.body.size());
+    return block;
 }
 }
+
+}  // namespace pelorus::support

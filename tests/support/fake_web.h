@@ -52,13 +52,7 @@ public:
         curl_write_callback writer = nullptr;
         void* context = nullptr;
     };
-    CURL* open();
-    void close(CURL* handle);
     Transfer& transferOf(CURL* handle);
-    CURLcode perform(CURL* handle);
-    void* wget(const std::string& url, int* size);
-
-private:
     Answer ask(const std::string& url);
 
     Transfer transfer;

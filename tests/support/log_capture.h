@@ -2,6 +2,7 @@
 #ifndef PELORUS_SUPPORT_LOG_CAPTURE_H
 #define PELORUS_SUPPORT_LOG_CAPTURE_H
 
+#include <gtest/gtest.h>
 #include <syslog.h>
 
 #include <functional>
@@ -11,12 +12,17 @@
 
 namespace pelorus::support {
 
+/// The priority, and the text as handed to syslog, final newline included.
 struct LogLine {
     int priority;
-    std::string text;  ///< as handed to syslog, final newline included
+    std::string text;
+    bool operator==(const LogLine& other) const {
+        return priority == other.priority && text == other.text;
+    }
+    friend void PrintTo(const LogLine& line, std::ostream* out) {
+        *out << "<" << line.priority << "> " << ::testing::PrintToString(line.text);
+    }
 };
-bool operator==(const LogLine& left, const LogLine& right);
-void PrintTo(const LogLine& line, std::ostream* out);
 
 /// A line that holds a secret fails the test. So does one that is sent while another is being
 /// sent: with the real log it would wait for a lock for ever.
@@ -33,7 +39,7 @@ public:
     void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
     void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
-    void addSecret(const std::string& secret);
+    void addSecret(const std::string& secret) { secrets.push_back(secret); }
     void take(const LogLine& line);
 
     std::vector<std::string> setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
@@ -50,7 +56,9 @@ void expectLogged(int priority, const std::string& text);
 /// Fails unless these lines came in this order, others possibly between them.
 void expectLoggedInOrder(const std::vector<std::string>& texts);
 /// Fails unless the lines are exactly these.
-void expectLogIs(const std::vector<LogLine>& lines);
+inline void expectLogIs(const std::vector<LogLine>& lines) {
+    EXPECT_EQ(LogCapture::get().lines(), lines);
+}
 
 }  // namespace pelorus::support
 

@@ -45,10 +45,6 @@ bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
     return false;
 }
 
-}  // namespace pelorus::support
-
-using pelorus::support::VirtualClock;
-
 extern "C" {
 unsigned __real_sleep(unsigned seconds);
 
@@ -78,3 +74,5 @@ int __wrap_ppoll(pollfd* /*fds*/, nfds_t count, const timespec* timeout, const s
     return -1;
 }
 }
+
+}  // namespace pelorus::support

@@ -21,12 +21,9 @@ TEST_F(HttpClientTest, AnAnswerIsKeptAsFarAsItCameAndFits) {
     const std::string large = std::string(10000, 'a') + std::string(238, 'b');
     web.answer("/x", large);
     EXPECT_EQ(get(), large);
-    EXPECT_EQ(web.options(), (FakeWeb::Options{{CURLOPT_TIMEOUT_MS, "30000"},
-                                               {CURLOPT_WRITEFUNCTION, ""},
-                                               {CURLOPT_WRITEDATA, ""},
-                                               {CURLOPT_SSLVERSION, "0"},
-                                               {CURLOPT_URL, kUrl},
-                                               {CURLOPT_SSL_VERIFYPEER, "1"}}));
+    // clang-format off
+    EXPECT_EQ(web.options(), (FakeWeb::Options{{CURLOPT_TIMEOUT_MS, "30000"}, {CURLOPT_WRITEFUNCTION, ""}, {CURLOPT_WRITEDATA, ""}, {CURLOPT_SSLVERSION, "0"}, {CURLOPT_URL, kUrl}, {CURLOPT_SSL_VERIFYPEER, "1"}}));
+    // clang-format on
     web.answer("/x", large + "c");
     EXPECT_EQ(get(), "(null)");
     EXPECT_EQ(log.countPart("TavikClient curlRcvData - Buffer overrun detected"), 1);

@@ -2,6 +2,7 @@
 #include <stdexcept>
 
 #include "cloud_fixture.h"
+#include "config/scrub.h"
 
 namespace pelorus {
 namespace {
@@ -52,9 +53,8 @@ TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
         if (*central != '-') asked.push_back(report.localUrl);
         EXPECT_EQ(web.urls(), asked);
         EXPECT_EQ(log.countPart("fail"), error.empty() ? 0 : 1) << log.dump();
-        for (const std::string& part :
-             {error, std::string{"?id=*ID_REMOVED*&"}, std::string{"&auth=*AUTH_REMOVED*"}})
-            EXPECT_GT(log.countPart(part), 0) << part;
+        EXPECT_GT(log.countPart(error), 0) << error;
+        EXPECT_GT(log.countPart(scrubSecrets(report.centralUrl)), 0);
     };
     // clang-format off
     row(kUpdate, "any device-7350142", "a success", true, "");
@@ -83,13 +83,13 @@ TEST_F(ReportsTest, WithoutCredentialsOrTemplatesNobodyIsTold) {
     setConfig("DEVICEID", support::kDeviceId);
     setConfig("DEVICEAUTH", support::kDeviceAuth);
     web.answer("web.kavra.example", "Success");
-    for (const char* key :
+    for (const std::string key :
          {"LOCAL_SETFORWARDURL", "LOCAL_DELFORWARDURL", "LOCAL_SETLOCALIPURL",
           "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"}) {
         setConfig(key, "%n");
         expectFailures();
         client().updateLocalCommStatus(key);
-        EXPECT_GT(log.countPart(std::string{"URL template of "} + key + " asks for more"), 0);
+        EXPECT_GT(log.countPart("URL template of " + key + " asks for more"), 0);
     }
 }
 
@@ -134,7 +134,6 @@ TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
     row("portforwarded", 1, "connected type=portforwarded");
     row("relayed", 1, "connected type=relayed");
     row("failed", 1, "failed type=portforwarded");
-    row("failed", 3, "failed type=disabled");
     row("failed", 5, "failed type=disabled");  // beyond the table
     row("odd", 2, "failed type=disabled");
     EXPECT_EQ(log.countPart("[odd] = NOT_FOUND\n"), 2);

@@ -5,6 +5,7 @@
 
 #include <filesystem>
 
+#include "config/setting_line.h"
 #include "support/fake_files.h"
 #include "support/fixture.h"
 
@@ -39,6 +40,21 @@ protected:
     GlobalConfig& config = *GlobalConfig::getInstance();
     const std::string copy = path("copy.ini");
 };
+
+TEST(SettingLine, IsSplitIntoKeyAndValue) {
+    const char* const rows[][3]{{" \t KEY= \tvalue \t\n", "KEY", "value"},
+                                {"KEY = v", "KEY ", "v"},
+                                {"KEY=\"a \"b\" \"", "KEY", "a \"b"},
+                                {"KEY=\"v\"\r\n", "KEY", "v\"\r"},
+                                {"KEY= \"\" \n", "KEY", ""},
+                                {"=A=b=c", "=A", "b=c"},
+                                {"  =v", "", "v"},
+                                {"KEY\n", "", ""}};
+    for (const auto& [line, key, value] : rows) {
+        EXPECT_EQ(parseSettingLine(line).key, key) << line;
+        EXPECT_EQ(parseSettingLine(line).value, value) << line;
+    }
+}
 
 TEST_F(ConfigTest, TheDynamicFileIsReadDirectlyWithoutACopy) {
     for (const char* none : {"", "DYNAMIC_CONFIG_TMP=empty\n", "DYNAMIC_CONFIG_TMP=\n"}) {

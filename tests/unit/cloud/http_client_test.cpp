@@ -50,6 +50,7 @@ TEST_F(HttpClientTest, WithoutCredentialsTheFirstUseReportsDisabledOnce) {
     EXPECT_EQ(log.countPart("initialize() - failed to read DEVICEID, DEVICEAUTH from"), 1);
     EXPECT_EQ(log.countPart("initialize() returned false, set Comm Status to [disabled]\n"), 1);
     setConfig("DEVICEID", "");
+    setConfig("DEVICEAUTH", support::kDeviceAuth);
     setConfig("DYNAMIC_CONFIG_TMP", path("gone"));  // every read of a setting complains once
     EXPECT_FALSE(TavikClient::getInstance()->initialize());
     EXPECT_EQ(log.countPart("failed to stat TEMP dynamic config file"), 2) << "both are read";

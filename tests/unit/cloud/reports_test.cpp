@@ -102,7 +102,10 @@ TEST_F(ReportsTest, ExceptionsStayInside) {
     web.answer("web.kavra.example", "Success");
     expectFailures();
     client().updateLocalCommStatus("relayed");
-    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1);
+    const auto fail = [](const std::string&) { throw std::runtime_error{"broken"}; };
+    commands.answer("hdparm", FakeCommands::Answer{"", 0, false, fail});
+    EXPECT_EQ(client().checkHddStandByMode(), 1);
+    EXPECT_EQ(log.countPart(" - Throw exception error. **\n"), 1 + 3 + 1 + 1);
 }
 
 TEST_F(ReportsTest, OnlyAChangeOfStatusIsSent) {

@@ -49,7 +49,7 @@ protected:
             return line.find(rule.first) != std::string::npos;
         };
         if (const auto next = std::find_if(once.begin(), once.end(), fits); next != once.end()) {
-            const Answer found = next->second;
+            Answer found = next->second;
             once.erase(next);
             return found;
         }

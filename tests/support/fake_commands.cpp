@@ -15,7 +15,7 @@ FakeCommands::Answer FakeCommands::run(const char* command) {
         EXPECT_EQ(sigismember(&mask, signal), 0)
             << "signal " << signal << " is blocked while this child starts: " << command;
     }
-    const Answer answer = take(command, {});
+    Answer answer = take(command, {});
     if (answer.action) answer.action(command);
     return answer;
 }

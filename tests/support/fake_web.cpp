@@ -15,7 +15,7 @@ void FakeWeb::checkBalance() const {
 }
 
 FakeWeb::Answer FakeWeb::ask(const std::string& url) {
-    const Answer answer = take(url, noAnswer());
+    Answer answer = take(url, noAnswer());
     if (answer.action) answer.action();
     return answer;
 }

@@ -2,12 +2,9 @@
 #ifndef PELORUS_FUZZ_WORLD_H
 #define PELORUS_FUZZ_WORLD_H
 
-#include <cstddef>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <map>
-#include <string>
 
 #include "config/global_config.h"
 #include "support/fixture.h"
@@ -18,7 +15,6 @@ namespace pelorus::fuzz {
 
 using support::kDeviceAuth;
 using support::kDeviceId;
-using support::kSubdomain;
 
 inline std::string asText(const std::uint8_t* data, std::size_t size) {
     return {data, data + size};
@@ -31,31 +27,20 @@ inline void require(bool holds, const char* what) {
     std::abort();
 }
 
-/// Sets the device up at the first call, and begins every input with empty records.
-inline void begin(const std::map<std::string, std::string>& settings) {
-    static bool ready = false;
-    if (!ready) {
-        ready = true;
-        GTEST_FLAG_SET(break_on_failure, true);  // the fakes' own checks end the run, too
-        auto* config = GlobalConfig::getInstance();
-        config->setProperty("DEVICEID", kDeviceId, false);
-        config->setProperty("DEVICEAUTH", kDeviceAuth, false);
-        config->setProperty("SUBDOMAIN", kSubdomain, false);
-        for (const auto& [key, value] : settings) config->setProperty(key, value, false);
-    }
+/// Begins every input with empty records, on a device of the given type.
+inline void begin(const char* deviceType) {
+    GTEST_FLAG_SET(break_on_failure, true);  // the fakes' own checks end the run, too
+    auto* config = GlobalConfig::getInstance();
+    config->setProperty("DEVICETYPE", deviceType, false);
+    config->setProperty("DEVICEID", kDeviceId, false);
+    config->setProperty("DEVICEAUTH", kDeviceAuth, false);
     support::LogCapture::get().reset();
-    for (const char* secret : {kDeviceId, kDeviceAuth, kSubdomain}) {
-        support::LogCapture::get().addSecret(secret);
-    }
     support::VirtualClock::get().reset();
     support::FakeCommands::get().reset();
     support::FakeNet::get().reset();
-}
-
-/// The standing checks of every input.
-inline void finish() {
-    support::FakeCommands::get().checkClosed();
-    support::FakeNet::get().checkReleased();
+    for (const char* secret : {kDeviceId, kDeviceAuth}) {
+        support::LogCapture::get().addSecret(secret);
+    }
 }
 
 }  // namespace pelorus::fuzz

@@ -5,7 +5,7 @@
 
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     using namespace pelorus;
-    fuzz::begin({{"DEVICETYPE", "5"}});
+    fuzz::begin("5");
     support::FakeGateway::get().reset();
     auto& commands = support::FakeCommands::get();
     commands.answer("tavik_helper.sh list", fuzz::asText(data, size));
@@ -25,6 +25,6 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
         fuzz::require(line.find_first_of(";|&$`\n<>(){}\\") == std::string::npos,
                       "a harmless command");
     }
-    fuzz::finish();
+    commands.checkClosed();
     return 0;
 }

@@ -10,25 +10,6 @@
 #include <cstdio>
 #include <cstring>
 
-namespace pelorus::support {
-
-FakeFiles& FakeFiles::get() {
-    static FakeFiles instance;
-    return instance;
-}
-
-const char* FakeFiles::target(const char* path) {
-    const auto found = targets.find(path);
-    return found == targets.end() ? path : found->second.c_str();
-}
-
-FakeProcess& FakeProcess::get() {
-    static FakeProcess instance;
-    return instance;
-}
-
-}  // namespace pelorus::support
-
 using pelorus::support::FakeFiles;
 using pelorus::support::FakeProcess;
 
@@ -47,7 +28,6 @@ void checkCloseOnExec(bool closes, const char* path) {
 
 }  // namespace
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 std::FILE* __real_fopen(const char* path, const char* mode);
 pid_t __real_fork();
@@ -89,4 +69,3 @@ int __wrap_kill(pid_t pid, int signal) {
     return process.killForReal ? __real_kill(pid, signal) : 0;
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)

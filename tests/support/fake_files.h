@@ -1,41 +1,35 @@
 // Files and process of a test: fopen, open, fork, setsid, chdir and kill pass through here. They
-// mostly do what they say. A file that is opened without close-on-exec fails the test: a child process
-// would inherit it.
+// mostly do what they say. A file that is opened without close-on-exec fails the test: a child
+// process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 
 #include <map>
 #include <set>
-#include <string>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
-/// The count of minutes that tells whether the disk may sleep. Missing until redirected, whatever the
-/// machine has there.
+/// The count of minutes that tells whether the disk may sleep. Missing until redirected, whatever
+/// the machine has there.
 inline constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 
 /// Paths that are the same on every machine lead to files of the test.
-class FakeFiles {
+class FakeFiles : public Single<FakeFiles> {
 public:
-    static FakeFiles& get();
-
-    /// Opens @p target (see PelorusTest::path and writeFile) in place of @p path; an empty target is a
-    /// missing file.
+    /// Opens @p target in place of @p path; an empty target is a missing file.
     void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
-    void reset() { *this = FakeFiles{}; }
-    /// What to open for @p path.
-    const char* target(const char* path);
+    const char* target(const char* path) {
+        const auto found = targets.find(path);
+        return found == targets.end() ? path : found->second.c_str();
+    }
 
 private:
-    FakeFiles() = default;
-
     std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
 };
 
-struct FakeProcess {
-    static FakeProcess& get();
-
+struct FakeProcess : Single<FakeProcess> {
     std::set<std::string> failing;  ///< of "fork", "setsid", "chdir"
     std::vector<int> selfKills;     ///< signals this process sent to itself
     bool killForReal = false;       ///< also delivers those

@@ -9,16 +9,6 @@
 #include <cstring>
 #include <deque>
 
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
-extern "C" {
-int __real_getaddrinfo(const char* name,
-                       const char* service,
-                       const addrinfo* hints,
-                       addrinfo** list);
-void __real_freeaddrinfo(addrinfo* list);
-}
-// NOLINTEND(bugprone-reserved-identifier)
-
 namespace pelorus::support {
 
 namespace {
@@ -48,26 +38,38 @@ sockaddr* parse(const std::string& text, sockaddr_storage& address) {
 
 }  // namespace
 
-FakeNet& FakeNet::get() {
-    static FakeNet instance;
-    return instance;
-}
-
 void FakeNet::checkReleased() const {
     EXPECT_TRUE(lists.empty()) << "address lists kept: " << lists.size();
 }
 
-void FakeNet::release(void* list) {
-    const bool known = lists.erase(list) == 1;
-    EXPECT_TRUE(known || list == nullptr) << "released a list that was not given, or twice";
+extern "C" {
+// clang-format off
+int __real_getaddrinfo(const char* name, const char* service, const addrinfo* hints, addrinfo** list);
+void __real_freeaddrinfo(addrinfo* list);
+
+int __wrap_getaddrinfo(const char* name, const char* /*service*/, const addrinfo* hints, addrinfo** list) {
+    // clang-format on
+    FakeNet& net = FakeNet::get();
+    addrinfo numeric = hints != nullptr ? *hints : addrinfo{};
+    numeric.ai_flags = AI_NUMERICHOST;
+    *list = nullptr;
+    addrinfo** end = list;
+    for (const std::string& address : net.names[net.asked.emplace_back(name)]) {
+        if (__real_getaddrinfo(address.c_str(), nullptr, &numeric, end) != 0) *end = nullptr;
+        while (*end != nullptr) end = &(*end)->ai_next;
+    }
+    if (*list == nullptr) return EAI_NONAME;
+    net.lists[*list] = nullptr;
+    return 0;
 }
 
-int FakeNet::takeInterfaces(ifaddrs** list) {
+int __wrap_getifaddrs(ifaddrs** list) {
+    FakeNet& net = FakeNet::get();
     errno = ENOMEM;
     *list = nullptr;
-    if (interfacesFail) return -1;
+    if (net.interfacesFail) return -1;
     const auto made = std::make_shared<std::deque<Node>>();
-    for (auto next = interfaces.rbegin(); next != interfaces.rend(); ++next) {
+    for (auto next = net.interfaces.rbegin(); next != net.interfaces.rend(); ++next) {
         auto& node = made->emplace_front();
         node.name = next->name;
         node.entry.ifa_next = *list;
@@ -76,60 +78,28 @@ int FakeNet::takeInterfaces(ifaddrs** list) {
         node.entry.ifa_addr = parse(next->address, node.address);
         *list = &node.entry;
     }
-    if (*list != nullptr) lists[*list] = made;
+    if (*list != nullptr) net.lists[*list] = made;
     return 0;
-}
-
-int FakeNet::lookUp(const char* name, const addrinfo* hints, addrinfo** list) {
-    addrinfo numeric = hints != nullptr ? *hints : addrinfo{};
-    numeric.ai_flags = AI_NUMERICHOST;
-    *list = nullptr;
-    addrinfo** end = list;
-    for (const std::string& address : names[asked.emplace_back(name)]) {
-        if (__real_getaddrinfo(address.c_str(), nullptr, &numeric, end) != 0) *end = nullptr;
-        while (*end != nullptr) end = &(*end)->ai_next;
-    }
-    if (*list == nullptr) return EAI_NONAME;
-    lists[*list] = nullptr;
-    return 0;
-}
-
-int FakeNet::takeHostname(char* name, std::size_t size) const {
-    errno = EPERM;
-    if (hostnameFails) return -1;
-    // Like libc: no terminator where the name fills the buffer.
-    std::memcpy(name, hostname.c_str(), std::min(size, hostname.size() + 1));
-    return size > hostname.size() ? 0 : -1;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeNet;
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
-extern "C" {
-int __wrap_getifaddrs(ifaddrs** list) {
-    return FakeNet::get().takeInterfaces(list);
 }
 
 void __wrap_freeifaddrs(ifaddrs* list) {
-    FakeNet::get().release(list);
-}
-
-int __wrap_getaddrinfo(const char* name,
-                       const char* /*service*/,
-                       const addrinfo* hints,
-                       addrinfo** list) {
-    return FakeNet::get().lookUp(name, hints, list);
+    const bool known = FakeNet::get().lists.erase(list) == 1;
+    EXPECT_TRUE(known || list == nullptr) << "released a list that was not given, or twice";
 }
 
 void __wrap_freeaddrinfo(addrinfo* list) {
-    FakeNet::get().release(list);
+    const bool known = FakeNet::get().lists.erase(list) == 1;
+    EXPECT_TRUE(known || list == nullptr) << "released a list that was not given, or twice";
     __real_freeaddrinfo(list);
 }
 
 int __wrap_gethostname(char* name, std::size_t size) {
-    return FakeNet::get().takeHostname(name, size);
+    const FakeNet& net = FakeNet::get();
+    errno = EPERM;
+    if (net.hostnameFails) return -1;
+    // Like libc: no terminator where the name fills the buffer.
+    std::memcpy(name, net.hostname.c_str(), std::min(size, net.hostname.size() + 1));
+    return size > net.hostname.size() ? 0 : -1;
 }
 
 // The one call of libcurl without a world behind it; a build without the library links too.
@@ -138,4 +108,5 @@ const char* __wrap_curl_easy_strerror(int code) {
     return code == kTimedOut ? "Timeout was reached" : "Another error";
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)
+
+}  // namespace pelorus::support

@@ -9,13 +9,12 @@
 
 #include <map>
 #include <memory>
-#include <string>
-#include <utility>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
-class FakeNet {
+class FakeNet : public Single<FakeNet> {
 public:
     struct Interface {
         std::string name;
@@ -23,8 +22,6 @@ public:
         std::string address;
         unsigned flags = IFF_UP | IFF_RUNNING;
     };
-
-    static FakeNet& get();
 
     /// The entries of getifaddrs, in order.
     void setInterfaces(std::vector<Interface> list) { interfaces = std::move(list); }
@@ -39,18 +36,8 @@ public:
     }
     /// The names that were looked up so far.
     [[nodiscard]] const std::vector<std::string>& lookups() const { return asked; }
-
     /// Fails the test when a list was not released.
     void checkReleased() const;
-    void reset() { *this = FakeNet{}; }
-
-    int takeInterfaces(ifaddrs** list);
-    int lookUp(const char* name, const addrinfo* hints, addrinfo** list);
-    void release(void* list);
-    int takeHostname(char* name, std::size_t size) const;
-
-private:
-    FakeNet() = default;
 
     std::vector<Interface> interfaces{{"lo", "127.0.0.1", IFF_UP | IFF_RUNNING | IFF_LOOPBACK},
                                       {"eth0", "192.168.77.10"}};
@@ -59,7 +46,7 @@ private:
     bool hostnameFails = false;
     std::map<std::string, std::vector<std::string>> names;
     std::vector<std::string> asked;
-    std::map<void*, std::shared_ptr<void>> lists;  // by their first entry
+    std::map<void*, std::shared_ptr<void>> lists;  ///< not yet released, by their first entry
 };
 
 }  // namespace pelorus::support

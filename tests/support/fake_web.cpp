@@ -4,72 +4,20 @@
 #include <miniupnpc/miniupnpc.h>
 #include <miniupnpc/miniwget.h>
 
-#include <algorithm>
 #include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 
 namespace pelorus::support {
 
-namespace {
-
-constexpr std::size_t kPieceSize = 1000;  // bytes
-
-bool holds(const std::string& url, const std::string& part) {
-    return url.find(part) != std::string::npos;
-}
-
-}  // namespace
-
-// Never destroyed: the client under test cleans libcurl up at the end of the process.
-FakeWeb& FakeWeb::get() {
-    static auto* const instance = new FakeWeb;
-    return *instance;
-}
-
-void FakeWeb::answer(const std::string& part, Answer answer) {
-    rules.emplace_back(part, std::move(answer));
-}
-
-void FakeWeb::answerOnce(const std::string& part, Answer answer) {
-    once.emplace_back(part, std::move(answer));
-}
-
-int FakeWeb::count(const std::string& part) const {
-    return static_cast<int>(std::count_if(
-        asked.begin(), asked.end(), [&](const std::string& url) { return holds(url, part); }));
-}
-
 void FakeWeb::checkBalance() const {
     EXPECT_FALSE(isOpen) << "easy handle not cleaned up";
 }
 
-void FakeWeb::reset() {
-    const int initialised = globalInits;
-    *this = FakeWeb{};
-    globalInits = initialised;
-}
-
-FakeWeb::Answer FakeWeb::take(const std::string& url) {
-    asked.push_back(url);
-    const auto fits = [&](const auto& rule) { return holds(url, rule.first); };
-    const auto next = std::find_if(once.begin(), once.end(), fits);
-    if (next != once.end()) {
-        Answer found = std::move(next->second);
-        once.erase(next);
-        return found;
-    }
-    const auto rule = std::find_if(rules.rbegin(), rules.rend(), fits);
-    return rule == rules.rend() ? noAnswer() : rule->second;
-}
-
-CURL* FakeWeb::open() {
-    EXPECT_GT(globalInits, 0) << "libcurl is not initialised";
-    EXPECT_FALSE(isOpen) << "another easy handle is open";
-    if (handlesFail) return nullptr;
-    transfer = {};
-    isOpen = true;
-    return &transfer;
+FakeWeb::Answer FakeWeb::ask(const std::string& url) {
+    Answer answer = take(url, noAnswer());
+    if (answer.action) answer.action();
+    return answer;
 }
 
 FakeWeb::Transfer& FakeWeb::transferOf(CURL* handle) {
@@ -77,62 +25,29 @@ FakeWeb::Transfer& FakeWeb::transferOf(CURL* handle) {
     return transfer;
 }
 
-void FakeWeb::close(CURL* handle) {
-    transferOf(handle);
-    isOpen = false;
-}
-
-CURLcode FakeWeb::perform(CURL* handle) {
-    const Transfer& now = transferOf(handle);
-    if (now.url.empty()) return CURLE_URL_MALFORMAT;
-    Answer answer = take(now.url);
-    if (answer.action) answer.action();
-    for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
-        const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
-        if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
-            return CURLE_WRITE_ERROR;
-        }
-    }
-    return answer.result;
-}
-
-void* FakeWeb::wget(const std::string& url, int* size) {
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
-    *size = 0;
-    if (url.empty()) return nullptr;
-    const Answer answer = take(url);
-    if (answer.action) answer.action();
-    if (answer.result != CURLE_OK) return nullptr;
-    // Without a terminator: the sanitizers catch whoever reads one.
-    void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
-    std::copy(answer.body.begin(), answer.body.end(), static_cast<char*>(block));
-    *size = static_cast<int>(answer.body.size());
-    return block;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeWeb;
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 CURLcode __wrap_curl_global_init(long /*flags*/) {
-    ++FakeWeb::get().globalInits;
+    ++FakeWeb::globalInits;
     return FakeWeb::get().globalInitFails ? CURLE_FAILED_INIT : CURLE_OK;
 }
 
 void __wrap_curl_global_cleanup() {
-    --FakeWeb::get().globalInits;
+    --FakeWeb::globalInits;
 }
 
 CURL* __wrap_curl_easy_init() {
-    return FakeWeb::get().open();
+    FakeWeb& web = FakeWeb::get();
+    EXPECT_GT(web.globalInits, 0) << "libcurl is not initialised";
+    EXPECT_FALSE(web.isOpen) << "another easy handle is open";
+    if (web.handlesFail) return nullptr;
+    web.transfer = {};
+    web.isOpen = true;
+    return &web.transfer;
 }
 
 void __wrap_curl_easy_cleanup(CURL* handle) {
-    FakeWeb::get().close(handle);
+    FakeWeb::get().transferOf(handle);
+    FakeWeb::get().isOpen = false;
 }
 
 // An enum in front of the dots would be promoted, which va_start does not allow.
@@ -159,7 +74,17 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
 }
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
-    return FakeWeb::get().perform(handle);
+    const FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
+    if (now.url.empty()) return CURLE_URL_MALFORMAT;
+    FakeWeb::Answer answer = FakeWeb::get().ask(now.url);
+    constexpr std::size_t kPieceSize = 1000;  // bytes
+    for (std::size_t at = 0; at < answer.body.size(); at += kPieceSize) {
+        const std::size_t piece = std::min(kPieceSize, answer.body.size() - at);
+        if (now.writer(answer.body.data() + at, 1, piece, now.context) != piece) {
+            return CURLE_WRITE_ERROR;
+        }
+    }
+    return answer.result;
 }
 
 #if MINIUPNPC_API_VERSION >= 16
@@ -167,7 +92,19 @@ void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* /*s
 #else
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
 #endif
-    return FakeWeb::get().wget(url, size);
+    sigset_t mask;
+    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
+    *size = 0;
+    if (*url == '\0') return nullptr;
+    const FakeWeb::Answer answer = FakeWeb::get().ask(url);
+    if (answer.result != CURLE_OK) return nullptr;
+    // Without a terminator: the sanitizers catch whoever reads one.
+    void* block = std::malloc(std::max<std::size_t>(answer.body.size(), 1));
+    std::copy(answer.body.begin(), answer.body.end(), static_cast<char*>(block));
+    *size = static_cast<int>(answer.body.size());
+    return block;
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)
+
+}  // namespace pelorus::support

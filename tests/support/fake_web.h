@@ -9,54 +9,42 @@
 #include <curl/curl.h>
 
 #include <functional>
-#include <string>
-#include <utility>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
-class FakeWeb {
-public:
-    struct Answer {
-        Answer(const char* text) : body{text} {}            // NOLINT(google-explicit-constructor)
-        Answer(std::string text, CURLcode code = CURLE_OK)  // NOLINT(google-explicit-constructor)
-            : body{std::move(text)}, result{code} {}
+struct WebAnswer {
+    WebAnswer(const char* text) : body{text} {}            // NOLINT(google-explicit-constructor)
+    WebAnswer(std::string text, CURLcode code = CURLE_OK)  // NOLINT(google-explicit-constructor)
+        : body{std::move(text)}, result{code} {}
 
-        std::string body;  ///< delivered in pieces of 1000 bytes
-        /// What curl_easy_perform returns after the body; any error is no answer of miniwget.
-        CURLcode result = CURLE_OK;
-        std::function<void()> action{};  ///< runs before the body is delivered; may throw
-    };
+    std::string body;  ///< delivered in pieces of 1000 bytes
+    /// What curl_easy_perform returns after the body; any error is no answer of miniwget.
+    CURLcode result = CURLE_OK;
+    std::function<void()> action{};  ///< runs before the body is delivered; may throw
+};
+
+/// What nobody answers cannot be reached.
+class FakeWeb : public Single<FakeWeb>, public Script<WebAnswer> {
+public:
+    using Answer = WebAnswer;
     /// Numbers in decimal, texts as they are, empty for pointers.
     using Options = std::vector<std::pair<CURLoption, std::string>>;
 
-    static FakeWeb& get();
     /// A server that cannot be reached.
     static Answer noAnswer() { return {"", CURLE_COULDNT_CONNECT}; }
 
-    /// Answers every URL that holds @p part; a later rule goes before an earlier one. What nobody
-    /// answers cannot be reached.
-    void answer(const std::string& part, Answer answer);
-    /// Answers one URL that holds @p part, before any standing rule; several in the order given.
-    void answerOnce(const std::string& part, Answer answer);
-
     /// All URLs asked for, central and local, in order, but for empty ones.
     [[nodiscard]] const std::vector<std::string>& urls() const { return asked; }
-    /// How many of them hold @p part.
-    [[nodiscard]] int count(const std::string& part) const;
-    /// Forgets the URLs, not the answers.
-    void clear() { asked.clear(); }
     /// The options of the last transfer in the order in which they were set.
     [[nodiscard]] const Options& options() const { return transfer.options; }
-
     /// Fails the test when the easy handle was not cleaned up.
     void checkBalance() const;
-    /// Forgets everything but that libcurl was initialised.
-    void reset();
 
     bool handlesFail = false;
     bool globalInitFails = false;
-    int globalInits = 0;  ///< minus the clean-ups
+    static inline int globalInits = 0;  ///< minus the clean-ups
 
     struct Transfer {
         Options options;
@@ -64,21 +52,9 @@ public:
         curl_write_callback writer = nullptr;
         void* context = nullptr;
     };
-    CURL* open();
-    void close(CURL* handle);
     Transfer& transferOf(CURL* handle);
-    CURLcode perform(CURL* handle);
-    void* wget(const std::string& url, int* size);
+    Answer ask(const std::string& url);
 
-private:
-    using Rules = std::vector<std::pair<std::string, Answer>>;
-
-    FakeWeb() = default;
-    Answer take(const std::string& url);
-
-    Rules rules;
-    Rules once;
-    std::vector<std::string> asked;
     Transfer transfer;
     bool isOpen = false;
 };

@@ -2,13 +2,6 @@
 // shell, the network, the system log or the real clock. Other seams (fake_*.h) are linked into a
 // binary when one of its tests uses them.
 //
-//   givenConfig({{"INTERNAL_HTTP_PORT", "80"}});
-//   commands.answer("hdparm", "drive state is: active/idle\n");
-//   net.setName("nas.kavra.example", {"44.128.0.20"});
-//   ... call the real class ...
-//   EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5}));
-//   expectLogged(LOG_INFO, "...\n");
-//
 // Every test fails without being asked when a configured secret is in a log line, and when pipes,
 // address lists, descriptors or the signal mask are not as they were. The fakes tell further
 // standing checks in their headers.

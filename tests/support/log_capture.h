@@ -2,29 +2,32 @@
 #ifndef PELORUS_SUPPORT_LOG_CAPTURE_H
 #define PELORUS_SUPPORT_LOG_CAPTURE_H
 
+#include <gtest/gtest.h>
 #include <syslog.h>
 
 #include <functional>
 #include <ostream>
-#include <string>
-#include <utility>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
+/// The priority, and the text as handed to syslog, final newline included.
 struct LogLine {
     int priority;
-    std::string text;  ///< as handed to syslog, final newline included
+    std::string text;
+    bool operator==(const LogLine& other) const {
+        return priority == other.priority && text == other.text;
+    }
+    friend void PrintTo(const LogLine& line, std::ostream* out) {
+        *out << "<" << line.priority << "> " << ::testing::PrintToString(line.text);
+    }
 };
-bool operator==(const LogLine& left, const LogLine& right);
-void PrintTo(const LogLine& line, std::ostream* out);
 
 /// A line that holds a secret fails the test. So does one that is sent while another is being
 /// sent: with the real log it would wait for a lock for ever.
-class LogCapture {
+class LogCapture : public Single<LogCapture> {
 public:
-    static LogCapture& get();
-
     /// Since the last clear().
     [[nodiscard]] const std::vector<LogLine>& lines() const { return captured; }
     [[nodiscard]] std::vector<std::string> texts() const;
@@ -33,23 +36,16 @@ public:
     [[nodiscard]] int countPart(const std::string& part) const;
     /// All lines, for failure messages.
     [[nodiscard]] std::string dump() const;
-    /// "level MASK" and "openlog IDENT OPTION FACILITY", in the order of the calls.
-    [[nodiscard]] const std::vector<std::string>& setup() const { return setupCalls; }
-
     void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
     void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
-    void addSecret(const std::string& secret);
-    void reset() { *this = LogCapture{}; }
-
+    void addSecret(const std::string& secret) { secrets.push_back(secret); }
     void take(const LogLine& line);
-    void takeSetup(const std::string& call) { setupCalls.push_back(call); }
+
+    std::vector<std::string> setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
 
 private:
-    LogCapture() = default;
-
     std::vector<LogLine> captured;
-    std::vector<std::string> setupCalls;
     std::vector<std::string> secrets;
     std::function<void(const LogLine&)> hook;
     int depth = 0;
@@ -57,12 +53,12 @@ private:
 
 /// Fails unless exactly this line came (text with its final newline).
 void expectLogged(int priority, const std::string& text);
-/// Fails when a line holds @p part.
-void expectNotLogged(const std::string& part);
 /// Fails unless these lines came in this order, others possibly between them.
 void expectLoggedInOrder(const std::vector<std::string>& texts);
 /// Fails unless the lines are exactly these.
-void expectLogIs(const std::vector<LogLine>& lines);
+inline void expectLogIs(const std::vector<LogLine>& lines) {
+    EXPECT_EQ(LogCapture::get().lines(), lines);
+}
 
 }  // namespace pelorus::support
 

@@ -28,11 +28,6 @@ bool deliverPending(const sigset_t* mask) {
 
 }  // namespace
 
-VirtualClock& VirtualClock::get() {
-    static VirtualClock instance;
-    return instance;
-}
-
 void VirtualClock::duringPause(int number, Action action) {
     actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
 }
@@ -50,11 +45,6 @@ bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
     return false;
 }
 
-}  // namespace pelorus::support
-
-using pelorus::support::VirtualClock;
-
-// NOLINTBEGIN(bugprone-reserved-identifier): names the linker gives
 extern "C" {
 unsigned __real_sleep(unsigned seconds);
 
@@ -84,4 +74,5 @@ int __wrap_ppoll(pollfd* /*fds*/, nfds_t count, const timespec* timeout, const s
     return -1;
 }
 }
-// NOLINTEND(bugprone-reserved-identifier)
+
+}  // namespace pelorus::support

@@ -10,16 +10,15 @@
 #include <ctime>
 #include <functional>
 #include <map>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
-class VirtualClock {
+class VirtualClock : public Single<VirtualClock> {
 public:
     using Action = std::function<void()>;
     static constexpr time_t kStart = 1'700'000'000;  ///< what time() says when a test begins
-
-    static VirtualClock& get();
 
     /// Seconds since the epoch, and since the test began.
     [[nodiscard]] time_t now() const { return static_cast<time_t>(micros / kMicrosPerSecond); }
@@ -35,8 +34,6 @@ public:
     /// came too early and is missed by the pause, as in the real world.
     void duringPause(int number, Action action);
 
-    void reset() { *this = VirtualClock{}; }
-
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
     bool wait(std::int64_t waitMicros, const sigset_t* mask);
     [[nodiscard]] timeval timeOfDay() const {
@@ -45,8 +42,6 @@ public:
 
 private:
     static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
-    VirtualClock() = default;
-
     std::int64_t micros = kStart * kMicrosPerSecond;
     std::vector<long> asked;
     std::map<std::size_t, Action> actions;

@@ -28,6 +28,13 @@ def start_demo(*options: str, binary: Path = sandbox.binary()) -> subprocess.Pop
                             stderr=subprocess.STDOUT, start_new_session=True)
 
 
+def output_of(*options: str, binary: Path = sandbox.binary(), status: int = 0) -> str:
+    demo = start_demo(*options, binary=binary)
+    text, _ = demo.communicate(timeout=90)
+    assert demo.returncode == status, text
+    return text
+
+
 def traces() -> tuple[list[str], list[bool]]:
     """The machine's mounts, and whether the daemon's files exist."""
     mounts = sorted(Path("/proc/self/mountinfo").read_text().splitlines())
@@ -48,9 +55,7 @@ def processes_in(pid_namespace: str) -> list[str]:
 
 def test_demo_prints_each_step_and_succeeds() -> None:
     before = traces()
-    demo = start_demo()
-    text, _ = demo.communicate(timeout=90)
-    assert demo.returncode == 0, text
+    text = output_of()
     steps = ["gateway found through UPnP", "external address: 44.128.0.20",
              "forwards TCP 9091 -> 192.168.77.10:80", "the device answers", "port test passed",
              "mapping published: 44.128.0.20 HTTP 9091, HTTPS 9444", "status: portforwarded",
@@ -62,12 +67,9 @@ def test_demo_prints_each_step_and_succeeds() -> None:
 
 
 def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path: Path) -> None:
-    listed, _ = start_demo("--list").communicate(timeout=20)
-    assert [line.split()[0] for line in listed.splitlines()] == list(SCENARIOS)
+    assert [line.split()[0] for line in output_of("--list").splitlines()] == list(SCENARIOS)
     picture = tmp_path / "ports-taken.svg"
-    demo = start_demo("ports-taken", "--svg", str(picture))
-    text, _ = demo.communicate(timeout=90)
-    assert demo.returncode == 0, text
+    text = output_of("ports-taken", "--svg", str(picture))
     assert "== it holds 9444 as well" in text and "all checks passed" in text
     words = " ".join(ElementTree.parse(picture).getroot().itertext())
     assert SCENARIOS["ports-taken"].title in words
@@ -75,10 +77,7 @@ def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path: Path) -> N
 
 
 def test_demo_fails_with_a_daemon_that_does_nothing() -> None:
-    demo = start_demo(binary=Path("/bin/true"))
-    text, _ = demo.communicate(timeout=60)
-    assert demo.returncode == 1, text
-    assert "FAILED: waited" in text
+    assert "FAILED: waited" in output_of(binary=Path("/bin/true"), status=1)
 
 
 @pytest.mark.parametrize("end", [signal.SIGINT, signal.SIGTERM, signal.SIGKILL],
@@ -86,14 +85,8 @@ def test_demo_fails_with_a_daemon_that_does_nothing() -> None:
 def test_lab_that_stays_up_leaves_no_trace_after(end: signal.Signals) -> None:
     before = traces()
     demo = start_demo("--stay")
-    said: list[str] = []
-    for line in demo.stdout or ():
-        said.append(line)
-        if "the view from outside" in line:
-            break
-    assert "the view from outside" in said[-1], "".join(said)
-    entry = re.search(r"-t (\d+) ", said[-1])
-    assert entry, said[-1]
+    entries = (re.search(r"the view from outside.*-t (\d+) ", line) for line in demo.stdout or ())
+    entry = next(found for found in entries if found)
     namespace = os.readlink(f"/proc/{entry[1]}/ns/pid")
     assert len(processes_in(namespace)) >= 4
     if end == signal.SIGINT:

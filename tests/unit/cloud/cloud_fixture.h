@@ -2,9 +2,6 @@
 #ifndef PELORUS_UNIT_CLOUD_FIXTURE_H
 #define PELORUS_UNIT_CLOUD_FIXTURE_H
 
-#include <string>
-#include <vector>
-
 #include "cloud/tavik_client.h"
 #include "support/fake_files.h"
 #include "support/fake_web.h"
@@ -12,7 +9,6 @@
 
 namespace pelorus {
 
-using support::expectLogged;
 using support::FakeCommands;
 using support::FakeWeb;
 using Urls = std::vector<std::string>;

@@ -1,3 +1,4 @@
+#include "cloud/public_address.h"
 #include "cloud_fixture.h"
 
 namespace pelorus {
@@ -12,114 +13,87 @@ const std::string kRequest =
 const std::string kDevice =
     "<req_device_id>device-7350142</req_device_id><resp_device_id>device-7350142</resp_device_id>";
 
-std::string remote(const std::string& address) {
-    return "<remote_external_ip>" + address + "</remote_external_ip>";
-}
-
 class PortTestTest : public CloudTest {
 protected:
     int test(HttpType type = HTTP) {
         return client.testPort(externalIp, 9091, type, true, checkSleep, &enforceRelay,
                                skipDoubleNat, remoteIp);
     }
+    // Tests with answers to all requests; what it leaves, and a line that must be logged once.
+    void row(const char* external,
+             const std::vector<FakeWeb::Answer>& answers,
+             int result,
+             const std::string& left,
+             const std::string& line) {
+        web.clear();
+        log.clear();
+        for (const auto& answer : answers) web.answerOnce("/test", answer);
+        externalIp = external;
+        EXPECT_EQ(test(), result) << line;
+        EXPECT_EQ(externalIp + ", " + remoteIp + (enforceRelay ? ", relay" : "") +
+                      (client.lastPortTestPassed() ? ", passed" : ", failed"),
+                  left);
+        EXPECT_EQ(web.count("/test"), answers.size()) << line;
+        EXPECT_EQ(log.countPart(line), 1) << line << log.dump();
+    }
 
     TavikClient& client = givenClient();
-    std::string externalIp = "44.128.0.20";
+    std::string externalIp;
     bool checkSleep = false;
     bool enforceRelay = true;
     bool skipDoubleNat = false;
     std::string remoteIp = "stale";
 };
 
-TEST_F(PortTestTest, APassTakesOneRequestAndGivesTheRemoteAddress) {
-    web.answer("/test", "Success<external_ip>a</external_ip>" + remote("44.128.0.9") + kDevice);
-    EXPECT_EQ(test(), PASS_TEST);
-    EXPECT_EQ(web.urls(), (Urls{kPoll, kRequest}));
-    EXPECT_EQ(externalIp + " " + remoteIp, "44.128.0.20 44.128.0.9");
-    EXPECT_FALSE(enforceRelay);
-    EXPECT_EQ(log.countPart("?id=*ID_REMOVED*&ip=44.128.0.20&port=9091&type=HTTP&auth=*AUTH"), 2);
-}
-
-TEST_F(PortTestTest, ThreeFailuresPauseThreeTimesAndReportFailed) {
-    web.answerOnce("/test", "no" + remote("44.128.0.20"));
-    web.answerOnce("/test", FakeWeb::noAnswer());
-    web.answerOnce("/test", "device-7350142 no");
-    EXPECT_EQ(test(), FAIL_TEST);
-    EXPECT_EQ(web.urls(),
-              (Urls{kPoll, kRequest, kRequest, kRequest, "http://127.0.0.1:80/status?is=failed"}));
-    EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5, 5, 1}));
-    EXPECT_FALSE(client.lastPortTestPassed());
-    EXPECT_EQ(remoteIp, "");
-    EXPECT_EQ(log.countPart("Cannot retrieve remote_external_ip"), 2);
-    EXPECT_EQ(log.countPart("auth=*AUTH_REMOVED*, no response from central server.\n"), 1);
-    EXPECT_EQ(log.countPart("[3] -  failure response from server: [*ID_REMOVED* no].\n"), 1);
-}
-
-TEST_F(PortTestTest, ALaterAttemptMayPass) {
-    web.answer("/test", "Success" + remote("44.128") + kDevice);
-    web.answerOnce("/test", "no");
-    client.clearPortTestSuccess();
-    EXPECT_EQ(test(static_cast<HttpType>(7)), PASS_TEST);
-    EXPECT_EQ(web.count("&port=9091&type=HTTPS&auth=auth-91c2f0aa"), 2);
-    EXPECT_EQ(remoteIp, "");
-    EXPECT_TRUE(client.lastPortTestPassed());
-}
-
-TEST_F(PortTestTest, OnlyAnotherAddressIsASecondNatAndEndsTheTestAtOnce) {
-    const auto relays = [&](const char* external, const char* seen) {
-        web.clear();
-        web.answer("/test", "no " + remote(seen));
-        externalIp = external;
-        EXPECT_EQ(test(), FAIL_TEST);
-        EXPECT_EQ(web.count("/test"), enforceRelay ? 1 : 3);
-        return enforceRelay;
+TEST_F(PortTestTest, TriesThreeTimesUnlessItPassesOrMeetsASecondNat) {
+    const FakeWeb::Answer none = FakeWeb::noAnswer();
+    const auto no = [](const std::string& seen) {
+        return FakeWeb::Answer{"no<remote_external_ip>" + seen + "</remote_external_ip>"};
     };
-    EXPECT_TRUE(relays("44.128.0.20", "44.128.0.9"));
-    EXPECT_TRUE(client.lastPortTestPassed());
-    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.20"));
-    EXPECT_FALSE(relays("44.128.0.20", "x"));
-    EXPECT_FALSE(relays("", "44.128.0.9"));
-    skipDoubleNat = true;
-    EXPECT_FALSE(relays("44.128.0.20", "44.128.0.9"));
-}
-
-TEST_F(PortTestTest, APassTakesTheTestedAddressAndFailsForAnotherDevice) {
-    const auto row = [&](const std::string& body, int result, const std::string& line) {
-        log.clear();
-        web.answer("/test", "Success" + body);
-        externalIp.clear();
-        EXPECT_EQ(test(), result) << line;
-        EXPECT_EQ(log.countPart(line), 1) << line << log.dump();
-        EXPECT_EQ(log.countPart("'*ID_REMOVED*' is different than"), result == PASS_TEST ? 0 : 1);
-        return externalIp;
-    };
+    const auto passed = [](const std::string& body) { return FakeWeb::Answer{"Success" + body}; };
+    const char* const ip = "44.128.0.20";
     // clang-format off
-    EXPECT_EQ(row("<external_ip>device-7350142</external_ip>" + kDevice, PASS_TEST, "GOT EXTERNAL IP: [*ID_REMOVED*], start: [20], end: [34]. \n"), "device-7350142");
-    EXPECT_EQ(row("<req_device_id>a</req_device_id>", FAIL_TEST, "received badly formatted response:\n"), "");
-    row("<resp_device_id>b</resp_device_id>", FAIL_TEST, "contains empty request device ID and/or response device ID.\n");
-    row("<req_device_id>a</req_device_id><resp_device_id>b</resp_device_id>", FAIL_TEST, "testPort - result data [Success<req");
-    row(std::string(1, '\0') + kDevice, FAIL_TEST, "httpGet got Success, 100 bytes");
-    row(std::string(10000, '%') + kDevice, PASS_TEST, "port map check success.\n");
+    row(ip, {passed("<external_ip>a</external_ip><remote_external_ip>44.128.0.9</remote_external_ip>" + kDevice)}, PASS_TEST, "44.128.0.20, 44.128.0.9, passed", "testPort[1] - port check URL: [https://web.kavra.example/test?id=*ID_REMOVED*&ip=44.128.0.20&port=9091&type=HTTP&auth=*AUTH_REMOVED*].\n");
+    EXPECT_EQ(web.urls(), (Urls{kPoll, kRequest}));
+    row(ip, {no("44.128.0.9")}, FAIL_TEST, "44.128.0.20, , relay, passed", "(double-NAT detected");
+    EXPECT_EQ(clock.pauses(), std::vector<long>{});
+    row(ip, {no(ip), none, "device-7350142 no"}, FAIL_TEST, "44.128.0.20, , failed", "[3] -  failure response from server: [*ID_REMOVED* no].\n");
+    EXPECT_EQ(web.urls(), (Urls{kRequest, kRequest, kRequest, "http://127.0.0.1:80/status?is=failed"}));
+    EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5, 5, 1}));
+    row(ip, {"no", passed("<remote_external_ip>44.128</remote_external_ip>" + kDevice)}, PASS_TEST, "44.128.0.20, , passed", "testPort[1] -  failure response");
+    row(ip, {no("x"), none, none}, FAIL_TEST, "44.128.0.20, , failed", "testPort[2] - httpGet for https://web.kavra.example/test?id=*ID_REMOVED*");
+    row("", {no("44.128.0.9"), none, none}, FAIL_TEST, ", , failed", "Response remote external IP: [44.128.0.9].\n");
+    row("", {passed("<external_ip>device-7350142</external_ip>" + kDevice)}, PASS_TEST, "device-7350142, , passed", "GOT EXTERNAL IP: [*ID_REMOVED*], start: [20], end: [34]. \n");
+    row("", {passed("<req_device_id>a</req_device_id>")}, FAIL_TEST, ", , passed", "received badly formatted response:\n");
+    row("", {passed(" 0123here</external_ip>" + kDevice)}, PASS_TEST, "here, , passed", "GOT EXTERNAL IP: [here], start: [12], end: [16]. \n");
+    row("", {passed("</external_ip><external_ip>x" + kDevice)}, PASS_TEST, ", , passed", "GOT EXTERNAL IP: [], start: [34], end: [7]. \n");
+    row(ip, {passed("789012345678944.128.0.9</remote_external_ip>" + kDevice)}, PASS_TEST, "44.128.0.20, , passed", "Cannot retrieve remote_external_ip from test port response\n");
+    row(ip, {passed("<remote_external_ip>44.128.0.9" + kDevice)}, PASS_TEST, "44.128.0.20, , passed", "Cannot retrieve remote_external_ip from test port response\n");
+    row(ip, {passed("<req_device_id>b<resp_device_id>b</resp_device_id>")}, FAIL_TEST, "44.128.0.20, , passed", "contains empty request device ID and/or response device ID.\n");
+    row(ip, {passed("<req_device_id>a</req_device_id><resp_device_id>b</resp_device_id>")}, FAIL_TEST, "44.128.0.20, , passed", "'*ID_REMOVED*' is different than");
+    row(ip, {passed(std::string(1, '\0') + kDevice)}, FAIL_TEST, "44.128.0.20, , passed", "httpGet got Success, 100 bytes");
+    row(ip, {passed(std::string(10000, '%') + kDevice)}, PASS_TEST, "44.128.0.20, , passed", "port map check success.\n");
+    client.clearPortTestSuccess();
+    EXPECT_FALSE(client.lastPortTestPassed());
+    skipDoubleNat = true;
+    row(ip, {no("44.128.0.9"), none, none}, FAIL_TEST, "44.128.0.20, , failed", "testPort - port map check failed.\n");
     // clang-format on
+    test(static_cast<HttpType>(7));
+    EXPECT_EQ(web.count("&port=9091&type=HTTPS&auth=auth-91c2f0aa"), 3);
 }
 
 TEST_F(PortTestTest, ObstaclesPreventTheTest) {
     commands.answer("hdparm", " drive state is:  standby\n");
     checkSleep = true;
-    EXPECT_EQ(test(), SKIP_TEST);
-    EXPECT_EQ(remoteIp, "");
-    EXPECT_FALSE(enforceRelay);
+    row("", {}, SKIP_TEST, ", , passed", "testPort - hard disk is asleep.\n");
     checkSleep = false;
     web.answerOnce(kPoll, "<action>wait</action><wait_time>9</wait_time>");
-    EXPECT_EQ(test(), SKIP_TEST);
+    row("", {}, SKIP_TEST, ", , passed", "testPort - server has requested sleep.\n");
     client.resetServerSleepTime();
-    for (const char* const key : {"DEVICEAUTH", "DEVICEID"}) {
-        setConfig(key, "");
-        EXPECT_EQ(test(), FAIL_TEST);
-    }
-    EXPECT_EQ(web.urls(), (Urls{kPoll, kPoll}));
-    EXPECT_TRUE(client.lastPortTestPassed());
-    EXPECT_EQ(log.countPart("testPort - failed to get Device "), 2);
+    setConfig("DEVICEAUTH", "");
+    row("", {}, FAIL_TEST, ", , passed", "testPort - failed to get Device Auth Code");
+    setConfig("DEVICEID", "");
+    row("", {}, FAIL_TEST, ", , passed", "testPort - failed to get Device ID");
 }
 
 TEST_F(PortTestTest, ThePublicAddressIsTheBodyAsItCame) {
@@ -136,6 +110,10 @@ TEST_F(PortTestTest, ThePublicAddressIsTheBodyAsItCame) {
     EXPECT_FALSE(client.getMyIP(externalIp, wait));
     EXPECT_EQ(wait, 9);
     EXPECT_EQ(web.urls(), (Urls{kPoll, kMyIp, kMyIp, kMyIp, kPoll}));
+    for (const char* const bad : {"", "44.128.0.9\n", "44.128.0.256", "::1"}) {
+        EXPECT_FALSE(isIpv4Address(bad)) << bad;
+    }
+    EXPECT_FALSE(isIpv4Address(std::string("1.2.3.4\0x", 9)));
 }
 
 }  // namespace

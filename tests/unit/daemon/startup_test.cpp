@@ -30,7 +30,7 @@ void reportExit() {
     report("exit: umask " + std::to_string(umask(0)) + ", folder " +
            std::filesystem::current_path().string() +
            (dup(0) < 0 && dup(1) < 0 && dup(2) < 0 ? ", streams closed\n" : ", streams open\n"));
-    for (const auto& call : support::LogCapture::get().setup()) report(call + "\n");
+    for (const auto& call : support::LogCapture::get().setup) report(call + "\n");
     if (::testing::Test::HasFailure()) report("a check failed\n");
 }
 

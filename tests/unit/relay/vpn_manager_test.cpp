@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <memory>
 
+#include "relay/client_output.h"
 #include "support/fixture.h"
 
 namespace pelorus::support {
@@ -55,18 +56,13 @@ protected:
     }
 
     // Returns the pid.
-    std::string startClient(const std::string& name = "openvpn") {
+    std::string startClient(const char* name = "openvpn") {
         client = std::make_unique<Process>(path(name));
-        writeFile("client.pid", client->pidText() + "\n");
+        writeFile("client.pid", " \t" + client->pidText() + " \t\r\n");
         return client->pidText();
     }
     [[nodiscard]] bool pidFileExists() const { return fs::exists(path("client.pid")); }
-    int started(const char* part) const {
-        return log.countPart(std::string{"VPNManager::openVPNConnection() - "} + part);
-    }
-    int stopped(const std::string& part) const {
-        return log.countPart("VPNManager::closeVPNConnection() - " + part);
-    }
+    int logged(const std::string& part) const { return log.countPart("VPNConnection() - " + part); }
 
     VPNManager& manager = *VPNManager::getInstance();
     std::unique_ptr<Process> client;
@@ -79,16 +75,15 @@ TEST_F(VpnManagerTest, StartsTheClientInItsFolderWithFreshCredentials) {
         writeFile("client.out", "connecting\nNov 21 Initialization Sequence Completed\n");
     });
     const fs::path before = fs::current_path();
-    FakeCommands::Answer start;
-    start.action = [&](const std::string&) { EXPECT_EQ(fs::current_path(), folder); };
-    commands.answer("start-client", start);
+    const auto inFolder = [&](const std::string&) { EXPECT_EQ(fs::current_path(), folder); };
+    commands.answer("start-client", FakeCommands::Answer{"", 0, false, inFolder});
     EXPECT_TRUE(manager.openVPNConnection());
     EXPECT_EQ(fs::current_path(), before);
     EXPECT_EQ(readFile(path("auth.txt")), std::string{kDeviceId} + "\n" + kDeviceAuth + "\n");
     EXPECT_EQ(commands.lines(), (Lines{"fetch-relays", "start-client"}));
     EXPECT_EQ(clock.pauses(), (std::vector<long>{10, 10, 10}));
-    EXPECT_EQ(started("openVPN initialization did not complete, waiting...\n"), 2);
-    EXPECT_EQ(started("openVPN has started successfully\n"), 1);
+    EXPECT_EQ(logged("openVPN initialization did not complete, waiting...\n"), 2);
+    EXPECT_EQ(logged("openVPN has started successfully\n"), 1);
 }
 
 TEST_F(VpnManagerTest, GivesUpAfterFourStartsOfSevenChecksAndStopsTheClient) {
@@ -97,35 +92,24 @@ TEST_F(VpnManagerTest, GivesUpAfterFourStartsOfSevenChecksAndStopsTheClient) {
     EXPECT_EQ(commands.count("fetch-relays"), 1);
     EXPECT_EQ(commands.count("start-client"), 4);
     EXPECT_EQ(clock.pauses(), std::vector<long>(28, 10));
-    EXPECT_EQ(stopped("openVPN process is not running, so return true.\n"), 4);
-    EXPECT_EQ(started("Failed to establish VPN connection, retries exceeded\n"), 1);
-}
-
-TEST_F(VpnManagerTest, LeavesARunningClientAlone) {
-    startClient("My-OpenVPN-2.6");
-    EXPECT_TRUE(manager.openVPNConnection());
-    EXPECT_TRUE(pidFileExists());
-    EXPECT_EQ(commands.lines(), Lines{});
-    EXPECT_EQ(started("openVPN is already running\n"), 1);
+    EXPECT_EQ(logged("openVPN process is not running, so return true.\n"), 4);
+    EXPECT_EQ(logged("Failed to establish VPN connection, retries exceeded\n"), 1);
 }
 
 TEST_F(VpnManagerTest, AFailureEndsTheStartAtOnce) {
-    const auto row = [&](const char* key, const char* value, const char* message,
-                         const Lines& lines) {
-        setConfig(key, value);
+    const auto row = [&](const char* key, const char* message, std::size_t lines) {
+        setConfig(key, "");
         log.clear();
         EXPECT_FALSE(manager.openVPNConnection());
-        EXPECT_EQ(started(message), 1) << key;
-        EXPECT_EQ(commands.lines(), lines);
+        EXPECT_EQ(logged(message), 1) << key;
+        EXPECT_EQ(commands.lines().size(), lines);
+        commands.clear();
     };
-    row("STARTCMD_OUTFILE", "/nowhere/out", "failed to open openVPN stdout file!\n",
-        {"fetch-relays", "start-client"});
-    commands.clear();
-    row("OPENVPN_AUTH_FILE", "/nowhere/auth", "failed to open VPN Auth file for write!\n", {});
-    row("DEVICEAUTH", "", "failed to get DEVICEID and/or DEVICEAUTH settings from config", {});
+    row("STARTCMD_OUTFILE", "failed to open openVPN stdout file!\n", 2);
+    row("OPENVPN_AUTH_FILE", "failed to open VPN Auth file for write!\n", 0);
+    row("DEVICEAUTH", "failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n", 0);
     setConfig("DEVICEAUTH", kDeviceAuth);
-    row("DEVICEID", "", "failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n",
-        {});
+    row("DEVICEID", "failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n", 0);
 }
 
 TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
@@ -147,33 +131,25 @@ TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
     EXPECT_EQ(commands.lines(), Lines{});
 }
 
-TEST_F(VpnManagerTest, StopsWithSigtermAndForgetsTheClient) {
-    const std::string pid = startClient();
-    EXPECT_TRUE(manager.closeVPNConnection());
-    EXPECT_EQ(commands.lines(), Lines{"kill -15 " + pid});
-    EXPECT_EQ(clock.pauses(), std::vector<long>{3});
-    EXPECT_FALSE(pidFileExists());
-}
-
-TEST_F(VpnManagerTest, RepeatsAFailingKillAndTurnsToSigkill) {
-    const std::string pid = startClient();
+TEST_F(VpnManagerTest, LeavesARunningClientAloneUntilItIsToBeStopped) {
+    const std::string pid = startClient("My-OpenVPN-2.6");
+    EXPECT_TRUE(manager.openVPNConnection());
+    EXPECT_EQ(logged("openVPN is already running\n"), 1);
     commands.answer("kill", "", 1);
     EXPECT_FALSE(manager.closeVPNConnection());
     const std::string gently = "kill -15 " + pid;
     const std::string hard = "kill -9 " + pid;
     EXPECT_EQ(commands.lines(), (Lines{gently, gently, gently, hard, hard}));
-    EXPECT_EQ(clock.pauses(), std::vector<long>(5, 3));
     EXPECT_TRUE(pidFileExists());
-    EXPECT_EQ(stopped("failed to stop openVPN process with PID: " + pid + ", result "), 5);
-    EXPECT_EQ(stopped("failed to gracefully stop openVPN, terminating with SIGKILL\n"), 2);
-    EXPECT_EQ(stopped("failed to stop openVPN process\n"), 1);
-}
-
-TEST_F(VpnManagerTest, AKillThatSucceedsEndsThePasses) {
-    startClient();
-    commands.answerOnce("kill -15", {"", 1, false, {}});
+    EXPECT_EQ(logged("failed to stop openVPN process with PID: " + pid + ", result "), 5);
+    EXPECT_EQ(logged("failed to gracefully stop openVPN, terminating with SIGKILL\n"), 2);
+    EXPECT_EQ(logged("failed to stop openVPN process\n"), 1);
+    commands.clear();
+    commands.answer("kill", "");
+    commands.answerOnce("kill", {"", 1, false, {}});
     EXPECT_TRUE(manager.closeVPNConnection());
-    EXPECT_EQ(commands.lines().size(), 2U);
+    EXPECT_EQ(commands.lines(), (Lines{gently, gently}));
+    EXPECT_EQ(clock.pauses(), std::vector<long>(7, 3));
     EXPECT_FALSE(pidFileExists());
 }
 
@@ -185,8 +161,8 @@ TEST_F(VpnManagerTest, EndsThePassesWhenThePidFileGoes) {
         }
     });
     EXPECT_TRUE(manager.closeVPNConnection());
-    EXPECT_EQ(stopped("failed to open PID output file\n"), 1);
-    EXPECT_EQ(stopped("openVPN process is running\n"), 1);
+    EXPECT_EQ(logged("failed to open PID output file\n"), 1);
+    EXPECT_EQ(logged("openVPN process is running\n"), 1);
 }
 
 TEST_F(VpnManagerTest, CleanupRemovesThePidFileAndLeavesTheClient) {
@@ -215,15 +191,12 @@ TEST_F(VpnManagerTest, TheLastReadableRelayAddressWins) {
     EXPECT_EQ(ip, "44.1.1.2");
     EXPECT_EQ(log.countPart("failed to open openVPN stdout file!\n"), 1);
     EXPECT_EQ(log.countPart("failed to fetch openVPN AF_INET IP address from line"), 2);
-}
-
-TEST_F(VpnManagerTest, TrimsBlanksAndLineEnds) {
-    const std::vector<std::pair<std::string, std::string>> rows{
-        {" \t42 \t\r\n", "42"}, {"\n42", "\n42"}, {" \t\r\n ", ""}, {"", ""}, {"4 2", "4 2"}};
-    for (auto [text, wanted] : rows) {
-        manager.trim(text);
-        EXPECT_EQ(text, wanted);
+    EXPECT_EQ(readRelayPeer((peer + " 44.300.007. 0").c_str())->address, "44.300.7.0");
+    for (const char* const bad : {"44.-1.0.2", "4294967297.1.1.1", "44.128.0", "44.128.0:1", ""}) {
+        const auto read = readRelayPeer((peer + bad).c_str());
+        EXPECT_TRUE(read && !read->address) << bad;
     }
+    EXPECT_FALSE(readRelayPeer("Peer Connection Initiated with [AF_INET6]::1"));
 }
 
 }  // namespace

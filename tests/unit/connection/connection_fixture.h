@@ -6,9 +6,14 @@
 #include <spawn.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <csignal>
 #include <filesystem>
+#include <functional>
+#include <iterator>
+#include <regex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "cloud/tavik_client.h"
@@ -33,6 +38,7 @@ using Ports = std::vector<int>;
 inline constexpr const char* kLanIp = "192.168.77.10";
 inline constexpr const char* kWanIp = "44.128.0.20";
 inline constexpr const char* kRelayIp = "44.128.0.1";
+inline const std::string kWait = "<action>wait</action><wait_time>300</wait_time>";
 inline const std::string kPassed =
     "<s>Success</s><remote_external_ip>44.128.0.20</remote_external_ip>"
     "<req_device_id>a</req_device_id><resp_device_id>a</resp_device_id>";
@@ -41,12 +47,37 @@ inline const std::string kNotReached =
 inline const std::string kOtherNat =
     "<s>Failure</s><remote_external_ip>44.128.9.9</remote_external_ip>";
 
+/// What a story() tells of the lines that hold the part: these words and what follows the part, up
+/// to the end mark.
+struct Word {
+    const char* part;
+    const char* words;
+    const char* end;
+};
+// clang-format off
+inline constexpr Word kCalls[] = {
+    {"&port=", "test ", "&"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell ", "\n"},
+    {"/delforward?", "withdraw ", "\n"}, {"/setstatus?", "status ", "\n"}, {"/lanip?", "lanip", ""},
+    {"/myip", "myip", ""}, {"natpmp map TCP ", "natpmp ", " for"}, {"unmap TCP ", "unmap ", "\n"},
+    {"map TCP ", "map ", "\n"}, {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""},
+    {"helper.sh add ", "add ", "\n"}, {"helper.sh remove ", "remove ", "\n"}};
+inline constexpr Word kLogLines[] = {{"cloudConnectivity state=", "", "\n"}, {"setForceConnect = ", "force ", "\n"},
+    {"Port test failed, ", "failed: ", "."}};
+// clang-format on
+
+/// Public, so that the rows of a table can change the world.
 class ConnectionTest : public support::PelorusTest {
-protected:
+public:
+    using PelorusTest::clock;
+    using PelorusTest::net;
+    using PelorusTest::setConfig;
+    using PelorusTest::writeFile;
+
     ConnectionTest() {
         web.reset();
         gateway.reset();
         files.reset();
+        log.onLine([this](const support::LogLine&) { listen(); });
         for (const char* part : {"/setstatus", "/setforward", "/delforward", "/setlanip"}) {
             web.answer(part, "success");
         }
@@ -116,9 +147,6 @@ protected:
         commands.answer("getip.sh lan", "192.168.77.1\n");
         commands.answer("tavik_helper.sh list", list);
     }
-    void askToWait() {
-        web.answer("/remote_access_status/", "<action>wait</action><wait_time>300</wait_time>");
-    }
     /// The next test of @p port fails, with all its attempts.
     void failTest(int port) {
         const std::string part = "&port=" + std::to_string(port) + "&";
@@ -145,6 +173,8 @@ protected:
         gateway.clear();
         commands.clear();
         log.clear();
+        told.clear();
+        std::fill(std::begin(heard), std::end(heard), 0);
     }
 
     /// The external ports that lead to this device, in order.
@@ -161,20 +191,27 @@ protected:
         for (const auto& tail : tails(web.urls(), "&port=")) ports.push_back(std::stoi(tail));
         return ports;
     }
-    /// The status words told to the local back end, in order.
-    Texts statusWords() const { return tails(web.urls(), "/setstatus?"); }
-    /// The mapping records sent to the server: external address, LAN address, ports.
-    Texts records() const {
-        Texts found = tails(web.urls(), std::string{"/forward?"} + support::kDeviceId + "&");
-        for (auto& text : found) text = text.substr(0, text.rfind('&'));
-        return found;
+    /// What happened since the last story, in order, then the mapped ports and the result.
+    std::string story(const std::string& result) {
+        listen();
+        std::string all = told.substr(std::min<std::size_t>(told.size(), 2)) + " =";
+        told.clear();
+        for (const int port : mappedPorts()) all += " " + std::to_string(port);
+        all += " " + result;
+        for (const auto& [text, shorter] : {std::pair<const char*, const char*>{kWanIp, "WAN"},
+                                            {kLanIp, "LAN"},
+                                            {" type=", "/"},
+                                            {" -> ", ">"}}) {
+            all = std::regex_replace(all, std::regex{text}, shorter);
+        }
+        return all;
     }
-    /// The analytics events, as "state/type".
-    Texts events() const {
-        Texts found = tails(log.texts(), "cloudConnectivity state=");
-        for (auto& event : found) event.replace(event.find(" type="), 6, "/");
-        return found;
+    std::string story(ConnectionType type) {
+        return story(ConnectionManager::convertEnumConnectionType(type));
     }
+    std::string story(int port) { return story(std::to_string(port)); }
+    /// What follows @p part in the log lines that hold it.
+    Texts logged(const std::string& part) const { return tails(log.texts(), part); }
 
     FakeWeb& web = FakeWeb::get();
     FakeGateway& gateway = FakeGateway::get();
@@ -182,6 +219,26 @@ protected:
 
 private:
     pid_t client = 0;
+    std::string told;
+    std::size_t heard[4] = {};  // lines of each source
+
+    void listen() {
+        tell(web.urls(), heard[0], kCalls);
+        tell(gateway.calls(), heard[1], kCalls);
+        tell(commands.lines(), heard[2], kCalls);
+        tell(log.texts(), heard[3], kLogLines);
+    }
+    template <std::size_t count>
+    void tell(const Texts& lines, std::size_t& seen, const Word (&words)[count]) {
+        for (; seen < lines.size(); ++seen) {
+            for (const Word& word : words) {
+                const Texts rest = tails({lines[seen]}, word.part);
+                if (rest.empty()) continue;
+                told += std::string{", "} + word.words + rest[0].substr(0, rest[0].find(word.end));
+                break;
+            }
+        }
+    }
 
     // What follows part in each line that holds it.
     static Texts tails(const Texts& lines, const std::string& part) {
@@ -191,6 +248,25 @@ private:
             if (at != std::string::npos) found.push_back(line.substr(at + part.size()));
         }
         return found;
+    }
+};
+
+using World = ConnectionTest;
+
+/// A row of a table of stories: how the world differs, and what each following step tells.
+struct Row {
+    const char* name;
+    std::function<void(World&)> world;
+    Texts stories;
+};
+
+class StoryTest : public ConnectionTest, public testing::WithParamInterface<Row> {
+protected:
+    /// Changes the world and compares the story of each @p step.
+    template <typename Step>
+    void expectStories(Step step) {
+        GetParam().world(*this);
+        for (const auto& wanted : GetParam().stories) EXPECT_EQ(story(step()), wanted);
     }
 };
 

@@ -75,7 +75,7 @@ TEST_F(NetworkAddrsTest, WaitsAsOftenAsTheServerAsks) {
 }
 
 TEST_F(NetworkAddrsTest, TerminationEndsAWaitThatTheServerNeverEnds) {
-    askToWait();
+    web.answer("/remote_access_status/", kWait);
     clock.duringPause(3, [] { sigConnKilled = SIGTERM; });
     std::string ip = "untouched";
     EXPECT_EQ(addresses.getMyIP(ip), 0);

@@ -103,7 +103,7 @@ TEST_F(DaemonControlTest, ASignalInThePauseEndsItAndTearsDown) {
     });
     control.run();
     EXPECT_LT(clock.now() - before, 900);
-    expectLoggedInOrder(
+    support::expectLoggedInOrder(
         {"sigTrap - sigConnKilled is set to incoming signal.\n",
          "TavikClient::sendAnalytics - COMMUNICATION status:[disabled]  connectionType:[1]  connectionSubType:[0]\n",
          "DaemonControl::run - Remote access disabled.\n"});

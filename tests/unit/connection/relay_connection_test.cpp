@@ -21,7 +21,6 @@ INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
     Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { forwarded(w); }, {kKept}}),
     RowName{});
 
-
 TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
     givenForwardedPorts();
     ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing

@@ -82,13 +82,13 @@ TEST_P(Pause, IsTheLongerOfTheTwoPeriods) {
     EXPECT_EQ(web.count("/remote_access_status/"), 2) << "asked anew in each cycle";
 }
 
-INSTANTIATE_TEST_SUITE_P(Rows,
-                         Pause,
-                         ::testing::Values(PauseRow{"ServersWait", 300, 301, 301},
-                                           PauseRow{"OwnWhenBothAreEqual", 300, 300, 300, "sleep"},
-                                           PauseRow{"OwnIsAtMost900", 1000, 0, 900, "sleep"},
-                                           PauseRow{"OwnIsAtLeast30", -1, 0, 120}),
-                         RowName{});
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Rows, Pause, ::testing::Values(
+    PauseRow{"ServersWait", 300, 301, 301},
+    PauseRow{"OwnWhenBothAreEqual", 300, 300, 300, "sleep"},
+    PauseRow{"OwnIsAtMost900", 1000, 0, 900, "sleep"},
+    PauseRow{"OwnIsAtLeast30", -1, 0, 120}), RowName{});
+// clang-format on
 
 // Raised between the last look at the flag and the wait.
 TEST_F(DaemonControlTest, ASignalInThePauseEndsItAndTearsDown) {

@@ -6,10 +6,13 @@
 #include <spawn.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <csignal>
 #include <filesystem>
+#include <functional>
+#include <iterator>
+#include <regex>
 #include <string>
-#include <vector>
 
 #include "cloud/tavik_client.h"
 #include "connection/connection_manager.h"
@@ -22,17 +25,14 @@
 
 namespace pelorus {
 
-using support::expectLogged;
-using support::expectLoggedInOrder;
 using support::FakeGateway;
 using support::FakeWeb;
 using support::RowName;
 using support::Texts;
-using Ports = std::vector<int>;
 
 inline constexpr const char* kLanIp = "192.168.77.10";
 inline constexpr const char* kWanIp = "44.128.0.20";
-inline constexpr const char* kRelayIp = "44.128.0.1";
+inline const std::string kWait = "<action>wait</action><wait_time>300</wait_time>";
 inline const std::string kPassed =
     "<s>Success</s><remote_external_ip>44.128.0.20</remote_external_ip>"
     "<req_device_id>a</req_device_id><resp_device_id>a</resp_device_id>";
@@ -41,12 +41,49 @@ inline const std::string kNotReached =
 inline const std::string kOtherNat =
     "<s>Failure</s><remote_external_ip>44.128.9.9</remote_external_ip>";
 
+// What many stories share.
+inline const std::string kSearch = "connecting/portforwarded, map 9091>LAN:8080 Kavra, test 9091, ";
+inline const std::string kPublish =
+    "map 9444>LAN:8443 KavraSSL, record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&8080, connected/portforwarded";
+inline const std::string kByHand =
+    "connecting/portforwarded, test 18080, record WAN&LAN&18080&18443, tell WAN&18080&18443&LAN&8080, ";
+inline const std::string kNoRelay =
+    "connecting/relayed, record NULL&LAN&0&0, withdraw 8080, start, failed/relayed";
+inline const std::string kKept = " = 9091 9444 portforwarded";
+
+/// What a story() tells of the lines that hold the part: these words and what follows the part, up
+/// to the end mark.
+struct Word {
+    const char* part;
+    const char* words;
+    const char* end = "\n";
+    bool isLog = false;
+};
+// clang-format off
+inline constexpr Word kWords[] = {
+    {"&port=", "test ", "&"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "},
+    {"/delforward?", "withdraw "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""},
+    {"natpmp map TCP ", "natpmp ", " for"}, {"unmap TCP ", "unmap "}, {"map TCP ", "map "},
+    {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""},
+    {"helper.sh add ", "add "}, {"helper.sh remove ", "remove "},
+    {"cloudConnectivity state=", "", "\n", true}, {"setForceConnect = ", "force ", "\n", true},
+    {"Port test failed, ", "failed: ", ".", true}};
+// clang-format on
+
+/// Public, so that the rows of a table can change the world.
 class ConnectionTest : public support::PelorusTest {
-protected:
+public:
+    using PelorusTest::clock;
+    using PelorusTest::commands;
+    using PelorusTest::net;
+    using PelorusTest::setConfig;
+    using PelorusTest::writeFile;
+
     ConnectionTest() {
         web.reset();
         gateway.reset();
         files.reset();
+        log.onLine([this](const support::LogLine&) { listen(); });
         for (const char* part : {"/setstatus", "/setforward", "/delforward", "/setlanip"}) {
             web.answer(part, "success");
         }
@@ -55,21 +92,18 @@ protected:
         web.answer("/lanip?", "Success");
         web.answer("/test?", kPassed);
         diskIsAwake();
-        givenConfig({{"SERVER_BASE_URL", "https://cloud.kavra.example"},
-                     {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"},
-                     {"REMOTE_SETFORWARDURL", "/forward?%s&%s&%s&%d&%d&%s"},
-                     {"REMOTE_SETCOMMSTATUSURL", "/lanip?%s&%s&%s"},
-                     {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/setforward?%s&%d&%d&%s&%d"},
-                     {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/delforward?%d"},
-                     {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/setstatus?%s"},
-                     {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/setlanip?%s"},
-                     {"OPENVPN_CONFIG_PATH", folder},
-                     {"OPENVPN_AUTH_FILE", path("auth.txt")},
-                     {"STARTCMD", "start-client"},
-                     {"STARTCMD_OUTFILE", path("client.out")},
-                     {"LOG_SUCCESS_TEXT", "Completed"},
-                     {"OPENVPN_PID_FILE", path("client.pid")}},
-                    {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
+        // clang-format off
+        const std::string local = "http://127.0.0.1:%d/";
+        givenConfig(
+            {{"SERVER_BASE_URL", "https://cloud.kavra.example"}, {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"},
+             {"REMOTE_SETFORWARDURL", "/forward?%s&%s&%s&%d&%d&%s"}, {"REMOTE_SETCOMMSTATUSURL", "/lanip?%s&%s&%s"},
+             {"LOCAL_SETFORWARDURL", local + "setforward?%s&%d&%d&%s&%d"}, {"LOCAL_DELFORWARDURL", local + "delforward?%d"},
+             {"LOCAL_SETCOMMSTATUSURL", local + "setstatus?%s"}, {"LOCAL_SETLOCALIPURL", local + "setlanip?%s"},
+             {"OPENVPN_CONFIG_PATH", folder}, {"OPENVPN_AUTH_FILE", path("auth.txt")}, {"STARTCMD", "start-client"},
+             {"STARTCMD_OUTFILE", path("client.out")}, {"LOG_SUCCESS_TEXT", "Completed"},
+             {"OPENVPN_PID_FILE", path("client.pid")}},
+            {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
+        // clang-format on
     }
 
     void TearDown() override {
@@ -93,8 +127,8 @@ protected:
     void relayWorks() {
         support::FakeCommands::Answer start;
         start.action = [this](const std::string&) {
-            writeFile("client.out", std::string{"Peer Connection Initiated with [AF_INET]"} +
-                                        kRelayIp + ":1194\nCompleted\n");
+            writeFile("client.out",
+                      "Peer Connection Initiated with [AF_INET]44.128.0.1:1194\nCompleted\n");
         };
         commands.answer("start-client", start);
     }
@@ -108,16 +142,12 @@ protected:
         ASSERT_EQ(posix_spawn(&client, program.c_str(), nullptr, nullptr, arguments, nullptr), 0);
         writeFile("client.pid", std::to_string(client) + "\n");
     }
-    void clientCannotBeStopped() { commands.answer("kill -", "", 1); }
     /// The device is the maker's router; an empty @p wan: without a connection.
     void givenMakersRouter(const std::string& wan, const std::string& list) {
         setConfig("DEVICETYPE", "5");
         commands.answer("getip.sh wan", wan);
         commands.answer("getip.sh lan", "192.168.77.1\n");
         commands.answer("tavik_helper.sh list", list);
-    }
-    void askToWait() {
-        web.answer("/remote_access_status/", "<action>wait</action><wait_time>300</wait_time>");
     }
     /// The next test of @p port fails, with all its attempts.
     void failTest(int port) {
@@ -145,36 +175,28 @@ protected:
         gateway.clear();
         commands.clear();
         log.clear();
+        told.clear();
+        std::fill(std::begin(heard), std::end(heard), 0);
     }
 
-    /// The external ports that lead to this device, in order.
-    Ports mappedPorts() const {
-        Ports ports;
+    /// What happened since the last story, in order, then the mapped ports and the result.
+    std::string story(const std::string& result) {
+        listen();
+        std::string all = told.substr(std::min<std::size_t>(told.size(), 2)) + " =";
+        told.clear();
         for (const auto& mapping : gateway.mappings()) {
-            if (mapping.client == kLanIp) ports.push_back(mapping.externalPort);
+            if (mapping.client == kLanIp) all += " " + std::to_string(mapping.externalPort);
         }
-        return ports;
+        all = std::regex_replace(all, std::regex{kWanIp}, "WAN");
+        all = std::regex_replace(all, std::regex{kLanIp}, "LAN");
+        all = std::regex_replace(all, std::regex{" type="}, "/");
+        return std::regex_replace(all, std::regex{" -> "}, ">") + " " + result;
     }
-    /// The ports the server was asked to test, in order.
-    Ports testedPorts() const {
-        Ports ports;
-        for (const auto& tail : tails(web.urls(), "&port=")) ports.push_back(std::stoi(tail));
-        return ports;
+    std::string story(ConnectionType type) {
+        return story(ConnectionManager::convertEnumConnectionType(type));
     }
-    /// The status words told to the local back end, in order.
-    Texts statusWords() const { return tails(web.urls(), "/setstatus?"); }
-    /// The mapping records sent to the server: external address, LAN address, ports.
-    Texts records() const {
-        Texts found = tails(web.urls(), std::string{"/forward?"} + support::kDeviceId + "&");
-        for (auto& text : found) text = text.substr(0, text.rfind('&'));
-        return found;
-    }
-    /// The analytics events, as "state/type".
-    Texts events() const {
-        Texts found = tails(log.texts(), "cloudConnectivity state=");
-        for (auto& event : found) event.replace(event.find(" type="), 6, "/");
-        return found;
-    }
+    /// What follows @p part in the log lines that hold it.
+    Texts logged(const std::string& part) const { return tails(log.texts(), part); }
 
     FakeWeb& web = FakeWeb::get();
     FakeGateway& gateway = FakeGateway::get();
@@ -182,7 +204,25 @@ protected:
 
 private:
     pid_t client = 0;
+    std::string told;
+    std::size_t heard[4] = {};  // lines of each source
 
+    void listen() {
+        const Texts sources[] = {web.urls(), gateway.calls(), commands.lines(), log.texts()};
+        for (int source = 0; source < 4; ++source) {
+            for (auto& seen = heard[source]; seen < sources[source].size(); ++seen) {
+                tell(sources[source][seen], source == 3);
+            }
+        }
+    }
+    void tell(const std::string& line, bool isLog) {
+        for (const Word& word : kWords) {
+            const auto rest = tails({line}, word.part);
+            if (word.isLog != isLog || rest.empty()) continue;
+            told += std::string{", "} + word.words + rest[0].substr(0, rest[0].find(word.end));
+            return;
+        }
+    }
     // What follows part in each line that holds it.
     static Texts tails(const Texts& lines, const std::string& part) {
         Texts found;
@@ -191,6 +231,25 @@ private:
             if (at != std::string::npos) found.push_back(line.substr(at + part.size()));
         }
         return found;
+    }
+};
+
+using World = ConnectionTest;
+
+/// A row of a table of stories: how the world differs, and what each following step tells.
+struct Row {
+    const char* name;
+    std::function<void(World&)> world;
+    Texts stories;
+};
+
+class StoryTest : public ConnectionTest, public testing::WithParamInterface<Row> {
+protected:
+    /// Changes the world and compares the story of each @p step.
+    template <typename Step>
+    void expectStories(Step step) {
+        GetParam().world(*this);
+        for (const auto& wanted : GetParam().stories) EXPECT_EQ(story(step()), wanted);
     }
 };
 

@@ -3,133 +3,67 @@
 namespace pelorus {
 namespace {
 
-class RelayConnectionTest : public ConnectionTest {};
-
-TEST_F(RelayConnectionTest, WithdrawsTheRecordBeforeTheTunnelStarts) {
-    relayWorks();
-    std::size_t requestsAtStart = 0;
-    support::FakeCommands::Answer update;
-    update.action = [&](const std::string&) { requestsAtStart = web.urls().size(); };
-    setConfig("UPDATE_CONF_WITH_SERVER_CMD", "fetch-relays");
-    commands.answer("fetch-relays", update);
-    gateway.speakUpnp(false);
-    EXPECT_EQ(manager().createConnection(), RELAYED);
-    EXPECT_EQ(requestsAtStart, 3U);
-    EXPECT_EQ(records(), (Texts{"NULL&192.168.77.10&0&0"}));
-    EXPECT_EQ(web.count("http://127.0.0.1:8080/delforward?8080"), 1);
-    EXPECT_EQ(web.count("/lanip?"), 1);  // the LAN address is new
-    EXPECT_EQ(statusWords(), (Texts{"relayed"}));
-    EXPECT_EQ(events(), (Texts{"connecting/relayed", "connected/relayed"}));
+void forwarded(World& w) {
+    w.manager().createDirectConnection();
+    w.forget();
 }
 
-TEST_F(RelayConnectionTest, RelayForgetsThePortsAndLeavesTheirMappings) {
+class RelayAttempt : public StoryTest {};
+TEST_P(RelayAttempt, TellsAsExpected) {
+    expectStories([this] { return manager().createRelayConnection(); });
+}
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
+    Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); }, {"connecting/relayed, record NULL&&0&0, withdraw 8080, start, connected/relayed, status relayed, force 0 = relayed"}},
+    Row{"KeepsARunningTunnelAndEndsAForcedAttempt", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
+    Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); }, {"connecting/relayed, record NULL&&0&0, withdraw 8080, start, start, start, start, failed/relayed, status failed = failed"}},
+    Row{"KeepsEverythingWhenTheServerAsksForAWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
+    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { forwarded(w); }, {kKept}}),
+    RowName{});
+
+TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
     givenForwardedPorts();
     ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing
     relayWorks();
-    web.answer("/forward?", FakeWeb::noAnswer());  // the tunnel starts all the same
-    EXPECT_EQ(manager().createRelayConnection(), RELAYED);
-    EXPECT_EQ(mappedPorts(), (Ports{9091, 9444}));
+    web.answer("/forward?", FakeWeb::noAnswer());
+    EXPECT_EQ(story(manager().createRelayConnection()), "connecting/relayed, record NULL&LAN&0&0, start, connected/relayed, status relayed, force 0 = 9091 9444 relayed");
     manager().createDirectConnection();
     EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
 }
 
-TEST_F(RelayConnectionTest, RunningTunnelIsKeptAndEndsAForcedAttempt) {
-    clientRuns();
-    manager().setForceConnect(true);
-    EXPECT_EQ(manager().createRelayConnection(), RELAYED);
-    EXPECT_EQ(commands.count("start-client"), 0);
-    EXPECT_TRUE(records().empty());
-    EXPECT_EQ(statusWords(), (Texts{"relayed"}));
-    expectLogged(LOG_INFO, "ConnectionManager::setForceConnect = 0\n");
-}
-
-TEST_F(RelayConnectionTest, TunnelThatDoesNotComeUpIsReported) {
-    writeFile("client.out", "");
-    manager().setForceConnect(true);
+class KillConnection : public StoryTest {};
+TEST_P(KillConnection, TellsAsExpected) {
+    expectStories([this] {
+        manager().killConnection(PORTFORWARDED);
+        return NONE;
+    });
     log.clear();
-    EXPECT_EQ(manager().createRelayConnection(), FAILED);
-    EXPECT_EQ(statusWords(), (Texts{"failed"}));
-    EXPECT_EQ(events(), (Texts{"connecting/relayed", "failed/relayed"}));
-    EXPECT_EQ(log.countPart("setForceConnect"), 0);
-}
-
-TEST_F(RelayConnectionTest, ServerThatAsksForAWaitKeepsEverythingAsItIs) {
-    askToWait();
-    EXPECT_EQ(manager().createRelayConnection(), FAILED);
-    EXPECT_TRUE(records().empty());
-    EXPECT_TRUE(statusWords().empty());
-    EXPECT_EQ(commands.count("start-client"), 0);
-}
-
-TEST_F(RelayConnectionTest, NothingIsDoneWhileBothPortsAreMapped) {
-    ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);
-    forget();
-    EXPECT_EQ(manager().createRelayConnection(), PORTFORWARDED);
-    EXPECT_TRUE(web.urls().empty());
-    EXPECT_TRUE(commands.lines().empty());
-}
-
-class KillConnectionTest : public ConnectionTest {};
-
-TEST_F(KillConnectionTest, DirectRemovesOwnMappingsAndTheRecordOnly) {
-    const FakeGateway::Mapping ssh{5000, kLanIp, 22, "ssh"};
-    const FakeGateway::Mapping theirs{9093, "192.168.77.66", 80, "Kavra"};
-    for (const auto& mapping : {FakeGateway::Mapping{9091, kLanIp, 8080, "Kavra"}, ssh, theirs,
-                                FakeGateway::Mapping{9444, kLanIp, 8443, "KavraSSL"}}) {
-        gateway.add(mapping);
-    }
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_EQ(gateway.mappings(), (std::vector<FakeGateway::Mapping>{ssh, theirs}));
-    EXPECT_EQ(records(), (Texts{"NULL&192.168.77.10&0&0"}));
-    EXPECT_EQ(log.countPart("successfully deleted port mappings on central server.\n"), 1);
-    EXPECT_EQ(web.count("/lanip?"), 1);  // the gateway object is new, so the address is
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_EQ(web.count("/lanip?"), 1);
-}
-
-TEST_F(KillConnectionTest, PortsOfTheConnectionAreForgotten) {
-    givenForwardedPorts();
-    manager().killConnection(PORTFORWARDED);
-    manager().createDirectConnection();
-    EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
-}
-
-TEST_F(KillConnectionTest, WithoutAGatewayNothingIsChanged) {
-    gateway.speakUpnp(false);
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_TRUE(web.urls().empty());
-    EXPECT_TRUE(commands.lines().empty());
-}
-
-TEST_F(KillConnectionTest, GatewayThatWentAwayLaterStillLosesTheRecord) {
-    givenForwardedPorts();
-    gateway.speakUpnp(false);
-    manager().createDirectConnection();
-    forget();
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_EQ(commands.lines(), (Texts{"/etc/scripts/tavik_helper.sh list"}));
-    EXPECT_EQ(records(), (Texts{"NULL&192.168.77.10&0&0"}));
-}
-
-TEST_F(KillConnectionTest, UnknownInternalPortLeavesTheRecord) {
-    setConfig("INTERNAL_HTTP_PORT", "");
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_TRUE(records().empty());
-}
-
-TEST_F(KillConnectionTest, OtherTypesDoNothing) {
     for (const auto type : {NONE, CONNECTING, FAILED}) manager().killConnection(type);
     EXPECT_TRUE(log.lines().empty());
+    manager().createDirectConnection();
+    EXPECT_EQ(logged("Port 9"), Texts{}) << "the ports are forgotten";
 }
-
-TEST_F(KillConnectionTest, MakersRouterRemovesThroughItsScript) {
-    givenMakersRouter(
-        "", "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n");
-    manager().killConnection(PORTFORWARDED);
-    EXPECT_EQ(commands.count(" remove "), 1);
-    EXPECT_EQ(commands.count("tavik_helper.sh remove \"TCP,9091,192.168.77.1,80\""), 1);
-    EXPECT_TRUE(gateway.calls().empty());
-}
+INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
+    // The gateway object is new at the first, and so is the LAN address.
+    Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
+            w.gateway.add({9091, kLanIp, 8080, "Kavra"});
+            w.gateway.add({5000, kLanIp, 22, "ssh"});
+            w.gateway.add({9093, "192.168.77.66", 80, "Kavra"});
+            w.gateway.add({9444, kLanIp, 8443, "KavraSSL"});
+        }, {"lanip, unmap 9091, unmap 9444, record NULL&LAN&0&0, withdraw 8080 = 5000 disabled", "record NULL&LAN&0&0, withdraw 8080 = 5000 disabled"}},
+    Row{"ForgetsThePortsOfTheConnection", [](World& w) { forwarded(w); }, {"unmap 9091, unmap 9444, record NULL&LAN&0&0, withdraw 8080 = disabled"}},
+    Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.speakUpnp(false); }, {" = disabled"}},
+    Row{"WithdrawsTheRecordWhenTheGatewayWentAway", [](World& w) {
+            forwarded(w);
+            w.gateway.speakUpnp(false);
+            forwarded(w);
+        }, {"record NULL&LAN&0&0, withdraw 8080 = 9091 9444 disabled"}},
+    Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
+    Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {
+            w.givenMakersRouter("", "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n");
+        }, {"remove \"TCP,9091,192.168.77.1,80\", record NULL&192.168.77.1&0&0, withdraw 8080 = disabled"}}),
+    RowName{});
+// clang-format on
 
 }  // namespace
 }  // namespace pelorus

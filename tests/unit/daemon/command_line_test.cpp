@@ -25,13 +25,6 @@ std::string describe(const Options& options) {
            (options.unmapAll ? "unmap " : "");
 }
 
-std::string badFrequency(const std::string& value) {
-    return "Run frequency is " + value +
-           ". It must be between 30 and 900 seconds. A default of 30 secs will be used.\n";
-}
-std::string badSeverity(const std::string& value) {
-    return "Invalid syslog severity " + value + ". Default 5 shall be used.\n";
-}
 constexpr const char* kNoSeverity = "Severity level is missing. A default of 5 will be used.\n";
 
 struct Row {
@@ -41,24 +34,22 @@ struct Row {
     std::optional<int> status{};  // none: the daemon starts
 };
 
+// clang-format off
 const std::vector<Row> kRows{
     {"", ""},
     {"-f 31 -l 0 -u -d 1 -t 1 -p 1", "f31 l0 d1 t1 p1 log unmap "},
-    {"-check_frequency 900 -enable_log 7 -unmapall -dnscheckinterval 5000000000 "
-     "-portmaplifetime 4294967295 -publicipcheckinterval 60",
-     "f900 l7 d5000000000 t4294967295 p60 log unmap "},
-    {"-f 60 -f 29", "", badFrequency("29")},
-    {"-f 901", "", badFrequency("901")},
-    {"-f -u", "", badFrequency("-u")},
+    {"-check_frequency 900 -enable_log 7 -unmapall -dnscheckinterval 5000000000 -portmaplifetime 4294967295 -publicipcheckinterval 60", "f900 l7 d5000000000 t4294967295 p60 log unmap "},
+    {"-f 60 -f 29", "", "Run frequency is 29. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
+    {"-f 901", "", "Run frequency is 901. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
+    {"-f -u", "", "Run frequency is -u. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f 60 -f", "", "Run frequency is missing. A default of 30 secs will be used.\n"},
-    {"-l 8", "log ", badSeverity("8")},
-    {"-l -1", "log ", badSeverity("-1")},
+    {"-l 8", "log ", "Invalid syslog severity 8. Default 5 shall be used.\n"},
+    {"-l -1", "log ", "Invalid syslog severity -1. Default 5 shall be used.\n"},
     {"-l", "log ", kNoSeverity},
     {"-lc 6", "l6 console "},
-    {"-enable_log_console x", "console ", badSeverity("x")},
+    {"-enable_log_console x", "console ", "Invalid syslog severity x. Default 5 shall be used.\n"},
     {"-lc", "console ", kNoSeverity},
-    {"-d 9 -d 0", "",
-     "DNS check interval is 0 which is not valid.  A default of 86400 secs will be used.\n"},
+    {"-d 9 -d 0", "", "DNS check interval is 0 which is not valid.  A default of 86400 secs will be used.\n"},
     {"-d", "", "DNS check interval is missing. A default of 86400 secs will be used.\n"},
     {"-t -1", "t4294967295 "},
     {"-t 9 -t 0", "t9 ", "NAT-PMP port mapping lifetime is 0 which is not valid.\n"},
@@ -66,9 +57,8 @@ const std::vector<Row> kRows{
     {"-p 9 -p 0", "p9 ", "Manual port forward public IP check interval is 0 which is not valid.\n"},
     {"-p", "", "Manual port forward public IP check interval is missing.\n"},
     {"-f 60 -v -x", "f60 ", "Version: 1.7.0-54\n", 0},
-    {"-u --check_frequency -v", "unmap ",
-     "Invalid argument: --check_frequency, usage: -f nnn (seconds) or -check_frequency nnn (seconds) | -l or -enable_log nnn (log severity level) | -lc or -enable_log_console nnn (log severity level).\n",
-     1}};
+    {"-u --check_frequency -v", "unmap ", "Invalid argument: --check_frequency, usage: -f nnn (seconds) or -check_frequency nnn (seconds) | -l or -enable_log nnn (log severity level) | -lc or -enable_log_console nnn (log severity level).\n", 1}};
+// clang-format on
 
 TEST(CommandLine, SetsOptionsAndReportsWhatIsInvalid) {
     for (const Row& row : kRows) {

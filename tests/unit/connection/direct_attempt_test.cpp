@@ -138,6 +138,14 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
         }, {"test 9091, test 9091, test 9091, status failed, " + kNoRelay + " = 9091 9444 failed", kNoRelay + " = 9091 9444 failed"}}),
     RowName{});
 
+TEST_F(DirectConnection, TestWithoutAGatewayStartsTheInterval) {
+    givenForwardedPorts();
+    gateway.speakUpnp(false);
+    web.answer("/test?", kNotReached);
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("due to UPnP not working. Elapsed time 0, "), 1);
+}
+
 // A search for a connection that held does not wake the disk, so that its port stays untested.
 TEST_F(DirectConnection, SearchesUntilItsPortIsTestedAndWhileRelayedOncePerInterval) {
     givenForwardedPorts();

@@ -91,6 +91,7 @@ TEST_F(ManualAttemptTest, ChangedExternalAddressIsPublishedAndStaysMasked) {
     serverSees(*this, kWanIp);
     EXPECT_EQ(story(cycle()), kByHand + "connected/portforwarded, force 0 = portforwarded");
     EXPECT_EQ(log.countPart("detected change to external IP [*ID_REMOVED*]"), 1) << log.dump();
+    EXPECT_EQ(manager().createRelayConnection(), PORTFORWARDED) << "both ports count as mapped";
 }
 
 struct BadPort {

@@ -137,7 +137,7 @@ std::string TavikClient::getDeviceAuth() const {
     return setting("DEVICEAUTH");
 }
 
-// The scheme of the setting is dropped: both are offered. False, with the cause logged, when no
+// Ignores the configured scheme and builds both base URLs. False, with the cause logged, when no
 // host of at least two characters is left.
 bool TavikClient::deriveServerUrls() {
     const std::string base = setting("SERVER_BASE_URL");
@@ -189,7 +189,7 @@ char* TavikClient::httpGet(const char* url, int& size) {
         if (handle) {
             setOptions(handle.get(), url, rcvBuffer);
             const CURLcode result = curl_easy_perform(handle.get());
-            // What arrived before the failure is returned all the same.
+            // Data received before the failure is still returned.
             if (result != CURLE_OK) {
                 logError("TavikClient::httpGet  Error: [%s]\n", curl_easy_strerror(result));
             }

@@ -160,7 +160,7 @@ bool PortTest::isBehindSecondNat() const {
     return false;
 }
 
-// After the last attempt, too.
+// Also pauses after the last attempt.
 void PortTest::pauseBeforeRetry() const {
     logError("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s].\n",
              attempt, kRetryDelay, url.logged.c_str());

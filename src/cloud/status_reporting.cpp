@@ -21,7 +21,7 @@ std::map<std::string, std::string> Status2LogType;
 const std::array<const char*, 5> ConnType2LogType{"disabled", "portforwarded", "relayed",
                                                   "disabled", "disabled"};
 
-// Only fills the tables, so it stands with them. A failure has no type of its own: sendAnalytics
+// Defined here because it only fills the tables above. A failure has no type of its own: sendAnalytics
 // takes that of the connection that failed.
 TavikClient::TavikClient() {
     Status2LogState["disabled"] = "connecting";
@@ -44,7 +44,7 @@ constexpr const char* kLocalStatusKey = "LOCAL_SETCOMMSTATUSURL";
 constexpr const char* kLocalAddressKey = "LOCAL_SETLOCALIPURL";
 constexpr const char* kRemoteStatusKey = "REMOTE_SETCOMMSTATUSURL";
 
-// The two sides spell it differently.
+// The two sides capitalise it differently.
 constexpr const char* kLocalSuccess = "success";
 constexpr const char* kCentralSuccess = "Success";
 
@@ -109,7 +109,8 @@ int firstNumber(std::FILE* file) {
     return std::fgets(line.data(), line.size(), file) == nullptr ? 0 : leadingInt(line.data());
 }
 
-// 1 when the disk has been idle for so long that it may be asleep, or nobody knows; 0 otherwise.
+// 1 when the disk has been idle for so long that it may be asleep, or its idle time is
+// unknown; 0 otherwise.
 int checkIdleMinutes() {
     const FileHandle file = openFile(kIdleMinutesFile, "re");
     if (!file) {

@@ -114,7 +114,7 @@ public:
 
     /// Asks the server for the public address of this device. True when @p ip now is an IPv4
     /// address; another answer is left in @p ip, too. @p waitSeconds is the wait the server asked
-    /// for in place of an answer, else 0.
+    /// for instead of answering, else 0.
     bool getMyIP(std::string& ip, int& waitSeconds);
 
     // --- mapping records ---------------------------------------------------------------------

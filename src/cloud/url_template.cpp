@@ -48,7 +48,7 @@ std::optional<std::string> format(const std::string& urlTemplate,
         if (!text) return std::nullopt;
         url += *text;
     }
-    // Before the cut, which could leave half a secret behind.
+    // Scrubbed before the cut, which could leave part of a secret.
     if (secrets == Secrets::MASKED) url = scrubSecrets(url);
     url.resize(std::min(url.size(), kUrlBufferSize - 1));
     return url;

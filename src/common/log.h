@@ -20,7 +20,7 @@ inline constexpr std::size_t kLogLineSize = 1280;
 /// the C library holds its log lock.
 void logLine(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
 
-/// As logLine, with the priority in the name: LOG_ERR, LOG_WARNING, LOG_NOTICE, LOG_INFO, LOG_DEBUG.
+/// As logLine, with LOG_ERR, LOG_WARNING, LOG_NOTICE, LOG_INFO and LOG_DEBUG.
 void logError(const char* format, ...) __attribute__((format(printf, 1, 2)));
 void logWarning(const char* format, ...) __attribute__((format(printf, 1, 2)));
 void logNotice(const char* format, ...) __attribute__((format(printf, 1, 2)));

@@ -1,6 +1,6 @@
 // miniupnpc with one set of signatures. The library changed its argument lists over the years;
-// every call of it in this tree goes through these wrappers, and nothing else looks at the
-// version. They also keep a gateway that drops the connection from raising SIGPIPE.
+// every request to a gateway goes through these wrappers, and nothing else looks at the version.
+// They also keep a gateway that drops the connection from raising SIGPIPE.
 #ifndef PELORUS_COMMON_MINIUPNPC_API_H
 #define PELORUS_COMMON_MINIUPNPC_API_H
 

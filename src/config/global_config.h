@@ -24,9 +24,9 @@ public:
     /// be read; the cause is logged and whatever was merged by then stays.
     bool loadConfig(const std::string& path);
 
-    /// Merges the lines of an open @p file (see parseSettingLine); a later value replaces an earlier
-    /// one. A line of 300 or more characters counts as several. Always true. The caller closes the
-    /// file.
+    /// Merges the lines of an open @p file (see parseSettingLine); a later value replaces an
+    /// earlier one. A line of 300 or more characters counts as several. Always true. The caller
+    /// closes the file.
     bool loadConfigSettings(std::FILE* file);
 
     /// The value of @p key, or an empty string when it is absent. Costs one stat of the temporary

@@ -16,7 +16,7 @@ bool sameLetter(unsigned char left, unsigned char right) {
     return std::tolower(left) == std::tolower(right);
 }
 
-// Upper and lower case are the same: secrets are part of host names, and DNS changes their case. A
+// Case-insensitive: secrets are part of host names, and DNS changes their case. A
 // configuration file with CRLF line ends leaves a carriage return behind a secret, which no answer
 // repeats.
 void hide(std::string& text, std::string secret, const std::string& mask) {

@@ -12,9 +12,9 @@ struct Setting {
     std::string_view value;
 };
 
-/// Splits one line at its first "=" that is not its first character. The key keeps blanks in front of
-/// the "="; the value loses blanks and double quotes at both ends, and the line feed. There are no
-/// comments.
+/// Splits one line at its first "=" that is not its first character. The key keeps blanks in front
+/// of the "="; the value loses blanks and double quotes at both ends, and the line feed. There are
+/// no comments.
 [[nodiscard]] Setting parseSettingLine(std::string_view line);
 
 }  // namespace pelorus

@@ -23,7 +23,7 @@ struct PortRequest {
     bool checkSleep;          ///< no port test while the disk sleeps
 };
 
-/// Maps one candidate after the other until one passes its port test. See
+/// Maps one candidate after another until one passes its port test. See
 /// ConnectionManager::forwardPort().
 class ForwardSearch {
 public:

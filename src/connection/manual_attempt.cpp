@@ -75,7 +75,7 @@ void ManualAttempt::leaveAutomaticForwarding() {
     manager.forgetPorts();
 }
 
-// Until something was published by hand, every attempt counts as a change.
+// Until hand-forwarded ports have been published, every attempt counts as a change.
 void ManualAttempt::detectChanges() {
     auto* addresses = NetworkAddrs::getInstance();
     changed = !manager.lastManualPortForward || externalHttpPort != manager.allocatedHttpPort ||

@@ -15,8 +15,8 @@ public:
     DaemonControl(const DaemonControl&) = delete;
     DaemonControl& operator=(const DaemonControl&) = delete;
 
-    /// Runs cycles while remote access is enabled, then reports "disabled", tears down both kinds of
-    /// connection and ends the process by the termination signal that arrived. Returns only when
+    /// Runs cycles while remote access is enabled, then reports "disabled", tears down both kinds
+    /// of connection and ends the process by the termination signal that arrived. Returns only when
     /// none did.
     void run();
 

@@ -71,8 +71,8 @@ void logBanner(pid_t session) {
               GetPelorusVersion(), getpid(), session);
 }
 
-// /tmp is world-writable: a symbolic link planted there must not redirect the write, and a FIFO must
-// not block start-up.
+// /tmp is world-writable: a symbolic link planted there must not redirect the write, and a FIFO
+// must not block start-up.
 void writePidFile() {
     const int file = open(
         kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPidFileMode);

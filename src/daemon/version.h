@@ -1,3 +1,4 @@
+// The version of the daemon.
 #ifndef PELORUS_DAEMON_VERSION_H
 #define PELORUS_DAEMON_VERSION_H
 

@@ -54,7 +54,7 @@ public:
     WorkingDirectory& operator=(const WorkingDirectory&) = delete;
 
 private:
-    // A missing directory has no line of its own: the client does not come up.
+    // A missing directory is not logged; the client then fails to come up.
     static bool change(const char* path) { return chdir(path) == 0; }
 
     std::array<char, kPathSize> saved{};

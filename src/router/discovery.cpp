@@ -84,8 +84,8 @@ bool isGateway(const UPNPDev& device) {
     return wanted && !contains(textOf(device.descURL), "udhisapi.dll");
 }
 
-// The gateways among @p device and what follows it, as a list of its own in the same order. The
-// texts stay those of the original list.
+// Copies the gateways from the list that starts at @p device, in order. The strings still belong to
+// that list.
 std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
     std::vector<UPNPDev> gateways;
     for (; device != nullptr; device = device->pNext) {

@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::size_t kPortDigits = 5;
 
-// A mapping's index is a 16-bit number. A gateway that answers beyond it will answer for ever.
+// A mapping's index is a 16-bit number. A gateway that answers for a higher index would never stop.
 constexpr int kLastMappingIndex = 65535;
 // A gateway that lies or stalls must not block the daemon, least of all during shutdown.
 constexpr std::time_t kLongestEnumeration = 60;  // seconds

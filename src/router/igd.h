@@ -20,7 +20,7 @@ struct IgdEntry {
     std::string lease;
 };
 
-/// An external address as the gateway reports it, as untrusted; empty when it reports none.
+/// An external address as the gateway reports it; also untrusted. Empty when it reports none.
 struct IgdAddress {
     int status = 0;  ///< the library's
     std::string text;

@@ -40,7 +40,7 @@ struct TrackedMapping {
 };
 
 /// One port mapping and its lease. All zero means that nothing is tracked. Such a tracker counts as
-/// due: its renewal is attempted, and the mapping call has to refuse port 0.
+/// due: UPnP refuses to renew port 0, NAT-PMP sends the request.
 class PMTracker {
 public:
     /// Records a mapping and starts its lease (@p leaseSeconds) now. (0, 0, 0) forgets it.

@@ -41,7 +41,7 @@ public:
     /// @p protocol is "TCP" or "UDP"; @p description is not sent, the protocol has none. What the
     /// gateway granted is returned in @p externalPort and @p lifetime and may differ from what was
     /// asked; a lifetime of 0 granted to a mapping counts as its removal. True when the gateway
-    /// answered. @p isHttps chooses the tracker of a new mapping.
+    /// granted it. @p isHttps chooses the tracker of a new mapping.
     bool portMappingRequest(int internalPort,
                             int& externalPort,
                             const std::string& protocol,

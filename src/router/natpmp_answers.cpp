@@ -15,7 +15,7 @@ constexpr std::size_t kRememberedRequests = 4;
 constexpr int kMostOwed = 16;
 constexpr int kMostDropped = 100;
 
-// Two seconds in all. Counted in waits, as a clock may be set meanwhile.
+// Two seconds in all. Counted in waits, because the clock may be set during the wait.
 constexpr int kWaits = 20;
 constexpr suseconds_t kWait = 100'000;  // microseconds
 
@@ -28,7 +28,7 @@ bool isReadable(int socket, suseconds_t wait) {
     return select(FD_SETSIZE, &readable, nullptr, nullptr, &timeout) > 0;
 }
 
-// The gateway's word, be it yes or no.
+// Whether the gateway answered, granting or refusing.
 bool isFromGateway(int status) {
     return status >= 0 ||
            (status <= NATPMP_ERR_UNDEFINEDERROR && status >= NATPMP_ERR_OUTOFRESOURCES) ||
@@ -53,14 +53,14 @@ void NatpmpAnswers::begin(const natpmp_t& client, const NatpmpRequest& request) 
     for (int waits = 0; gatewayAnswers && owed > 0 && waits < kWaits; ++waits) {
         if (isReadable(client.s, kWait)) drop(client.s);
     }
-    // Two seconds without any: they are lost. One that comes all the same is still recognised.
+    // Nothing in two seconds: assume they are lost. isLate() still recognises a straggler.
     if (gatewayAnswers && owed == before) owed = 0;
     for (int more = 0; more < kMostDropped; ++more) {
         if (!drop(client.s)) break;
     }
 }
 
-// Takes one answer away, or a refused connection. False when nothing was there.
+// Discards one datagram or a pending ECONNREFUSED. False when there was neither.
 bool NatpmpAnswers::drop(int socket) {
     std::array<char, sizeof(natpmpresp_t)> answer{};
     if (recv(socket, answer.data(), answer.size(), MSG_DONTWAIT) < 0 && errno == EAGAIN) {

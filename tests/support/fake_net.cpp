@@ -16,7 +16,7 @@ namespace {
 // An entry of getifaddrs with what it points to.
 struct Node {
     ifaddrs entry{};
-    std::string name;
+    std::string name;  // cppcheck-suppress unusedStructMember; entry points to it
     sockaddr_storage address{};
 };
 

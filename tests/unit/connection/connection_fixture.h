@@ -54,8 +54,8 @@ inline const std::string kKept = " = 9091 9444 portforwarded";
 /// What a story() tells of the lines that hold the part: these words and what follows the part, up
 /// to the end mark.
 struct Word {
-    const char* part;
-    const char* words;
+    const char* part = "";
+    const char* words = "";
     const char* end = "\n";
     bool isLog = false;
 };

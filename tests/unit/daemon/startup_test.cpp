@@ -45,7 +45,7 @@ protected:
         };
     }
 
-    /// Runs the daemon to its end, the forks included.
+    // Runs the daemon to its end, the forks included.
     void start(const Texts& arguments) {
         prctl(PR_SET_CHILD_SUBREAPER, 1);
         const pid_t child = fork();
@@ -64,10 +64,10 @@ protected:
         writeFile("static.ini", readFile(file) + "ENABLEREMOTEACCESS=" + value + "\n");
     }
 
-    std::function<void(const LogLine&)> atLine;  ///< called by the daemon for each of its lines
-    std::set<std::string> failing;               ///< see FakeProcess
-    int parentStatus = 0;                        ///< wait status of the process that was started
-    int daemonStatus = 0;                        ///< wait status of its child, if there was one
+    std::function<void(const LogLine&)> atLine;  // called by the daemon for each of its lines
+    std::set<std::string> failing;               // see FakeProcess
+    int parentStatus = 0;                        // wait status of the process that was started
+    int daemonStatus = 0;                        // wait status of its child, if there was one
     static constexpr int kNone = -1;
     std::string reported;
 

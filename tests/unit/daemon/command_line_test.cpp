@@ -39,6 +39,7 @@ const std::vector<Row> kRows{
     {"", ""},
     {"-f 31 -l 0 -u -d 1 -t 1 -p 1", "f31 l0 d1 t1 p1 log unmap "},
     {"-check_frequency 900 -enable_log 7 -unmapall -dnscheckinterval 5000000000 -portmaplifetime 4294967295 -publicipcheckinterval 60", "f900 l7 d5000000000 t4294967295 p60 log unmap "},
+    {"-f 60 -f 30", ""},
     {"-f 60 -f 29", "", "Run frequency is 29. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f 901", "", "Run frequency is 901. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f -u", "", "Run frequency is -u. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},

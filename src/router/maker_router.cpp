@@ -117,7 +117,7 @@ std::optional<_BrenvikPortIp> parseEntry(const std::string& line) {
 }
 
 // Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
-// be started, else 1; what the script made of it is not known.
+// be started, else 1; the script's own result is not known.
 int runHelper(const char* action, const std::string& argument) {
     constexpr std::string_view kSpecialInQuotes = "\"$`\\";
     std::string command = std::string(kHelperScript) + " " + action + " \"";

@@ -12,6 +12,7 @@
 #include "cloud/tavik_client.h"
 #include "common/handles.h"
 #include "common/log.h"
+#include "common/signal_block.h"
 #include "common/text.h"
 #include "config/global_config.h"
 #include "config/scrub.h"
@@ -119,6 +120,7 @@ bool TavikClient::initialize() {
         logError(
             "TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file\n");
     }
+    const TerminationBlock held;
     if (curl_global_init(CURL_GLOBAL_ALL) != CURLE_OK) {
         logError("TavikClient::initialize() - CURL initialization failed.\n");
     }
@@ -126,6 +128,7 @@ bool TavikClient::initialize() {
 }
 
 void TavikClient::cleanup() {
+    const TerminationBlock held;
     curl_global_cleanup();
 }
 
@@ -185,6 +188,7 @@ char* TavikClient::httpGet(const char* url, int& size) {
     }
     rcvBuffer = {};
     try {
+        const TerminationBlock held;
         const CurlHandle handle{curl_easy_init()};
         if (handle) {
             setOptions(handle.get(), url, rcvBuffer);
@@ -211,6 +215,7 @@ std::optional<Answer> TavikClient::fetchCentral(const MaskedUrl& url) {
 }
 
 std::string TavikClient::nsLookup(const std::string& hostname) const {
+    const TerminationBlock held;
     addrinfo* found = nullptr;
     const int error = getaddrinfo(hostname.c_str(), nullptr, nullptr, &found);
     if (error != 0) {

@@ -3,12 +3,12 @@
 
 #include <array>
 #include <cstdio>
-#include <cstdlib>
 
 #include "cloud/tavik_client.h"
 #include "common/handles.h"
 #include "common/log.h"
 #include "common/masks.h"
+#include "common/shell.h"
 #include "common/signal_block.h"
 #include "common/text.h"
 #include "config/global_config.h"
@@ -91,7 +91,7 @@ bool tellBackEndLocalIp(const std::string& localIp) {
 
 void emitEvent(const char* state, const char* type) {
     // The library may hold the log's lock, and the termination handler logs, too.
-    const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
+    const TerminationBlock held;
     __qvlog_kvp(kEventLevel, "cloudConnectivity", "state", kTextValue, state, "type", kTextValue,
                 type, __QVLOG_END);
 }
@@ -167,7 +167,7 @@ void TavikClient::updateLocalCommStatus(const std::string& status) try {
             scrubSecrets(url).c_str());
         return;
     }
-    if (std::system(kTouchDynamicConfig) != -1) {
+    if (runShell(kTouchDynamicConfig) != -1) {
         logInfo("TavikClient::updateLocalCommStatus - enforced touch to /tmp/dynamicconfig.ini.\n");
     }
     judgeLocalStatusAnswer(url, answer->text);

@@ -12,7 +12,7 @@ void vlogLine(std::size_t size, int priority, const char* format, va_list args) 
     std::array<char, kLogLineSize> line{};
     const std::size_t capacity = std::min(size, line.size());
     if (std::vsnprintf(line.data(), capacity, format, args) < 0) return;
-    const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
+    const TerminationBlock held;
     syslog(priority, "%s", line.data());
 }
 

@@ -16,8 +16,8 @@ inline constexpr std::size_t kLogLineSize = 1280;
 /// Formats one line and sends it to syslog with @p priority (LOG_ERR, LOG_INFO, ...).
 ///
 /// Text from outside (answers, configured values, names) must be an argument, never the format.
-/// Safe to call from the termination signal handler: the termination signals are blocked while
-/// the C library holds its log lock.
+/// Safe to call from the termination signal handler, which cannot interrupt a holder of the locks
+/// that the C library takes here: see TerminationBlock. A short line allocates nothing there.
 void logLine(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
 
 /// As logLine, with LOG_ERR, LOG_WARNING, LOG_NOTICE, LOG_INFO and LOG_DEBUG.

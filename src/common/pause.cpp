@@ -11,7 +11,7 @@
 namespace pelorus {
 
 void pauseUnlessTerminated(int seconds) {
-    const SignalBlock held{SIGINT, SIGTERM, SIGQUIT};
+    const TerminationBlock held;
     if (terminationRequested()) return;
     const timespec length{seconds, 0};
     static_cast<void>(ppoll(nullptr, 0, &length, &held.previousMask()));

@@ -25,6 +25,15 @@ private:
     sigset_t previous{};
 };
 
+/// Holds SIGINT, SIGTERM and SIGQUIT back until the end of the scope. Their handler writes to the
+/// log, and a log line takes the C library's log and time-zone locks: a handler that interrupts the
+/// holder of one would wait forever. Hence around every library call that may take one of them,
+/// OpenSSL's included. Not for system() and popen(): their children would be hard to stop.
+class TerminationBlock : public SignalBlock {
+public:
+    TerminationBlock() : SignalBlock{SIGINT, SIGTERM, SIGQUIT} {}
+};
+
 /// Keeps SIGPIPE from ending the process when a peer closes its connection early: the signal is
 /// blocked for the scope and discarded at its end, so that the write merely fails. For libraries
 /// that write to sockets without MSG_NOSIGNAL.

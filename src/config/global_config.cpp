@@ -5,10 +5,10 @@
 
 #include <array>
 #include <cstdarg>
-#include <cstdlib>
 
 #include "common/handles.h"
 #include "common/log.h"
+#include "common/shell.h"
 #include "config/replace_command.h"
 #include "config/setting_line.h"
 
@@ -218,7 +218,7 @@ void GlobalConfig::writeToStaticFile(const std::string& key,
         return;
     }
     if (!isNew) {
-        if (std::system(text.c_str()) != 0) {
+        if (runShell(text) != 0) {
             logConfigError("GlobalConfig::setProperty() - failed to update config file: %s\n",
                            configPath.c_str());
         }

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <ctime>
 #include <initializer_list>
 
 #include "common/log.h"
@@ -57,10 +58,16 @@ void sigTrap(int sig) {
 }
 
 bool installSignalHandlers() {
+    // Loads the time zone: the handler's log lines must not be the first to need it.
+    tzset();
+    sigset_t handled;
+    sigemptyset(&handled);
     for (const int sig : {SIGINT, SIGTERM, SIGQUIT}) {
         if (std::signal(sig, sigTrap) == SIG_ERR) return false;
+        sigaddset(&handled, sig);
     }
-    return true;
+    // Whoever started the daemon may have blocked them.
+    return pthread_sigmask(SIG_UNBLOCK, &handled, nullptr) == 0;
 }
 
 }  // namespace pelorus

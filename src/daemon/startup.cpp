@@ -48,7 +48,7 @@ Options readCommandLine(int argc, char** argv) {
 void openLog(const Options& options) {
     if (!options.log && !options.logToConsole) return;
     // Both take the lock that the signal handler needs for its own lines.
-    const SignalBlock noTermination{SIGINT, SIGTERM, SIGQUIT};
+    const TerminationBlock held;
     setlogmask((1 << (options.severity + 1)) - 1);
     openlog("Pelorus", options.logToConsole ? LOG_CONS : 0, LOG_LOCAL0);
     logLine(LOG_ALERT, "main - syslog severity level set to %d.\n", options.severity);

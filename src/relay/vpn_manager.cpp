@@ -6,11 +6,11 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 
 #include "common/handles.h"
 #include "common/log.h"
+#include "common/shell.h"
 #include "common/text.h"
 #include "config/global_config.h"
 #include "config/scrub.h"
@@ -32,10 +32,6 @@ constexpr std::size_t kOutputLineSize = 1024;  // bytes
 constexpr std::size_t kPidLineSize = 81;       // bytes: 80 characters and the terminator
 constexpr std::size_t kStopPidLineSize = 128;  // bytes
 constexpr std::size_t kLinkTargetSize = 512;   // bytes
-
-int runShell(const std::string& command) {
-    return std::system(command.c_str());
-}
 
 // 0, or the errno of a failure.
 int removeFile(const std::string& path) {

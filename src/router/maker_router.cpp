@@ -4,7 +4,6 @@
 
 #include <array>
 #include <charconv>
-#include <cstdlib>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -12,6 +11,7 @@
 
 #include "common/handles.h"
 #include "common/log.h"
+#include "common/shell.h"
 #include "router/router.h"
 
 namespace pelorus {
@@ -126,7 +126,7 @@ int runHelper(const char* action, const std::string& argument) {
         command.push_back(character);
     }
     command += "\"";
-    return std::system(command.c_str()) == -1 ? 0 : 1;
+    return runShell(command) == -1 ? 0 : 1;
 }
 
 }  // namespace

@@ -2,12 +2,27 @@
 #ifndef PELORUS_SUPPORT_FAKE_H
 #define PELORUS_SUPPORT_FAKE_H
 
+#include <gtest/gtest.h>
+
 #include <algorithm>
+#include <csignal>
 #include <string>
 #include <utility>
 #include <vector>
 
 namespace pelorus::support {
+
+inline bool isBlocked(int signal) {
+    sigset_t mask;
+    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    return sigismember(&mask, signal) == 1;
+}
+
+/// For a library that may hold a lock which the handler's log line needs.
+inline void expectTerminationHeld() {
+    EXPECT_TRUE(isBlocked(SIGINT) && isBlocked(SIGTERM) && isBlocked(SIGQUIT))
+        << "the handler could wait for a lock forever";
+}
 
 /// One object for the calls that the linker leads to a fake. Never destroyed: the code under test
 /// still calls it at the end of the process.

@@ -48,6 +48,7 @@ int __real_getaddrinfo(const char* name, const char* service, const addrinfo* hi
 void __real_freeaddrinfo(addrinfo* list);
 
 int __wrap_getaddrinfo(const char* name, const char* /*service*/, const addrinfo* hints, addrinfo** list) {
+    expectTerminationHeld();
     // clang-format on
     FakeNet& net = FakeNet::get();
     addrinfo numeric = hints != nullptr ? *hints : addrinfo{};

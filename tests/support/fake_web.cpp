@@ -27,16 +27,19 @@ FakeWeb::Transfer& FakeWeb::transferOf(CURL* handle) {
 
 extern "C" {
 CURLcode __wrap_curl_global_init(long /*flags*/) {
+    expectTerminationHeld();
     ++FakeWeb::globalInits;
     return FakeWeb::get().globalInitFails ? CURLE_FAILED_INIT : CURLE_OK;
 }
 
 void __wrap_curl_global_cleanup() {
+    expectTerminationHeld();
     --FakeWeb::globalInits;
 }
 
 CURL* __wrap_curl_easy_init() {
     FakeWeb& web = FakeWeb::get();
+    expectTerminationHeld();
     EXPECT_GT(web.globalInits, 0) << "libcurl is not initialised";
     EXPECT_FALSE(web.isOpen) << "another easy handle is open";
     if (web.handlesFail) return nullptr;
@@ -46,6 +49,7 @@ CURL* __wrap_curl_easy_init() {
 }
 
 void __wrap_curl_easy_cleanup(CURL* handle) {
+    expectTerminationHeld();
     FakeWeb::get().transferOf(handle);
     FakeWeb::get().isOpen = false;
 }
@@ -74,6 +78,7 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
 }
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
+    expectTerminationHeld();
     const FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
     if (now.url.empty()) return CURLE_URL_MALFORMAT;
     FakeWeb::Answer answer = FakeWeb::get().ask(now.url);
@@ -92,9 +97,8 @@ void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* /*s
 #else
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
 #endif
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
+    expectTerminationHeld();
+    EXPECT_TRUE(isBlocked(SIGPIPE)) << "a closed connection would end the process";
     *size = 0;
     if (*url == '\0') return nullptr;
     const FakeWeb::Answer answer = FakeWeb::get().ask(url);

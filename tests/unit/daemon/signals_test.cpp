@@ -2,6 +2,7 @@
 
 #include <cerrno>
 
+#include "common/signal_block.h"
 #include "common/termination.h"
 #include "daemon_fixture.h"
 
@@ -31,6 +32,21 @@ TEST_F(SignalsTest, ATerminationSignalDisablesAndIsKeptForTheEnd) {
         EXPECT_EQ(sigConnKilled, signal);
         EXPECT_TRUE(hadDefaultAction(signal)) << "a second one ends the process at once";
     }
+}
+
+TEST_F(SignalsTest, ASignalDuringATransferIsHandledAfterIt) {
+    const TerminationBlock inherited;  // from whoever started the daemon
+    ASSERT_TRUE(installSignalHandlers());
+    support::FakeWeb::Answer answer("Success");
+    answer.action = [] {
+        raise(SIGTERM);
+        EXPECT_FALSE(terminationRequested());
+    };
+    web.answer("/x", answer);
+    int size = 0;
+    std::free(TavikClient::getInstance()->httpGet("https://cloud.kavra.example/x", size));
+    EXPECT_EQ(size, 7);
+    EXPECT_TRUE(terminationRequested());
 }
 
 TEST_F(SignalsTest, OtherNumbersAreNotInstalledAndDoNotTerminate) {

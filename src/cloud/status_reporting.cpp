@@ -5,6 +5,7 @@
 #include <cstdio>
 
 #include "cloud/tavik_client.h"
+#include "common/files.h"
 #include "common/handles.h"
 #include "common/log.h"
 #include "common/masks.h"
@@ -112,7 +113,7 @@ int firstNumber(std::FILE* file) {
 // 1 when the disk has been idle for so long that it may be asleep, or its idle time is
 // unknown; 0 otherwise.
 int checkIdleMinutes() {
-    const FileHandle file = openFile(kIdleMinutesFile, "re");
+    const FileHandle file = openForeignFile(kIdleMinutesFile);
     if (!file) {
         logError(
             "TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.\n");

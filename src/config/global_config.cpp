@@ -6,7 +6,7 @@
 #include <array>
 #include <cstdarg>
 
-#include "common/handles.h"
+#include "common/files.h"
 #include "common/log.h"
 #include "common/shell.h"
 #include "config/replace_command.h"
@@ -52,7 +52,7 @@ bool copyFile(std::FILE* from, std::FILE* to) {
 // Makes the first temporary copy. False, with the cause logged, when it cannot be made.
 bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
     logConfigInfo("Opening dynamic config file for copy.\n");
-    const FileHandle dynamicFile = openFile(dynamicPath, "re");
+    const FileHandle dynamicFile = openForeignFile(dynamicPath);
     if (!dynamicFile) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
@@ -60,7 +60,7 @@ bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copy
         return false;
     }
     logConfigInfo("Creating temp copy of dynamic config file.\n");
-    const FileHandle copy = openFile(copyPath, "we");
+    const FileHandle copy = createFile(copyPath, kCopyMode);
     if (!copy) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to create temporary dynamic config file: %s\n",
@@ -117,7 +117,7 @@ bool GlobalConfig::loadStaticConfig() {
 bool GlobalConfig::loadDynamicConfig(const std::string& path) {
     logConfigInfo("OPENING dynamic config file for read: \n");
     logConfigInfo("%s", path.c_str());
-    const FileHandle file = openFile(path, "re");
+    const FileHandle file = openForeignFile(path);
     if (!file) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [%s].\n",
@@ -130,12 +130,11 @@ bool GlobalConfig::loadDynamicConfig(const std::string& path) {
 
 bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
     logConfigInfo("Loading TEMP dynamic config file.\n");
-    FileHandle copy = openFile(copyPath, "re");
+    FileHandle copy = openForeignFile(copyPath);
     if (!copy) {
         if (!createTemporaryCopy(dynamicPath, copyPath)) return false;
-        static_cast<void>(chmod(copyPath.c_str(), kCopyMode));
         logConfigInfo("Re-opening TEMP dynamic config file.\n");
-        copy = openFile(copyPath, "re");
+        copy = openForeignFile(copyPath);
     }
     if (!copy) {
         logConfigError(
@@ -190,7 +189,7 @@ void GlobalConfig::reloadChangedCopy() {
     if (status.st_mtime == tmpModTime) return;
     // Stored even when the copy cannot be opened: only its next change starts another attempt.
     tmpModTime = status.st_mtime;
-    const FileHandle copy = openFile(path, "re");
+    const FileHandle copy = openForeignFile(path);
     if (!copy) return;
     logConfigInfo("Reload dynamicconfig.ini file.\n");
     loadConfigSettings(copy.get());

@@ -1,6 +1,5 @@
 #include "daemon/startup.h"
 
-#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -9,6 +8,7 @@
 #include <optional>
 #include <string>
 
+#include "common/files.h"
 #include "common/log.h"
 #include "common/signal_block.h"
 #include "common/termination.h"
@@ -28,7 +28,7 @@ constexpr const char* kPidFile = "/tmp/tavik_cm_pid";
 constexpr const char* kStaticConfigVariable = "TAVIK_STATIC_CONFIG";
 constexpr const char* kDefaultStaticConfig = "/var/www/rest-api/config/globalconfig.ini";
 constexpr mode_t kUmask = 077;
-constexpr mode_t kPidFileMode = 0666;  // before the umask
+constexpr mode_t kPidFileMode = 0600;
 
 void trapTerminationSignals() {
     if (installSignalHandlers()) return;
@@ -71,14 +71,9 @@ void logBanner(pid_t session) {
               GetPelorusVersion(), getpid(), session);
 }
 
-// /tmp is world-writable: a symbolic link planted there must not redirect the write, and a FIFO
-// must not block start-up.
 void writePidFile() {
-    const int file = open(
-        kPidFile, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPidFileMode);
-    if (file < 0) return;
-    static_cast<void>(dprintf(file, "%d", getpid()));
-    static_cast<void>(close(file));
+    const FileHandle file = createFile(kPidFile, kPidFileMode);
+    if (file) static_cast<void>(std::fprintf(file.get(), "%d", getpid()));
 }
 
 bool loadConfiguration() {

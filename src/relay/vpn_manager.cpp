@@ -8,7 +8,7 @@
 #include <cstdio>
 #include <cstring>
 
-#include "common/handles.h"
+#include "common/files.h"
 #include "common/log.h"
 #include "common/shell.h"
 #include "common/text.h"
@@ -26,6 +26,8 @@ constexpr unsigned kStartCheckDelay = 10;  // seconds
 constexpr int kMaxStopPasses = 5;
 constexpr int kGracefulStopPasses = 3;
 constexpr unsigned kStopDelay = 3;  // seconds
+
+constexpr mode_t kCredentialsMode = 0600;
 
 constexpr std::size_t kPathSize = 1024;        // bytes, terminator included
 constexpr std::size_t kOutputLineSize = 1024;  // bytes
@@ -113,7 +115,7 @@ bool VPNManager::writeCredentials() {
             "VPNManager::openVPNConnection() - failed to get DEVICEID and/or DEVICEAUTH settings from config file!\n");
         return false;
     }
-    const FileHandle file = openFile(setting("OPENVPN_AUTH_FILE"), "we");
+    const FileHandle file = createFile(setting("OPENVPN_AUTH_FILE"), kCredentialsMode);
     if (!file) {
         logError("VPNManager::openVPNConnection() - failed to open VPN Auth file for write!\n");
         return false;
@@ -152,7 +154,7 @@ bool holdsSuccessText(std::FILE* output, const std::string& successText) {
 VPNManager::StartState VPNManager::waitUntilUp() {
     for (int check = 0; check < kChecksPerStart; ++check) {
         sleep(kStartCheckDelay);
-        const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
+        const FileHandle output = openForeignFile(setting("STARTCMD_OUTFILE"), Part::TAIL);
         if (!output) {
             logError("VPNManager::openVPNConnection() - failed to open openVPN stdout file!\n");
             return StartState::UNREADABLE;
@@ -171,7 +173,7 @@ bool VPNManager::isVPNRunning() {
     const std::string pidFile = setting("OPENVPN_PID_FILE");
     std::array<char, kPidLineSize> line{};
     {
-        const FileHandle file = openFile(pidFile, "re");
+        const FileHandle file = openForeignFile(pidFile);
         if (!file) return false;
         if (std::fgets(line.data(), line.size(), file.get()) == nullptr) line.front() = '\0';
     }
@@ -250,7 +252,7 @@ bool VPNManager::stopOnce(int pass) {
     logInfo("VPNManager::closeVPNConnection() - openVPN process is running\n");
     bool allStopped = true;
     {
-        const FileHandle file = openFile(pidFile, "re");
+        const FileHandle file = openForeignFile(pidFile);
         if (!file) {
             logError("VPNManager::closeVPNConnection() - failed to open PID output file\n");
             return false;
@@ -286,7 +288,7 @@ bool VPNManager::cleanupVPNConnection() {
 }
 
 bool VPNManager::fetchOpenVPN_IPAddr(std::string& ip) {
-    const FileHandle output = openFile(setting("STARTCMD_OUTFILE"), "re");
+    const FileHandle output = openForeignFile(setting("STARTCMD_OUTFILE"), Part::TAIL);
     if (!output) {
         logError("VPNManager::fetchOpenVPN_IPAddr() - failed to open openVPN stdout file!\n");
         return false;

@@ -5,6 +5,8 @@
 
 #include <array>
 #include <cstdarg>
+#include <sstream>
+#include <utility>
 
 #include "common/files.h"
 #include "common/log.h"
@@ -20,6 +22,9 @@ constexpr std::size_t kLineSize = 300;        // bytes of one fgets, terminator 
 constexpr std::size_t kConfigLogSize = 1024;  // bytes of one log line of this store
 constexpr mode_t kCopyMode = 0666;            // other programs on the device rewrite the copy
 
+constexpr std::size_t kMostSettings = 10'000;
+
+const std::string kStaticOnlyKey = "STATIC_ONLY_KEYS";
 const std::string kTmpPathKey = "DYNAMIC_CONFIG_TMP";
 
 __attribute__((format(printf, 1, 2))) void logConfigError(const char* format, ...) {
@@ -104,7 +109,8 @@ bool GlobalConfig::loadStaticConfig() {
                        configPath.c_str());
         return false;
     }
-    const bool parsed = loadConfigSettings(file.get());
+    staticOnlyKeys.clear();
+    const bool parsed = merge(file.get(), Source::STATIC);
     if (properties.empty()) {
         // Says "open", but means a file without a single setting.
         logConfigError("GlobalConfig::loadConfigSettings() - failed to open config file: [%s].\n",
@@ -125,7 +131,7 @@ bool GlobalConfig::loadDynamicConfig(const std::string& path) {
         return false;
     }
     logConfigInfo("LOADING dynamic config file settings.\n");
-    return loadConfigSettings(file.get());
+    return merge(file.get(), Source::DYNAMIC);
 }
 
 bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
@@ -142,7 +148,7 @@ bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::
             copyPath.c_str());
         return false;
     }
-    const bool parsed = loadConfigSettings(copy.get());
+    const bool parsed = merge(copy.get(), Source::DYNAMIC);
     copy.reset();
     struct stat status {};
     if (stat(copyPath.c_str(), &status) == 0) tmpModTime = status.st_mtime;
@@ -150,16 +156,42 @@ bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::
 }
 
 bool GlobalConfig::loadConfigSettings(std::FILE* file) {
+    return merge(file, Source::STATIC);
+}
+
+bool GlobalConfig::merge(std::FILE* file, Source source) {
     std::array<char, kLineSize> line{};
     std::string key;  // outside the loop to keep its memory: the map copies new keys only
     while (std::fgets(line.data(), line.size(), file) != nullptr) {
         const Setting setting = parseSettingLine(line.data());
         if (setting.key.empty()) continue;
         key = setting.key;
+        if (!isAccepted(key, source)) continue;
+        if (source == Source::STATIC && key == kStaticOnlyKey) addStaticOnlyKeys(setting.value);
         const auto [position, isNew] = properties.try_emplace(key, setting.value);
         if (!isNew) position->second = setting.value;
     }
     return true;
+}
+
+// Others can write the dynamic file's copy: it must not set what they could run commands with, nor
+// fill the memory.
+bool GlobalConfig::isAccepted(const std::string& key, Source source) {
+    if (source == Source::STATIC) return true;
+    const auto reserved = staticOnlyKeys.find(key);
+    if (reserved == staticOnlyKeys.end()) {
+        return properties.size() < kMostSettings || properties.count(key) != 0;
+    }
+    if (!std::exchange(reserved->second, true)) {
+        logConfigError("GlobalConfig::merge() - only the static config file may set %s, ignored.\n",
+                       key.c_str());
+    }
+    return false;
+}
+
+void GlobalConfig::addStaticOnlyKeys(std::string_view keys) {
+    std::istringstream words{std::string{keys}};
+    for (std::string key; words >> key;) staticOnlyKeys.try_emplace(key, false);
 }
 
 const std::string& GlobalConfig::getProperty(const std::string& key) {
@@ -192,7 +224,7 @@ void GlobalConfig::reloadChangedCopy() {
     const FileHandle copy = openForeignFile(path);
     if (!copy) return;
     logConfigInfo("Reload dynamicconfig.ini file.\n");
-    loadConfigSettings(copy.get());
+    merge(copy.get(), Source::DYNAMIC);
 }
 
 std::string& GlobalConfig::setProperty(const std::string& key,

@@ -6,6 +6,7 @@
 #include <ctime>
 #include <map>
 #include <string>
+#include <string_view>
 
 namespace pelorus {
 
@@ -14,6 +15,11 @@ namespace pelorus {
 /// The dynamic file belongs to other programs on the device. It is read through a temporary copy
 /// (key DYNAMIC_CONFIG_TMP), which those programs rewrite as well. A lookup that finds a new
 /// modification time merges the copy again, so callers see changes without reloading.
+///
+/// The copy may be writable by everybody. Keys that the static file lists in STATIC_ONLY_KEYS
+/// (separated by blanks; several such lines add up) are ignored anywhere else; the first time, a
+/// log line names the key. Of a dynamic file at most kMostForeignBytes are read, and the store
+/// takes no new key beyond 10,000.
 class GlobalConfig {
 public:
     static GlobalConfig* getInstance();
@@ -53,6 +59,11 @@ private:
     GlobalConfig() = default;
     ~GlobalConfig() = default;
 
+    enum class Source { STATIC, DYNAMIC };
+
+    bool merge(std::FILE* file, Source source);
+    void addStaticOnlyKeys(std::string_view keys);
+    bool isAccepted(const std::string& key, Source source);
     bool loadStaticConfig();
     bool loadDynamicConfig(const std::string& path);
     bool loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath);
@@ -64,6 +75,7 @@ private:
     time_t tmpModTime = 0;
     std::string configPath;
     std::map<std::string, std::string> properties;
+    std::map<std::string, bool> staticOnlyKeys;  // true: a line elsewhere has been reported
 };
 
 /// A copy of the value of @p key, for callers that keep it; empty when the key is absent.

@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 
 #include <filesystem>
+#include <fstream>
 
 #include "config/setting_line.h"
 #include "support/fake_files.h"
@@ -152,6 +153,59 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
     });
     row(inUse + "copy.ini", "() - failed to open temp dynamic config settings file: [copy.ini].");
     // clang-format on
+}
+
+TEST_F(ConfigTest, OnlyTheStaticFileSetsTheKeysItReserves) {
+    writeConfig("STARTCMD=id\nKEY=v\nSTATIC_ONLY_KEYS=KEY\n");
+    std::ofstream{path("static.ini"), std::ios::app}
+        << "STARTCMD=openvpn\nSTATIC_ONLY_KEYS=STARTCMD GONE\nSTATIC_ONLY_KEYS=OTHER\n";
+    EXPECT_TRUE(config.loadConfig(path("static.ini")));
+    EXPECT_EQ(config.getProperty("KEY"), "v");
+    for (const char* text : {"STARTCMD=id\n", "OTHER=id\nGONE=x\n"}) {
+        rewriteCopy(text);
+        EXPECT_EQ(config.getProperty("STARTCMD"), "openvpn");
+    }
+    EXPECT_EQ(config.getProperty("OTHER") + config.getProperty("GONE"), "");
+    EXPECT_EQ(log.countPart("only the static config file may set STARTCMD, ignored.\n"), 1);
+    EXPECT_EQ(log.countPart("only the static config file may set "), 3);
+}
+
+struct Planted {
+    const char* name;
+    std::function<void(const std::string&)> plant;
+};
+class PlantedCopy : public ConfigTest, public ::testing::WithParamInterface<Planted> {};
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(, PlantedCopy, ::testing::Values(
+    Planted{"Fifo", [](const std::string& copy) { mkfifo(copy.c_str(), 0666); }},
+    Planted{"LinkToADevice", [](const std::string& copy) { fs::create_symlink("/dev/zero", copy); }},
+    Planted{"DanglingLink", [](const std::string& copy) { fs::create_symlink("target", copy); }}), RowName{});
+// clang-format on
+TEST_P(PlantedCopy, IsReplaced) {
+    fs::current_path(folder);
+    const std::string file = writeConfig("KEY=v\n");
+    GetParam().plant(copy);
+    EXPECT_TRUE(config.loadConfig(file));
+    EXPECT_EQ(config.getProperty("KEY"), "v");
+    EXPECT_EQ(fs::symlink_status(copy).permissions(), fs::perms{0666});
+    EXPECT_FALSE(fs::exists("target"));
+    fs::remove(copy);
+    GetParam().plant(copy);
+    EXPECT_EQ(config.getProperty("KEY"), "v");
+}
+
+TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
+    EXPECT_TRUE(config.loadConfig(writeConfig("KEY=v\n")));
+    rewriteCopy("KEY=w\n");
+    const auto rewritten = fs::last_write_time(copy);
+    fs::resize_file(copy, 1'000'000'000'000);
+    fs::last_write_time(copy, rewritten);
+    EXPECT_EQ(config.getProperty("KEY"), "w");
+    std::string many;
+    for (int key = 0; key < 20'000; ++key) many += "K" + std::to_string(key) + "=x\n";
+    rewriteCopy(many + "KEY=y\n");
+    EXPECT_EQ(config.getProperty("K9000") + config.getProperty("K11000"), "x");
+    EXPECT_EQ(config.getProperty("KEY"), "y");
 }
 
 // Runs the real shell and the real sed: no character of a value means anything to either.

@@ -1,0 +1,84 @@
+#include "common/files.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "common/log.h"
+
+namespace pelorus {
+
+namespace {
+
+class Descriptor {
+public:
+    explicit Descriptor(int descriptor) : number{descriptor} {}
+    ~Descriptor() {
+        const int error = errno;
+        if (number >= 0) static_cast<void>(close(number));
+        errno = error;
+    }
+    Descriptor(const Descriptor&) = delete;
+    Descriptor& operator=(const Descriptor&) = delete;
+
+    const int number;
+};
+
+// The bytes from @p offset on, as far as they are read. False, and errno set, on an error.
+bool readFrom(int file, off_t offset, std::string& text) {
+    text.resize(kMostForeignBytes);
+    std::size_t size = 0;
+    while (size < text.size()) {
+        const ssize_t count =
+            pread(file, &text[size], text.size() - size, offset + static_cast<off_t>(size));
+        if (count < 0) return false;
+        if (count == 0) break;
+        size += static_cast<std::size_t>(count);
+    }
+    text.resize(size);
+    return true;
+}
+
+// A stream that owns a copy of @p text.
+FileHandle streamOf(const std::string& text) {
+    FileHandle stream{fmemopen(nullptr, text.size() + 1, "w+")};
+    if (stream) {
+        static_cast<void>(std::fwrite(text.data(), 1, text.size(), stream.get()));
+        std::rewind(stream.get());
+    }
+    return stream;
+}
+
+}  // namespace
+
+FileHandle openForeignFile(const std::string& path, Part part) {
+    const Descriptor file{open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY)};
+    struct stat status {};
+    if (file.number < 0 || fstat(file.number, &status) != 0) return nullptr;
+    if (!S_ISREG(status.st_mode)) {
+        logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
+        errno = EINVAL;
+        return nullptr;
+    }
+    const off_t excess = status.st_size - static_cast<off_t>(kMostForeignBytes);
+    const off_t offset = part == Part::TAIL ? std::max<off_t>(excess, 0) : 0;
+    if (excess > 0 && part == Part::HEAD) {
+        logWarning("openForeignFile - only the first %zu bytes of %s are read.\n",
+                   kMostForeignBytes, path.c_str());
+    }
+    std::string text;
+    return readFrom(file.number, offset, text) ? streamOf(text) : nullptr;
+}
+
+FileHandle createFile(const std::string& path, mode_t mode) {
+    static_cast<void>(unlink(path.c_str()));
+    const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+    if (file < 0) return nullptr;
+    static_cast<void>(fchmod(file, mode));  // whatever the umask
+    return FileHandle{fdopen(file, "w")};
+}
+
+}  // namespace pelorus

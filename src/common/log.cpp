@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cctype>
 #include <cstdio>
 
 #include "common/signal_block.h"
@@ -12,6 +13,13 @@ void vlogLine(std::size_t size, int priority, const char* format, va_list args) 
     std::array<char, kLogLineSize> line{};
     const std::size_t capacity = std::min(size, line.size());
     if (std::vsnprintf(line.data(), capacity, format, args) < 0) return;
+    // The texts have line feeds of their own; no other control character reaches a terminal.
+    for (char& letter : line) {
+        if (letter != '\n' && letter != '\0' &&
+            std::iscntrl(static_cast<unsigned char>(letter)) != 0) {
+            letter = ' ';
+        }
+    }
     const TerminationBlock held;
     syslog(priority, "%s", line.data());
 }

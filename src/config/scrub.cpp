@@ -46,6 +46,9 @@ std::string scrubSecrets(std::string text) {
         return left.first.size() > right.first.size();
     });
     for (const auto& [secret, mask] : secrets) hide(text, secret, mask);
+    std::replace_if(
+        text.begin(), text.end(), [](unsigned char letter) { return std::iscntrl(letter) != 0; },
+        ' ');
     return text;
 }
 

@@ -7,6 +7,7 @@
 #include "common/log.h"
 #include "common/text.h"
 #include "config/global_config.h"
+#include "config/scrub.h"
 #include "connection/direct_attempt.h"
 #include "connection/dns_check.h"
 #include "connection/forward_search.h"
@@ -78,7 +79,7 @@ ConnectionType ConnectionManager::createConnection() {
         connectionType = createRelayConnection();
     }
     logInfo("ConnectionManager::createConnection() - port test response remote external IP [%s]\n",
-            responseExternalIP.c_str());
+            scrubSecrets(responseExternalIP).c_str());
     if (connectionType == PORTFORWARDED || connectionType == RELAYED) noteConnectionType();
     return connectionType;
 }

@@ -56,7 +56,7 @@ std::string directAddress(Router& router, const std::string& seenByServer) {
         } else {
             logInfo(
                 "ConnectionManager::fetchLocalDeviceDomainIPAddr - for auto/manual portforward, use most recent remote external IP in test port response = %s\n",
-                ip.c_str());
+                scrubSecrets(ip).c_str());
         }
     }
     logInfo(

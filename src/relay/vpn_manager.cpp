@@ -219,19 +219,20 @@ bool VPNManager::pidIsOpenVPNProcess(char* line, std::string& pid) {
                    shownPath.c_str(), error);
         return false;
     }
+    const std::string shownTarget = scrubSecrets(target.data());
     logInfo("VPNManager::pidIsOpenVPNProcess() - readlink %s succeeded, symlink %s\n",
-            shownPath.c_str(), target.data());
+            shownPath.c_str(), shownTarget.c_str());
 
     const std::string pidFile = setting("OPENVPN_PID_FILE");
     // The text becomes part of a shell command, so only a number is a pid: /proc also resolves
     // "123/task/123".
     if (isNumber(pid) && strcasestr(target.data(), "openvpn") != nullptr) {
         logInfo("VPNManager::pidIsOpenVPNProcess() - pid %s in %s matches %s symlink %s\n",
-                shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
+                shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), shownTarget.c_str());
         return true;
     }
     logWarning("VPNManager::pidIsOpenVPNProcess() - pid %s in %s does not match %s symlink %s\n",
-               shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), target.data());
+               shownPid.c_str(), pidFile.c_str(), shownPath.c_str(), shownTarget.c_str());
     return false;
 }
 

@@ -87,9 +87,9 @@ bool Router::heldByAnother(int internalPort, int externalPort, const std::string
     if (entry.status == 0) {
         logInfo(
             "Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d], intClient[%s], intPort[%s], desc[%s], enabled[%s], leaseDuration[%s]\n",
-            entry.status, scrubSecrets(entry.internalClient).c_str(), entry.internalPort.c_str(),
-            scrubSecrets(entry.description).c_str(), entry.enabled.c_str(),
-            scrubSecrets(entry.lease).c_str());
+            entry.status, scrubSecrets(entry.internalClient).c_str(),
+            scrubSecrets(entry.internalPort).c_str(), scrubSecrets(entry.description).c_str(),
+            scrubSecrets(entry.enabled).c_str(), scrubSecrets(entry.lease).c_str());
     } else {
         logInfo("Router::mapPort() - UPNP_GetSpecificPortMappingEntry returned status[%d]\n",
                 entry.status);

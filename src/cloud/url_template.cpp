@@ -1,7 +1,9 @@
 #include "cloud/url_template.h"
 
 #include <algorithm>
+#include <cctype>
 #include <optional>
+#include <string_view>
 
 #include "common/log.h"
 #include "config/scrub.h"
@@ -11,6 +13,22 @@ namespace pelorus {
 namespace {
 
 enum class Secrets { REAL, MASKED };
+
+// Leaves what addresses and words consist of.
+std::string percentEncoded(const std::string& text) {
+    constexpr std::string_view kPlain = ".:-_~";
+    constexpr std::string_view kHexDigits = "0123456789ABCDEF";
+    std::string encoded;
+    for (const char letter : text) {
+        const auto code = static_cast<unsigned char>(letter);
+        if (code < 128 && (std::isalnum(code) != 0 || kPlain.find(letter) != kPlain.npos)) {
+            encoded += letter;
+        } else {
+            encoded += {'%', kHexDigits[code / 16], kHexDigits[code % 16]};
+        }
+    }
+    return encoded;
+}
 
 // Nothing when the argument is not of the kind the placeholder asks for.
 std::optional<std::string> argumentText(const TemplateArgument& argument,
@@ -25,7 +43,7 @@ std::optional<std::string> argumentText(const TemplateArgument& argument,
     if (const auto* secret = std::get_if<SecretArgument>(&argument)) {
         return secrets == Secrets::REAL ? secret->value : secret->mask;
     }
-    return std::get<std::string>(argument);
+    return percentEncoded(std::get<std::string>(argument));
 }
 
 std::optional<std::string> format(const std::string& urlTemplate,

@@ -18,7 +18,8 @@ struct SecretArgument {
     const char* mask;
 };
 
-/// One argument of a URL template.
+/// One argument of a URL template. A text is percent-encoded: it may come from a gateway or a
+/// script, and must not add arguments to the request.
 using TemplateArgument = std::variant<int, std::string, SecretArgument>;
 
 /// Fills a printf template from the configuration: %s takes a text, %d, %i and %u a number, %% is a

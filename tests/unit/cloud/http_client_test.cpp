@@ -86,11 +86,11 @@ TEST_F(HttpClientTest, AUrlTemplateIsFilledOrRefusedWithOneLine) {
                          const std::string& logged) {
         log.clear();
         const MaskedUrl url = fillMaskedTemplate(
-            "SOME_URL", urlTemplate, {SecretArgument{"id%s7", "*ID*"}, -1, "%d device-7350142"});
+            "SOME_URL", urlTemplate, {SecretArgument{"id%s7", "*ID*"}, -1, "%d&#device-7350142"});
         EXPECT_EQ(url.request + "; " + url.logged, request + "; " + logged) << urlTemplate;
         EXPECT_EQ(log.countPart("SOME_URL"), request.empty() ? 1 : 0) << urlTemplate;
     };
-    row("/%s/%d/%s", "/id%s7/-1/%d device-7350142", "/*ID*/-1/%d *ID_REMOVED*");
+    row("/%s/%d/%s", "/id%s7/-1/%25d%26%23device-7350142", "/*ID*/-1/%25d%26%23*ID_REMOVED*");
     row("/device-7350142/%s/%u", "/device-7350142/id%s7/4294967295",
         "/*ID_REMOVED*/*ID*/4294967295");
     row("/100%%/%%s%s/%i", "/100%/%sid%s7/-1", "/100%/%s*ID*/-1");

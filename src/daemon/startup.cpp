@@ -1,5 +1,6 @@
 #include "daemon/startup.h"
 
+#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -65,6 +66,11 @@ pid_t becomeDaemon() {
     return session;
 }
 
+// A core dump would hold the device's credentials. Programs that the daemon starts are not affected.
+void forbidCoreDumps() {
+    static_cast<void>(prctl(PR_SET_DUMPABLE, 0));
+}
+
 void logBanner(pid_t session) {
     logNotice("=======================================================================\n");
     logNotice("main - %s daemon starting up, Version: [%s], PID: [%d], SID: [%d] \n", "pelorus",
@@ -122,6 +128,7 @@ void runPelorus(int argc, char** argv) {
     const Options options = readCommandLine(argc, argv);
     openLog(options);
     const pid_t session = becomeDaemon();
+    forbidCoreDumps();
     logBanner(session);
     writePidFile();
     if (!loadConfiguration()) endProcess(EXIT_FAILURE);

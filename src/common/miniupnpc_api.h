@@ -1,7 +1,6 @@
 // miniupnpc with one set of signatures. The library changed its argument lists over the years;
 // every request to a gateway goes through these wrappers, and nothing else looks at the version.
-// They also keep a gateway that drops the connection from raising SIGPIPE, and hold termination
-// signals back.
+// They also bound what a hostile gateway can make the library do, see BoundedCall.
 #ifndef PELORUS_COMMON_MINIUPNPC_API_H
 #define PELORUS_COMMON_MINIUPNPC_API_H
 
@@ -10,7 +9,7 @@
 #include <miniupnpc/upnpcommands.h>
 #include <miniupnpc/upnperrors.h>
 
-#include "common/signal_block.h"
+#include "common/bounded_call.h"
 
 #if !defined(MINIUPNPC_API_VERSION) || MINIUPNPC_API_VERSION < 9
 #error "miniupnpc API version 9 or newer is needed"
@@ -26,22 +25,23 @@ enum IgdState : int {
     OTHER_UPNP_DEVICE = 3  ///< a UPnP device that is no gateway
 };
 
-struct CallGuard {
-    TerminationBlock termination;
-    BrokenPipeGuard brokenPipe;
-};
+/// Longest duration of each kind of call, seconds.
+inline constexpr int kDiscoveryLimit = 20;
+inline constexpr int kDescriptionLimit = 30;
+inline constexpr int kRequestLimit = 10;
+inline constexpr int kLocalLimit = 30;
 
 /// Calls a library function whose argument list never changed.
 template <typename Function, typename... Args>
 auto call(Function function, Args... args) {
-    const CallGuard guard;
+    const BoundedCall bounds{Peer::GATEWAY, kRequestLimit};
     return function(args...);
 }
 
 /// Discovers UPnP devices for @p delay milliseconds. The caller releases the list with
 /// freeUPNPDevlist; null when nothing answered.
 inline UPNPDev* discover(int delay) {
-    const CallGuard guard;
+    const BoundedCall bounds{Peer::GATEWAY, kDiscoveryLimit};
     int error = 0;
 #if MINIUPNPC_API_VERSION >= 14
     constexpr unsigned char kTtl = 2;
@@ -56,7 +56,7 @@ inline UPNPDev* discover(int delay) {
 /// possible with libraries newer than this header.
 inline int getValidIgd(
     UPNPDev* devices, UPNPUrls& urls, IGDdatas& data, char* lanAddress, int lanAddressSize) {
-    const CallGuard guard;
+    const BoundedCall bounds{Peer::GATEWAY, kDescriptionLimit};
 #if MINIUPNPC_API_VERSION >= 18
     char wanAddress[64] = "";
     const int state = UPNP_GetValidIGD(devices, &urls, &data, lanAddress, lanAddressSize,
@@ -78,7 +78,7 @@ inline int getSpecificPortMappingEntry(const char* controlUrl,
                                        char* description,
                                        char* enabled,
                                        char* leaseDuration) {
-    const CallGuard guard;
+    const BoundedCall bounds{Peer::GATEWAY, kRequestLimit};
     return UPNP_GetSpecificPortMappingEntry(controlUrl, serviceType, externalPort, protocol,
 #if MINIUPNPC_API_VERSION >= 10
                                             nullptr,
@@ -90,7 +90,7 @@ inline int getSpecificPortMappingEntry(const char* controlUrl,
 /// Fetches @p url with a plain GET. The caller releases the answer of @p size bytes, which is not
 /// terminated, with free; null when there was none.
 inline void* wget(const char* url, int& size, unsigned scopeId) {
-    const CallGuard guard;
+    const BoundedCall bounds{Peer::ANYBODY, kLocalLimit};
 #if MINIUPNPC_API_VERSION >= 16
     return miniwget(url, &size, scopeId, nullptr);
 #else

@@ -1,0 +1,51 @@
+// Bounds around calls of miniupnpc, which has none of its own: a peer that sends a byte now and then
+// holds it for hours, one that never stops sending fills the memory.
+#ifndef PELORUS_COMMON_BOUNDED_CALL_H
+#define PELORUS_COMMON_BOUNDED_CALL_H
+
+#include <condition_variable>
+#include <mutex>
+#include <set>
+#include <thread>
+
+#include "common/signal_block.h"
+
+namespace pelorus {
+
+/// Who the sockets that are opened during the call may connect to.
+enum class Peer {
+    ANYBODY,
+    GATEWAY,  ///< IPv4 hosts other than this device: its own servers trust local clients
+};
+
+/// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
+/// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
+/// the peer had closed the connection. Also holds termination signals back and keeps a closed
+/// connection from raising SIGPIPE. One at a time; not around child processes.
+class BoundedCall {
+public:
+    /// Bytes of resident memory.
+    static constexpr long kMostGrowth = 8L * 1024 * 1024;
+
+    BoundedCall(Peer peer, int seconds);
+    ~BoundedCall();
+    BoundedCall(const BoundedCall&) = delete;
+    BoundedCall& operator=(const BoundedCall&) = delete;
+
+private:
+    void watch(int seconds);
+    void shutSockets() const;
+
+    TerminationBlock termination;
+    BrokenPipeGuard brokenPipe;
+    std::set<int> before;  // descriptors that were open
+    std::mutex mutex;
+    std::condition_variable ended;
+    long residentBefore;  // bytes
+    bool over = false;
+    std::thread watcher;
+};
+
+}  // namespace pelorus
+
+#endif

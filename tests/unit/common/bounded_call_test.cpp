@@ -1,0 +1,77 @@
+#include "common/bounded_call.h"
+
+#include <arpa/inet.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "support/fixture.h"
+
+namespace pelorus::support {
+namespace {
+
+// A server on loopback that accepts connections and says nothing.
+class BoundedCallTest : public PelorusTest {
+protected:
+    BoundedCallTest() {
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t size = sizeof address;
+        bind(server, reinterpret_cast<sockaddr*>(&address), size);
+        listen(server, 1);
+        getsockname(server, reinterpret_cast<sockaddr*>(&address), &size);
+    }
+    void TearDown() override {
+        close(server);
+        PelorusTest::TearDown();
+    }
+
+    // Connects and waits for an answer; 0 when the connection was ended.
+    ssize_t ask(int type) {
+        const int client = socket(AF_INET, type, 0);
+        if (type == SOCK_STREAM) connectTo(client);
+        char letter = 0;
+        const ssize_t received = recv(client, &letter, 1, 0);
+        close(client);
+        return received;
+    }
+    int connectTo(int client) {
+        return connect(client, reinterpret_cast<sockaddr*>(&address), sizeof address);
+    }
+
+    const int server = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in address{};
+};
+
+TEST_F(BoundedCallTest, AWaitEndsWithTheTimeOfTheCall) {
+    const BoundedCall bounds{Peer::ANYBODY, 0};
+    EXPECT_EQ(ask(SOCK_STREAM), 0);
+    EXPECT_EQ(ask(SOCK_STREAM), 0);
+    EXPECT_EQ(ask(SOCK_DGRAM), 0);
+}
+
+TEST_F(BoundedCallTest, AWaitEndsWhenTheProcessGrows) {
+    const BoundedCall bounds{Peer::ANYBODY, 3600};
+    const std::string received(BoundedCall::kMostGrowth + 1'000'000, 'x');
+    EXPECT_EQ(ask(SOCK_STREAM), 0);
+}
+
+TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {
+    const int client = socket(AF_INET, SOCK_STREAM, 0);
+    {
+        const BoundedCall bounds{Peer::GATEWAY, 3600};
+        for (const char* own : {"127.0.0.1", "127.3.2.1", "0.0.0.0", "0.1.2.3"}) {
+            inet_pton(AF_INET, own, &address.sin_addr);
+            EXPECT_EQ(connectTo(client), -1) << own;
+            EXPECT_EQ(errno, EACCES) << own;
+        }
+        sockaddr_in6 local{AF_INET6, address.sin_port, 0, in6addr_loopback, 0};
+        EXPECT_EQ(connect(client, reinterpret_cast<sockaddr*>(&local), sizeof local), -1);
+        EXPECT_EQ(errno, EACCES);
+    }
+    inet_pton(AF_INET, "127.0.0.1", &address.sin_addr);
+    EXPECT_EQ(connectTo(client), 0);
+    close(client);
+}
+
+}  // namespace
+}  // namespace pelorus::support

@@ -1,6 +1,8 @@
 # Flags of every target in the project.
 #   pelorus_flags: warnings, sanitizers and, in a release, hardening.
 
+include(CheckCXXCompilerFlag)
+
 add_library(pelorus_flags INTERFACE)
 
 target_compile_options(pelorus_flags INTERFACE
@@ -26,8 +28,12 @@ elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
   # Fortify does not work with the sanitizers.
   set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
   target_compile_options(pelorus_flags INTERFACE
-    -D_FORTIFY_SOURCE=2 -D_GLIBCXX_ASSERTIONS -fstack-protector-strong -fstack-clash-protection
+    -D_FORTIFY_SOURCE=3 -D_GLIBCXX_ASSERTIONS -fstack-protector-strong -fstack-clash-protection
     -fPIE -ffunction-sections -fdata-sections)
+  check_cxx_compiler_flag(-ftrivial-auto-var-init=zero PELORUS_HAVE_AUTO_VAR_INIT)
+  if(PELORUS_HAVE_AUTO_VAR_INIT)
+    target_compile_options(pelorus_flags INTERFACE -ftrivial-auto-var-init=zero)
+  endif()
   target_link_options(pelorus_flags INTERFACE
     -pie -Wl,-z,relro,-z,now -Wl,--gc-sections -Wl,--as-needed)
 endif()

@@ -1,27 +1,20 @@
 #include "support/fake_commands.h"
 
-#include <gtest/gtest.h>
 #include <sys/wait.h>
 
 #include <cerrno>
-#include <csignal>
 
 namespace pelorus::support {
 
 FakeCommands::Answer FakeCommands::run(const char* command) {
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    const std::set<int> blocked = blockedSignals();
     for (const int signal : {SIGINT, SIGTERM, SIGQUIT, SIGPIPE}) {
-        EXPECT_EQ(sigismember(&mask, signal), 0)
-            << "signal " << signal << " is blocked while this child starts: " << command;
+        EXPECT_EQ(blocked.count(signal), 0U)
+            << "signal " << signal << " is blocked for: " << command;
     }
     Answer answer = take(command, {});
     if (answer.action) answer.action(command);
     return answer;
-}
-
-void FakeCommands::checkClosed() const {
-    EXPECT_TRUE(openPipes.empty()) << "pipes left open: " << openPipes.size();
 }
 
 extern "C" {
@@ -30,9 +23,7 @@ int __real_system(const char* command);
 int __wrap_system(const char* command) {
     FakeCommands& fake = FakeCommands::get();
     const FakeCommands::Answer answer = fake.run(command);
-    if (std::string{command}.find(fake.realPart) != std::string::npos) {
-        return __real_system(command);
-    }
+    if (holds(command, fake.realPart)) return __real_system(command);
     return answer.fails ? -1 : W_EXITCODE(answer.exitStatus, 0);
 }
 
@@ -44,14 +35,12 @@ std::FILE* __wrap_popen(const char* command, const char* mode) {
     std::FILE* pipe = std::tmpfile();
     std::fwrite(answer.output.data(), 1, answer.output.size(), pipe);
     std::rewind(pipe);
-    FakeCommands::get().openPipes.emplace(pipe, answer.exitStatus);
-    return pipe;
+    return *FakeCommands::get().openPipes.insert(pipe).first;
 }
 
 int __wrap_pclose(std::FILE* pipe) {
-    const auto open = FakeCommands::get().openPipes.extract(pipe);
-    std::fclose(pipe);
-    return W_EXITCODE(open.mapped(), 0);
+    EXPECT_EQ(FakeCommands::get().openPipes.erase(pipe), 1U) << "closed a pipe that is not open";
+    return std::fclose(pipe);
 }
 }
 

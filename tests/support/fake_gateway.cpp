@@ -2,63 +2,18 @@
 
 #include <arpa/inet.h>
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <miniupnpc/upnpcommands.h>
 #include <sys/select.h>
 #include <sys/socket.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
-#include <csignal>
-#include <cstdint>
 #include <cstring>
-#include <iterator>
-#include <utility>
 
 namespace pelorus::support {
 
-// Never destroyed: a Router under test may close its client at the end of the process.
-FakeGateway& FakeGateway::get() {
-    static auto* const instance = new FakeGateway;
-    return *instance;
-}
-
-void FakeGateway::checkReleased() const {
-    EXPECT_TRUE(listed.empty() && urlSets == 0) << "a device list or URLs not released";
-}
-
-Texts FakeGateway::calls(const std::string& part) const {
-    Texts found;
-    std::copy_if(lines.begin(), lines.end(), std::back_inserter(found),
-                 [&](const auto& line) { return line.find(part) != std::string::npos; });
-    return found;
-}
-
-int FakeGateway::count(const std::string& part) const {
-    return static_cast<int>(calls(part).size());
-}
-
-void FakeGateway::note(const std::string& line) {
-    lines.push_back(line);
-    if (hook) hook(line);
-}
-
-bool operator==(const FakeGateway::Mapping& left, const FakeGateway::Mapping& right) {
-    return ::testing::PrintToString(left) == ::testing::PrintToString(right);
-}
-
-void PrintTo(const FakeGateway::Mapping& mapping, std::ostream* out) {
-    *out << mapping.protocol << " " << mapping.externalPort << " -> " << mapping.client << ":"
-         << mapping.internalPort << " " << mapping.description;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeGateway;
 using Mapping = FakeGateway::Mapping;
-using pelorus::support::kDeviceAddress;
 
 namespace {
 
@@ -99,15 +54,12 @@ bool isUnread() {
 }
 
 void checkBrokenPipeBlocked() {
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    EXPECT_EQ(sigismember(&mask, SIGPIPE), 1) << "a closed connection would end the process";
+    EXPECT_EQ(blockedSignals().count(SIGPIPE), 1U) << "a closed connection would end the process";
 }
 
 // As the library does it: not terminated when the text fills the buffer.
 void fill(char* buffer, std::size_t size, const std::string& text) {
-    std::memset(buffer, 0, size);
-    std::copy_n(text.data(), std::min(size, text.size()), buffer);
+    std::strncpy(buffer, text.c_str(), size);
 }
 
 // Notes a question to the control URL; true when it arrives.
@@ -177,10 +129,24 @@ int ask(natpmp_t* client, const std::string& call, const std::function<natpmpres
     return 0;
 }
 
-}  // namespace
-
 // NOLINTBEGIN(bugprone-reserved-identifier, readability-function-size): names the linker gives
 // clang-format off: long argument lists, which changed with the versions of miniupnpc
+int hand(const FakeGateway::Reply& reply,
+         char* client,
+         char* internalPort,
+         char* description,
+         char* enabled,
+         char* lease) {
+    fill(client, 16, reply.client);
+    fill(internalPort, 6, reply.internalPort);
+    fill(description, 80, reply.description);
+    fill(enabled, 4, reply.enabled);
+    fill(lease, 16, reply.lease);
+    return reply.status;
+}
+
+}  // namespace
+
 extern "C" {
 UPNPDev* __wrap_upnpDiscover(int delay,
                              const char*,
@@ -250,7 +216,7 @@ int __wrap_UPNP_GetExternalIPAddress(const char* url, const char* service, char*
 int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url,
                                             const char* service,
                                             const char* port,
-                                            const char* proto,
+                                            const char* protocol,
 #if MINIUPNPC_API_VERSION >= 10
                                             const char* /*remoteHost*/,
 #endif
@@ -259,16 +225,10 @@ int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url,
                                             char* description,
                                             char* enabled,
                                             char* lease) {
-    const std::string line = std::string("entry ") + proto + " " + port;
+    const std::string line = std::string("entry ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
-    const auto reply = replyFor(find(std::stoi(port), proto), 714);
-    if (!reply.client.empty()) fill(client, 16, reply.client);
-    if (!reply.internalPort.empty()) fill(internalPort, 6, reply.internalPort);
-    if (reply.status != 0) return reply.status;
-    fill(description, 80, reply.description);
-    fill(enabled, 4, reply.enabled);
-    fill(lease, 16, reply.lease);
-    return 0;
+    const auto reply = replyFor(find(std::stoi(port), protocol), 714);
+    return hand(reply, client, internalPort, description, enabled, lease);
 }
 
 int __wrap_UPNP_AddPortMapping(const char* url,
@@ -277,30 +237,30 @@ int __wrap_UPNP_AddPortMapping(const char* url,
                                const char* internalPort,
                                const char* client,
                                const char* description,
-                               const char* proto,
+                               const char* protocol,
                                const char* remoteHost,
                                const char* lease) {
     EXPECT_TRUE(remoteHost == nullptr && lease == nullptr);
-    const std::string line = std::string("map ") + proto + " " + port + " -> " + client + ":" +
+    const std::string line = std::string("map ") + protocol + " " + port + " -> " + client + ":" +
                              internalPort + " " + description;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
     if (refuses(std::stoi(port))) return 718;  // conflict
-    const auto held = find(std::stoi(port), proto);
+    const auto held = find(std::stoi(port), protocol);
     const auto place = held == gateway.table.end() ? gateway.table.emplace(held) : held;
-    *place = {std::stoi(port), client, std::stoi(internalPort), description, proto};
+    *place = {std::stoi(port), client, std::stoi(internalPort), description, protocol};
     return 0;
 }
 
 int __wrap_UPNP_DeletePortMapping(const char* url,
                                   const char* service,
                                   const char* port,
-                                  const char* proto,
+                                  const char* protocol,
                                   const char* remoteHost) {
     EXPECT_EQ(remoteHost, nullptr);
-    const std::string line = std::string("unmap ") + proto + " " + port;
+    const std::string line = std::string("unmap ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
     if (gateway.keepMappings) return 501;  // action failed
-    const auto held = find(std::stoi(port), proto);
+    const auto held = find(std::stoi(port), protocol);
     if (held == gateway.table.end()) return 714;  // no such entry
     gateway.table.erase(held);
     return 0;
@@ -312,7 +272,7 @@ int __wrap_UPNP_GetGenericPortMappingEntry(const char* url,
                                            char* port,
                                            char* client,
                                            char* internalPort,
-                                           char* proto,
+                                           char* protocol,
                                            char* description,
                                            char* enabled,
                                            char* remoteHost,
@@ -320,16 +280,10 @@ int __wrap_UPNP_GetGenericPortMappingEntry(const char* url,
     if (!arrives(url, service, std::string("entry #") + index)) return UPNPCOMMAND_HTTP_ERROR;
     const auto at = std::min(std::stol(index), static_cast<long>(gateway.table.size()));
     const auto reply = replyFor(gateway.table.begin() + at, 713);
-    if (reply.status != 0) return reply.status;
     fill(port, 6, reply.externalPort);
-    fill(client, 16, reply.client);
-    fill(internalPort, 6, reply.internalPort);
-    fill(proto, 4, reply.protocol);
-    fill(description, 80, reply.description);
-    fill(enabled, 4, reply.enabled);
+    fill(protocol, 4, reply.protocol);
     fill(remoteHost, 64, "");
-    fill(lease, 16, reply.lease);
-    return 0;
+    return hand(reply, client, internalPort, description, enabled, lease);
 }
 
 int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
@@ -412,3 +366,5 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
 }
 // clang-format on
 // NOLINTEND(bugprone-reserved-identifier, readability-function-size)
+
+}  // namespace pelorus::support

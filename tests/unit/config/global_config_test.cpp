@@ -157,7 +157,7 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
 // Runs the real shell and the real sed: no character of a value means anything to either.
 TEST_F(ConfigTest, AWriteThroughTakesValuesAsTheyAre) {
     const std::string file = path("it's $(touch hurt)");
-    commands.runForReal("sed");
+    commands.realPart = "sed";
     const std::string rest = "\nOLDX=1\n\n#KEY\nKEY=abx\n";
     std::string before = "plain";
     for (const char* value : {"http://a/b", "a.*[x]^$\\", "ab.", "a&b\\1\\n&", "it's",

@@ -1,14 +1,10 @@
-// Time of a test: time, gettimeofday, sleep and ppoll end here. It moves by pauses and by
-// advance() only, so that instants are exact.
+// Time of a test: time, gettimeofday, sleep and ppoll end here. Only pauses and advance() move it,
+// so that instants are exact.
 #ifndef PELORUS_SUPPORT_VIRTUAL_CLOCK_H
 #define PELORUS_SUPPORT_VIRTUAL_CLOCK_H
 
-#include <sys/time.h>
-
-#include <csignal>
 #include <cstdint>
 #include <ctime>
-#include <functional>
 #include <map>
 
 #include "support/fake.h"
@@ -19,6 +15,7 @@ class VirtualClock : public Single<VirtualClock> {
 public:
     using Action = std::function<void()>;
     static constexpr time_t kStart = 1'700'000'000;  ///< what time() says when a test begins
+    static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
 
     /// Seconds since the epoch, and since the test began.
     [[nodiscard]] time_t now() const { return static_cast<time_t>(micros / kMicrosPerSecond); }
@@ -36,13 +33,10 @@ public:
 
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
     bool wait(std::int64_t waitMicros, const sigset_t* mask);
-    [[nodiscard]] timeval timeOfDay() const {
-        return {now(), static_cast<suseconds_t>(micros % kMicrosPerSecond)};
-    }
+
+    std::int64_t micros = kStart * kMicrosPerSecond;
 
 private:
-    static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
-    std::int64_t micros = kStart * kMicrosPerSecond;
     std::vector<long> asked;
     std::map<std::size_t, Action> actions;
 };

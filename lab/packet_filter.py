@@ -137,7 +137,7 @@ def counted(name: str) -> int:
 
 
 def watch(tell: Callable[[str, Mapping], None]) -> None:
-    """Call `tell` for each forwarding that is added ("add") or deleted ("delete"), for ever."""
+    """Call `tell` with "add" or "delete" for each forwarding that changes; never returns."""
     for verb, subject in nft.monitor(network.GATEWAY, "rules"):
         rule = subject.get("rule", {})
         if verb in ("add", "delete") and rule.get("chain") == ASKED_FOR.redirect:

@@ -8,7 +8,7 @@
 
 namespace pelorus {
 
-/// The text between two tags, and where it stands in the answer.
+/// The text between two tags, and its place in the answer.
 struct TaggedText {
     std::string text;       ///< empty when the closing tag comes before @p start
     std::size_t start = 0;  ///< offset behind the opening tag

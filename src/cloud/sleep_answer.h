@@ -12,7 +12,7 @@ struct SleepAnswer {
         NO_ACTION,  ///< neither told to wait nor to proceed
         PROCEED,    ///< told not to wait
         WAIT,       ///< told to wait for a time, which may be 0
-        NO_TIME,    ///< told to wait, but no time stands behind the action
+        NO_TIME,    ///< told to wait, but no time follows the action
         BAD_TIME,   ///< told to wait, but the time is negative or no number that fits
     };
     Kind kind = NO_ACTION;

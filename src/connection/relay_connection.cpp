@@ -83,8 +83,8 @@ void ConnectionManager::removeMappings() {
         router().unmapAllPorts(kTcp, kHttpDescription);
         router().unmapAllPorts(kTcp, kHttpsDescription);
     } else {
-        // On purpose also on other devices whose gateway is gone: without the maker's script the
-        // list is empty and nothing happens.
+        // Deliberately not limited to the maker's router: on any other device the script is missing,
+        // the list is empty and nothing happens.
         router().unmapAllPortBrenvik(kTcp);
     }
     forgetPorts();

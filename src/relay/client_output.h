@@ -7,14 +7,14 @@
 
 namespace pelorus {
 
-/// What a line that tells of a relay says.
+/// What a line about a relay says.
 struct RelayPeer {
     /// Four numbers with dots between them, as the client wrote them: numbers above 255 are not
     /// refused. Nothing when they cannot be read.
     std::optional<std::string> address;
 };
 
-/// Reads one line. Nothing when it does not tell of a relay.
+/// Reads one line. Nothing when it does not mention a relay.
 [[nodiscard]] std::optional<RelayPeer> readRelayPeer(const char* line);
 
 }  // namespace pelorus

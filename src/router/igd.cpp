@@ -2,6 +2,7 @@
 
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <ctime>
 
 #include "common/miniupnpc_api.h"
@@ -15,7 +16,7 @@ constexpr std::size_t kPortDigits = 5;
 // A mapping's index is a 16-bit number. A gateway that answers for a higher index would never stop.
 constexpr int kLastMappingIndex = 65535;
 // A gateway that lies or stalls must not block the daemon, least of all during shutdown.
-constexpr std::time_t kLongestEnumeration = 60;  // seconds
+constexpr std::int64_t kLongestEnumeration = 60;  // seconds
 
 // A cleared buffer for one text of the library. It has one byte more than the @p Size the library
 // documents, so the text always ends, even when the library fills all of its share.
@@ -86,7 +87,7 @@ int Igd::remove(int externalPort, const std::string& protocol) const {
 }
 
 bool Igd::forEach(const std::function<bool(const IgdEntry&)>& visit) const {
-    const std::time_t end = std::time(nullptr) + kLongestEnumeration;
+    const std::int64_t end = std::time(nullptr) + kLongestEnumeration;
     for (int index = 0; index <= kLastMappingIndex && std::time(nullptr) <= end; ++index) {
         EntryTexts texts;
         const int status = miniupnpc::call(

@@ -31,14 +31,14 @@ constexpr unsigned kPauseAfterRemoval = 1;  // seconds, for the router to apply 
 constexpr std::size_t kLongestLine = 1024;  // what follows in a line is dropped
 constexpr std::size_t kFieldsBeforeDescription = 5;
 
-bool readLine(std::FILE* stream, std::string& line) {
-    line.clear();
+std::optional<std::string> readLine(std::FILE* stream) {
     int next = std::getc(stream);
-    if (next == EOF) return false;
+    if (next == EOF) return std::nullopt;
+    std::string line;
     for (; next != EOF && next != '\n'; next = std::getc(stream)) {
         if (line.size() < kLongestLine) line.push_back(static_cast<char>(next));
     }
-    return true;
+    return line;
 }
 
 std::string trimmed(const std::string& text) {
@@ -58,10 +58,8 @@ bool isAddress(const std::string& text) {
 // address would travel on into shell commands and requests, so it counts as none.
 std::string askForAddress(const char* command) {
     const PipeHandle answer(popen(command, "re"));
-    std::string line;
-    if (!answer || !readLine(answer.get(), line)) return "";
-    line = trimmed(line);
-    return isAddress(line) ? line : "";
+    const std::string address = answer ? trimmed(readLine(answer.get()).value_or("")) : "";
+    return isAddress(address) ? address : "";
 }
 
 std::optional<int> parsePort(const std::string& text) {
@@ -119,7 +117,7 @@ std::optional<_BrenvikPortIp> parseEntry(const std::string& line) {
 }
 
 // Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
-// be started, else 1; what the script made of it is not known.
+// be started, else 1; the script's own result is not known.
 int runHelper(const char* action, const std::string& argument) {
     constexpr std::string_view kSpecialInQuotes = "\"$`\\";
     std::string command = std::string(kHelperScript) + " " + action + " \"";
@@ -193,9 +191,8 @@ void Router::loadPortListBrenvik() {
     brenvikPorts.clear();
     const PipeHandle list(popen(kListCommand, "re"));
     if (!list) return;
-    std::string line;
-    while (readLine(list.get(), line)) {
-        if (const auto entry = parseEntry(line)) brenvikPorts.push_back(*entry);
+    while (const auto line = readLine(list.get())) {
+        if (const auto entry = parseEntry(*line)) brenvikPorts.push_back(*entry);
     }
 }
 

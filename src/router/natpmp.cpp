@@ -18,7 +18,6 @@ namespace pelorus {
 namespace {
 
 constexpr int kMaxReads = 3;
-constexpr int kMaxLateAnswers = 100;
 constexpr int kSelectDescriptors = FD_SETSIZE;
 
 // The protocol's number for "TCP" or "UDP", 0 for anything else.
@@ -32,6 +31,18 @@ int protocolNumber(const std::string& protocol) {
 void closeOnExec(int socket) {
     const int flags = fcntl(socket, F_GETFD);
     if (flags >= 0) static_cast<void>(fcntl(socket, F_SETFD, flags | FD_CLOEXEC));
+}
+
+// Opens @p client for @p gateway, or for the default gateway if that is 0. The library's status.
+int openClient(natpmp_t& client, in_addr_t gateway) {
+    const int status = initnatpmp(&client, gateway != 0 ? 1 : 0, gateway);
+    if (status == 0) {
+        closeOnExec(client.s);
+    } else if (client.s > 0) {
+        // The library opens its socket first and keeps it when it then finds no gateway.
+        static_cast<void>(closenatpmp(&client));
+    }
+    return status;
 }
 
 void waitForAnswer(int socket, timeval timeout) {
@@ -50,16 +61,10 @@ CMnatpmp::~CMnatpmp() {
 
 bool CMnatpmp::init() {
     if (initialized) return true;
-    const int status = initnatpmp(&natpmp, 0, 0);
+    natpmp = {};
+    const int status = openClient(natpmp, 0);
     initialized = status == 0;
-    if (initialized) {
-        closeOnExec(natpmp.s);
-    } else {
-        // The library opens its socket first and keeps it when it then finds no gateway.
-        if (natpmp.s > 0) static_cast<void>(closenatpmp(&natpmp));
-        natpmp = {};
-        logError("CMnatpmp::init  initnatpmp failed %d\n", status);
-    }
+    if (!initialized) logError("CMnatpmp::init  initnatpmp failed %d\n", status);
     return initialized;
 }
 
@@ -68,36 +73,38 @@ bool CMnatpmp::close() {
         const int status = closenatpmp(&natpmp);
         if (status < 0) logError("CMnatpmp::close  closenatpmp failed %d\n", status);
         initialized = false;
-        answers = {};
     }
     return true;
 }
 
+// The library takes whatever the gateway sends for the answer to its last request, and it repeats a
+// request that is not answered at once, so that a slow gateway answers more than once. Such answers
+// go to the port they were asked from: the next request is sent from another one.
+void CMnatpmp::leaveLateAnswersBehind() {
+    const bool moreMayCome = natpmp.has_pending_request != 0 || natpmp.try_number > 1;
+    if (!moreMayCome) return;
+    // Opened while the old socket still holds its port. Where that fails, sending may still work.
+    natpmp_t fresh{};
+    if (openClient(fresh, natpmp.gateway) != 0) return;
+    close();
+    natpmp = fresh;
+    initialized = true;
+}
+
 int CMnatpmp::CheckNATPMPResponse() {
     int status = NATPMP_TRYAGAIN;
-    int reads = 0;
-    int late = 0;
-    while (status == NATPMP_TRYAGAIN && reads < kMaxReads) {
+    for (int reads = 0; status == NATPMP_TRYAGAIN && reads < kMaxReads; ++reads) {
         timeval timeout{};
-        const int timeoutStatus = getnatpmprequesttimeout(&natpmp, &timeout);
-        if (timeoutStatus < 0) {
-            logError("CMnatpmp::CheckNATPMPResponse  getnatpmprequesttimeout error %d\n",
-                     timeoutStatus);
-            return timeoutStatus;
+        status = getnatpmprequesttimeout(&natpmp, &timeout);
+        if (status < 0) {
+            const int error = errno;
+            logError("CMnatpmp::CheckNATPMPResponse  getnatpmprequesttimeout error %d\n", status);
+            errno = error;
+            return status;
         }
         waitForAnswer(natpmp.s, timeout);
         status = readnatpmpresponseorretry(&natpmp, &response);
-        if (status >= 0 && late < kMaxLateAnswers && answers.isLate(response)) {
-            // The library takes any answer for the one it waits for; ours is still to come.
-            natpmp.has_pending_request = 1;
-            status = NATPMP_TRYAGAIN;
-            answers.countLate();
-            ++late;
-        } else {
-            ++reads;
-        }
     }
-    answers.end(natpmp, status);
     return status;
 }
 
@@ -106,7 +113,7 @@ bool CMnatpmp::retrieveExternalIP(std::string& ip) {
         logError("CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
-    answers.begin(natpmp, {});
+    leaveLateAnswersBehind();
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
@@ -145,9 +152,11 @@ bool CMnatpmp::portMappingRequest(int internalPort,
         logError("CMnatpmp::portMappingRequest  invalid protocol string %s\n", protocol.c_str());
         return false;
     }
-    if (!exchangeMapping(protocolNumber(protocol), internalPort, externalPort, lifetime)) {
-        return false;
-    }
+    const auto granted =
+        exchangeMapping(protocolNumber(protocol), internalPort, externalPort, lifetime);
+    if (!granted) return false;
+    externalPort = granted->externalPort;
+    lifetime = granted->lifetime;
     if (lifetime != 0) {
         trackMapping(internalPort, externalPort, isHttps, lifetime);
     } else if (internalPort != 0) {
@@ -158,12 +167,12 @@ bool CMnatpmp::portMappingRequest(int internalPort,
     return true;
 }
 
-// Sends one request and takes over what the gateway granted: it wins over what was asked.
-bool CMnatpmp::exchangeMapping(int protocol,
-                               int internalPort,
-                               int& externalPort,
-                               unsigned& lifetime) {
-    answers.begin(natpmp, {protocol, internalPort, lifetime == 0});
+// What the gateway granted wins over what was asked.
+std::optional<CMnatpmp::Grant> CMnatpmp::exchangeMapping(int protocol,
+                                                         int internalPort,
+                                                         int externalPort,
+                                                         unsigned lifetime) {
+    leaveLateAnswersBehind();
     const int sent =
         sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
                                   static_cast<std::uint16_t>(externalPort), lifetime);
@@ -172,14 +181,14 @@ bool CMnatpmp::exchangeMapping(int protocol,
         logError(
             "CMnatpmp::portMappingRequest  sendnewportmappingrequest error %d, protocol %d, internalPort %d, externalPort %d, lifetime %u, errno %d\n",
             sent, protocol, internalPort, externalPort, lifetime, error);
-        return false;
+        return std::nullopt;
     }
     if (CheckNATPMPResponse() < 0) {
         const int error = errno;
         logError(
             "CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u, errno %d\n",
             externalPort, internalPort, protocol, lifetime, error);
-        return false;
+        return std::nullopt;
     }
     const auto& granted = response.pnu.newportmapping;
     // The protocol in this line is the answer's type; the two have the same numbers.
@@ -187,14 +196,13 @@ bool CMnatpmp::exchangeMapping(int protocol,
         "CMnatpmp::portMappingRequest  mapped public port %hu to localport %hu protocol %d, lifetime %u\n",
         granted.mappedpublicport, granted.privateport, static_cast<int>(response.type),
         granted.lifetime);
-    externalPort = granted.mappedpublicport;
-    lifetime = granted.lifetime;
+    const Grant result{granted.mappedpublicport, granted.lifetime};
     if (granted.privateport != internalPort) {
         logInfo(
             "CMnatpmp::portMappingRequest  requested internal port does not match the response internal port. req_internal_port %d, resp_internal_port %hu, external_port %d, lifetime %u\n",
-            internalPort, granted.privateport, externalPort, lifetime);
+            internalPort, granted.privateport, result.externalPort, result.lifetime);
     }
-    return true;
+    return result;
 }
 
 void CMnatpmp::trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime) {

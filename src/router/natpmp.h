@@ -4,17 +4,17 @@
 
 #include <natpmp.h>
 
+#include <optional>
 #include <string>
 
 #include "router/lease_tracking.h"
-#include "router/natpmp_answers.h"
 
 namespace pelorus {
 
 /// NAT-PMP client for the default gateway. The first request opens it, the destructor closes it. A
-/// request blocks for at most three reads of the library's retry schedule (1.75 s), plus up to two
-/// seconds for answers that the gateway still owes to earlier requests. Every failure is logged and
-/// returned as false.
+/// request blocks for at most three reads of the library's retry schedule (1.75 s). An answer that
+/// comes later is lost: no request takes it for its own. Every failure is logged and returned as
+/// false.
 class CMnatpmp {
 public:
     CMnatpmp() = default;
@@ -71,7 +71,16 @@ public:
     void setReqPortMappingLifetime(unsigned seconds) { gwPorts.reqLifetime = seconds; }
 
 private:
-    bool exchangeMapping(int protocol, int internalPort, int& externalPort, unsigned& lifetime);
+    struct Grant {
+        int externalPort;
+        unsigned lifetime;
+    };
+
+    void leaveLateAnswersBehind();
+    std::optional<Grant> exchangeMapping(int protocol,
+                                         int internalPort,
+                                         int externalPort,
+                                         unsigned lifetime);
     void trackMapping(int internalPort, int externalPort, bool isHttps, unsigned lifetime);
     void forgetMapping(int internalPort);
     void forgetAllMappings(int internalPort, int externalPort, unsigned lifetime);
@@ -80,7 +89,6 @@ private:
     std::string externalIp;
     natpmp_t natpmp{};
     natpmpresp_t response{};
-    NatpmpAnswers answers;
     GWPortsTracker gwPorts;
 };
 

@@ -10,9 +10,9 @@
 //   map TCP 9091 -> 192.168.77.10:80 Kavra     natpmp close
 //   unmap TCP 9091
 //
-// Fails the test on a UPnP call while SIGPIPE could end the process, a NAT-PMP request while an
-// answer is unread or on a socket that a child process would inherit, a remote host or a lease with
-// a UPnP mapping, and a release of what was not handed out.
+// Fails the test on a UPnP call while SIGPIPE could end the process, a NAT-PMP request on a socket
+// that a child process would inherit, a remote host or a lease with a UPnP mapping, and a release
+// of what was not handed out.
 #ifndef PELORUS_SUPPORT_FAKE_GATEWAY_H
 #define PELORUS_SUPPORT_FAKE_GATEWAY_H
 
@@ -114,7 +114,12 @@ public:
     std::optional<natpmpresp_t> pending;  // the answer to the last request
     long retryTime = 0;
     bool connectionRefused = false;
-    std::multimap<long, natpmpresp_t> onTheWay;
+    struct Answer {
+        int client;
+        natpmpresp_t answer;
+    };
+    int asking = 0;                        // the client that sent the last request
+    std::multimap<long, Answer> onTheWay;  // by arrival
 };
 
 }  // namespace pelorus::support

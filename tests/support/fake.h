@@ -43,12 +43,14 @@ struct Single {
 };
 
 /// The calls that reached a fake, a line each.
+template <class Line = std::string>
 class Calls {
 public:
-    [[nodiscard]] const Texts& calls() const { return asked; }
+    using Lines = std::vector<Line>;
+    [[nodiscard]] const Lines& calls() const { return asked; }
     /// Those that hold @p part.
-    [[nodiscard]] Texts calls(const std::string& part) const {
-        Texts found;
+    [[nodiscard]] Lines calls(const std::string& part) const {
+        Lines found;
         std::copy_if(asked.begin(), asked.end(), std::back_inserter(found),
                      [&](const auto& line) { return holds(line, part); });
         return found;
@@ -59,20 +61,20 @@ public:
     /// Forgets the calls, not the answers.
     void clear() { asked.clear(); }
     /// Runs @p action at each following call, before it is answered.
-    void onCall(std::function<void(const std::string&)> action) { hook = std::move(action); }
-    void note(const std::string& line) {
+    void onCall(std::function<void(const Line&)> action) { hook = std::move(action); }
+    void note(const Line& line) {
         asked.push_back(line);
         if (hook) hook(line);
     }
 
 private:
-    Texts asked;
-    std::function<void(const std::string&)> hook;
+    Lines asked;
+    std::function<void(const Line&)> hook;
 };
 
 /// Answers calls by a part of their text.
 template <class Answer>
-class Script : public Calls {
+class Script : public Calls<> {
 public:
     /// Answers every call that holds @p part. A later rule goes before an earlier one.
     void answer(const std::string& part, Answer answer) {
@@ -86,7 +88,7 @@ public:
 protected:
     /// Notes the call; @p otherwise is the answer when there is no rule.
     Answer take(const std::string& line, const Answer& otherwise) {
-        note(line);
+        this->note(line);
         const auto fits = [&](const auto& rule) { return holds(line, rule.first); };
         if (const auto next = std::find_if(once.begin(), once.end(), fits); next != once.end()) {
             Answer found = next->second;

@@ -1,6 +1,5 @@
-// Files and process of a test: fopen, open, fork, setsid, chdir and kill pass through here. Most go
-// straight through to libc. A file that is opened without close-on-exec fails the test: a child
-// process would inherit it.
+// Files and process of a test: fopen, open, fork, setsid, chdir and kill. Most go straight through
+// to libc. A file opened without close-on-exec fails the test: a child process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 

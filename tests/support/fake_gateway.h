@@ -31,7 +31,7 @@ namespace pelorus::support {
 /// The device as the gateway sees it; also the first address FakeNet gives it.
 inline constexpr const char* kDeviceAddress = "192.168.77.10";
 
-class FakeGateway : public Single<FakeGateway>, public Calls {
+class FakeGateway : public Single<FakeGateway>, public Calls<> {
 public:
     struct Mapping {
         int externalPort = 0;

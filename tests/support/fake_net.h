@@ -1,5 +1,5 @@
-// Names and interfaces of a test: getifaddrs, getaddrinfo, gethostname and the calls that release
-// their lists end here.
+// Names and interfaces of a test: getifaddrs, getaddrinfo, gethostname and the release of their
+// lists end here.
 #ifndef PELORUS_SUPPORT_FAKE_NET_H
 #define PELORUS_SUPPORT_FAKE_NET_H
 

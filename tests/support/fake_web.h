@@ -1,8 +1,6 @@
 // The web of a test: libcurl's easy interface (the central server) and miniwget (the local web back
-// end) end here and nothing is sent.
-//
-// Fails the test on a transfer before curl_global_init, on a call for another handle than the open
-// one, and on miniwget while SIGPIPE could end the process.
+// end) end here and nothing is sent. Fails the test on a transfer before curl_global_init, a call
+// with a handle other than the open one, and miniwget while SIGPIPE could end the process.
 #ifndef PELORUS_SUPPORT_FAKE_WEB_H
 #define PELORUS_SUPPORT_FAKE_WEB_H
 

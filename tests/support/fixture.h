@@ -1,10 +1,7 @@
-// The base of every test fixture. The seams of libc are always in place: no test reaches the shell,
-// the network, the system log or the real clock. Other fakes (fake_*.h) are linked into a binary
-// when one of its tests names them.
-//
-// Every test fails by itself when a configured secret is in a log line, and when pipes, address
-// lists, descriptors or the signal mask are not as they were. The headers of the fakes name their
-// own checks.
+// The base of every test fixture. The fakes are always in place: no test reaches the shell, the
+// network, the system log or the real clock. Every test fails when a configured secret is in a log
+// line, and when pipes, address lists, descriptors or the signal mask are not as they were. The
+// headers of the fakes name their own checks.
 #ifndef PELORUS_SUPPORT_FIXTURE_H
 #define PELORUS_SUPPORT_FIXTURE_H
 

@@ -22,30 +22,30 @@ struct LogLine {
     }
 };
 
+inline bool holds(const LogLine& line, const std::string& part) {
+    return holds(line.text, part);
+}
+
 /// A line that holds a secret fails the test. So does one that is sent while another is being
 /// sent: with the real log it would wait for a lock forever.
-class LogCapture : public Single<LogCapture> {
+class LogCapture : public Single<LogCapture>, public Calls<LogLine> {
 public:
-    /// Since the last clear().
-    [[nodiscard]] const std::vector<LogLine>& lines() const { return captured; }
+    [[nodiscard]] const Lines& lines() const { return calls(); }
     [[nodiscard]] Texts texts() const;
     /// How often exactly this line came, and how many lines hold @p part.
     [[nodiscard]] int count(int priority, const std::string& text) const;
-    [[nodiscard]] int countPart(const std::string& part) const;
+    [[nodiscard]] int countPart(const std::string& part) const { return Calls::count(part); }
     /// All lines, for failure messages.
     [[nodiscard]] std::string dump() const;
-    void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
-    void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
+    void onLine(std::function<void(const LogLine&)> action) { onCall(std::move(action)); }
     void addSecret(const std::string& secret) { secrets.push_back(secret); }
     void take(const LogLine& line);
 
     Texts setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
 
 private:
-    std::vector<LogLine> captured;
     Texts secrets;
-    std::function<void(const LogLine&)> hook;
     bool taking = false;
 };
 

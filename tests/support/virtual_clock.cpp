@@ -14,8 +14,6 @@ unsigned __real_sleep(unsigned seconds);
 int __real_ppoll(pollfd* fds, nfds_t count, const timespec* timeout, const sigset_t* mask);
 }
 
-constexpr auto kMicrosPerSecond = VirtualClock::kMicrosPerSecond;
-
 void VirtualClock::duringPause(int number, Action action) {
     actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
 }

@@ -11,11 +11,12 @@
 
 namespace pelorus::support {
 
+constexpr std::int64_t kMicrosPerSecond = 1'000'000;
+
 class VirtualClock : public Single<VirtualClock> {
 public:
     using Action = std::function<void()>;
     static constexpr time_t kStart = 1'700'000'000;  ///< what time() says when a test begins
-    static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
 
     /// Seconds since the epoch, and since the test began.
     [[nodiscard]] time_t now() const { return static_cast<time_t>(micros / kMicrosPerSecond); }
@@ -26,9 +27,8 @@ public:
     /// The length of every sleep and timed ppoll so far, as asked for, in whole seconds.
     [[nodiscard]] const std::vector<long>& pauses() const { return asked; }
 
-    /// Runs @p action as the @p number th pause from now begins. A signal raised there ends the
-    /// pause if it was blocked and the mask of the pause lets it in; one that was not blocked
-    /// came too early and is missed by the pause, as in the real world.
+    /// Runs @p action as the @p number th pause from now begins. A blocked signal raised there ends
+    /// the pause if its mask lets it in; one that is not blocked comes too early to end it.
     void duringPause(int number, Action action);
 
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.

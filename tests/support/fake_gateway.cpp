@@ -17,8 +17,8 @@ namespace {
 constexpr const char* kControlUrl = "http://192.168.77.1:5000/ctl/IPConn";
 constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnection:1";
 
-// Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins, since
-// clients may outlive the test that made them.
+// Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins,
+// since clients may outlive the test that made them.
 const int clientSocket = open("/dev/null", O_RDONLY);
 int clientsMade = 0;
 int openClients = 0;

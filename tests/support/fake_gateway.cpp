@@ -55,7 +55,6 @@ void checkBrokenPipeBlocked() {
     EXPECT_EQ(blockedSignals().count(SIGPIPE), 1U) << "a closed connection would end the process";
 }
 
-// As the library does it: not terminated when the text fills the buffer.
 void fill(char* buffer, std::size_t size, const std::string& text) {
     std::strncpy(buffer, text.c_str(), size);
 }
@@ -128,13 +127,10 @@ int ask(natpmp_t* client, const std::string& call, const std::function<natpmpres
 }
 
 // NOLINTBEGIN(bugprone-reserved-identifier, readability-function-size): names the linker gives
-// clang-format off: long argument lists, which changed with the versions of miniupnpc
-int hand(const FakeGateway::Reply& reply,
-         char* client,
-         char* internalPort,
-         char* description,
-         char* enabled,
-         char* lease) {
+// Long argument lists, which changed with the versions of miniupnpc.
+// clang-format off
+int hand(const FakeGateway::Reply& reply, char* client, char* internalPort, char* description,
+         char* enabled, char* lease) {
     fill(client, 16, reply.client);
     fill(internalPort, 6, reply.internalPort);
     fill(description, 80, reply.description);
@@ -146,11 +142,7 @@ int hand(const FakeGateway::Reply& reply,
 }  // namespace
 
 extern "C" {
-UPNPDev* __wrap_upnpDiscover(int delay,
-                             const char*,
-                             const char*,
-                             int,
-                             int,
+UPNPDev* __wrap_upnpDiscover(int delay, const char*, const char*, int, int,
 #if MINIUPNPC_API_VERSION >= 14
                              unsigned char,
 #endif
@@ -173,15 +165,10 @@ void __wrap_freeUPNPDevlist(UPNPDev* list) {
     gateway.listed.clear();
 }
 
-int __wrap_UPNP_GetValidIGD(UPNPDev* list,
-                            UPNPUrls* urls,
-                            IGDdatas* data,
-                            char* lanAddress,
-                            int size
+int __wrap_UPNP_GetValidIGD(UPNPDev* list, UPNPUrls* urls, IGDdatas* data,
+                            char* lanAddress, int size
 #if MINIUPNPC_API_VERSION >= 18
-                            ,
-                            char*,
-                            int
+                            , char*, int
 #endif
 ) {
     checkBrokenPipeBlocked();
@@ -211,33 +198,23 @@ int __wrap_UPNP_GetExternalIPAddress(const char* url, const char* service, char*
     return gateway.externalIpStatus;
 }
 
-int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url,
-                                            const char* service,
-                                            const char* port,
+int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url, const char* service, const char* port,
                                             const char* protocol,
 #if MINIUPNPC_API_VERSION >= 10
                                             const char* /*remoteHost*/,
 #endif
-                                            char* client,
-                                            char* internalPort,
-                                            char* description,
-                                            char* enabled,
-                                            char* lease) {
+                                            char* client, char* internalPort, char* description,
+                                            char* enabled, char* lease) {
     const std::string line = std::string("entry ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
     const auto reply = replyFor(find(std::stoi(port), protocol), 714);
     return hand(reply, client, internalPort, description, enabled, lease);
 }
 
-int __wrap_UPNP_AddPortMapping(const char* url,
-                               const char* service,
-                               const char* port,
-                               const char* internalPort,
-                               const char* client,
-                               const char* description,
-                               const char* protocol,
-                               const char* remoteHost,
-                               const char* lease) {
+int __wrap_UPNP_AddPortMapping(const char* url, const char* service, const char* port,
+                               const char* internalPort, const char* client,
+                               const char* description, const char* protocol,
+                               const char* remoteHost, const char* lease) {
     EXPECT_TRUE(remoteHost == nullptr && lease == nullptr);
     const std::string line = std::string("map ") + protocol + " " + port + " -> " + client + ":" +
                              internalPort + " " + description;
@@ -249,11 +226,8 @@ int __wrap_UPNP_AddPortMapping(const char* url,
     return 0;
 }
 
-int __wrap_UPNP_DeletePortMapping(const char* url,
-                                  const char* service,
-                                  const char* port,
-                                  const char* protocol,
-                                  const char* remoteHost) {
+int __wrap_UPNP_DeletePortMapping(const char* url, const char* service, const char* port,
+                                  const char* protocol, const char* remoteHost) {
     EXPECT_EQ(remoteHost, nullptr);
     const std::string line = std::string("unmap ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
@@ -264,17 +238,10 @@ int __wrap_UPNP_DeletePortMapping(const char* url,
     return 0;
 }
 
-int __wrap_UPNP_GetGenericPortMappingEntry(const char* url,
-                                           const char* service,
-                                           const char* index,
-                                           char* port,
-                                           char* client,
-                                           char* internalPort,
-                                           char* protocol,
-                                           char* description,
-                                           char* enabled,
-                                           char* remoteHost,
-                                           char* lease) {
+int __wrap_UPNP_GetGenericPortMappingEntry(const char* url, const char* service, const char* index,
+                                           char* port, char* client, char* internalPort,
+                                           char* protocol, char* description, char* enabled,
+                                           char* remoteHost, char* lease) {
     if (!arrives(url, service, std::string("entry #") + index)) return UPNPCOMMAND_HTTP_ERROR;
     const auto at = std::min(std::stol(index), static_cast<long>(gateway.table.size()));
     const auto reply = replyFor(gateway.table.begin() + at, 713);

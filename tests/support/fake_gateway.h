@@ -28,7 +28,7 @@
 
 namespace pelorus::support {
 
-/// The device as the gateway sees it; also the first address FakeNet gives it.
+/// The device as the gateway sees it.
 inline constexpr const char* kDeviceAddress = "192.168.77.10";
 
 class FakeGateway : public Single<FakeGateway>, public Calls<> {
@@ -47,22 +47,16 @@ public:
             return ::testing::PrintToString(left) == ::testing::PrintToString(right);
         }
     };
-    /// A mapping as the gateway reports it, true or not. Each text is cut to the library's size for
-    /// it, without a terminator when it fills that.
+    /// A mapping as the gateway reports it, true or not. As in the library, a text is cut to the
+    /// size of its buffer and has no terminator when it fills that.
     struct Reply {
         int status = 0;
-        std::string client{};
-        std::string internalPort{};
-        std::string description{};
-        std::string externalPort{};
-        std::string protocol{};
-        std::string enabled = "1";
-        std::string lease = "0";
+        std::string client{}, internalPort{}, description{}, externalPort{}, protocol{};
+        std::string enabled = "1", lease = "0";
     };
     /// What a NAT-PMP gateway grants in place of what was asked.
     struct Grant {
-        std::optional<int> publicPort{};
-        std::optional<int> privatePort{};
+        std::optional<int> publicPort{}, privatePort{};
         std::optional<unsigned> lifetime{};
     };
 

@@ -1,7 +1,5 @@
 #include "daemon/daemon_control.h"
 
-#include <filesystem>
-
 #include "common/log.h"
 #include "common/termination.h"
 #include "daemon/signals.h"
@@ -10,7 +8,6 @@
 namespace pelorus {
 namespace {
 
-using std::filesystem::exists;
 using support::LogLine;
 
 class DaemonControlTest : public DaemonTest {
@@ -42,37 +39,35 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
     EXPECT_TRUE(process.selfKills.empty());
 }
 
-struct PauseRow {
-    const char* name;
-    int ownPeriod;
-    const char* serverWait;
-    long pause;
-    const char* line;
-};
-class Pause : public DaemonControlTest, public ::testing::WithParamInterface<PauseRow> {};
-
-TEST_P(Pause, IsTheLongerOfTheTwoPeriods) {
-    const auto& [name, ownPeriod, serverWait, pause, line] = GetParam();
-    givenEnabled(ownPeriod);
-    web.answer("/remote_access_status/",
-               std::string{"<action>wait</action><wait_time>"} + serverWait + "</wait_time>");
-    inPauseOfCycle(2, [this, seconds = pause] {
-        EXPECT_EQ(clock.pauses().back(), seconds);
-        terminate();
+TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
+    const std::vector<std::pair<int, const char*>> periods{
+        {300, "301"}, {300, "300"}, {-1, "30"}, {1000, "30"}};  // own and server's
+    std::size_t cycle = 0;
+    const auto beginCycle = [&] {
+        if (cycle == periods.size()) return terminate();
+        control.setSleepTime(periods[cycle].first);
+        web.answer("/remote_access_status/", std::string{"<action>wait</action><wait_time>"} +
+                                                 periods[cycle].second + "</wait_time>");
+    };
+    givenEnabled();
+    beginCycle();
+    std::string pauses;
+    log.onLine([&](const LogLine& line) {
+        if (!endsCycle(line)) return;
+        clock.duringPause(1, [&, line] {
+            pauses += line.text + std::to_string(clock.pauses().back()) + " ";
+            ++cycle;
+            beginCycle();
+        });
     });
     control.run();
-    EXPECT_EQ(logged(line).size(), 2U);
-    EXPECT_EQ(web.count("/remote_access_status/"), 2) << "asked anew in each cycle";
+    EXPECT_EQ(pauses,
+              "DaemonControl::run - retry connection after 301 secs.\n301 "
+              "DaemonControl::run - sleep 300 secs.\n300 "
+              "DaemonControl::run - retry connection after 120 secs.\n120 "
+              "DaemonControl::run - sleep 900 secs.\n900 ");
+    EXPECT_EQ(web.count("/remote_access_status/"), 4) << "asked anew in each cycle";
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Rows,
-    Pause,
-    ::testing::Values(PauseRow{"ServersWait", 300, "301", 301, "retry connection after 301 secs."},
-                      PauseRow{"OwnWhenBothAreEqual", 300, "300", 300, "sleep 300 secs."},
-                      PauseRow{"OwnIsAtMost900", 1000, "0", 900, "sleep 900 secs."},
-                      PauseRow{"AtLeast120", -1, "0", 120, "retry connection after 120 secs."}),
-    RowName{});
 
 // Raised between the last look at the flag and the wait.
 TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
@@ -97,7 +92,7 @@ TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     EXPECT_EQ(logged("COMMUNICATION status:"),
               Texts{"[disabled]  connectionType:[1]  connectionSubType:[0]\n"});
     EXPECT_EQ(log.texts().back(), "DaemonControl::run - Remote access disabled.\n");
-    EXPECT_FALSE(exists(path("client.pid")));
+    EXPECT_FALSE(std::filesystem::exists(path("client.pid")));
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
 }
 

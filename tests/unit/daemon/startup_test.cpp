@@ -36,8 +36,7 @@ protected:
         process.killForReal = true;
     }
 
-    // Runs the daemon to its end. Returns how the process that was started ended, and then its
-    // child, if there was one.
+    // Runs the daemon to its end. Returns how the process that was started and its child ended.
     std::string start(Texts arguments, const std::set<std::string>& failingCalls = {}) {
         prctl(PR_SET_CHILD_SUBREAPER, 1);
         if (fork() == 0) {
@@ -63,7 +62,7 @@ protected:
         }
         reported = readFile(path("report"));
         EXPECT_FALSE(holds("a check failed"));
-        return ends;
+        return ends + (holds("ConnectionManager::createConnection()") ? " after cycles" : "");
     }
     [[nodiscard]] bool holds(const std::string& part) const {
         return reported.find(part) != std::string::npos;
@@ -128,7 +127,6 @@ TEST_F(StartupTest, OnlyOneAndNoUnmapMakesCyclesRun) {
     for (const auto& [value, arguments] : off) {
         givenSwitch(value);
         EXPECT_EQ(start(arguments), " exit 0 exit 0") << value;
-        EXPECT_FALSE(holds("ConnectionManager::createConnection()")) << value;
         EXPECT_TRUE(holds("<6>DaemonControl::run - Remote access disabled.\n"));
     }
 }
@@ -136,7 +134,8 @@ TEST_F(StartupTest, OnlyOneAndNoUnmapMakesCyclesRun) {
 TEST_F(StartupTest, TunablesReachTheirOwners) {
     givenSwitch(
         "1\nMANUAL_PORT_FORWARD=TRUE\nMANUAL_EXTERNAL_HTTP_PORT=9091\nMANUAL_EXTERNAL_HTTPS_PORT=9444");
-    EXPECT_EQ(start({"-f", "300", "-d", "55", "-t", "77", "-p", "88"}), " exit 0 signal 2");
+    EXPECT_EQ(start({"-f", "300", "-d", "55", "-t", "77", "-p", "88"}),
+              " exit 0 signal 2 after cycles");
     EXPECT_TRUE(holds("<6>DaemonControl::run - nslookup check interval 55\n"));
     EXPECT_TRUE(holds("<6>DaemonControl::run - UPnP lifetime 77, NAT-PMP lifetime 77\n"));
     EXPECT_TRUE(holds("Interval duration: 88\n"));
@@ -148,7 +147,6 @@ TEST_F(StartupTest, ASignalDuringTheStartIsKept) {
     givenSwitch("1");
     atStart = [] { raise(SIGTERM); };
     EXPECT_EQ(start({}), " exit 0 signal 15");
-    EXPECT_FALSE(holds("ConnectionManager::createConnection()")) << reported;
     EXPECT_TRUE(holds("<6>DaemonControl::run - Remote access disabled.\n"));
 }
 

@@ -26,10 +26,10 @@ protected:
                      {"LOG_SUCCESS_TEXT", "Initialization Sequence Completed"},
                      {"OPENVPN_PID_FILE", path("client.pid")}});
     }
-    ~VpnManagerTest() override {
-        if (client <= 0) return;
-        kill(client, SIGKILL);
-        waitpid(client, nullptr, 0);
+    void TearDown() override {
+        if (client > 0) kill(client, SIGKILL);
+        if (client > 0) waitpid(client, nullptr, 0);
+        PelorusTest::TearDown();
     }
 
     // Starts a process whose executable has the given name; returns its pid.
@@ -39,7 +39,7 @@ protected:
         fs::copy_file("/bin/sleep", program);
         char* const arguments[] = {program.data(), seconds.data(), nullptr};
         EXPECT_EQ(posix_spawn(&client, program.c_str(), nullptr, nullptr, arguments, nullptr), 0);
-        const std::string pid = std::to_string(client);
+        std::string pid = std::to_string(client);
         writeFile("client.pid", " \t" + pid + " \t\r\n");
         return pid;
     }

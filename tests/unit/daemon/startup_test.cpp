@@ -31,7 +31,7 @@ void reportExit() {
 class StartupTest : public DaemonTest {
 protected:
     StartupTest() {
-        files.redirect("/tmp/tavik_cm_pid", path("pid"));
+        support::FakeFiles::get().redirect("/tmp/tavik_cm_pid", path("pid"));
         setenv("TAVIK_STATIC_CONFIG", path("static.ini").c_str(), 1);
         process.killForReal = true;
     }
@@ -78,7 +78,8 @@ protected:
 
 TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
     unsetenv("TAVIK_STATIC_CONFIG");
-    files.redirect("/var/www/rest-api/config/globalconfig.ini", path("static.ini"));
+    support::FakeFiles::get().redirect("/var/www/rest-api/config/globalconfig.ini",
+                                       path("static.ini"));
     EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
     const std::string pid = readFile(path("pid"));
     const std::string banner =

@@ -28,7 +28,9 @@ protected:
     // A full disk: files cannot grow beyond this size until the end of the test.
     static void limitFiles(rlim_t size) {
         std::signal(SIGXFSZ, SIG_IGN);
-        const rlimit limit{size, RLIM_INFINITY};
+        rlimit limit{};
+        getrlimit(RLIMIT_FSIZE, &limit);
+        limit.rlim_cur = size;
         setrlimit(RLIMIT_FSIZE, &limit);
     }
 
@@ -173,7 +175,7 @@ TEST_F(ConfigTest, OnlyAWriteThroughThatFitsTouchesTheStaticFile) {
     logged.clear();
     commands.answer("sed", "", 1);
     EXPECT_EQ(config.setProperty("A", "new", true), "new");
-    limitFiles(fs::file_size(file));
+    limitFiles(static_cast<rlim_t>(fs::file_size(file)));
     EXPECT_EQ(config.setProperty("B", "x", true), "x");
     limitFiles(RLIM_INFINITY);
     FakeFiles::get().redirect(file, "");

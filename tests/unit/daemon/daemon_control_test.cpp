@@ -42,23 +42,18 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
 TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
     const std::vector<std::pair<int, const char*>> periods{
         {300, "301"}, {300, "300"}, {-1, "30"}, {1000, "30"}};  // own and server's
-    std::size_t cycle = 0;
-    const auto beginCycle = [&] {
+    const auto beginCycle = [&](std::size_t cycle) {
         if (cycle == periods.size()) return terminate();
         control.setSleepTime(periods[cycle].first);
         web.answer("/remote_access_status/", std::string{"<action>wait</action><wait_time>"} +
                                                  periods[cycle].second + "</wait_time>");
     };
     givenEnabled();
-    beginCycle();
+    beginCycle(0);
     std::string pauses;
-    log.onLine([&](const LogLine& line) {
-        if (!endsCycle(line)) return;
-        clock.duringPause(1, [&, line] {
-            pauses += line.text + std::to_string(clock.pauses().back()) + " ";
-            ++cycle;
-            beginCycle();
-        });
+    inEachPause([&](unsigned cycles, const std::string& line) {
+        pauses += line + std::to_string(clock.pauses().back()) + " ";
+        beginCycle(cycles);
     });
     control.run();
     EXPECT_EQ(pauses,
@@ -75,7 +70,8 @@ TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     gateway.add({9555, kLanIp, 80, "Kavra"});  // by an earlier run, as is the client
     clientRuns();
     time_t before = 0;
-    inPauseOfCycle(2, [&] {
+    inEachPause([&](unsigned cycles, const std::string&) {
+        if (cycles == 1) return;
         EXPECT_EQ(gateway.calls("unmap ").front(), "unmap TCP 9555") << "before the search";
         EXPECT_EQ(commands.count("kill"), 0) << "only its file is removed";
         EXPECT_EQ(gateway.mappings().size(), 2U);

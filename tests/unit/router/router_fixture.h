@@ -17,13 +17,11 @@ using Mappings = std::vector<Mapping>;
 
 class RouterTest : public support::PelorusTest {
 protected:
-    RouterTest() { gateway.reset(); }
-
-    void SetUp() override { givenConfig(); }
-    void TearDown() override {
-        gateway.checkReleased();
-        PelorusTest::TearDown();
+    RouterTest() {
+        gateway.reset();
+        givenConfig();
     }
+    ~RouterTest() override { gateway.checkReleased(); }
 
     void discovered() {
         ASSERT_TRUE(router.discover()) << log.dump();

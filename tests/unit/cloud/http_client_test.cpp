@@ -16,7 +16,6 @@ TEST_F(HttpClientTest, AnAnswerIsKeptAsFarAsItCameAndFits) {
     };
     EXPECT_EQ(get(nullptr) + get(""), "(null)(null)");
     EXPECT_EQ(size, -7);
-    EXPECT_EQ(log.countPart("TavikClient:httpGet - empty url\n"), 2);
     const std::string large = std::string(10000, 'a') + std::string(238, 'b');
     web.answer("x", large);
     EXPECT_EQ(get("x"), large);
@@ -27,7 +26,6 @@ TEST_F(HttpClientTest, AnAnswerIsKeptAsFarAsItCameAndFits) {
     // clang-format on
     web.answer("x", large + "c");
     EXPECT_EQ(get("x"), "(null)");
-    EXPECT_EQ(log.countPart("TavikClient curlRcvData - Buffer overrun detected"), 1);
     web.answer("x", {"half", CURLE_OPERATION_TIMEDOUT});
     EXPECT_EQ(get("x"), "half");
     EXPECT_EQ(log.countPart("TavikClient::httpGet  Error: [Timeout was reached]\n"), 1);
@@ -44,7 +42,6 @@ TEST_F(FirstUseTest, ReportsDisabledOnceWithoutCredentials) {
     EXPECT_EQ(FakeWeb::get().globalInits, 1);
     EXPECT_EQ(log.countPart("TavikClient::initialize() - CURL initialization failed.\n"), 1);
     EXPECT_EQ(log.countPart("initialize() - failed to read DEVICEID, DEVICEAUTH from"), 1);
-    EXPECT_EQ(log.countPart("initialize() returned false, set Comm Status to [disabled]\n"), 1);
     setConfig("DEVICEID", "");
     setConfig("DEVICEAUTH", support::kDeviceAuth);
     setConfig("DYNAMIC_CONFIG_TMP", path("gone"));  // every read of a setting complains once
@@ -61,7 +58,6 @@ TEST_F(FirstUseTest, OnlyTheHostOfTheFirstUsableBaseCounts) {
     };
     EXPECT_EQ(url("", "/%s", HTTP) + url("web.kavra.example", "/%d", HTTP), "/%s/%d");
     EXPECT_EQ(url("http://a", "/%s", HTTP), "/%s");
-    EXPECT_EQ(log.countPart("Invalid base server url http://a. Return input urn.\n"), 1);
     EXPECT_EQ(url("x://ab", "/%s", HTTPS), "https://ab/%s");
     EXPECT_EQ(url("http://two.x", "/a", 0), "/a");
     EXPECT_EQ(url("http://two.x", "/%s%n", HTTP), "http://ab/%s%n");

@@ -42,41 +42,37 @@ TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
         "http://127.0.0.1:80/ip?lan=192.168.77.10"}));
     web.clear();
     const std::string silent = "httpGet failed to get response from central server for url https://web.kavra.example/";
-    const std::string id = "id=*ID_REMOVED*&";
-    row(UPDATE, none, "", false, silent + "set?" + id + "ip=44.128.0.20&lan=192.168.77.10&p=9091&ps=9444&auth=*AUTH_REMOVED*.");
-    row(WITHDRAW, none, "", false, silent + "set?" + id + "ip=NULL&lan=192.168.77.10&p=0&ps=0&auth=*AUTH_REMOVED*.");
-    row(ADDRESS, none, "", false, silent + "status?" + id + "auth=*AUTH_REMOVED*&lan=192.168.77.10.");
+    row(UPDATE, none, "", false, silent + "set?id=*ID_REMOVED*&ip=44.128.0.20&lan=192.168.77.10&p=9091&ps=9444&auth=*AUTH_REMOVED*.");
+    row(WITHDRAW, none, "", false, silent + "set?id=*ID_REMOVED*&ip=NULL&lan=192.168.77.10&p=0&ps=0&auth=*AUTH_REMOVED*.");
+    row(ADDRESS, none, "", false, silent + "status?id=*ID_REMOVED*&auth=*AUTH_REMOVED*&lan=192.168.77.10.");
     EXPECT_EQ(web.count("127.0.0.1"), 0) << "the back end is told although the server was not";
-    const std::string noAnswer = "failed to get response from local";
-    const std::string refused = "failure response received from ";
-    row(UPDATE, "any", none, false, noAnswer + "host for url: [http:");
-    row(WITHDRAW, "any", none, false, noAnswer + "host for url: [http:");
-    row(ADDRESS, "Success", none, false, noAnswer + " server for url:  http:");
-    row(UPDATE, "any", "Success auth-91c2f0aa", true, refused + "localhost for url: [http:");
-    row(WITHDRAW, "any", "Success auth-91c2f0aa", false, refused + "localhost for url: [http:");
-    row(ADDRESS, "success device-7350142", "no", true, refused + "central server for url:  https:");
+    row(UPDATE, "any", none, false, "failed to get response from localhost for url: [http:");
+    row(WITHDRAW, "any", none, false, "failed to get response from localhost for url: [http:");
+    row(ADDRESS, "Success", none, false, "failed to get response from local server for url:  http:");
+    row(UPDATE, "any", "Success auth-91c2f0aa", true, "failure response received from localhost for url: [http:");
+    row(WITHDRAW, "any", "Success auth-91c2f0aa", false, "failure response received from localhost for url: [http:");
+    row(ADDRESS, "success device-7350142", "no", true, "failure response received from central server for url:  https:");
     // clang-format on
 }
 
-TEST_F(ReportsTest, WithoutCredentialsOrTemplatesNobodyIsTold) {
+TEST_F(ReportsTest, WithoutTemplatesOrCredentialsNobodyIsTold) {
     const auto without = [&](const std::string& key, const char* value, const std::string& line) {
         setConfig(key, value);
         EXPECT_FALSE(send(UPDATE) || send(WITHDRAW) || send(ADDRESS));
         client.updateLocalCommStatus(key);
         EXPECT_GT(log.countPart(line), 0) << key;
     };
-    without("DEVICEAUTH", "", "failed to get Device Auth Code from DynamicConfig");
-    without("DEVICEID", "", "failed to get Device ID from DynamicConfig");
-    EXPECT_EQ(web.count("https:"), 0);
-    EXPECT_EQ(log.countPart("from DynamicConfig"), 3 + 3);
-    setConfig("DEVICEID", support::kDeviceId);
-    setConfig("DEVICEAUTH", support::kDeviceAuth);
     web.answer("web.kavra.example", "Success");
     for (const std::string key :
          {"LOCAL_SETFORWARDURL", "LOCAL_DELFORWARDURL", "LOCAL_SETLOCALIPURL",
           "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"}) {
         without(key, "%n", "URL template of " + key + " asks for more");
     }
+    web.clear();
+    without("DEVICEAUTH", "", "failed to get Device Auth Code from DynamicConfig");
+    without("DEVICEID", "", "failed to get Device ID from DynamicConfig");
+    EXPECT_EQ(web.urls(), Urls{});
+    EXPECT_EQ(log.countPart("from DynamicConfig"), 3 + 3);
 }
 
 TEST_F(ReportsTest, ExceptionsStayInside) {
@@ -121,30 +117,30 @@ TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
     row("failed", 1, "failed type=portforwarded");
     row("failed", 5, "failed type=disabled");  // beyond the table
     row("odd", 2, "failed type=disabled");
-    EXPECT_EQ(log.countPart("[odd] = NOT_FOUND\n"), 2);
 }
 
 TEST_F(ReportsTest, ADiskAsleepOrUnknownSkipsTheTest) {
     const auto row = [&](int skips, const std::string& state, const char* type,
                          const std::string& last) {
         log.clear();
-        const std::string output = "/dev/sda:\n drive state is:  " + state + "\n";
-        commands.answer("hdparm -C /dev/sda", FakeCommands::Answer{output, 0, state.empty(), {}});
+        commands.answer("hdparm -C /dev/sda",
+                        FakeCommands::Answer{"\n" + state, 0, state.empty(), {}});
         setConfig("DEVICETYPE", type);
         EXPECT_EQ(client.checkHddStandByMode(), skips) << last;
         EXPECT_EQ(log.countPart(last), log.lines().empty() ? 0 : 1) << log.dump();
     };
     support::FakeFiles::get().redirect(support::kIdleMinutesFile, path("minutes"));
-    row(1, "idle", "", "failed to get open Ostrel sleep count file.\n");
+    row(1, "state: idle", "", "failed to get open Ostrel sleep count file.\n");
     writeFile("minutes", "2\n0\n");
-    row(1, "standby", "5", "drive is in standby, port test is suspended, port testing SKIP.\n");
+    row(1, "state: standby", "5",
+        "drive is in standby, port test is suspended, port testing SKIP.\n");
     row(1, "", "5", "unable to check drive status, popen() returned NULL.\n");
-    row(1, "idle", "3", "sleep count > 1, port testing SKIP.\n");
-    row(0, "idle", "5", "");  // the maker's router counts nothing
+    row(1, "state: idle", "3", "sleep count > 1, port testing SKIP.\n");
+    row(0, "state: idle", "5", "");  // the maker's router counts nothing
     writeFile("minutes", "1\n9\n");
-    row(0, "idle", "3", "checking sleep count.\n");
+    row(0, "state: idle", "3", "checking sleep count.\n");
     writeFile("minutes", "");
-    row(0, "idle", "3", "checking sleep count.\n");
+    row(0, "state: idle", "3", "checking sleep count.\n");
 }
 
 }  // namespace

@@ -17,6 +17,7 @@ class CloudTest : public support::PelorusTest {
 protected:
     ~CloudTest() override { web.checkBalance(); }
 
+    const FakeWeb::Answer none = FakeWeb::noAnswer();
     FakeWeb& web = FakeWeb::get();
     TavikClient& client = givenClient();
 

@@ -29,7 +29,6 @@ TEST_F(ReportsTest, GoToTheServerAndThenToTheBackEnd) {
         EXPECT_GT(log.countPart(failure), 0) << failure << log.dump();
     };
     // clang-format off
-    const FakeWeb::Answer none = FakeWeb::noAnswer();
     row(UPDATE, "any device-7350142", "a success", true, "");
     row(WITHDRAW, "any device-7350142", "a success", true, "");
     row(ADDRESS, "Success", "no", true, "");
@@ -65,9 +64,8 @@ TEST_F(ReportsTest, WithoutTemplatesOrCredentialsNobodyIsTold) {
     web.answer("web.kavra.example", "Success");
     for (const std::string key :
          {"LOCAL_SETFORWARDURL", "LOCAL_DELFORWARDURL", "LOCAL_SETLOCALIPURL",
-          "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"}) {
+          "LOCAL_SETCOMMSTATUSURL", "REMOTE_SETFORWARDURL", "REMOTE_SETCOMMSTATUSURL"})
         without(key, "%n", "URL template of " + key + " asks for more");
-    }
     web.clear();
     without("DEVICEAUTH", "", "failed to get Device Auth Code from DynamicConfig");
     without("DEVICEID", "", "failed to get Device ID from DynamicConfig");
@@ -120,8 +118,7 @@ TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
 }
 
 TEST_F(ReportsTest, ADiskAsleepOrUnknownSkipsTheTest) {
-    const auto row = [&](int skips, const std::string& state, const char* type,
-                         const std::string& last) {
+    const auto row = [&](int skips, const std::string& state, const char* type, const char* last) {
         log.clear();
         commands.answer("hdparm -C /dev/sda",
                         FakeCommands::Answer{"\n" + state, 0, state.empty(), {}});

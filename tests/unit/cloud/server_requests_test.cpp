@@ -5,6 +5,7 @@
 namespace pelorus {
 namespace {
 
+using Answers = std::vector<FakeWeb::Answer>;
 using ServerRequestsTest = CloudTest;
 
 const std::string kRest = "http://web.kavra.example/api/1.0/rest/";
@@ -15,20 +16,20 @@ TEST_F(ServerRequestsTest, TheRequestedWaitHoldsForOneCycle) {
     const auto row = [&](const std::string& body, int wait, const std::string& line) {
         web.answer(kPoll, body);
         EXPECT_EQ(client.serverRequestedSleep(), wait > 0) << body;
-        const std::string last = log.lines().back().text;
-        EXPECT_EQ(last.find("TavikClient::pollServerForSleepTime - " + line), 0U) << last;
+        EXPECT_EQ(log.lines().back().text.find("TavikClient::pollServerForSleepTime - " + line),
+                  0U);
         EXPECT_EQ(client.pollServerForSleepTime(), wait) << body;
         EXPECT_EQ(client.getServerSleepTime(), std::max(wait, 120));
         client.resetServerSleepTime();
         EXPECT_EQ(client.getServerSleepTime(), 120);
     };
-    const std::string proceed = "<action>proceed</action>";
-    row(proceed + kWait + "x <wait_time> 121s", 121, "sleep time from server is 121 secs.\n");
+    row("<action>proceed</action>" + kWait + "x <wait_time> 121s", 121,
+        "sleep time from server is 121");
     row(kWait + "<wait_time>0</wait_time>", 0, "sleep time from server is 0 secs.\n");
     row(kWait + "<wait_time>-1", 0, "received garbage sleep time from central server.");
     row(kWait + "<wait_time>soon", 0, "received garbage sleep time from central server.");
     row("<wait_time>300</wait_time>" + kWait, 0, "malformed wait_time from central server.");
-    row(proceed + "<wait_time>300", 0, "central server gave permission to proceed.");
+    row("<action>proceed</action><wait_time>300", 0, "central server gave permission to proceed.");
     row("", 0,
         "httpGet for " + kRest + "remote_access_status/*ID_REMOVED*, failed to get response");
     row("<ACTION>wait</ACTION><wait_time>300", 0, "missing action from central server.");
@@ -42,15 +43,13 @@ TEST_F(ServerRequestsTest, ThePublicAddressIsTheBodyAsItCame) {
     std::string ip;
     int wait = 5;
     web.answerOnce("/myip", "44.128.0.9");
-    EXPECT_TRUE(client.getMyIP(ip, wait));
-    EXPECT_EQ(wait, 0);
+    EXPECT_TRUE(client.getMyIP(ip, wait) && wait == 0);
     web.answerOnce("/myip", "device-7350142\n");
     EXPECT_FALSE(client.getMyIP(ip, wait) || client.getMyIP(ip, wait));
     EXPECT_EQ(ip, "device-7350142\n");
     client.resetServerSleepTime();
     web.answer(kPoll, kWait + "<wait_time>9</wait_time>");
-    EXPECT_FALSE(client.getMyIP(ip, wait));
-    EXPECT_EQ(wait, 9);
+    EXPECT_TRUE(!client.getMyIP(ip, wait) && wait == 9);
     EXPECT_EQ(web.urls(), (Urls{kPoll, kRest + "myip", kRest + "myip", kRest + "myip", kPoll}));
     for (const std::string bad : {"", "44.128.0.9\n", "44.128.0.256", "::1"})
         EXPECT_FALSE(isIpv4Address(bad)) << bad;
@@ -60,17 +59,14 @@ TEST_F(ServerRequestsTest, ThePublicAddressIsTheBodyAsItCame) {
 class PortTestTest : public CloudTest {
 protected:
     // What a test with these answers returns and leaves, and a line that it must log once.
-    void row(std::string ip,
-             const std::vector<FakeWeb::Answer>& answers,
-             const std::string& left,
-             const std::string& line) {
+    void row(std::string ip, const Answers& answers, const std::string& left, const char* line) {
         web.clear();
         log.clear();
         for (const auto& answer : answers) web.answerOnce("/test", answer);
         const int result =
-            client.testPort(ip, 9091, type, true, checkSleep, &relay, skipDoubleNat, remoteIp);
+            client.testPort(ip, 9091, type, true, checkSleep, &relay, skipNat, remote);
         const char* const results[]{"", "skip", "fail", "pass"};
-        EXPECT_EQ(results[result] + (", " + ip) + ", " + remoteIp + (relay ? ", relay" : "") +
+        EXPECT_EQ(results[result] + (", " + ip) + ", " + remote + (relay ? ", relay" : "") +
                       (client.lastPortTestPassed() ? "" : ", last failed"),
                   left);
         EXPECT_EQ(web.count("/test"), answers.size()) << line;
@@ -78,12 +74,11 @@ protected:
     }
 
     HttpType type = HTTP;
-    bool checkSleep = false, relay = true, skipDoubleNat = false;
-    std::string remoteIp = "stale";
+    bool checkSleep = false, relay = true, skipNat = false;
+    std::string remote = "stale";
 };
 
 TEST_F(PortTestTest, TriesThreeTimesUnlessItPassesOrMeetsASecondNat) {
-    const FakeWeb::Answer none = FakeWeb::noAnswer();
     const std::string ip = "44.128.0.20", ok = "Success", large = ok + std::string(9900, '%');
     const std::string passed = "pass, 44.128.0.20, ", failed = "fail, 44.128.0.20, , last failed";
     // clang-format off
@@ -112,7 +107,7 @@ TEST_F(PortTestTest, TriesThreeTimesUnlessItPassesOrMeetsASecondNat) {
         "'*ID_REMOVED*' is different than");
     row(ip, {ok + '\0' + device}, "fail, 44.128.0.20, ", "httpGet got Success, 100 bytes");
     // clang-format on
-    skipDoubleNat = true;
+    skipNat = true;
     row(ip, {"no" + seen("44.128.0.9"), none, none}, failed, "testPort - port map check failed.\n");
     type = static_cast<HttpType>(7);
     row(ip, {ok + device}, passed, "port map check success.\n");

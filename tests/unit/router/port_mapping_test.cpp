@@ -74,7 +74,7 @@ TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {
     router.setReqPortMappingLifetime(600, 700);
     router.renewPortMapping("HTTPS");
     once(
-        "HTTPS: mapPort returncode[1], internalPort[443], new externalPort[9444], now[1700302401], previous start[1700000000], previous lifetime[604800], new lifetime[600].\n");
+        "now[1700302401], previous start[1700000000], previous lifetime[604800], new lifetime[600]");
     EXPECT_EQ(renewedAfter(0), Texts{http});
     EXPECT_EQ(renewedAfter(300), Texts{});
     EXPECT_EQ(renewedAfter(1), (Texts{http, https}));
@@ -85,8 +85,7 @@ TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {
     EXPECT_EQ(renewedAfter(301), Texts{https});
     EXPECT_TRUE(router.unmapPort(443, 9444, "TCP"));
     EXPECT_EQ(renewedAfter(301), Texts{});
-    once(
-        "mismatch when destroying port mapping. tracked_internal_port 443, req_internal_port 22, external_port 9444");
+    once("tracked_internal_port 443, req_internal_port 22, external_port 9444");
     once("destroyed HTTP port mapping. internal_port 80, external_port 9091");
     once("destroyed HTTPS");
     once("mismatch");
@@ -114,7 +113,7 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
 TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     discovered();
     ASSERT_TRUE(map(443, 9444));
-    const std::string large(200, '9');
+    const std::string large(99, '9');
     gateway.lie = {0,    "192.168.77.10.168.77.10", "80808080", large, "90919091", "TCPTCP", large,
                    large};
     EXPECT_EQ(router.getMappedInternalPort(909190, "TCP"), -1);

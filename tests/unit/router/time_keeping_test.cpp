@@ -48,6 +48,7 @@ TEST_F(TimeKeepingTest, ALeaseStartsWhenItIsRecorded) {
 
 TEST_F(TimeKeepingTest, ATimerMeasuresUntilItIsStopped) {
     Timer timer;
+    clock.set(10);
     static_cast<void>(clock.wait(900000, nullptr));
     timer.start();
     static_cast<void>(clock.wait(3700000, nullptr));
@@ -56,6 +57,7 @@ TEST_F(TimeKeepingTest, ATimerMeasuresUntilItIsStopped) {
     timer.stop();
     clock.advance(30);
     EXPECT_EQ(timer.getElapsedTimeInMicroSec(), 3700000);
+    EXPECT_EQ(log.countPart("end.sec[14] end.usec[600000] start.sec[10] start.usec[900000]"), 1);
 }
 
 }  // namespace

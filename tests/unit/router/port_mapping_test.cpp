@@ -52,7 +52,7 @@ TEST_F(PortMappingTest, AnEntryOfAnotherHostKeepsItsPort) {
     row(501, "192.168.77.7", "80", "192.168.77.7");
     row(0, "%s%n.%s%n%s%n.7777", "808080", "%s%n.%s%n%s%n.77\n");  // too long
     row(0, "192.168.77.0", "80", "");
-    row(0, "nobody", "80", "");
+    row(0, "host.lan", "80", "");
 }
 
 TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {

@@ -15,7 +15,10 @@ using Urls = std::vector<std::string>;
 
 class CloudTest : public support::PelorusTest {
 protected:
-    ~CloudTest() override { web.checkBalance(); }
+    void TearDown() override {
+        web.checkBalance();
+        PelorusTest::TearDown();
+    }
 
     const FakeWeb::Answer none = FakeWeb::noAnswer();
     FakeWeb& web = FakeWeb::get();

@@ -19,11 +19,10 @@ TEST_F(HttpClientTest, AnAnswerIsKeptAsFarAsItCameAndFits) {
     const std::string large = std::string(10000, 'a') + std::string(238, 'b');
     web.answer("x", large);
     EXPECT_EQ(get("x"), large);
-    // clang-format off
-    EXPECT_EQ(web.options(), (FakeWeb::Options{
+    const FakeWeb::Options options{
         {CURLOPT_TIMEOUT_MS, "30000"}, {CURLOPT_WRITEFUNCTION, ""}, {CURLOPT_WRITEDATA, ""},
-        {CURLOPT_SSLVERSION, "0"}, {CURLOPT_URL, "x"}, {CURLOPT_SSL_VERIFYPEER, "1"}}));
-    // clang-format on
+        {CURLOPT_SSLVERSION, "0"},     {CURLOPT_URL, "x"},          {CURLOPT_SSL_VERIFYPEER, "1"}};
+    EXPECT_EQ(web.options(), options);
     web.answer("x", large + "c");
     EXPECT_EQ(get("x"), "(null)");
     web.answer("x", {"half", CURLE_OPERATION_TIMEDOUT});
@@ -51,10 +50,9 @@ TEST_F(FirstUseTest, ReportsDisabledOnceWithoutCredentials) {
 
 TEST_F(FirstUseTest, OnlyTheHostOfTheFirstUsableBaseCounts) {
     givenConfig();
-    TavikClient& client = *TavikClient::getInstance();
     const auto url = [&](const char* base, const char* urn, int type) {
         setConfig("SERVER_BASE_URL", base);
-        return client.getRestUrl(urn, static_cast<HttpType>(type));
+        return TavikClient::getInstance()->getRestUrl(urn, static_cast<HttpType>(type));
     };
     EXPECT_EQ(url("", "/%s", HTTP) + url("web.kavra.example", "/%d", HTTP), "/%s/%d");
     EXPECT_EQ(url("http://a", "/%s", HTTP), "/%s");

@@ -7,7 +7,7 @@ using DiscoveryTest = RouterTest;
 
 TEST_F(DiscoveryTest, UpnpIsPreferredAndChangesAreReportedUntilTheyAreRead) {
     net.failInterfaces();
-    discoveredThroughNatpmp();
+    discovered("NAT-PMP");
     EXPECT_TRUE(router.isNatPMPGateway());
     net.failInterfaces(false);
     gateway.speakUpnp(true);

@@ -118,7 +118,7 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
 
 TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
     router.setReqPortMappingLifetime(600, 700);
-    discoveredThroughNatpmp();
+    discovered("NAT-PMP");
     EXPECT_TRUE(map(443, 9444));
     EXPECT_EQ(renewedAfter(351).back(), "natpmp map TCP 9444 -> 443 for 700 s");
     EXPECT_EQ(log.countPart("Router::renewPortMapping"), 0);

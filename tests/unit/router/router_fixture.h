@@ -21,19 +21,18 @@ protected:
         gateway.reset();
         givenConfig();
     }
-    ~RouterTest() override { gateway.checkReleased(); }
+    void TearDown() override {
+        gateway.checkReleased();
+        PelorusTest::TearDown();
+    }
 
-    void discovered() {
+    void discovered(const std::string& protocol = "UPnP") {
+        gateway.speakUpnp(protocol == "UPnP");
+        gateway.speakNatpmp(protocol == "NAT-PMP");
         ASSERT_TRUE(router.discover()) << log.dump();
         log.clear();
         gateway.clear();
     }
-    void discoveredThroughNatpmp() {
-        gateway.speakUpnp(false);
-        gateway.speakNatpmp(true);
-        discovered();
-    }
-
     void once(const char* part) { EXPECT_EQ(log.countPart(part), 1) << part << log.dump(); }
 
     FakeGateway& gateway = FakeGateway::get();

@@ -113,6 +113,7 @@ TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
     row("portforwarded", 1, "connected type=portforwarded");
     row("relayed", 1, "connected type=relayed");
     row("failed", 1, "failed type=portforwarded");
+    row("failed", 4, "failed type=disabled");
     row("failed", 5, "failed type=disabled");  // beyond the table
     row("odd", 2, "failed type=disabled");
 }

@@ -18,8 +18,10 @@ TEST_F(ConnectionManagerTest, WithoutCredentialsItIdlesAndSendsNothing) {
 TEST_F(ConnectionManagerTest, SteadyConnectionStretchesThePortTestInterval) {
     givenForwardedPorts();
     for (int unchanged = 0; unchanged < 31; ++unchanged) cycle();
-    EXPECT_EQ(logged("increased port test interval to "),
-              (Texts{"360.\n", "480.\n", "600.\n", "720.\n", "840.\n", "960.\n", "960.\n"}));
+    EXPECT_EQ(story(PORTFORWARDED),
+              "disk, test 9091, interval 360, disk, test 9091, interval 480, disk, test 9091, "
+              "interval 600, interval 720, disk, test 9091, interval 840, interval 960, disk, "
+              "test 9091, interval 960 = 9091 9444 portforwarded");
 }
 
 TEST_F(ConnectionManagerTest, ChangeOfTypeResetsTheIntervalAndForcesANameCheck) {
@@ -28,7 +30,6 @@ TEST_F(ConnectionManagerTest, ChangeOfTypeResetsTheIntervalAndForcesANameCheck) 
     relayWorks();
     gateway.speakUpnp(false);
     web.answer("/test?", kNotReached);
-    forget();
     EXPECT_EQ(cycle(), RELAYED);
     EXPECT_EQ(log.countPart("changed to 2, port test interval reset to 240,"), 1);
     manager().checkConnection(RELAYED);
@@ -37,26 +38,15 @@ TEST_F(ConnectionManagerTest, ChangeOfTypeResetsTheIntervalAndForcesANameCheck) 
     EXPECT_EQ(log.countPart("connection type 2 un-changed. connTypeUnchangedCount 0,"), 1);
 }
 
-TEST_F(ConnectionManagerTest, WaitingForTheNextPortTestIsNoReasonForARelay) {
-    manager().killConnection(PORTFORWARDED);
-    web.answer("/test?", kNotReached);
-    ASSERT_EQ(cycle(), FAILED);
-    setConfig("COMMUNICATION_STATUS", "connecting");
-    forget();
-    EXPECT_EQ(story(cycle()), " = connecting");
-    EXPECT_EQ(logged(" connection type changed"), Texts{});
-}
-
 TEST_F(ConnectionManagerTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
-    unsigned upnp = 0;
-    unsigned natpmp = 0;
-    manager().getReqPortMappingLifetime(upnp, natpmp);
-    EXPECT_EQ(upnp, 4294967295U);
-    EXPECT_EQ(natpmp, 4294967295U);
+    const auto lifetimes = [this] {
+        std::pair<unsigned, unsigned> asked;
+        manager().getReqPortMappingLifetime(asked.first, asked.second);
+        return asked;
+    };
+    EXPECT_EQ(lifetimes(), std::pair(4294967295U, 4294967295U));
     manager().setReqPortMappingLifetime(600, 700);
-    manager().getReqPortMappingLifetime(upnp, natpmp);
-    EXPECT_EQ(upnp, 600U);
-    EXPECT_EQ(natpmp, 700U);
+    EXPECT_EQ(lifetimes(), std::pair(600U, 700U));
 }
 
 TEST_F(ConnectionManagerTest, WrongNamesTearEverythingDownAndForceATestInTheSameCycle) {
@@ -68,11 +58,11 @@ TEST_F(ConnectionManagerTest, WrongNamesTearEverythingDownAndForceATestInTheSame
         net.setName(name, {"44.128.0.99"});
     }
     manager().checkConnection(PORTFORWARDED);
-    EXPECT_EQ(
-        story(FAILED),
-        "failed/portforwarded, status failed, unmap 9091, unmap 9444, record NULL&LAN&0&0, withdraw 8080, stop, force 1 = failed");
+    EXPECT_EQ(story(FAILED),
+              "failed, status failed, unmap 9091 9444, withdraw LAN, stop, force 1 = failed");
     EXPECT_EQ(story(manager().createConnection()),
-              kSearch + kPublish + ", status portforwarded, force 0" + kKept);
+              "connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444, up"
+              " = 9091 9444 portforwarded");
 }
 
 }  // namespace

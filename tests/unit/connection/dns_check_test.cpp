@@ -1,5 +1,4 @@
 #include <limits>
-#include <map>
 
 #include "connection_fixture.h"
 
@@ -12,14 +11,15 @@ const std::string kThreeLevel = "nas-devicedevice-7350142.kavra.example";
 
 class DnsCheckTest : public ConnectionTest {
 protected:
+    /// An empty address: the name is not known.
     void namesLeadTo(const std::string& four, const std::string& three, const std::string& hashed) {
+        net.reset();
         if (!four.empty()) net.setName(kFourLevel, {four});
         if (!three.empty()) net.setName(kThreeLevel, {three});
         if (!hashed.empty()) net.setName(support::kSubdomain, {hashed});
     }
     bool forcedCheck(ConnectionType type) {
         manager().setForceDNSCheck(true);
-        log.clear();
         return manager().checkDNS(type);
     }
 };
@@ -39,7 +39,6 @@ TEST_F(DnsCheckTest, NamesMustAllLeadToTheExternalAddress) {
              {wan, wan, "", false, 30}, {kOther, kOther, kOther, false, 0}, {wan, kOther, wan, false, 0},
              {wan, wan, kOther, false, 0}, {wan, wan, wan, true, 0}}) {
         // clang-format on
-        net.reset();
         namesLeadTo(row.four, row.three, row.hashed);
         const time_t before = clock.now();
         EXPECT_EQ(forcedCheck(PORTFORWARDED), row.fine);
@@ -75,15 +74,18 @@ TEST_F(DnsCheckTest, RelayedNamesMustLeadToTheRelay) {
 }
 
 TEST_F(DnsCheckTest, WithoutAGatewayTheAddressOfTheLastPortTestCounts) {
-    gateway.speakUpnp(false);
     std::string ip = "as it was";
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(FAILED, ip), 0);
     EXPECT_EQ(ip, "as it was");
+    gateway.speakUpnp(false);
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 0);
     EXPECT_EQ(ip, "");
-    manager().setResponseExternalIP(kOther);
+    EXPECT_EQ(log.countPart("most recent remote external IP in test port response is empty"), 1);
+    gateway.speakUpnp(true);
+    manager().createDirectConnection();
+    gateway.speakUpnp(false);
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 1);
-    EXPECT_EQ(ip, kOther);
+    EXPECT_EQ(ip, kWanIp);
 }
 
 TEST_F(DnsCheckTest, RunsWhenItsIntervalHasPassedAndEveryCheckRestartsIt) {
@@ -127,21 +129,19 @@ TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
 }
 
 TEST_F(DnsCheckTest, DomainBeginsAtTheFirstDotOfTheServer) {
-    const std::map<std::string, std::string> domains{
-        {"https://cloud.other.example", "other.example"},
-        {"https://cloud.a.b:8443/x", "a.b:8443/x"},
-        {"https://cloud", "kavra.example"},
-        {"", "kavra.example"}};
     std::string host = "nas";
     std::string names[3];
-    for (const auto& [server, domain] : domains) {
+    const auto build = [&](const std::string& server, char* hostname, const std::string& id) {
         setConfig("SERVER_BASE_URL", server);
-        EXPECT_EQ(manager().buildDeviceDomainName(host.data(), "7", names[0], names[1], names[2]),
-                  1);
-        EXPECT_EQ(names[0], "nas.device7." + domain);
-    }
-    EXPECT_EQ(manager().buildDeviceDomainName(nullptr, "7", names[0], names[1], names[2]), 0);
-    EXPECT_EQ(manager().buildDeviceDomainName(host.data(), "", names[0], names[1], names[2]), 0);
+        const int built =
+            manager().buildDeviceDomainName(hostname, id, names[0], names[1], names[2]);
+        return built == 1 ? names[0] : "";
+    };
+    EXPECT_EQ(build("https://cloud.a.b:8443/x", host.data(), "7"), "nas.device7.a.b:8443/x");
+    EXPECT_EQ(build("https://cloud", host.data(), "7"), "nas.device7.kavra.example");
+    EXPECT_EQ(build("", host.data(), "7"), "nas.device7.kavra.example");
+    EXPECT_EQ(build("", nullptr, "7"), "");
+    EXPECT_EQ(build("", host.data(), ""), "");
 }
 
 }  // namespace

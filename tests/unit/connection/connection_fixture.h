@@ -54,7 +54,8 @@ inline const std::vector<Word> kWords{
 inline const std::vector<Word> kLogWords{
     {"cloudConnectivity state=", ""}, {"setForceConnect = ", "force "}, {"increased port test interval to ", "interval ", "."},
     {"Port test failed, trying next port", "next port", ""}, {"Port test failed, retries exceeded", "exceeded", ""},
-    {"mapping port : e-[", "check ", "]"}, {"extended port range : e-[", "range ", "]"}};
+    {"mapping port : e-[", "check ", "]"}, {"extended port range : e-[", "range ", "]"},
+    {"UPnP not working. Elapsed time ", "elapsed ", ","}};
 
 /// How a story() abbreviates what mostly goes together; anything else stands in full.
 inline constexpr const char* kPhrases[][2] = {
@@ -66,17 +67,15 @@ inline constexpr const char* kPhrases[][2] = {
     {"connected, status portforwarded, force 0", "up"},
     {R"(record NULL&(\S+)&0&0, forget 8080)", "withdraw $1"},
     {"connecting/relayed, withdraw LAN, start, failed/relayed", "no relay"},
-    {"connecting/relayed, withdraw LAN, start, connected/relayed, status relayed, force 0", "relay up"}};
+    {"connecting/relayed, withdraw LAN, start, connected/relayed, status relayed, force 0", "relay up"},
+    {"= 9091 9444 portforwarded", "= forwarded"}};
 // clang-format on
 
 /// Public, so that the rows of a table can change the world.
 class ConnectionTest : public support::PelorusTest {
 public:
-    using PelorusTest::clock;
-    using PelorusTest::commands;
-    using PelorusTest::net;
-    using PelorusTest::setConfig;
-    using PelorusTest::writeFile;
+    using PelorusTest::clock, PelorusTest::commands, PelorusTest::net;
+    using PelorusTest::setConfig, PelorusTest::writeFile;
 
     ConnectionTest() {
         log.onLine([this](const support::LogLine&) { listen(); });
@@ -161,10 +160,11 @@ public:
         for (const auto& mapping : gateway.mappings()) {
             if (mapping.client == kLanIp) all += " " + std::to_string(mapping.externalPort);
         }
+        all += " " + result;
         for (const auto& [full, brief] : kPhrases) {
             all = std::regex_replace(all, std::regex{full}, brief);
         }
-        return all + " " + result;
+        return all;
     }
     std::string story(ConnectionType type) {
         return story(ConnectionManager::convertEnumConnectionType(type));
@@ -181,18 +181,17 @@ private:
     void listen() {
         const Texts sources[] = {web.urls(), gateway.calls(), commands.lines(), log.texts()};
         for (int i = 0; i < 4; ++i) {
-            const auto& words = i == 3 ? kLogWords : kWords;
-            for (auto& seen = heard[i]; seen < sources[i].size(); ++seen) {
-                tell(sources[i][seen], words);
+            for (auto& next = heard[i]; next < sources[i].size(); ++next) {
+                tell(sources[i][next], i == 3 ? kLogWords : kWords);
             }
         }
     }
-    void tell(const std::string& line, const std::vector<Word>& words) {
-        for (const Word& word : words) {
-            const auto at = line.find(word.part);
+    void tell(const std::string& line, const std::vector<Word>& vocabulary) {
+        for (const auto& [part, words, end] : vocabulary) {
+            const auto at = line.find(part);
             if (at == std::string::npos) continue;
-            const auto rest = line.substr(at + word.part.size());
-            told += ", " + word.words + rest.substr(0, rest.find(word.end));
+            const auto rest = line.substr(at + part.size());
+            told += ", " + words + rest.substr(0, rest.find(end));
             return;
         }
     }

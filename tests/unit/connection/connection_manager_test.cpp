@@ -15,27 +15,22 @@ TEST_F(ConnectionManagerTest, WithoutCredentialsItIdlesAndSendsNothing) {
     EXPECT_EQ(manager().createConnection(), PORTFORWARDED);
 }
 
-TEST_F(ConnectionManagerTest, SteadyConnectionStretchesThePortTestInterval) {
+TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneResetsIt) {
     givenForwardedPorts();
     for (int unchanged = 0; unchanged < 31; ++unchanged) cycle();
     EXPECT_EQ(story(PORTFORWARDED),
               "disk, test 9091, interval 360, disk, test 9091, interval 480, disk, test 9091, "
               "interval 600, interval 720, disk, test 9091, interval 840, interval 960, disk, "
-              "test 9091, interval 960 = 9091 9444 portforwarded");
-}
-
-TEST_F(ConnectionManagerTest, ChangeOfTypeResetsTheIntervalAndForcesANameCheck) {
-    givenForwardedPorts();
-    for (int unchanged = 0; unchanged < 5; ++unchanged) cycle();
-    relayWorks();
+              "test 9091, interval 960 = forwarded");
+    clientRuns();
     gateway.speakUpnp(false);
-    web.answer("/test?", kNotReached);
-    EXPECT_EQ(cycle(), RELAYED);
-    EXPECT_EQ(log.countPart("changed to 2, port test interval reset to 240,"), 1);
-    manager().checkConnection(RELAYED);
-    EXPECT_EQ(log.countPart("nslookup check interval, forceDNSCheck 1,"), 1);
-    cycle();
-    EXPECT_EQ(log.countPart("connection type 2 un-changed. connTypeUnchangedCount 0,"), 1);
+    failTest(9091);
+    for (int relayed = 0; relayed < 5; ++relayed) EXPECT_EQ(cycle(), RELAYED);
+    EXPECT_EQ(story(RELAYED),
+              "test :9091 x3, status failed, elapsed 0, status relayed, force 0, elapsed 121, "
+              "force 0, elapsed 241, force 0, elapsed 361, force 0, elapsed 481, force 0, "
+              "interval 360 = 9091 9444 relayed");
+    EXPECT_FALSE(manager().checkDNS(RELAYED)) << "a new type forces a check; no name is known";
 }
 
 TEST_F(ConnectionManagerTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
@@ -62,7 +57,7 @@ TEST_F(ConnectionManagerTest, WrongNamesTearEverythingDownAndForceATestInTheSame
               "failed, status failed, unmap 9091 9444, withdraw LAN, stop, force 1 = failed");
     EXPECT_EQ(story(manager().createConnection()),
               "connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444, up"
-              " = 9091 9444 portforwarded");
+              " = forwarded");
 }
 
 }  // namespace

@@ -56,8 +56,72 @@ TEST_F(ConnectionManagerTest, WrongNamesTearEverythingDownAndForceATestInTheSame
     EXPECT_EQ(story(FAILED),
               "failed, status failed, unmap 9091 9444, withdraw LAN, stop, force 1 = failed");
     EXPECT_EQ(story(manager().createConnection()),
-              "connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444, up"
+              "map both, up"
               " = forwarded");
+}
+
+void forwarded(World& w) {
+    w.manager().createDirectConnection();
+    w.forget();
+}
+
+class RelayAttempt : public StoryTest {};
+TEST_P(RelayAttempt, TellsAsExpected) {
+    expectStories([this] { return manager().createRelayConnection(); });
+}
+class KillConnection : public StoryTest {};
+TEST_P(KillConnection, TellsAsExpected) {
+    expectStories([this] {
+        manager().killConnection(PORTFORWARDED);
+        return NONE;
+    });
+    log.clear();
+    for (const auto type : {NONE, CONNECTING, FAILED}) manager().killConnection(type);
+    EXPECT_TRUE(log.lines().empty());
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("Port 9"), 0) << "the ports are forgotten";
+}
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
+    Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); },
+        {"connecting/relayed, record NULL&&0&0, forget 8080, start, connected/relayed, status relayed, force 0 = relayed"}},
+    Row{"KeepsARunningTunnelAndEndsAForcedAttempt", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
+    Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
+        {"connecting/relayed, record NULL&&0&0, forget 8080, start, start, start, start, failed/relayed, status failed = failed"}},
+    Row{"KeepsEverythingWhenTheServerAsksForAWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
+    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { forwarded(w); }, {" = forwarded"}}), RowName{});
+INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
+    // The gateway object is new at the first, and so is the LAN address.
+    Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
+            w.gateway.add({9091, kLanIp, 8080, "Kavra"});
+            w.gateway.add({5000, kLanIp, 22, "ssh"});
+            w.gateway.add({9093, "192.168.77.66", 80, "Kavra"});
+            w.gateway.add({9444, kLanIp, 8443, "KavraSSL"});
+        }, {"lanip, unmap 9091 9444, withdraw LAN = 5000 disabled", "withdraw LAN = 5000 disabled"}},
+    Row{"ForgetsThePortsOfTheConnection", [](World& w) { forwarded(w); }, {"unmap 9091 9444, withdraw LAN = disabled"}},
+    Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.speakUpnp(false); }, {" = disabled"}},
+    Row{"WithdrawsTheRecordWhenTheGatewayWentAway", [](World& w) {
+            forwarded(w);
+            w.gateway.speakUpnp(false);
+            forwarded(w);
+        }, {"withdraw LAN = 9091 9444 disabled"}},
+    Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
+    Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {
+            w.givenMakersRouter("BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n", "");
+        }, {"remove \"TCP,9091,192.168.77.1,80\", withdraw 192.168.77.1 = disabled"}}), RowName{});
+// clang-format on
+
+TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
+    givenForwardedPorts();
+    ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing
+    relayWorks();
+    web.answer("/forward?", FakeWeb::noAnswer());
+    EXPECT_EQ(story(manager().createRelayConnection()),
+              "connecting/relayed, record NULL&LAN&0&0, start, connected/relayed, status relayed, "
+              "force 0 = 9091 9444 relayed");
+    log.clear();
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
 }
 
 }  // namespace

@@ -40,15 +40,12 @@ TEST_F(DnsCheckTest, NamesMustAllLeadToTheExternalAddress) {
     EXPECT_EQ(log.countPart("DNS matches local value"), 1);
 }
 
-TEST_F(DnsCheckTest, OnlyNamesWithoutAnAddressAreLookedUpAgain) {
+TEST_F(DnsCheckTest, OnlyUsedNamesWithoutAnAddressAreLookedUpAgain) {
     namesLeadTo("W-W");
     clock.duringPause(2, [this] { net.setName(kThreeLevel, {kWanIp}); });
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(net.lookups(),
               (Texts{kFourLevel, kThreeLevel, support::kSubdomain, kThreeLevel, kThreeLevel}));
-}
-
-TEST_F(DnsCheckTest, UnusedHashedNameIsNeitherLookedUpNorCompared) {
     setConfig("SUBDOMAIN", "");
     namesLeadTo("WW-");
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
@@ -105,6 +102,8 @@ TEST_F(DnsCheckTest, ForcedCheckWaitsForAConnectionThatHasNames) {
 }
 
 TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
+    std::string names[3];
+    EXPECT_EQ(manager().buildDeviceDomainName(nullptr, "7", names[0], names[1], names[2]), 0);
     net.setHostname("");
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(log.countPart("cannot generate device domain names"), 1);
@@ -118,19 +117,15 @@ TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
 }
 
 TEST_F(DnsCheckTest, DomainBeginsAtTheFirstDotOfTheServer) {
-    std::string host = "nas";
-    std::string names[3];
-    const auto build = [&](const std::string& server, char* hostname, const std::string& id) {
+    const std::map<std::string, std::string> domains{{"https://cloud.a.b:8443/x", ".a.b:8443/x"},
+                                                     {"https://cloud", ".kavra.example"},
+                                                     {"", ".kavra.example"}};
+    for (const auto& [server, domain] : domains) {
         setConfig("SERVER_BASE_URL", server);
-        const int built =
-            manager().buildDeviceDomainName(hostname, id, names[0], names[1], names[2]);
-        return built == 1 ? names[0] : "";
-    };
-    EXPECT_EQ(build("https://cloud.a.b:8443/x", host.data(), "7"), "nas.device7.a.b:8443/x");
-    EXPECT_EQ(build("https://cloud", host.data(), "7"), "nas.device7.kavra.example");
-    EXPECT_EQ(build("", host.data(), "7"), "nas.device7.kavra.example");
-    EXPECT_EQ(build("", nullptr, "7"), "");
-    EXPECT_EQ(build("", host.data(), ""), "");
+        net.reset();
+        forcedCheck(PORTFORWARDED);
+        EXPECT_EQ(net.lookups().front(), "nas.devicedevice-7350142" + domain);
+    }
 }
 
 }  // namespace

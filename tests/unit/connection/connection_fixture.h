@@ -41,7 +41,7 @@ struct Word {
 // clang-format off
 inline const std::vector<Word> kWords{
     {"&ip=", "test ", "&auth"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "},
-    {"/delforward?", "forget "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""},
+    {"/delforward?", "drop "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""},
     {"natpmp map TCP ", "natpmp ", " for"}, {"unmap TCP ", "unmap "}, {"map TCP ", "map "},
     {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""},
     {"helper.sh add ", "add "}, {"helper.sh remove ", "remove "}};
@@ -61,7 +61,7 @@ inline constexpr const char* kPhrases[][2] = {
     {"connected, status portforwarded, force 0", "up"},
     {"connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444", "map both"},
     {"connecting, test :18080, publish WAN LAN 18080 18443", "by hand"},
-    {R"(record NULL&(\S+)&0&0, forget 8080)", "withdraw $1"},
+    {R"(record NULL&(\S+)&0&0, drop 8080)", "withdraw $1"},
     {"connecting/relayed, withdraw LAN, start, failed/relayed", "no relay"},
     {"connecting/relayed, withdraw LAN, start, connected/relayed, status relayed, force 0", "relay up"},
     {"= 9091 9444 portforwarded", "= forwarded"}};

@@ -1,6 +1,3 @@
-#include <limits>
-#include <map>
-
 #include "connection_fixture.h"
 
 namespace pelorus {
@@ -34,8 +31,7 @@ TEST_F(DnsCheckTest, NamesMustAllLeadToTheExternalAddress) {
         namesLeadTo(places);
         const time_t before = clock.now();
         EXPECT_EQ(forcedCheck(PORTFORWARDED), places == "WWW") << places;
-        const bool waits = places.find('-') != std::string::npos;
-        EXPECT_EQ(clock.now() - before, waits ? 30 : 0) << places;
+        EXPECT_EQ(clock.now() - before, places.find('-') < 3 ? 30 : 0) << places;
     }
     EXPECT_EQ(log.countPart("DNS matches local value"), 1);
 }
@@ -88,7 +84,7 @@ TEST_F(DnsCheckTest, RunsWhenItsIntervalHasPassedAndEveryCheckRestartsIt) {
     EXPECT_TRUE(fineAfter(999));
     EXPECT_FALSE(fineAfter(1));
     EXPECT_TRUE(fineAfter(999));
-    manager().setDNSCheckInterval(std::numeric_limits<std::int64_t>::max());  // never due
+    manager().setDNSCheckInterval(INT64_MAX);  // never due
     EXPECT_TRUE(fineAfter(1));
 }
 

@@ -3,15 +3,6 @@
 namespace pelorus {
 namespace {
 
-class ManualAttemptTest : public StoryTest {
-protected:
-    ManualAttemptTest() {
-        setConfig("MANUAL_PORT_FORWARD", "TRUE");
-        setConfig("MANUAL_EXTERNAL_HTTP_PORT", "18080");
-        setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "18443");
-    }
-};
-
 // An automatic attempt, before the user takes over.
 void automaticCycle(World& w) {
     w.setConfig("MANUAL_PORT_FORWARD", "FALSE");
@@ -26,12 +17,15 @@ void published(World& w, long ago = 240) {
     w.forget();
 }
 
-class ManualStories : public ManualAttemptTest {};
-TEST_P(ManualStories, TellsAsExpected) {
+class ManualAttempt : public StoryTest {};
+TEST_P(ManualAttempt, TellsAsExpected) {
+    setConfig("MANUAL_PORT_FORWARD", "TRUE");
+    setConfig("MANUAL_EXTERNAL_HTTP_PORT", "18080");
+    setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "18443");
     expectStories([this] { return cycle(); });
 }
 // clang-format off
-INSTANTIATE_TEST_SUITE_P(Worlds, ManualStories, testing::Values(
+INSTANTIATE_TEST_SUITE_P(Worlds, ManualAttempt, testing::Values(
     Row{"PublishesAndStopsTheRelayThoughTheDiskSleeps", [](World& w) { w.clientRuns(); w.diskIsAsleep(); },
         {"by hand, stop, up = portforwarded", " = portforwarded"}},
     Row{"RelayThatCannotBeStoppedFailsOnlyTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
@@ -71,7 +65,8 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualStories, testing::Values(
         {"disk, test :18080 x3, status failed, relay up, lanip = relayed", "by hand, up = portforwarded"}}), RowName{});
 // clang-format on
 
-TEST_F(ManualAttemptTest, PortsMustBeWithinTheRange) {
+TEST_F(ConnectionTest, ManuallyForwardedPortsMustBeWithinTheRange) {
+    setConfig("MANUAL_PORT_FORWARD", "TRUE");
     const auto attempt = [this](const char* http, const char* https) {
         setConfig("MANUAL_EXTERNAL_HTTP_PORT", http);
         setConfig("MANUAL_EXTERNAL_HTTPS_PORT", https);

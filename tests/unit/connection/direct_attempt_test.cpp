@@ -48,13 +48,12 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
             "disk, test 7001 = portforwarded"}},
     Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
             w.gateway.refusePort(9091);
-            w.manager().createDirectConnection();
+            w.cycle();
             w.gateway.acceptPort(9091);
             w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
             w.forget();
         }, {"unmap 9092 9444, map both, connected, force 0 = forwarded"}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
-    Row{"RetestsTheHttpPortOnceTheIntervalHasPassed", [](World&) {}, {"disk, test 9091 = forwarded", " = forwarded"}},
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
         {"map 9091>LAN:8080 , map 9444>LAN:8443 , disk, test 9091 = forwarded"}},
     Row{"CountsThePortsAsOpenWhileTheDiskSleeps", [](World& w) { w.diskIsAsleep(); }, {"disk = forwarded", "disk = forwarded"}},

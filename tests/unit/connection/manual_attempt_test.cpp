@@ -27,25 +27,23 @@ TEST_P(ManualAttempt, TellsAsExpected) {
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Worlds, ManualAttempt, testing::Values(
     Row{"PublishesAndStopsTheRelayThoughTheDiskSleeps", [](World& w) { w.clientRuns(); w.diskIsAsleep(); },
-        {"by hand, stop, up = portforwarded", " = portforwarded"}},
+        {"take over, by hand, stop, up = portforwarded", " = portforwarded"}},
     Row{"RelayThatCannotBeStoppedFailsOnlyTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
-        {"by hand, stop, stop, stop, failed = portforwarded", " = portforwarded"}},
-    Row{"TakingOverRemovesTheAutomaticMappingsAndOnlyThem", [](World& w) {
-            w.gateway.add({5000, kLanIp, 22, "ssh"});
-            w.cycle();
-            automaticCycle(w);
-        }, {"unmap 9091 9444, by hand, connected, force 0 = 5000 portforwarded", " = 5000 portforwarded"}},
+        {"take over, by hand, stop, stop, stop, failed = portforwarded", " = portforwarded"}},
+    Row{"TakingOverRemovesTheAutomaticMappingsAndOnlyThem",
+        [](World& w) { w.gateway.add({5000, kLanIp, 22, "ssh"}); w.cycle(); automaticCycle(w); },
+        {"take over, unmap 9091 9444, by hand, connected, force 0 = 5000 portforwarded", " = 5000 portforwarded"}},
     Row{"TakingOverWithoutAGatewayRemovesNothing", [](World& w) { w.gateway.speakUpnp(false); }, {"by hand, up = portforwarded"}},
     // The user's router may well sit behind another one: only the test counts.
     Row{"ClosedPortFailsAndIsReported", [](World& w) { w.web.answer("/test?", kOtherNat); },
-        {"connecting, test :18080 x3, status failed, failed, no relay, lanip = failed"}},
+        {"take over, connecting, test :18080 x3, status failed, failed, no relay, lanip = failed"}},
     Row{"SkippedTestKeepsThePreviousConnectionType", [](World& w) { automaticCycle(w); w.web.answer("/remote_access_status/", kWait); },
-        {"unmap 9091 9444, connecting, failed = portforwarded"}},
+        {"take over, unmap 9091 9444, connecting, failed = portforwarded"}},
     Row{"DoubleNatSeenByTheAutomaticSearchEndsTheAttempt", [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
-        {"no relay = failed"}},
+        {"take over, no relay = failed"}},
     Row{"UnpublishedPortsFailAndAreTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
-        {"connecting, test :18080, record WAN&LAN&18080&18443, failed, no relay, status failed, lanip = failed",
-         "by hand, up = portforwarded"}},
+        {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, no relay, status failed, lanip = failed",
+         "take over, by hand, up = portforwarded"}},
     Row{"TestsUnchangedPortsAfterTheInterval", [](World& w) { published(w, 241); },
         {"disk, test :18080 = portforwarded", " = portforwarded"}},
     Row{"LetsTheDiskSleep", [](World& w) { published(w, 241); w.diskIsAsleep(); }, {"disk = portforwarded", "disk = portforwarded"}},
@@ -54,15 +52,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualAttempt, testing::Values(
     Row{"PublishesAChangedHttpsPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "28443"); },
         {"connecting, test :18080, publish WAN LAN 18080 28443, connected, force 0 = portforwarded", " = portforwarded"}},
     // The server may send anything as an address; the fixture looks for secrets in all lines.
-    Row{"PublishesAChangedAddressAndMasksIt", [](World& w) {
-            w.web.answer("/test?", passed(support::kDeviceId));
-            published(w);
-            w.web.answer("/test?", passed());
-        }, {"by hand, connected, force 0 = portforwarded", " = portforwarded"}},
+    Row{"PublishesAChangedAddressAndMasksIt",
+        [](World& w) { w.web.answer("/test?", passed(support::kDeviceId)); published(w); w.web.answer("/test?", passed()); },
+        {"by hand, connected, force 0 = portforwarded", " = portforwarded"}},
     Row{"PublishesWhenForced", [](World& w) { published(w); w.manager().setForceConnect(true); },
         {"force 1, by hand, connected, force 0 = portforwarded", " = portforwarded"}},
     Row{"EndsWithTheRelay", [](World& w) { published(w, 241); w.relayWorks(); w.failTest(18080); },
-        {"disk, test :18080 x3, status failed, relay up, lanip = relayed", "by hand, up = portforwarded"}}), RowName{});
+        {"disk, test :18080 x3, status failed, relay up, lanip = relayed", "take over, by hand, up = portforwarded"}}), RowName{});
 // clang-format on
 
 TEST_F(ConnectionTest, ManuallyForwardedPortsMustBeWithinTheRange) {

@@ -17,15 +17,15 @@ void published(World& w, long ago = 240) {
     w.forget();
 }
 
-class ManualAttempt : public StoryTest {};
-TEST_P(ManualAttempt, TellsAsExpected) {
+class ManualForwarding : public StoryTest {};
+TEST_P(ManualForwarding, TellsAsExpected) {
     setConfig("MANUAL_PORT_FORWARD", "TRUE");
     setConfig("MANUAL_EXTERNAL_HTTP_PORT", "18080");
     setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "18443");
     expectStories([this] { return cycle(); });
 }
 // clang-format off
-INSTANTIATE_TEST_SUITE_P(Worlds, ManualAttempt, testing::Values(
+INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"PublishesAndStopsTheRelayThoughTheDiskSleeps", [](World& w) { w.clientRuns(); w.diskIsAsleep(); },
         {"take over, by hand, stop, up = portforwarded", " = portforwarded"}},
     Row{"RelayThatCannotBeStoppedFailsOnlyTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },

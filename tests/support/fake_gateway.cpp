@@ -82,7 +82,7 @@ std::string protocolName(int protocol) {
 natpmpresp_t map(int type, int privatePort, int publicPort, unsigned lifetime) {
     natpmpresp_t answer{};
     answer.type = static_cast<std::uint16_t>(type);
-    if (lifetime == 0 ? gateway.keepMappings : refuses(publicPort)) {
+    if (lifetime != 0 && refuses(publicPort)) {
         answer.resultcode = 2;  // not authorized
         return answer;
     }
@@ -231,7 +231,6 @@ int __wrap_UPNP_DeletePortMapping(const char* url, const char* service, const ch
     EXPECT_EQ(remoteHost, nullptr);
     const std::string line = std::string("unmap ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
-    if (gateway.keepMappings) return 501;  // action failed
     const auto held = find(std::stoi(port), protocol);
     if (held == gateway.table.end()) return 714;  // no such entry
     gateway.table.erase(held);

@@ -63,11 +63,9 @@ public:
     /// Fails the test when a device list or URLs were not released.
     void checkReleased() const { EXPECT_TRUE(listed.empty() && urlSets == 0); }
 
-    void speakUpnp(bool on) { upnp = on; }
-    /// Off: requests are refused at once, as where nothing listens.
-    void speakNatpmp(bool on) { natpmp = on; }
-    /// The address in both protocols.
-    void setExternalIp(const std::string& address) { externalIp = address; }
+    bool upnp = true;
+    bool natpmp = false;                     ///< off: refused at once, as where nothing listens
+    std::string externalIp = "44.128.0.20";  ///< in both protocols
     int externalIpStatus = 0;
     /// URL and search target of the UPnP devices.
     std::vector<std::pair<std::string, std::string>> devices{
@@ -80,29 +78,18 @@ public:
     long answerDelay = 0;  ///< requests are answered so much later
     long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
-    void grant(const Grant& what) { granted = what; }
     /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",
     /// "read".
     std::set<std::string> failing;
 
-    void add(const Mapping& mapping) { table.push_back(mapping); }
-    [[nodiscard]] const std::vector<Mapping>& mappings() const { return table; }
-    void refusePort(int port) { refused.insert(port); }
-    void acceptPort(int port) { refused.erase(port); }
-    void refuseAllPorts(bool on = true) { refuseAll = on; }
-    /// Fails removals and keeps the mapping.
-    bool keepMappings = false;
+    Grant granted;
+    std::vector<Mapping> table;
+    std::set<int> refused;  ///< external ports
+    bool refuseAll = false;
     /// The UPnP answer for every port and index, whatever the table says.
     std::optional<Reply> lie;
 
     // For the library calls.
-    bool upnp = true;
-    bool natpmp = false;
-    std::string externalIp = "44.128.0.20";
-    std::vector<Mapping> table;
-    std::set<int> refused;
-    bool refuseAll = false;
-    Grant granted;
     std::vector<UPNPDev> listed;  // handed out and not released
     int urlSets = 0;
     std::optional<natpmpresp_t> pending;  // the answer to the last request

@@ -43,7 +43,7 @@ int __wrap_getaddrinfo(const char* name, const char*, const addrinfo* hints, add
     numeric.ai_flags = AI_NUMERICHOST;
     *list = nullptr;
     addrinfo** end = list;
-    for (const std::string& address : net.names[net.asked.emplace_back(name)]) {
+    for (const std::string& address : net.names[net.lookups.emplace_back(name)]) {
         if (__real_getaddrinfo(address.c_str(), nullptr, &numeric, end) != 0) *end = nullptr;
         while (*end != nullptr) end = &(*end)->ai_next;
     }

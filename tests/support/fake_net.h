@@ -20,12 +20,6 @@ struct FakeNet : Single<FakeNet> {
         unsigned flags = IFF_UP | IFF_RUNNING;
     };
 
-    void setInterfaces(std::vector<Interface> list) { interfaces = std::move(list); }
-    void failInterfaces(bool fail = true) { interfacesFail = fail; }
-    void setHostname(const std::string& name) { hostname = name; }
-    void failHostname() { hostnameFails = true; }
-    void setName(const std::string& name, const Texts& addresses) { names[name] = addresses; }
-    [[nodiscard]] const Texts& lookups() const { return asked; }
     /// Fails the test when a list was not released.
     void checkReleased() const { EXPECT_TRUE(lists.empty()); }
 
@@ -35,7 +29,7 @@ struct FakeNet : Single<FakeNet> {
     std::string hostname = "nas";
     bool hostnameFails = false;
     std::map<std::string, Texts> names;            ///< their addresses; others are not known
-    Texts asked;                                   ///< the names that were looked up
+    Texts lookups;                                 ///< the names that were looked up
     std::map<void*, std::shared_ptr<void>> lists;  ///< not yet released, by their first entry
 };
 

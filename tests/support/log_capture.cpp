@@ -39,17 +39,6 @@ void expectLogged(int priority, const std::string& text) {
         << "never logged: <" << priority << "> " << text << LogCapture::get().dump();
 }
 
-void expectLoggedInOrder(const Texts& texts) {
-    std::size_t at = 0;
-    std::string all;
-    for (const LogLine& line : LogCapture::get().lines()) all += line.text;
-    for (const std::string& text : texts) {
-        at = all.find(text, at);
-        ASSERT_NE(at, std::string::npos) << "not logged, or not in this place: " << text << all;
-        at += text.size();
-    }
-}
-
 extern "C" {
 __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const char* format, ...) {
     std::array<char, 16384> text{};

@@ -51,8 +51,6 @@ private:
 
 /// Fails unless exactly this line came (text with its final newline).
 void expectLogged(int priority, const std::string& text);
-/// Fails unless these texts came in this order, others possibly between them.
-void expectLoggedInOrder(const Texts& texts);
 /// Fails unless the lines are exactly these.
 inline void expectLogIs(const std::vector<LogLine>& lines) {
     EXPECT_EQ(LogCapture::get().lines(), lines);

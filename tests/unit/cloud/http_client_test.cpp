@@ -63,7 +63,7 @@ TEST_F(FirstUseTest, OnlyTheHostOfTheFirstUsableBaseCounts) {
 }
 
 TEST_F(HttpClientTest, ALookupGivesTheFirstAddressAndMasksAnUnknownName) {
-    net.setName("six", {"2001:db8::1", "44.128.0.20"});
+    net.names["six"] = {"2001:db8::1", "44.128.0.20"};
     EXPECT_EQ(client.nsLookup("six"), "2001:db8::1");
     EXPECT_EQ(client.nsLookup("device-7350142.homecloud-smith.kavra.example"), "");
     EXPECT_EQ(log.countPart("hostname: *ID_REMOVED*.*SUBDOMAIN_REMOVED*.kavra.example\n"), 1);

@@ -142,7 +142,7 @@ public:
     std::string story(const std::string& result) {
         listen();
         std::string all = std::exchange(told, "") + " =";
-        for (const auto& mapping : gateway.mappings()) {
+        for (const auto& mapping : gateway.table) {
             if (mapping.client == kLanIp) all += " " + std::to_string(mapping.externalPort);
         }
         all += " " + result;

@@ -23,7 +23,7 @@ TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneRe
               "interval 600, interval 720, disk, test 9091, interval 840, interval 960, disk, "
               "test 9091, interval 960 = forwarded");
     clientRuns();
-    gateway.speakUpnp(false);
+    gateway.upnp = false;
     failTest(9091);
     for (int relayed = 0; relayed < 5; ++relayed) EXPECT_EQ(cycle(), RELAYED);
     EXPECT_EQ(story(RELAYED),
@@ -82,15 +82,15 @@ INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
 INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
     // The gateway object is new at the first, and so is the LAN address.
     Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
-            w.gateway.add({9091, kLanIp, 8080, "Kavra"});
-            w.gateway.add({5000, kLanIp, 22, "ssh"});
-            w.gateway.add({9093, "192.168.77.66", 80, "Kavra"});
-            w.gateway.add({9444, kLanIp, 8443, "KavraSSL"});
+            w.gateway.table.push_back({9091, kLanIp, 8080, "Kavra"});
+            w.gateway.table.push_back({5000, kLanIp, 22, "ssh"});
+            w.gateway.table.push_back({9093, "192.168.77.66", 80, "Kavra"});
+            w.gateway.table.push_back({9444, kLanIp, 8443, "KavraSSL"});
         }, {"lanip, unmap 9091 9444, withdraw LAN = 5000 disabled", "withdraw LAN = 5000 disabled"}},
     Row{"ForgetsThePortsOfTheConnection", [](World& w) { w.givenForwardedPorts(); }, {"unmap 9091 9444, withdraw LAN = disabled"}},
-    Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.speakUpnp(false); }, {" = disabled"}},
+    Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.upnp = false; }, {" = disabled"}},
     Row{"WithdrawsTheRecordWhenTheGatewayWentAway",
-        [](World& w) { w.givenForwardedPorts(); w.gateway.speakUpnp(false); w.cycle(); w.forget(); },
+        [](World& w) { w.givenForwardedPorts(); w.gateway.upnp = false; w.cycle(); w.forget(); },
         {"withdraw LAN = 9091 9444 disabled"}},
     Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
     Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {

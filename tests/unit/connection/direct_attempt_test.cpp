@@ -47,9 +47,9 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
         }, {"connecting, test 7000 x3, status failed, test 7001, publish WAN 192.168.77.1 7001 1, up = portforwarded",
             "disk, test 7001 = portforwarded"}},
     Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
-            w.gateway.refusePort(9091);
+            w.gateway.refused.insert(9091);
             w.cycle();
-            w.gateway.acceptPort(9091);
+            w.gateway.refused.erase(9091);
             w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
             w.forget();
         }, {"unmap 9092 9444, map both, connected, force 0 = forwarded"}}), RowName{});
@@ -61,14 +61,14 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
         {"force 1, connecting, test 9091, connected = forwarded", "connecting, test 9091, connected = forwarded"}},
     Row{"SearchesAgainAfterAFailedRetest", [](World& w) {
             w.failTest(9091);
-            w.gateway.add({9093, "192.168.77.66", 80});
-            w.gateway.refusePort(9091);
-            w.gateway.refusePort(9092);
+            w.gateway.table.push_back({9093, "192.168.77.66", 80});
+            w.gateway.refused.insert(9091);
+            w.gateway.refused.insert(9092);
         }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091 9444, map 9092, unmap 9091 9444, "
             "unmap 9091 9444, map 9094, disk, test 9094, map 9444 SSL, publish WAN LAN 9094 9444, up = 9094 9444 portforwarded"}},
     Row{"AddressThatChangesDuringARetestWakesTheDisk", [](World& w) {
             w.failTest(9091);
-            w.commands.answer("hdparm", {"active/idle\n", 0, false, [&w](auto&) { w.gateway.setExternalIp("44.128.0.77"); }});
+            w.commands.answer("hdparm", {"active/idle\n", 0, false, [&w](auto&) { w.gateway.externalIp = "44.128.0.77"; }});
         }, {"disk, test 9091 x3, status failed, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, "
             "publish 44.128.0.77 LAN 9091 9444, up = forwarded"}},
     Row{"DoubleNatAtARetestGoesToTheRelay", [](World& w) { w.relayWorks(); w.web.answer("/test?", kOtherNat); },
@@ -78,19 +78,19 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
         {"force 1, connecting, test 9091 x3, status failed, failed, connecting, map 9091, test 9091, unmap 9091, failed, "
             "no relay = 9444 failed", "connecting, map 9091, test 9091, unmap 9091, failed, no relay = 9444 failed"}},
     // An address change is worth waking the disk.
-    Row{"NewExternalAddressMakesTheMappingsAnew", [](World& w) { w.diskIsAsleep(); w.gateway.setExternalIp("44.128.0.77"); },
+    Row{"NewExternalAddressMakesTheMappingsAnew", [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
         {"unmap 9091 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, publish 44.128.0.77 LAN 9091 9444, "
          "connected, force 0 = forwarded", " = forwarded"}},
     Row{"NewLocalAddressMakesTheMappingsAnew",
-        [](World& w) { w.diskIsAsleep(); w.net.setInterfaces({{"eth0", "192.168.77.11"}}); },
+        [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
         {"unmap 9091 9444, connecting, map 9091>192.168.77.11:8080 Kavra, test 9091, map 9444>192.168.77.11:8443 KavraSSL, "
          "publish WAN 192.168.77.11 9091 9444, connected, force 0 = portforwarded"}},
     // A skipped test is no evidence against the ports.
     Row{"TestsThePortsWithoutTheirGateway",
-        [](World& w) { w.gateway.speakUpnp(false); w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },
+        [](World& w) { w.gateway.upnp = false; w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },
         {" = forwarded", "test :9091 = forwarded"}},
     Row{"ClosedPortsWithoutTheirGatewayAreForgotten",
-        [](World& w) { w.gateway.speakUpnp(false); w.web.answer("/test?", kNotReached); },
+        [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
         {"test :9091 x3, status failed, elapsed 0, no relay = 9091 9444 failed", "elapsed 130, no relay = 9091 9444 failed"}}),
     RowName{});
 // clang-format on
@@ -113,11 +113,11 @@ TEST_F(DirectConnection, SearchesUntilItsPortIsTestedAndWhileRelayedOncePerInter
 }
 
 TEST_F(DirectConnection, StatusOfTheFileIsKeptUntilTheNextSearch) {
-    for (int port = 9444; port <= 9543; ++port) gateway.refusePort(port);
+    for (int port = 9444; port <= 9543; ++port) gateway.refused.insert(port);
     manager().killConnection(PORTFORWARDED);
     ASSERT_EQ(cycle(), FAILED);  // the HTTP port was tested, HTTPS refused, the relay is down
-    EXPECT_TRUE(gateway.mappings().empty());
-    gateway.acceptPort(9445);
+    EXPECT_TRUE(gateway.table.empty());
+    gateway.refused.erase(9445);
     clock.set(support::VirtualClock::kStart + 240);  // the end of the interval
     forget();
     for (const std::string status : {"connecting", "portforwarded", "failed"}) {

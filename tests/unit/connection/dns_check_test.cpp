@@ -15,7 +15,7 @@ protected:
             {'W', kWanIp}, {'R', "44.128.0.1"}, {'O', "44.1.1.1"}};
         net.reset();
         for (std::size_t i = 0; i < 3; ++i) {
-            if (places[i] != '-') net.setName(names[i], {addresses[places[i]]});
+            if (places[i] != '-') net.names[names[i]] = {addresses[places[i]]};
         }
     }
     bool forcedCheck(ConnectionType type) {
@@ -37,14 +37,14 @@ TEST_F(DnsCheckTest, NamesMustAllLeadToTheExternalAddress) {
 
 TEST_F(DnsCheckTest, OnlyUsedNamesWithoutAnAddressAreLookedUpAgain) {
     namesLeadTo("W-W");
-    clock.duringPause(2, [this] { net.setName(kThreeLevel, {kWanIp}); });
+    clock.duringPause(2, [this] { net.names[kThreeLevel] = {kWanIp}; });
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
-    EXPECT_EQ(net.lookups(),
+    EXPECT_EQ(net.lookups,
               (Texts{kFourLevel, kThreeLevel, support::kSubdomain, kThreeLevel, kThreeLevel}));
     setConfig("SUBDOMAIN", "");
     namesLeadTo("WW-");
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
-    EXPECT_EQ(net.lookups(), (Texts{kFourLevel, kThreeLevel}));
+    EXPECT_EQ(net.lookups, (Texts{kFourLevel, kThreeLevel}));
 }
 
 TEST_F(DnsCheckTest, RelayedNamesMustLeadToTheRelay) {
@@ -62,13 +62,13 @@ TEST_F(DnsCheckTest, WithoutAGatewayTheAddressOfTheLastPortTestCounts) {
     std::string ip = "as it was";
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(FAILED, ip), 0);
     EXPECT_EQ(ip, "as it was");
-    gateway.speakUpnp(false);
+    gateway.upnp = false;
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 0);
     EXPECT_EQ(ip, "");
     EXPECT_EQ(log.countPart("most recent remote external IP in test port response is empty"), 1);
-    gateway.speakUpnp(true);
+    gateway.upnp = true;
     manager().createDirectConnection();
-    gateway.speakUpnp(false);
+    gateway.upnp = false;
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 1);
     EXPECT_EQ(ip, kWanIp);
 }
@@ -90,25 +90,25 @@ TEST_F(DnsCheckTest, RunsWhenItsIntervalHasPassedAndEveryCheckRestartsIt) {
 TEST_F(DnsCheckTest, ForcedCheckWaitsForAConnectionThatHasNames) {
     EXPECT_TRUE(forcedCheck(FAILED));
     EXPECT_TRUE(manager().checkDNS(CONNECTING));
-    EXPECT_TRUE(net.lookups().empty());
+    EXPECT_TRUE(net.lookups.empty());
     EXPECT_FALSE(manager().checkDNS(PORTFORWARDED));  // still forced
-    net.setHostname("other");
+    net.hostname = "other";
     EXPECT_TRUE(manager().checkDNS(PORTFORWARDED));  // no longer
 }
 
 TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
     std::string names[3];
     EXPECT_EQ(manager().buildDeviceDomainName(nullptr, "7", names[0], names[1], names[2]), 0);
-    net.setHostname("");
+    net.hostname = "";
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(log.countPart("cannot generate device domain names"), 1);
-    net.failHostname();
+    net.hostnameFails = true;
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(log.countPart("failed to retrieve NAS hostname, errno = "), 1);
     setConfig("DEVICEID", "");
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(log.countPart("failed to get DEVICEID from config file!\n"), 1);
-    EXPECT_TRUE(net.lookups().empty());
+    EXPECT_TRUE(net.lookups.empty());
 }
 
 TEST_F(DnsCheckTest, DomainBeginsAtTheFirstDotOfTheServer) {
@@ -119,7 +119,7 @@ TEST_F(DnsCheckTest, DomainBeginsAtTheFirstDotOfTheServer) {
         setConfig("SERVER_BASE_URL", server);
         net.reset();
         forcedCheck(PORTFORWARDED);
-        EXPECT_EQ(net.lookups().front(), "nas.devicedevice-7350142" + domain);
+        EXPECT_EQ(net.lookups.front(), "nas.devicedevice-7350142" + domain);
     }
 }
 

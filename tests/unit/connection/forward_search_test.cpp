@@ -19,7 +19,7 @@ protected:
 
 TEST_F(ForwardSearchTest, GatewayThatRefusesAllIsAskedABoundedNumberOfTimes) {
     givenGateway();
-    gateway.refuseAllPorts();
+    gateway.refuseAll = true;
     EXPECT_EQ(search(), "0");
     // 100 candidates in the first cycle; the last one is then known as bad.
     EXPECT_EQ(gateway.count(" -> "), 100 + 99 + 99);
@@ -40,11 +40,11 @@ TEST_F(ForwardSearchTest, TestsThreeCandidatesAndRemembersThemUntilItMayWakeTheD
 
 TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOther) {
     givenGateway();
-    gateway.refusePort(9091);
+    gateway.refused.insert(9091);
     EXPECT_EQ(story(search(true)), "map 9091, map 9091, map 9091 = 0");
     for (int round = 1; round < 34; ++round) search(true);   // each adds three bad ports
     EXPECT_EQ(log.countPart("Cleared bad port vector"), 0);  // the last one found 99
-    gateway.acceptPort(9091);
+    gateway.refused.erase(9091);
     web.answer("/test?", kNotReached);
     forget();
     EXPECT_EQ(story(search(true)),
@@ -55,10 +55,10 @@ TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOther) {
 
 // The second cycle finds the granted start port bad: the range begins, with an empty table.
 TEST_F(ForwardSearchTest, GrantedNatpmpPortIsTestedAndTakenBackByItsInternalPort) {
-    gateway.speakUpnp(false);
-    gateway.speakNatpmp(true);
+    gateway.upnp = false;
+    gateway.natpmp = true;
     givenGateway();
-    gateway.grant({40001, {}, 600});
+    gateway.granted = {40001, {}, 600};
     EXPECT_EQ(story(search()), "natpmp 9091>8080, disk, test 40001 = 40001 40001");
     failTest(40001);
     EXPECT_EQ(story(search()),

@@ -31,9 +31,9 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"RelayThatCannotBeStoppedFailsOnlyTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
         {"take over, by hand, stop, stop, stop, failed = portforwarded", " = portforwarded"}},
     Row{"TakingOverRemovesTheAutomaticMappingsAndOnlyThem",
-        [](World& w) { w.gateway.add({5000, kLanIp, 22, "ssh"}); w.cycle(); automaticCycle(w); },
+        [](World& w) { w.gateway.table.push_back({5000, kLanIp, 22, "ssh"}); w.cycle(); automaticCycle(w); },
         {"take over, unmap 9091 9444, by hand, connected, force 0 = 5000 portforwarded", " = 5000 portforwarded"}},
-    Row{"TakingOverWithoutAGatewayRemovesNothing", [](World& w) { w.gateway.speakUpnp(false); }, {"by hand, up = portforwarded"}},
+    Row{"TakingOverWithoutAGatewayRemovesNothing", [](World& w) { w.gateway.upnp = false; }, {"by hand, up = portforwarded"}},
     // The user's router may well sit behind another one: only the test counts.
     Row{"ClosedPortFailsAndIsReported", [](World& w) { w.web.answer("/test?", kOtherNat); },
         {"take over, connecting, test :18080 x3, status failed, failed, no relay, lanip = failed"}},

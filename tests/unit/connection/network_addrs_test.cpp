@@ -32,7 +32,7 @@ TEST_F(NetworkAddrsTest, TellsWhichAddressChangedUntilItIsClearedOrPublished) {
 }
 
 TEST_F(NetworkAddrsTest, WithoutAGatewayTheServerIsAskedOncePerInterval) {
-    gateway.speakUpnp(false);
+    gateway.upnp = false;
     addresses.SetIntervalDuration(600);
     addresses.setNetworkAddrs(kWanIp, kLanIp);
     clock.advance(600);

@@ -31,7 +31,7 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
     for (const auto& [status, wanted] : rows) {
         forget();
         setConfig("COMMUNICATION_STATUS", status);
-        gateway.add({9091, kLanIp, 80, "Kavra"});
+        gateway.table.push_back({9091, kLanIp, 80, "Kavra"});
         control.disableRemoteAccess();
         control.run();
         EXPECT_EQ(story(NONE), wanted);
@@ -67,14 +67,14 @@ TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
 // Raised between the last look at the flag and the wait.
 TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     givenEnabled(900);
-    gateway.add({9555, kLanIp, 80, "Kavra"});  // by an earlier run, as is the client
+    gateway.table.push_back({9555, kLanIp, 80, "Kavra"});  // by an earlier run, as is the client
     clientRuns();
     time_t before = 0;
     inEachPause([&](unsigned cycles, const std::string&) {
         if (cycles == 1) return;
         EXPECT_EQ(gateway.calls("unmap ").front(), "unmap TCP 9555") << "before the search";
         EXPECT_EQ(commands.count("kill"), 0) << "only its file is removed";
-        EXPECT_EQ(gateway.mappings().size(), 2U);
+        EXPECT_EQ(gateway.table.size(), 2U);
         forget();
         before = clock.now();
         writeFile("client.pid", "999999\n");  // of a relay client that has ended
@@ -98,14 +98,14 @@ TEST_F(DaemonControlTest, ASignalWhileTheCycleWorksIsNotSleptOver) {
     });
     control.run();
     EXPECT_LT(clock.elapsed(), 900);
-    EXPECT_TRUE(gateway.mappings().empty());
+    EXPECT_TRUE(gateway.table.empty());
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
 }
 
 // The capture fails the test when the handler's line comes within another one.
 TEST_F(DaemonControlTest, NoLineOfAWholeRunLetsASignalIn) {
     givenEnabled();
-    gateway.refuseAllPorts();
+    gateway.refuseAll = true;
     for (const int signal : {SIGINT, SIGQUIT}) {
         std::signal(signal, [](int) { logLine(LOG_INFO, "handler\n"); });
     }

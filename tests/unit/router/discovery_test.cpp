@@ -6,11 +6,11 @@ namespace {
 using DiscoveryTest = RouterTest;
 
 TEST_F(DiscoveryTest, UpnpIsPreferredAndChangesAreReportedUntilTheyAreRead) {
-    net.failInterfaces();
+    net.interfacesFail = true;
     discovered("NAT-PMP");
     EXPECT_TRUE(router.isNatPMPGateway());
-    net.failInterfaces(false);
-    gateway.speakUpnp(true);
+    net.interfacesFail = false;
+    gateway.upnp = true;
     EXPECT_TRUE(router.discover() && !router.isNatPMPGateway());
     EXPECT_EQ(gateway.calls(), (Texts{"discover 2000 ms",
                                       "igd http://192.168.77.1:5000/rootDesc.xml", "external ip"}));
@@ -21,12 +21,12 @@ TEST_F(DiscoveryTest, UpnpIsPreferredAndChangesAreReportedUntilTheyAreRead) {
     router.discover();
     EXPECT_FALSE(router.hasExternalIpChanged() || router.hasLocalIpChanged());
 
-    gateway.setExternalIp("44.128.0.99");
-    net.setInterfaces({{"eth0", "192.168.77.11"}});
+    gateway.externalIp = "44.128.0.99";
+    net.interfaces = {{"eth0", "192.168.77.11"}};
     router.discover();
-    gateway.speakUpnp(false);
-    gateway.speakNatpmp(false);
-    net.setInterfaces({});
+    gateway.upnp = false;
+    gateway.natpmp = false;
+    net.interfaces = {};
     EXPECT_FALSE(router.discover() || router.isInitialized());
     EXPECT_TRUE(router.hasExternalIpChanged() && router.hasLocalIpChanged());
     EXPECT_EQ(router.getExternalIp() + router.getLocalIp(), "44.128.0.99192.168.77.11");
@@ -37,7 +37,7 @@ TEST_F(DiscoveryTest, AGatewayIsUsedWhenItTellsItsAddress) {
     const auto row = [&](int state, int error, const std::string& ip, bool used, const char* line) {
         gateway.igdState = state;
         gateway.externalIpStatus = error;
-        gateway.setExternalIp(ip);
+        gateway.externalIp = ip;
         log.clear();
         Router asking;
         EXPECT_TRUE(asking.upnp_discover() == used && asking.isInitialized() == used) << line;
@@ -72,7 +72,7 @@ TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
 
 TEST_F(DiscoveryTest, TheLocalAddressIsChosenAmongTheLanInterfaces) {
     const auto chosen = [&](const std::vector<support::FakeNet::Interface>& interfaces) {
-        net.setInterfaces(interfaces);
+        net.interfaces = interfaces;
         router.initLocalIp();
         return router.getLocalIp();
     };

@@ -31,7 +31,7 @@ TEST_F(PortMappingTest, RefusalsAndMissingDiscoveryFail) {
     EXPECT_FALSE(router.unmapPort(80, -12345, "TCP"));
     EXPECT_EQ(gateway.calls(), (Texts{"unmap TCP -1234"}));  // as the library holds a port
     once("Router::unmapPort() - fail - failed to unmap external port: -12345\n");
-    gateway.refusePort(9091);
+    gateway.refused.insert(9091);
     EXPECT_FALSE(map(80, 9091));
 }
 
@@ -71,9 +71,9 @@ TEST_F(PortMappingTest, ALeaseIsRenewedAfterItsHalfUntilItIsUnmapped) {
     EXPECT_EQ(renewedAfter(300), Texts{});
     EXPECT_EQ(renewedAfter(1), (Texts{http, https}));
 
-    gateway.add({7000, "192.168.77.10", 22});
+    gateway.table.push_back({7000, "192.168.77.10", 22});
     EXPECT_TRUE(router.unmapPort(22, 7000, "TCP") && router.unmapPort(80, 9091, "TCP"));
-    EXPECT_EQ(gateway.mappings(), (Mappings{{9444, "192.168.77.10", 443}}));
+    EXPECT_EQ(gateway.table, (Mappings{{9444, "192.168.77.10", 443}}));
     EXPECT_EQ(renewedAfter(301), Texts{https});
     EXPECT_TRUE(router.unmapPort(443, 9444, "TCP"));
     EXPECT_EQ(renewedAfter(301), Texts{});
@@ -90,13 +90,13 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
                           {9003, "192.168.77.10", 80, "Kavra", "UDP"}};
     // The second entry moves into the place of the first and is met in the second pass.
     ASSERT_TRUE(map(80, 9100));
-    gateway.add({9101, "192.168.77.10", 81, "Kavra"});
-    for (const Mapping& mapping : others) gateway.add(mapping);
+    gateway.table.push_back({9101, "192.168.77.10", 81, "Kavra"});
+    for (const Mapping& mapping : others) gateway.table.push_back(mapping);
     gateway.clear();
     EXPECT_EQ(router.getMappedInternalPort(9101, "TCP"), 81);
     EXPECT_EQ(gateway.calls(), (Texts{"entry #0", "entry #1"}));
     EXPECT_FALSE(router.isPortMapped(9003, "TCP") || router.unmapAllPorts("TCP", "Kavra"));
-    EXPECT_EQ(gateway.mappings(), others);
+    EXPECT_EQ(gateway.table, others);
     EXPECT_EQ(renewedAfter(302401), (Texts{"map TCP 9100 -> 192.168.77.10:80 "}));
 }
 

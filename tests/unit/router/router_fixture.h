@@ -27,8 +27,8 @@ protected:
     }
 
     void discovered(const std::string& protocol = "UPnP") {
-        gateway.speakUpnp(protocol == "UPnP");
-        gateway.speakNatpmp(protocol == "NAT-PMP");
+        gateway.upnp = protocol == "UPnP";
+        gateway.natpmp = protocol == "NAT-PMP";
         ASSERT_TRUE(router.discover()) << log.dump();
         log.clear();
         gateway.clear();

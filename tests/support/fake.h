@@ -6,22 +6,40 @@
 
 #include <algorithm>
 #include <csignal>
+#include <functional>
+#include <iterator>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
 
 namespace pelorus::support {
 
-inline bool isBlocked(int signal) {
+using Texts = std::vector<std::string>;
+
+inline bool holds(const std::string& text, const std::string& part) {
+    return text.find(part) != std::string::npos;
+}
+
+inline std::set<int> blockedSignals() {
     sigset_t mask;
     pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    return sigismember(&mask, signal) == 1;
+    std::set<int> blocked;
+    for (int signal = 1; signal < SIGRTMIN; ++signal) {
+        if (sigismember(&mask, signal) == 1) blocked.insert(signal);
+    }
+    return blocked;
+}
+
+inline bool areBlocked(std::initializer_list<int> signals) {
+    const std::set<int> blocked = blockedSignals();
+    return std::all_of(signals.begin(), signals.end(),
+                       [&](int signal) { return blocked.count(signal) != 0; });
 }
 
 /// For a library that may hold a lock which the handler's log line needs.
 inline void expectTerminationHeld() {
-    EXPECT_TRUE(isBlocked(SIGINT) && isBlocked(SIGTERM) && isBlocked(SIGQUIT))
-        << "the handler could wait for a lock forever";
+    EXPECT_TRUE(areBlocked({SIGINT, SIGTERM, SIGQUIT})) << "the handler could wait forever";
 }
 
 /// One object for the calls that the linker leads to a fake. Never destroyed: the code under test
@@ -35,34 +53,54 @@ struct Single {
     void reset() { get() = Fake{}; }
 };
 
-/// Answers requests by a part of their text.
-template <class Answer>
-class Script {
+/// The calls that reached a fake, a line each.
+template <class Line = std::string>
+class Calls {
 public:
-    /// Answers every request that holds @p part. A later rule goes before an earlier one.
+    using Lines = std::vector<Line>;
+    [[nodiscard]] const Lines& calls() const { return asked; }
+    /// Those that hold @p part.
+    [[nodiscard]] Lines calls(const std::string& part) const {
+        Lines found;
+        std::copy_if(asked.begin(), asked.end(), std::back_inserter(found),
+                     [&](const auto& line) { return holds(line, part); });
+        return found;
+    }
+    [[nodiscard]] int count(const std::string& part) const {
+        return static_cast<int>(calls(part).size());
+    }
+    /// Forgets the calls, not the answers.
+    void clear() { asked.clear(); }
+    /// Runs @p action at each following call, before it is answered.
+    void onCall(std::function<void(const Line&)> action) { hook = std::move(action); }
+    void note(const Line& line) {
+        asked.push_back(line);
+        if (hook) hook(line);
+    }
+
+private:
+    Lines asked;
+    std::function<void(const Line&)> hook;
+};
+
+/// Answers calls by a part of their text.
+template <class Answer>
+class Script : public Calls<> {
+public:
+    /// Answers every call that holds @p part. A later rule goes before an earlier one.
     void answer(const std::string& part, Answer answer) {
         rules.emplace_back(part, std::move(answer));
     }
-    /// Answers the next request that holds @p part, before any standing rule; several for one
-    /// part in the order in which they were given.
+    /// Answers the next call that holds @p part, before any standing rule; several in order.
     void answerOnce(const std::string& part, Answer answer) {
         once.emplace_back(part, std::move(answer));
     }
-    /// How many requests hold @p part.
-    [[nodiscard]] int count(const std::string& part) const {
-        const auto holds = [&](const auto& line) { return line.find(part) != std::string::npos; };
-        return static_cast<int>(std::count_if(asked.begin(), asked.end(), holds));
-    }
-    /// Forgets the requests, not the answers.
-    void clear() { asked.clear(); }
 
 protected:
-    /// Records the request; @p otherwise is the answer when there is no rule.
+    /// Notes the call; @p otherwise is the answer when there is no rule.
     Answer take(const std::string& line, const Answer& otherwise) {
-        asked.push_back(line);
-        const auto fits = [&](const auto& rule) {
-            return line.find(rule.first) != std::string::npos;
-        };
+        this->note(line);
+        const auto fits = [&](const auto& rule) { return holds(line, rule.first); };
         if (const auto next = std::find_if(once.begin(), once.end(), fits); next != once.end()) {
             Answer found = next->second;
             once.erase(next);
@@ -72,11 +110,8 @@ protected:
         return rule == rules.rend() ? otherwise : rule->second;
     }
 
-    std::vector<std::string> asked;
-
 private:
-    std::vector<std::pair<std::string, Answer>> rules;
-    std::vector<std::pair<std::string, Answer>> once;
+    std::vector<std::pair<std::string, Answer>> rules, once;
 };
 
 }  // namespace pelorus::support

@@ -1,6 +1,5 @@
 #include "support/fake_commands.h"
 
-#include <gtest/gtest.h>
 #include <sys/wait.h>
 
 #include <cerrno>
@@ -8,14 +7,10 @@
 namespace pelorus::support {
 
 FakeCommands::Answer FakeCommands::run(const char* command) {
-    EXPECT_FALSE(isBlocked(SIGTERM) || isBlocked(SIGPIPE)) << "inherited by: " << command;
+    EXPECT_FALSE(areBlocked({SIGTERM}) || areBlocked({SIGPIPE})) << "inherited by: " << command;
     Answer answer = take(command, {});
     if (answer.action) answer.action(command);
     return answer;
-}
-
-void FakeCommands::checkClosed() const {
-    EXPECT_TRUE(openPipes.empty()) << "pipes left open: " << openPipes.size();
 }
 
 extern "C" {
@@ -23,11 +18,9 @@ int __real_system(const char* command);
 
 int __wrap_system(const char* command) {
     FakeCommands& fake = FakeCommands::get();
-    EXPECT_TRUE(isBlocked(SIGINT) && isBlocked(SIGQUIT)) << "would be lost during: " << command;
+    EXPECT_TRUE(areBlocked({SIGINT, SIGQUIT})) << "would be lost during: " << command;
     const FakeCommands::Answer answer = fake.run(command);
-    if (std::string{command}.find(fake.realPart) != std::string::npos) {
-        return __real_system(command);
-    }
+    if (holds(command, fake.realPart)) return __real_system(command);
     return answer.fails ? -1 : W_EXITCODE(answer.exitStatus, 0);
 }
 
@@ -39,14 +32,12 @@ std::FILE* __wrap_popen(const char* command, const char* mode) {
     std::FILE* pipe = std::tmpfile();
     std::fwrite(answer.output.data(), 1, answer.output.size(), pipe);
     std::rewind(pipe);
-    FakeCommands::get().openPipes.emplace(pipe, answer.exitStatus);
-    return pipe;
+    return *FakeCommands::get().openPipes.insert(pipe).first;
 }
 
 int __wrap_pclose(std::FILE* pipe) {
-    const auto open = FakeCommands::get().openPipes.extract(pipe);
-    std::fclose(pipe);
-    return W_EXITCODE(open.mapped(), 0);
+    EXPECT_EQ(FakeCommands::get().openPipes.erase(pipe), 1U) << "closed a pipe that is not open";
+    return std::fclose(pipe);
 }
 }
 

@@ -3,23 +3,20 @@
 #define PELORUS_SUPPORT_FAKE_COMMANDS_H
 
 #include <cstdio>
-#include <functional>
-#include <map>
 
 #include "support/fake.h"
 
 namespace pelorus::support {
 
 struct CommandAnswer {
-    std::string output{};  ///< what a popen reader reads
-    int exitStatus = 0;
+    std::string output{};                              ///< what a popen reader reads
+    int exitStatus = 0;                                ///< of system
     bool fails = false;                                ///< system returns -1, popen null
     std::function<void(const std::string&)> action{};  ///< runs as the command
 };
 
-/// What nobody answers succeeds without output. A command that starts while a termination signal
-/// or SIGPIPE is blocked fails the test: the child would inherit the mask. So does a pipe not
-/// opened close-on-exec.
+/// A command without a rule succeeds with no output. Fails the test when a command starts while a
+/// termination signal or SIGPIPE is blocked, or a pipe is not close-on-exec: a child inherits both.
 class FakeCommands : public Single<FakeCommands>, public Script<CommandAnswer> {
 public:
     using Answer = CommandAnswer;
@@ -27,15 +24,13 @@ public:
     void answer(const std::string& part, const std::string& output, int exitStatus = 0) {
         answer(part, Answer{output, exitStatus});
     }
-    /// Lets the real shell run the system calls that hold @p part.
-    void runForReal(const std::string& part) { realPart = part; }
-    [[nodiscard]] const std::vector<std::string>& lines() const { return asked; }
+    [[nodiscard]] const Texts& lines() const { return calls(); }
     /// Fails the test when a pipe was not closed with pclose.
-    void checkClosed() const;
+    void checkClosed() const { EXPECT_TRUE(openPipes.empty()); }
     Answer run(const char* command);
 
-    std::map<std::FILE*, int> openPipes;  ///< with the exit status
-    std::string realPart = "\n";          ///< in no command
+    std::string realPart = "\n";  ///< the real shell runs the system calls that hold it
+    std::set<std::FILE*> openPipes;
 };
 
 }  // namespace pelorus::support

@@ -1,7 +1,6 @@
 #include "support/fake_files.h"
 
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -14,6 +13,12 @@ using pelorus::support::FakeFiles;
 using pelorus::support::FakeProcess;
 
 namespace {
+
+const char* targetOf(const char* path) {
+    const auto& targets = FakeFiles::get().targets;
+    const auto found = targets.find(path);
+    return found == targets.end() ? path : found->second.c_str();
+}
 
 bool fails(const char* call) {
     errno = EPERM;
@@ -38,7 +43,7 @@ int __real_kill(pid_t pid, int signal);
 
 std::FILE* __wrap_fopen(const char* path, const char* mode) {
     checkCloseOnExec(std::strchr(mode, 'e') != nullptr, path);
-    return __real_fopen(FakeFiles::get().target(path), mode);
+    return __real_fopen(targetOf(path), mode);
 }
 
 int __wrap_open(const char* path, int flags, ...) {
@@ -47,7 +52,7 @@ int __wrap_open(const char* path, int flags, ...) {
     const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
     va_end(args);
     checkCloseOnExec((flags & O_CLOEXEC) != 0, path);
-    return __real_open(FakeFiles::get().target(path), flags, mode);
+    return __real_open(targetOf(path), flags, mode);
 }
 
 pid_t __wrap_fork() {

@@ -1,11 +1,9 @@
-// Files and process of a test: fopen, open, fork, setsid, chdir and kill pass through here. They
-// mostly do what they say. A file that is opened without close-on-exec fails the test: a child
-// process would inherit it.
+// Files and process of a test: fopen, open, fork, setsid, chdir and kill. Most go straight through
+// to libc. A file opened without close-on-exec fails the test: a child process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 
 #include <map>
-#include <set>
 
 #include "support/fake.h"
 
@@ -15,17 +13,10 @@ namespace pelorus::support {
 /// the machine has there.
 inline constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access";
 
-/// Paths that are the same on every machine lead to files of the test.
-class FakeFiles : public Single<FakeFiles> {
-public:
+struct FakeFiles : Single<FakeFiles> {
     /// Opens @p target in place of @p path; an empty target is a missing file.
     void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
-    const char* target(const char* path) {
-        const auto found = targets.find(path);
-        return found == targets.end() ? path : found->second.c_str();
-    }
 
-private:
     std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
 };
 

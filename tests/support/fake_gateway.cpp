@@ -2,72 +2,23 @@
 
 #include <arpa/inet.h>
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <miniupnpc/upnpcommands.h>
 #include <sys/select.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <csignal>
-#include <cstdint>
 #include <cstring>
-#include <iterator>
-#include <utility>
-
-#include "support/fake.h"
 
 namespace pelorus::support {
 
-// Never destroyed: a Router under test may close its client at the end of the process.
-FakeGateway& FakeGateway::get() {
-    static auto* const instance = new FakeGateway;
-    return *instance;
-}
-
-void FakeGateway::checkReleased() const {
-    EXPECT_TRUE(listed.empty() && urlSets == 0) << "a device list or URLs not released";
-}
-
-Texts FakeGateway::calls(const std::string& part) const {
-    Texts found;
-    std::copy_if(lines.begin(), lines.end(), std::back_inserter(found),
-                 [&](const auto& line) { return line.find(part) != std::string::npos; });
-    return found;
-}
-
-int FakeGateway::count(const std::string& part) const {
-    return static_cast<int>(calls(part).size());
-}
-
-void FakeGateway::note(const std::string& line) {
-    lines.push_back(line);
-    if (hook) hook(line);
-}
-
-bool operator==(const FakeGateway::Mapping& left, const FakeGateway::Mapping& right) {
-    return ::testing::PrintToString(left) == ::testing::PrintToString(right);
-}
-
-void PrintTo(const FakeGateway::Mapping& mapping, std::ostream* out) {
-    *out << mapping.protocol << " " << mapping.externalPort << " -> " << mapping.client << ":"
-         << mapping.internalPort << " " << mapping.description;
-}
-
-}  // namespace pelorus::support
-
-using pelorus::support::FakeGateway;
 using Mapping = FakeGateway::Mapping;
-using pelorus::support::expectTerminationHeld;
-using pelorus::support::isBlocked;
-using pelorus::support::kDeviceAddress;
 
 namespace {
 
 constexpr const char* kControlUrl = "http://192.168.77.1:5000/ctl/IPConn";
 constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnection:1";
 
-// Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins, since
-// clients may outlive the test that made them.
+// Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins,
+// since clients may outlive the test that made them.
 const int clientSocket = open("/dev/null", O_RDONLY);
 int clientsMade = 0;
 int openClients = 0;
@@ -102,13 +53,11 @@ bool hasArrived() {
 
 void checkBrokenPipeBlocked() {
     expectTerminationHeld();
-    EXPECT_TRUE(isBlocked(SIGPIPE)) << "a closed connection would end the process";
+    EXPECT_TRUE(areBlocked({SIGPIPE})) << "a closed connection would end the process";
 }
 
-// As the library does it: not terminated when the text fills the buffer.
 void fill(char* buffer, std::size_t size, const std::string& text) {
-    std::memset(buffer, 0, size);
-    std::copy_n(text.data(), std::min(size, text.size()), buffer);
+    std::strncpy(buffer, text.c_str(), size);
 }
 
 // Notes a question to the control URL; true when it arrives.
@@ -134,7 +83,7 @@ std::string protocolName(int protocol) {
 natpmpresp_t map(int type, int privatePort, int publicPort, unsigned lifetime) {
     natpmpresp_t answer{};
     answer.type = static_cast<std::uint16_t>(type);
-    if (lifetime == 0 ? gateway.keepMappings : refuses(publicPort)) {
+    if (lifetime != 0 && refuses(publicPort)) {
         answer.resultcode = 2;  // not authorized
         return answer;
     }
@@ -178,16 +127,23 @@ int ask(natpmp_t* client, const std::string& call, const std::function<natpmpres
     return 0;
 }
 
+// NOLINTBEGIN(bugprone-reserved-identifier, readability-function-size): names the linker gives
+// Long argument lists, which changed with the versions of miniupnpc.
+// clang-format off
+int hand(const FakeGateway::Reply& reply, char* client, char* internalPort, char* description,
+         char* enabled, char* lease) {
+    fill(client, 16, reply.client);
+    fill(internalPort, 6, reply.internalPort);
+    fill(description, 80, reply.description);
+    fill(enabled, 4, reply.enabled);
+    fill(lease, 16, reply.lease);
+    return reply.status;
+}
+
 }  // namespace
 
-// NOLINTBEGIN(bugprone-reserved-identifier, readability-function-size): names the linker gives
-// clang-format off: long argument lists, which changed with the versions of miniupnpc
 extern "C" {
-UPNPDev* __wrap_upnpDiscover(int delay,
-                             const char*,
-                             const char*,
-                             int,
-                             int,
+UPNPDev* __wrap_upnpDiscover(int delay, const char*, const char*, int, int,
 #if MINIUPNPC_API_VERSION >= 14
                              unsigned char,
 #endif
@@ -210,15 +166,10 @@ void __wrap_freeUPNPDevlist(UPNPDev* list) {
     gateway.listed.clear();
 }
 
-int __wrap_UPNP_GetValidIGD(UPNPDev* list,
-                            UPNPUrls* urls,
-                            IGDdatas* data,
-                            char* lanAddress,
-                            int size
+int __wrap_UPNP_GetValidIGD(UPNPDev* list, UPNPUrls* urls, IGDdatas* data,
+                            char* lanAddress, int size
 #if MINIUPNPC_API_VERSION >= 18
-                            ,
-                            char*,
-                            int
+                            , char*, int
 #endif
 ) {
     checkBrokenPipeBlocked();
@@ -248,89 +199,56 @@ int __wrap_UPNP_GetExternalIPAddress(const char* url, const char* service, char*
     return gateway.externalIpStatus;
 }
 
-int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url,
-                                            const char* service,
-                                            const char* port,
-                                            const char* proto,
+int __wrap_UPNP_GetSpecificPortMappingEntry(const char* url, const char* service, const char* port,
+                                            const char* protocol,
 #if MINIUPNPC_API_VERSION >= 10
                                             const char* /*remoteHost*/,
 #endif
-                                            char* client,
-                                            char* internalPort,
-                                            char* description,
-                                            char* enabled,
-                                            char* lease) {
-    const std::string line = std::string("entry ") + proto + " " + port;
+                                            char* client, char* internalPort, char* description,
+                                            char* enabled, char* lease) {
+    const std::string line = std::string("entry ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
-    const auto reply = replyFor(find(std::stoi(port), proto), 714);
-    if (!reply.client.empty()) fill(client, 16, reply.client);
-    if (!reply.internalPort.empty()) fill(internalPort, 6, reply.internalPort);
-    if (reply.status != 0) return reply.status;
-    fill(description, 80, reply.description);
-    fill(enabled, 4, reply.enabled);
-    fill(lease, 16, reply.lease);
-    return 0;
+    const auto reply = replyFor(find(std::stoi(port), protocol), 714);
+    return hand(reply, client, internalPort, description, enabled, lease);
 }
 
-int __wrap_UPNP_AddPortMapping(const char* url,
-                               const char* service,
-                               const char* port,
-                               const char* internalPort,
-                               const char* client,
-                               const char* description,
-                               const char* proto,
-                               const char* remoteHost,
-                               const char* lease) {
+int __wrap_UPNP_AddPortMapping(const char* url, const char* service, const char* port,
+                               const char* internalPort, const char* client,
+                               const char* description, const char* protocol,
+                               const char* remoteHost, const char* lease) {
     EXPECT_TRUE(remoteHost == nullptr && lease == nullptr);
-    const std::string line = std::string("map ") + proto + " " + port + " -> " + client + ":" +
+    const std::string line = std::string("map ") + protocol + " " + port + " -> " + client + ":" +
                              internalPort + " " + description;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
     if (refuses(std::stoi(port))) return 718;  // conflict
-    const auto held = find(std::stoi(port), proto);
+    const auto held = find(std::stoi(port), protocol);
     const auto place = held == gateway.table.end() ? gateway.table.emplace(held) : held;
-    *place = {std::stoi(port), client, std::stoi(internalPort), description, proto};
+    *place = {std::stoi(port), client, std::stoi(internalPort), description, protocol};
     return 0;
 }
 
-int __wrap_UPNP_DeletePortMapping(const char* url,
-                                  const char* service,
-                                  const char* port,
-                                  const char* proto,
-                                  const char* remoteHost) {
+int __wrap_UPNP_DeletePortMapping(const char* url, const char* service, const char* port,
+                                  const char* protocol, const char* remoteHost) {
     EXPECT_EQ(remoteHost, nullptr);
-    const std::string line = std::string("unmap ") + proto + " " + port;
+    const std::string line = std::string("unmap ") + protocol + " " + port;
     if (!arrives(url, service, line)) return UPNPCOMMAND_HTTP_ERROR;
-    if (gateway.keepMappings) return 501;  // action failed
-    const auto held = find(std::stoi(port), proto);
+    const auto held = find(std::stoi(port), protocol);
     if (held == gateway.table.end()) return 714;  // no such entry
     gateway.table.erase(held);
     return 0;
 }
 
-int __wrap_UPNP_GetGenericPortMappingEntry(const char* url,
-                                           const char* service,
-                                           const char* index,
-                                           char* port,
-                                           char* client,
-                                           char* internalPort,
-                                           char* proto,
-                                           char* description,
-                                           char* enabled,
-                                           char* remoteHost,
-                                           char* lease) {
+int __wrap_UPNP_GetGenericPortMappingEntry(const char* url, const char* service, const char* index,
+                                           char* port, char* client, char* internalPort,
+                                           char* protocol, char* description, char* enabled,
+                                           char* remoteHost, char* lease) {
     if (!arrives(url, service, std::string("entry #") + index)) return UPNPCOMMAND_HTTP_ERROR;
     const auto at = std::min(std::stol(index), static_cast<long>(gateway.table.size()));
     const auto reply = replyFor(gateway.table.begin() + at, 713);
-    if (reply.status != 0) return reply.status;
     fill(port, 6, reply.externalPort);
-    fill(client, 16, reply.client);
-    fill(internalPort, 6, reply.internalPort);
-    fill(proto, 4, reply.protocol);
-    fill(description, 80, reply.description);
-    fill(enabled, 4, reply.enabled);
+    fill(protocol, 4, reply.protocol);
     fill(remoteHost, 64, "");
-    fill(lease, 16, reply.lease);
-    return 0;
+    return hand(reply, client, internalPort, description, enabled, lease);
 }
 
 int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
@@ -414,3 +332,5 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
 }
 // clang-format on
 // NOLINTEND(bugprone-reserved-identifier, readability-function-size)
+
+}  // namespace pelorus::support

@@ -1,9 +1,6 @@
 // The home gateway of a test. The UPnP calls of miniupnpc, libnatpmp and select end here, in one
-// mapping table; nothing is sent.
-//
-// At first the gateway speaks UPnP but not NAT-PMP, is connected and has an empty table. UPnP takes
-// no time; NAT-PMP keeps a time of its own, which only the waits for answers move. Every call
-// leaves one line, in order:
+// mapping table; nothing is sent. At first it speaks UPnP only, is connected and has no mapping.
+// Only waits for NAT-PMP answers take time. Each call leaves one line, in order:
 //
 //   discover 2000 ms                           natpmp open
 //   igd http://192.168.77.1:5000/rootDesc.xml  natpmp address
@@ -13,32 +10,28 @@
 //   map TCP 9091 -> 192.168.77.10:80 Kavra     natpmp close
 //   unmap TCP 9091
 //
-// Fails the test by itself: a UPnP call while SIGPIPE could end the process, a NAT-PMP request on a
-// socket that a child process would inherit, a remote host or a lease with a UPnP mapping, a
-// release of what was not handed out.
+// Fails the test on a UPnP call while SIGPIPE could end the process, a NAT-PMP request on a socket
+// that a child process would inherit, a remote host or a lease with a UPnP mapping, and a release
+// of what was not handed out.
 #ifndef PELORUS_SUPPORT_FAKE_GATEWAY_H
 #define PELORUS_SUPPORT_FAKE_GATEWAY_H
 
+#include <gtest/gtest.h>
 #include <miniupnpc/miniupnpc.h>
 #include <natpmp.h>
 
-#include <functional>
 #include <map>
 #include <optional>
 #include <ostream>
-#include <set>
-#include <string>
-#include <utility>
-#include <vector>
+
+#include "support/fake.h"
 
 namespace pelorus::support {
 
-using Texts = std::vector<std::string>;
-
-/// The device as the gateway sees it; also the first address FakeNet gives it.
+/// The device as the gateway sees it.
 inline constexpr const char* kDeviceAddress = "192.168.77.10";
 
-class FakeGateway {
+class FakeGateway : public Single<FakeGateway>, public Calls<> {
 public:
     struct Mapping {
         int externalPort = 0;
@@ -46,36 +39,33 @@ public:
         int internalPort = 0;
         std::string description{};
         std::string protocol = "TCP";
+        friend void PrintTo(const Mapping& mapping, std::ostream* out) {
+            *out << mapping.protocol << " " << mapping.externalPort << " -> " << mapping.client
+                 << ":" << mapping.internalPort << " " << mapping.description;
+        }
+        friend bool operator==(const Mapping& left, const Mapping& right) {
+            return ::testing::PrintToString(left) == ::testing::PrintToString(right);
+        }
     };
-    /// A mapping as the gateway reports it, true or not. Each text is cut to what the library
-    /// documents for it, without a terminator when it fills that.
+    /// A mapping as the gateway reports it, true or not. As in the library, a text is cut to the
+    /// size of its buffer and has no terminator when it fills that.
     struct Reply {
         int status = 0;
-        std::string client{};
-        std::string internalPort{};
-        std::string description{};
-        std::string externalPort{};
-        std::string protocol{};
-        std::string enabled = "1";
-        std::string lease = "0";
+        std::string client{}, internalPort{}, description{}, externalPort{}, protocol{};
+        std::string enabled = "1", lease = "0";
     };
     /// What a NAT-PMP gateway grants in place of what was asked.
     struct Grant {
-        std::optional<int> publicPort{};
-        std::optional<int> privatePort{};
+        std::optional<int> publicPort{}, privatePort{};
         std::optional<unsigned> lifetime{};
     };
 
-    static FakeGateway& get();
-    void reset() { *this = FakeGateway{}; }
     /// Fails the test when a device list or URLs were not released.
-    void checkReleased() const;
+    void checkReleased() const { EXPECT_TRUE(listed.empty() && urlSets == 0); }
 
-    void speakUpnp(bool on) { upnp = on; }
-    /// Off: requests are refused at once, as where nothing listens.
-    void speakNatpmp(bool on) { natpmp = on; }
-    /// The address in both protocols.
-    void setExternalIp(const std::string& address) { externalIp = address; }
+    bool upnp = true;
+    bool natpmp = false;                     ///< off: refused at once, as where nothing listens
+    std::string externalIp = "44.128.0.20";  ///< in both protocols
     int externalIpStatus = 0;
     /// URL and search target of the UPnP devices.
     std::vector<std::pair<std::string, std::string>> devices{
@@ -88,39 +78,18 @@ public:
     long answerDelay = 0;  ///< requests are answered so much later
     long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
-    void grant(const Grant& what) { granted = what; }
-    /// Library calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout", "read".
+    /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",
+    /// "read".
     std::set<std::string> failing;
 
-    void add(const Mapping& mapping) { table.push_back(mapping); }
-    [[nodiscard]] const std::vector<Mapping>& mappings() const { return table; }
-    void refusePort(int port) { refused.insert(port); }
-    void acceptPort(int port) { refused.erase(port); }
-    void refuseAllPorts(bool on = true) { refuseAll = on; }
-    /// Fails removals and keeps the mapping.
-    bool keepMappings = false;
+    Grant granted;
+    std::vector<Mapping> table;
+    std::set<int> refused;  ///< external ports
+    bool refuseAll = false;
     /// The UPnP answer for every port and index, whatever the table says.
     std::optional<Reply> lie;
 
-    [[nodiscard]] const Texts& calls() const { return lines; }
-    [[nodiscard]] Texts calls(const std::string& part) const;
-    [[nodiscard]] int count(const std::string& part) const;
-    /// Forgets the calls, not the table and the state.
-    void clear() { lines.clear(); }
-    /// Runs @p action at each following call, before it is answered; gets its line.
-    void onCall(std::function<void(const std::string&)> action) { hook = std::move(action); }
-
     // For the library calls.
-    void note(const std::string& line);
-    bool upnp = true;
-    bool natpmp = false;
-    std::string externalIp = "44.128.0.20";
-    std::vector<Mapping> table;
-    std::set<int> refused;
-    bool refuseAll = false;
-    Grant granted;
-    Texts lines;
-    std::function<void(const std::string&)> hook;
     std::vector<UPNPDev> listed;  // handed out and not released
     int urlSets = 0;
     std::optional<natpmpresp_t> pending;  // the answer to the last request
@@ -132,13 +101,7 @@ public:
     };
     int asking = 0;                        // the client that sent the last request
     std::multimap<long, Answer> onTheWay;  // by arrival
-
-private:
-    FakeGateway() = default;
 };
-
-bool operator==(const FakeGateway::Mapping& left, const FakeGateway::Mapping& right);
-void PrintTo(const FakeGateway::Mapping& mapping, std::ostream* out);
 
 }  // namespace pelorus::support
 

@@ -1,18 +1,12 @@
 #include "support/fake_web.h"
 
-#include <gtest/gtest.h>
 #include <miniupnpc/miniupnpc.h>
 #include <miniupnpc/miniwget.h>
 
-#include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 
 namespace pelorus::support {
-
-void FakeWeb::checkBalance() const {
-    EXPECT_FALSE(isOpen) << "easy handle not cleaned up";
-}
 
 FakeWeb::Answer FakeWeb::ask(const std::string& url) {
     Answer answer = take(url, noAnswer());
@@ -92,13 +86,17 @@ CURLcode __wrap_curl_easy_perform(CURL* handle) {
     return answer.result;
 }
 
+const char* __wrap_curl_easy_strerror(CURLcode code) {
+    return code == CURLE_OPERATION_TIMEDOUT ? "Timeout was reached" : "Another error";
+}
+
 #if MINIUPNPC_API_VERSION >= 16
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/, int* /*statusCode*/) {
 #else
 void* __wrap_miniwget(const char* url, int* size, unsigned /*scopeId*/) {
 #endif
     expectTerminationHeld();
-    EXPECT_TRUE(isBlocked(SIGPIPE)) << "a closed connection would end the process";
+    EXPECT_TRUE(areBlocked({SIGPIPE})) << "a closed connection would end the process";
     *size = 0;
     if (*url == '\0') return nullptr;
     const FakeWeb::Answer answer = FakeWeb::get().ask(url);

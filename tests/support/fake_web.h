@@ -1,14 +1,10 @@
-// The web of a test: libcurl's easy interface (the central server) and miniwget (the local web
-// back end) end here and nothing is sent.
-//
-// Standing checks: no transfer before curl_global_init, calls for the open easy handle only, no
-// miniwget while SIGPIPE could end the process.
+// The web of a test: libcurl's easy interface (the central server) and miniwget (the local web back
+// end) end here and nothing is sent. Fails the test on a transfer before curl_global_init, a call
+// with a handle other than the open one, and miniwget while SIGPIPE could end the process.
 #ifndef PELORUS_SUPPORT_FAKE_WEB_H
 #define PELORUS_SUPPORT_FAKE_WEB_H
 
 #include <curl/curl.h>
-
-#include <functional>
 
 #include "support/fake.h"
 
@@ -19,13 +15,12 @@ struct WebAnswer {
     WebAnswer(std::string text, CURLcode code = CURLE_OK)  // NOLINT(google-explicit-constructor)
         : body{std::move(text)}, result{code} {}
 
-    std::string body;  ///< delivered in pieces of 1000 bytes
-    /// What curl_easy_perform returns after the body; any error is no answer of miniwget.
-    CURLcode result = CURLE_OK;
+    std::string body;                ///< delivered in pieces of 1000 bytes
+    CURLcode result = CURLE_OK;      ///< returned after the body; miniwget: null on any error
     std::function<void()> action{};  ///< runs before the body is delivered; may throw
 };
 
-/// What nobody answers cannot be reached.
+/// A URL without a rule cannot be reached.
 class FakeWeb : public Single<FakeWeb>, public Script<WebAnswer> {
 public:
     using Answer = WebAnswer;
@@ -34,13 +29,12 @@ public:
 
     /// A server that cannot be reached.
     static Answer noAnswer() { return {"", CURLE_COULDNT_CONNECT}; }
-
     /// All URLs asked for, central and local, in order, but for empty ones.
-    [[nodiscard]] const std::vector<std::string>& urls() const { return asked; }
+    [[nodiscard]] const Texts& urls() const { return calls(); }
     /// The options of the last transfer in the order in which they were set.
     [[nodiscard]] const Options& options() const { return transfer.options; }
     /// Fails the test when the easy handle was not cleaned up.
-    void checkBalance() const;
+    void checkBalance() const { EXPECT_FALSE(isOpen); }
 
     bool handlesFail = false;
     bool globalInitFails = false;

@@ -3,8 +3,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
-#include <sstream>
 #include <stdexcept>
 
 #include "config/global_config.h"
@@ -28,24 +26,14 @@ std::ptrdiff_t openDescriptors() {
 }  // namespace
 
 PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescriptors()} {
-    pthread_sigmask(SIG_SETMASK, nullptr, &maskAtStart);
-}
-
-PelorusTest::~PelorusTest() {
-    std::error_code ignored;
-    fs::remove_all(folder, ignored);
 }
 
 void PelorusTest::TearDown() {
     commands.checkClosed();
     net.checkReleased();
     EXPECT_EQ(openDescriptors(), descriptorsAtStart) << "descriptors now and at the start";
-    sigset_t mask;
-    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
-    for (int signal = 1; signal < SIGRTMIN; ++signal) {
-        EXPECT_EQ(sigismember(&mask, signal), sigismember(&maskAtStart, signal))
-            << "mask of signal " << signal << " now and at the start";
-    }
+    EXPECT_EQ(blockedSignals(), blockedAtStart) << "blocked signals now and at the start";
+    fs::remove_all(folder);
 }
 
 std::string PelorusTest::writeFile(const std::string& name, const std::string& content) const {
@@ -54,9 +42,8 @@ std::string PelorusTest::writeFile(const std::string& name, const std::string& c
 }
 
 std::string PelorusTest::readFile(const std::string& file) {
-    std::ostringstream content;
-    content << std::ifstream{file, std::ios::binary}.rdbuf();
-    return content.str();
+    std::ifstream content{file, std::ios::binary};
+    return {std::istreambuf_iterator<char>{content}, {}};
 }
 
 // Registers the secrets among them.
@@ -71,14 +58,10 @@ std::string PelorusTest::asLines(const Settings& settings) {
 
 void PelorusTest::givenConfig(const Settings& settings, const Settings& dynamicSettings) {
     Settings fixed = settings;
-    fixed.emplace("DYNAMIC_CONFIG", folder);
-    fixed.emplace("DYNAMIC_CONFIG_TMP", "empty");
+    fixed.insert({{"DYNAMIC_CONFIG", folder}, {"DYNAMIC_CONFIG_TMP", "empty"}});
     Settings changing = dynamicSettings;
-    const Settings identity{
-        {"DEVICEID", kDeviceId}, {"DEVICEAUTH", kDeviceAuth}, {"SUBDOMAIN", kSubdomain}};
-    for (const auto& [key, value] : identity) {
-        if (fixed.count(key) == 0) changing.emplace(key, value);
-    }
+    changing.insert(
+        {{"DEVICEID", kDeviceId}, {"DEVICEAUTH", kDeviceAuth}, {"SUBDOMAIN", kSubdomain}});
     writeFile("dynamicconfig.ini", asLines(changing));
     ASSERT_TRUE(GlobalConfig::getInstance()->loadConfig(writeFile("static.ini", asLines(fixed))))
         << log.dump();

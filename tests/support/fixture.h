@@ -1,18 +1,9 @@
-// The base of every test fixture. The seams of libc are always in place: no test reaches the
-// shell, the network, the system log or the real clock. Other seams (fake_*.h) are linked into a
-// binary when one of its tests uses them.
-//
-// Every test fails without being asked when a configured secret is in a log line, and when pipes,
-// address lists, descriptors or the signal mask are not as they were. The fakes tell further
-// standing checks in their headers.
+// The base of every test fixture. The fakes are always in place: no test reaches the shell, the
+// network, the system log or the real clock. Every test fails when a configured secret is in a log
+// line, and when pipes, address lists, descriptors or the signal mask are not as they were. The
+// headers of the fakes name their own checks.
 #ifndef PELORUS_SUPPORT_FIXTURE_H
 #define PELORUS_SUPPORT_FIXTURE_H
-
-#include <gtest/gtest.h>
-
-#include <csignal>
-#include <map>
-#include <string>
 
 #include "support/fake_commands.h"
 #include "support/fake_net.h"
@@ -31,10 +22,6 @@ protected:
     using Settings = std::map<std::string, std::string>;
 
     PelorusTest();
-    ~PelorusTest() override;
-    PelorusTest(const PelorusTest&) = delete;
-    PelorusTest& operator=(const PelorusTest&) = delete;
-
     /// The standing checks. Call it last from a TearDown of your own.
     void TearDown() override;
 
@@ -44,7 +31,7 @@ protected:
     [[nodiscard]] static std::string readFile(const std::string& file);
 
     /// Writes static.ini and dynamicconfig.ini, loads both and clears the log. The device has
-    /// the identity above unless the settings say otherwise; a value may be empty. The dynamic
+    /// the identity above unless the dynamic settings say otherwise. The dynamic
     /// file is read directly, without a temporary copy.
     void givenConfig(const Settings& settings = {}, const Settings& dynamicSettings = {});
     /// Changes one value in memory, and the secrets with it.
@@ -59,8 +46,8 @@ protected:
 private:
     std::string asLines(const Settings& settings);
 
-    sigset_t maskAtStart{};
-    std::ptrdiff_t descriptorsAtStart;
+    const std::set<int> blockedAtStart = blockedSignals();
+    const std::ptrdiff_t descriptorsAtStart;
 };
 
 /// Names a case of a table by the name of its row.

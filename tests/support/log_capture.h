@@ -2,10 +2,8 @@
 #ifndef PELORUS_SUPPORT_LOG_CAPTURE_H
 #define PELORUS_SUPPORT_LOG_CAPTURE_H
 
-#include <gtest/gtest.h>
 #include <syslog.h>
 
-#include <functional>
 #include <ostream>
 
 #include "support/fake.h"
@@ -24,37 +22,35 @@ struct LogLine {
     }
 };
 
+inline bool holds(const LogLine& line, const std::string& part) {
+    return holds(line.text, part);
+}
+
 /// A line that holds a secret fails the test. So does one that is sent while another is being
-/// sent: with the real log it would wait for a lock for ever.
-class LogCapture : public Single<LogCapture> {
+/// sent: with the real log it would wait for a lock forever.
+class LogCapture : public Single<LogCapture>, public Calls<LogLine> {
 public:
-    /// Since the last clear().
-    [[nodiscard]] const std::vector<LogLine>& lines() const { return captured; }
-    [[nodiscard]] std::vector<std::string> texts() const;
+    [[nodiscard]] const Lines& lines() const { return calls(); }
+    [[nodiscard]] Texts texts() const;
     /// How often exactly this line came, and how many lines hold @p part.
     [[nodiscard]] int count(int priority, const std::string& text) const;
-    [[nodiscard]] int countPart(const std::string& part) const;
+    [[nodiscard]] int countPart(const std::string& part) const { return Calls::count(part); }
     /// All lines, for failure messages.
     [[nodiscard]] std::string dump() const;
-    void clear() { captured.clear(); }
     /// Runs @p action inside every following syslog call, as a signal would.
-    void onLine(std::function<void(const LogLine&)> action) { hook = std::move(action); }
+    void onLine(std::function<void(const LogLine&)> action) { onCall(std::move(action)); }
     void addSecret(const std::string& secret) { secrets.push_back(secret); }
     void take(const LogLine& line);
 
-    std::vector<std::string> setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
+    Texts setup;  ///< "level MASK" and "openlog IDENT OPTION FACILITY"
 
 private:
-    std::vector<LogLine> captured;
-    std::vector<std::string> secrets;
-    std::function<void(const LogLine&)> hook;
-    int depth = 0;
+    Texts secrets;
+    bool taking = false;
 };
 
 /// Fails unless exactly this line came (text with its final newline).
 void expectLogged(int priority, const std::string& text);
-/// Fails unless these lines came in this order, others possibly between them.
-void expectLoggedInOrder(const std::vector<std::string>& texts);
 /// Fails unless the lines are exactly these.
 inline void expectLogIs(const std::vector<LogLine>& lines) {
     EXPECT_EQ(LogCapture::get().lines(), lines);

@@ -1,32 +1,18 @@
 #include "support/virtual_clock.h"
 
-#include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/time.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 
 namespace pelorus::support {
 
-namespace {
-
-// Delivers a pending signal that the mask lets through; false when there is none.
-bool deliverPending(const sigset_t* mask) {
-    sigset_t pending;
-    sigpending(&pending);
-    for (int signal = 1; mask != nullptr && signal < NSIG; ++signal) {
-        if (sigismember(&pending, signal) != 1 || sigismember(mask, signal) == 1) continue;
-        sigset_t own;
-        pthread_sigmask(SIG_SETMASK, mask, &own);
-        pthread_sigmask(SIG_SETMASK, &own, nullptr);
-        return true;
-    }
-    return false;
+extern "C" {
+unsigned __real_sleep(unsigned seconds);
+int __real_ppoll(pollfd* fds, nfds_t count, const timespec* timeout, const sigset_t* mask);
 }
-
-}  // namespace
 
 void VirtualClock::duringPause(int number, Action action) {
     actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
@@ -36,18 +22,17 @@ bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
     constexpr std::size_t kMostPauses = 100'000;
     asked.push_back(static_cast<long>(waitMicros / kMicrosPerSecond));
     if (asked.size() > kMostPauses) {
-        std::fputs("virtual clock: the code under test pauses for ever\n", stderr);
+        std::fputs("virtual clock: the code under test pauses forever\n", stderr);
         std::abort();
     }
     if (const auto found = actions.find(asked.size()); found != actions.end()) found->second();
-    if (deliverPending(mask)) return true;
+    const timespec moment{0, 1};  // delivers a pending signal that the mask lets in
+    if (mask != nullptr && __real_ppoll(nullptr, 0, &moment, mask) != 0) return true;
     micros += waitMicros;
     return false;
 }
 
 extern "C" {
-unsigned __real_sleep(unsigned seconds);
-
 time_t __wrap_time(time_t* result) {
     const time_t now = VirtualClock::get().now();
     if (result != nullptr) *result = now;
@@ -55,23 +40,22 @@ time_t __wrap_time(time_t* result) {
 }
 
 int __wrap_gettimeofday(timeval* result, void* /*zone*/) {
-    *result = VirtualClock::get().timeOfDay();
+    const VirtualClock& clock = VirtualClock::get();
+    *result = {clock.now(), static_cast<suseconds_t>(clock.micros % kMicrosPerSecond)};
     return 0;
 }
 
 unsigned __wrap_sleep(unsigned seconds) {
     // A thread of the test tool itself; the daemon has one thread.
     if (gettid() != getpid()) return __real_sleep(seconds);
-    VirtualClock::get().wait(std::int64_t{seconds} * 1'000'000, nullptr);
+    VirtualClock::get().wait(seconds * kMicrosPerSecond, nullptr);
     return 0;
 }
 
 int __wrap_ppoll(pollfd* /*fds*/, nfds_t count, const timespec* timeout, const sigset_t* mask) {
     EXPECT_EQ(count, 0U) << "only a pause without descriptors is known here";
-    const std::int64_t micros = std::int64_t{timeout->tv_sec} * 1'000'000 + timeout->tv_nsec / 1000;
-    if (!VirtualClock::get().wait(micros, mask)) return 0;
-    errno = EINTR;
-    return -1;
+    const std::int64_t micros = timeout->tv_sec * kMicrosPerSecond + timeout->tv_nsec / 1000;
+    return VirtualClock::get().wait(micros, mask) ? -1 : 0;
 }
 }
 

@@ -1,19 +1,17 @@
-// Time of a test: time, gettimeofday, sleep and ppoll end here. It moves by pauses and by
-// advance() only, so that instants are exact.
+// Time of a test: time, gettimeofday, sleep and ppoll end here. Only pauses and advance() move it,
+// so that instants are exact.
 #ifndef PELORUS_SUPPORT_VIRTUAL_CLOCK_H
 #define PELORUS_SUPPORT_VIRTUAL_CLOCK_H
 
-#include <sys/time.h>
-
-#include <csignal>
 #include <cstdint>
 #include <ctime>
-#include <functional>
 #include <map>
 
 #include "support/fake.h"
 
 namespace pelorus::support {
+
+constexpr std::int64_t kMicrosPerSecond = 1'000'000;
 
 class VirtualClock : public Single<VirtualClock> {
 public:
@@ -29,20 +27,16 @@ public:
     /// The length of every sleep and timed ppoll so far, as asked for, in whole seconds.
     [[nodiscard]] const std::vector<long>& pauses() const { return asked; }
 
-    /// Runs @p action as the @p number th pause from now begins. A signal raised there ends the
-    /// pause if it was blocked and the mask of the pause lets it in; one that was not blocked
-    /// came too early and is missed by the pause, as in the real world.
+    /// Runs @p action as the @p number th pause from now begins. A blocked signal raised there ends
+    /// the pause if its mask lets it in; one that is not blocked comes too early to end it.
     void duringPause(int number, Action action);
 
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
     bool wait(std::int64_t waitMicros, const sigset_t* mask);
-    [[nodiscard]] timeval timeOfDay() const {
-        return {now(), static_cast<suseconds_t>(micros % kMicrosPerSecond)};
-    }
+
+    std::int64_t micros = kStart * kMicrosPerSecond;
 
 private:
-    static constexpr std::int64_t kMicrosPerSecond = 1'000'000;
-    std::int64_t micros = kStart * kMicrosPerSecond;
     std::vector<long> asked;
     std::map<std::size_t, Action> actions;
 };

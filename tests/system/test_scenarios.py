@@ -2,13 +2,12 @@
 
 from __future__ import annotations
 
-from collections.abc import Callable
-
 import pytest
 
 from lab.relay import TUNNEL_DEVICE
-from lab.scenario import Lab, Situation
+from lab.scenario import Lab
 from lab.scenarios import SCENARIOS
+from lab.timeline import Timeline
 
 NEEDS_TUNNEL = pytest.mark.skipif(not TUNNEL_DEVICE.exists(),
                                   reason="this machine has no tunnel device")
@@ -19,6 +18,10 @@ LONGEST_FIRST = sorted(SCENARIOS.values(), key=lambda scenario: "leases" not in 
 @pytest.mark.parametrize("name", [
     pytest.param(scenario.name, marks=NEEDS_TUNNEL if scenario.situation.relay else ())
     for scenario in LONGEST_FIRST])
-def test_scenario(play: Callable[[Situation], Lab], name: str) -> None:
-    scenario = SCENARIOS[name]
-    scenario.play(play(scenario.situation))
+def test_scenario(name: str) -> None:
+    lab = Lab(SCENARIOS[name].situation, Timeline())
+    try:
+        SCENARIOS[name].play(lab)
+    except Exception:
+        print(lab.report())
+        raise

@@ -20,26 +20,23 @@ protected:
         PelorusTest::TearDown();
     }
 
+    const FakeWeb::Answer none = FakeWeb::noAnswer();
+    FakeWeb& web = FakeWeb::get();
+    TavikClient& client = givenClient();
+
+private:
     TavikClient& givenClient() {
-        // clang-format off
         givenConfig({{"SERVER_BASE_URL", "https://web.kavra.example"},
                      {"INTERNAL_HTTP_PORT", "80"},
                      {"REMOTE_TESTPORTURL", "/test?id=%s&ip=%s&port=%d&type=%s&auth=%s"},
                      {"REMOTE_SETFORWARDURL", "/set?id=%s&ip=%s&lan=%s&p=%d&ps=%d&auth=%s"},
                      {"REMOTE_SETCOMMSTATUSURL", "/status?id=%s&auth=%s&lan=%s"},
-                     {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/set?ip=%s&p=%d&ps=%d&lan=%s&i=%d"},
+                     {"LOCAL_SETFORWARDURL", "http://127.0.0.1:%d/set?ip=%s&p=%d&s=%d&lan=%s&i=%d"},
                      {"LOCAL_DELFORWARDURL", "http://127.0.0.1:%d/del?i=%d"},
                      {"LOCAL_SETCOMMSTATUSURL", "http://127.0.0.1:%d/status?is=%s"},
                      {"LOCAL_SETLOCALIPURL", "http://127.0.0.1:%d/ip?lan=%s"}});
-        // clang-format on
-        TavikClient* client = TavikClient::getInstance();
-        static_cast<void>(client->getRestUrl("", HTTP));
-        log.clear();
-        web.clear();
-        return *client;
+        return *TavikClient::getInstance();
     }
-
-    FakeWeb& web = FakeWeb::get();
 };
 
 }  // namespace pelorus

@@ -1,23 +1,15 @@
 // The fixture of the connection module: the real classes of all modules it uses, between a fake
-// gateway, a fake web and a tunnel whose start command writes its output.
+// gateway, a fake web and a fake shell.
 #ifndef PELORUS_UNIT_CONNECTION_FIXTURE_H
 #define PELORUS_UNIT_CONNECTION_FIXTURE_H
 
 #include <spawn.h>
-#include <sys/wait.h>
 
-#include <algorithm>
-#include <csignal>
 #include <filesystem>
-#include <functional>
-#include <iterator>
 #include <regex>
-#include <string>
 
 #include "cloud/tavik_client.h"
 #include "connection/connection_manager.h"
-#include "connection/network_addrs.h"
-#include "relay/vpn_manager.h"
 #include "support/fake_files.h"
 #include "support/fake_gateway.h"
 #include "support/fake_web.h"
@@ -25,92 +17,79 @@
 
 namespace pelorus {
 
-using support::FakeGateway;
-using support::FakeWeb;
-using support::RowName;
-using support::Texts;
+using support::FakeGateway, support::FakeWeb, support::RowName, support::Texts;
 
-inline constexpr const char* kLanIp = "192.168.77.10";
+inline constexpr const char* kLanIp = support::kDeviceAddress;
 inline constexpr const char* kWanIp = "44.128.0.20";
 inline const std::string kWait = "<action>wait</action><wait_time>300</wait_time>";
-inline const std::string kPassed =
-    "<s>Success</s><remote_external_ip>44.128.0.20</remote_external_ip>"
-    "<req_device_id>a</req_device_id><resp_device_id>a</resp_device_id>";
-inline const std::string kNotReached =
-    "<s>Failure</s><remote_external_ip>44.128.0.20</remote_external_ip>";
-inline const std::string kOtherNat =
-    "<s>Failure</s><remote_external_ip>44.128.9.9</remote_external_ip>";
-
-// What many stories share.
-inline const std::string kSearch = "connecting/portforwarded, map 9091>LAN:8080 Kavra, test 9091, ";
-inline const std::string kPublish =
-    "map 9444>LAN:8443 KavraSSL, record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&8080, connected/portforwarded";
-inline const std::string kByHand =
-    "connecting/portforwarded, test 18080, record WAN&LAN&18080&18443, tell WAN&18080&18443&LAN&8080, ";
-inline const std::string kNoRelay =
-    "connecting/relayed, record NULL&LAN&0&0, withdraw 8080, start, failed/relayed";
-inline const std::string kKept = " = 9091 9444 portforwarded";
+inline const std::string kNotReached = "<remote_external_ip>44.128.0.20</remote_external_ip>";
+inline const std::string kOtherNat = "<remote_external_ip>44.128.9.9</remote_external_ip>";
+/// Success for everything that is asked; @p testedIp is what the server says it tested.
+inline std::string passed(const std::string& testedIp = kWanIp) {
+    return "success Success<action>proceed</action><external_ip>" + testedIp +
+           "</external_ip><remote_external_ip>44.128.0.20</remote_external_ip>"
+           "<req_device_id>a</req_device_id><resp_device_id>a</resp_device_id>";
+}
 
 /// What a story() tells of the lines that hold the part: these words and what follows the part, up
 /// to the end mark.
 struct Word {
-    const char* part = "";
-    const char* words = "";
-    const char* end = "\n";
-    bool isLog = false;
+    std::string part;
+    std::string words;
+    std::string end = "\n";
 };
 // clang-format off
-inline constexpr Word kWords[] = {
-    {"&port=", "test ", "&"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "},
-    {"/delforward?", "withdraw "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""},
-    {"natpmp map TCP ", "natpmp ", " for"}, {"unmap TCP ", "unmap "}, {"map TCP ", "map "},
-    {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""},
-    {"helper.sh add ", "add "}, {"helper.sh remove ", "remove "},
-    {"cloudConnectivity state=", "", "\n", true}, {"setForceConnect = ", "force ", "\n", true},
-    {"Port test failed, ", "failed: ", ".", true}};
+inline const std::vector<Word> kWords{
+    {"&ip=", "test ", "&auth"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "},
+    {"/delforward?", "drop "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""}, {"natpmp map TCP ", "natpmp ", " for"},
+    {"unmap TCP ", "unmap "}, {"map TCP ", "map "}, {"helper.sh add ", "add "}, {"helper.sh remove ", "remove "},
+    {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""}};
+inline const std::vector<Word> kLogWords{
+    {"cloudConnectivity state=", ""}, {"setForceConnect = ", "force "}, {"increased port test interval to ", "interval ", "."},
+    {"Port test failed, trying next port", "next port", ""}, {"Port test failed, retries exceeded", "exceeded", ""},
+    {"mapping port : e-[", "check ", "]"}, {"extended port range : e-[", "range ", "]"},
+    {"UPnP not working. Elapsed time ", "elapsed ", ","}, {"unmapping existing ports", "take over", ""}};
+
+/// How a story() abbreviates what mostly goes together; anything else stands in full. A test of
+/// ":9091" leaves it to the server which address to test.
+inline constexpr const char* kPhrases[][2] = {
+    {"^, ", ""}, {kWanIp, "WAN"}, {R"(192.168.77.10\b)", "LAN"}, {" type=portforwarded", ""}, {" type=", "/"},
+    {"WAN&port=", ""}, {"&port=", ":"}, {R"(&HTTP\b)", ""}, {R"((test \S+), \1, \1)", "$1 x3"}, {" -> ", ">"},
+    {R"(>LAN:8080 Kavra\b)", ""}, {">LAN:8443 KavraSSL", " SSL"}, {R"((unmap \d+), unmap (\d+))", "$1 $2"},
+    {R"(record (\S+)&(\S+)&(\d+)&(\d+), tell \1&\3&\4&\2&8080)", "publish $1 $2 $3 $4"},
+    {"connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444", "map both"},
+    {"connecting, test :18080, publish WAN LAN 18080 18443", "by hand"}, {"connected, status portforwarded, force 0", "up"},
+    {"= 9091 9444 portforwarded", "= forwarded"}, {R"(record NULL&(\S+)&0&0, drop 8080)", "withdraw $1"},
+    {"connecting/relayed, withdraw LAN, start, failed/relayed", "no relay"},
+    {"connecting/relayed, withdraw LAN, start, connected/relayed, status relayed, force 0", "relay up"}};
 // clang-format on
 
 /// Public, so that the rows of a table can change the world.
 class ConnectionTest : public support::PelorusTest {
 public:
-    using PelorusTest::clock;
-    using PelorusTest::commands;
-    using PelorusTest::net;
-    using PelorusTest::setConfig;
-    using PelorusTest::writeFile;
+    using PelorusTest::clock, PelorusTest::commands, PelorusTest::net;
+    using PelorusTest::setConfig, PelorusTest::writeFile;
 
     ConnectionTest() {
-        web.reset();
-        gateway.reset();
-        files.reset();
         log.onLine([this](const support::LogLine&) { listen(); });
-        for (const char* part : {"/setstatus", "/setforward", "/delforward", "/setlanip"}) {
-            web.answer(part, "success");
-        }
-        web.answer("/remote_access_status/", "<action>proceed</action>");
-        web.answer("/forward?", "Success");
-        web.answer("/lanip?", "Success");
-        web.answer("/test?", kPassed);
-        diskIsAwake();
+        web.answer("", passed());
+        commands.answer("hdparm", "drive state is:  active/idle\n");
+        support::FakeFiles::get().redirect(support::kIdleMinutesFile, writeFile("minutes", "0\n"));
         // clang-format off
         const std::string local = "http://127.0.0.1:%d/";
         givenConfig(
             {{"SERVER_BASE_URL", "https://cloud.kavra.example"}, {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"},
              {"REMOTE_SETFORWARDURL", "/forward?%s&%s&%s&%d&%d&%s"}, {"REMOTE_SETCOMMSTATUSURL", "/lanip?%s&%s&%s"},
              {"LOCAL_SETFORWARDURL", local + "setforward?%s&%d&%d&%s&%d"}, {"LOCAL_DELFORWARDURL", local + "delforward?%d"},
-             {"LOCAL_SETCOMMSTATUSURL", local + "setstatus?%s"}, {"LOCAL_SETLOCALIPURL", local + "setlanip?%s"},
-             {"OPENVPN_CONFIG_PATH", folder}, {"OPENVPN_AUTH_FILE", path("auth.txt")}, {"STARTCMD", "start-client"},
-             {"STARTCMD_OUTFILE", path("client.out")}, {"LOG_SUCCESS_TEXT", "Completed"},
-             {"OPENVPN_PID_FILE", path("client.pid")}},
+             {"LOCAL_SETCOMMSTATUSURL", local + "setstatus?%s"}, {"OPENVPN_AUTH_FILE", path("auth.txt")},
+             {"OPENVPN_PID_FILE", path("client.pid")}, {"STARTCMD_OUTFILE", path("client.out")},
+             {"STARTCMD", "start-client"}, {"LOG_SUCCESS_TEXT", "Completed"}},
             {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
         // clang-format on
     }
 
     void TearDown() override {
-        if (client > 0) {
-            kill(client, SIGKILL);
-            waitpid(client, nullptr, 0);
-        }
+        if (client > 0) kill(client, SIGKILL);
         web.checkBalance();
         gateway.checkReleased();
         PelorusTest::TearDown();
@@ -118,21 +97,9 @@ public:
 
     ConnectionManager& manager() { return *ConnectionManager::getInstance(); }
 
-    void diskIsAwake() {
-        commands.answer("hdparm", "drive state is:  active/idle\n");
-        files.redirect(support::kIdleMinutesFile, writeFile("minutes", "0\n"));
-    }
     void diskIsAsleep() { commands.answer("hdparm", "drive state is:  standby\n"); }
     /// The tunnel comes up when it is started.
-    void relayWorks() {
-        support::FakeCommands::Answer start;
-        start.action = [this](const std::string&) {
-            writeFile("client.out",
-                      "Peer Connection Initiated with [AF_INET]44.128.0.1:1194\nCompleted\n");
-        };
-        commands.answer("start-client", start);
-    }
-
+    void relayWorks() { writeFile("client.out", "Completed\n"); }
     /// A client of the relay runs: a process whose executable has the right name.
     void clientRuns() {
         std::string program = path("openvpn");
@@ -143,7 +110,7 @@ public:
         writeFile("client.pid", std::to_string(client) + "\n");
     }
     /// The device is the maker's router; an empty @p wan: without a connection.
-    void givenMakersRouter(const std::string& wan, const std::string& list) {
+    void givenMakersRouter(const std::string& list, const std::string& wan = kWanIp) {
         setConfig("DEVICETYPE", "5");
         commands.answer("getip.sh wan", wan);
         commands.answer("getip.sh lan", "192.168.77.1\n");
@@ -162,45 +129,34 @@ public:
         TavikClient::getInstance()->resetServerSleepTime();
         return type;
     }
-    /// Starts as the main loop does, reaches PORTFORWARDED (through 9091 and 9444 when nothing
-    /// prevents it) and forgets what was asked and logged.
+    /// Starts as the main loop does and reaches PORTFORWARDED. No story tells of that.
     void givenForwardedPorts() {
         manager().killConnection(PORTFORWARDED);
         ASSERT_EQ(cycle(), PORTFORWARDED);
         setConfig("COMMUNICATION_STATUS", "portforwarded");
         forget();
     }
-    void forget() {
-        web.clear();
-        gateway.clear();
-        commands.clear();
-        log.clear();
-        told.clear();
-        std::fill(std::begin(heard), std::end(heard), 0);
-    }
-
+    /// Begins the next story here.
+    void forget() { static_cast<void>(story("")); }
     /// What happened since the last story, in order, then the mapped ports and the result.
     std::string story(const std::string& result) {
         listen();
-        std::string all = told.substr(std::min<std::size_t>(told.size(), 2)) + " =";
-        told.clear();
-        for (const auto& mapping : gateway.mappings()) {
+        std::string all = std::exchange(told, "") + " =";
+        for (const auto& mapping : gateway.table) {
             if (mapping.client == kLanIp) all += " " + std::to_string(mapping.externalPort);
         }
-        all = std::regex_replace(all, std::regex{kWanIp}, "WAN");
-        all = std::regex_replace(all, std::regex{kLanIp}, "LAN");
-        all = std::regex_replace(all, std::regex{" type="}, "/");
-        return std::regex_replace(all, std::regex{" -> "}, ">") + " " + result;
+        all += " " + result;
+        for (const auto& [full, brief] : kPhrases) {
+            all = std::regex_replace(all, std::regex{full}, brief);
+        }
+        return all;
     }
     std::string story(ConnectionType type) {
         return story(ConnectionManager::convertEnumConnectionType(type));
     }
-    /// What follows @p part in the log lines that hold it.
-    Texts logged(const std::string& part) const { return tails(log.texts(), part); }
 
     FakeWeb& web = FakeWeb::get();
     FakeGateway& gateway = FakeGateway::get();
-    support::FakeFiles& files = support::FakeFiles::get();
 
 private:
     pid_t client = 0;
@@ -209,28 +165,20 @@ private:
 
     void listen() {
         const Texts sources[] = {web.urls(), gateway.calls(), commands.lines(), log.texts()};
-        for (int source = 0; source < 4; ++source) {
-            for (auto& seen = heard[source]; seen < sources[source].size(); ++seen) {
-                tell(sources[source][seen], source == 3);
+        for (int i = 0; i < 4; ++i) {
+            for (auto& next = heard[i]; next < sources[i].size(); ++next) {
+                tell(sources[i][next], i == 3 ? kLogWords : kWords);
             }
         }
     }
-    void tell(const std::string& line, bool isLog) {
-        for (const Word& word : kWords) {
-            const auto rest = tails({line}, word.part);
-            if (word.isLog != isLog || rest.empty()) continue;
-            told += std::string{", "} + word.words + rest[0].substr(0, rest[0].find(word.end));
+    void tell(const std::string& line, const std::vector<Word>& vocabulary) {
+        for (const auto& [part, words, end] : vocabulary) {
+            const auto at = line.find(part);
+            if (at == std::string::npos) continue;
+            const auto rest = line.substr(at + part.size());
+            told += ", " + words + rest.substr(0, rest.find(end));
             return;
         }
-    }
-    // What follows part in each line that holds it.
-    static Texts tails(const Texts& lines, const std::string& part) {
-        Texts found;
-        for (const auto& line : lines) {
-            const auto at = line.find(part);
-            if (at != std::string::npos) found.push_back(line.substr(at + part.size()));
-        }
-        return found;
     }
 };
 

@@ -15,64 +15,100 @@ TEST_F(ConnectionManagerTest, WithoutCredentialsItIdlesAndSendsNothing) {
     EXPECT_EQ(manager().createConnection(), PORTFORWARDED);
 }
 
-TEST_F(ConnectionManagerTest, SteadyConnectionStretchesThePortTestInterval) {
+TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneResetsIt) {
     givenForwardedPorts();
     for (int unchanged = 0; unchanged < 31; ++unchanged) cycle();
-    EXPECT_EQ(logged("increased port test interval to "),
-              (Texts{"360.\n", "480.\n", "600.\n", "720.\n", "840.\n", "960.\n", "960.\n"}));
-}
-
-TEST_F(ConnectionManagerTest, ChangeOfTypeResetsTheIntervalAndForcesANameCheck) {
-    givenForwardedPorts();
-    for (int unchanged = 0; unchanged < 5; ++unchanged) cycle();
-    relayWorks();
-    gateway.speakUpnp(false);
-    web.answer("/test?", kNotReached);
-    forget();
-    EXPECT_EQ(cycle(), RELAYED);
-    EXPECT_EQ(log.countPart("changed to 2, port test interval reset to 240,"), 1);
-    manager().checkConnection(RELAYED);
-    EXPECT_EQ(log.countPart("nslookup check interval, forceDNSCheck 1,"), 1);
-    cycle();
-    EXPECT_EQ(log.countPart("connection type 2 un-changed. connTypeUnchangedCount 0,"), 1);
-}
-
-TEST_F(ConnectionManagerTest, WaitingForTheNextPortTestIsNoReasonForARelay) {
-    manager().killConnection(PORTFORWARDED);
-    web.answer("/test?", kNotReached);
-    ASSERT_EQ(cycle(), FAILED);
-    setConfig("COMMUNICATION_STATUS", "connecting");
-    forget();
-    EXPECT_EQ(story(cycle()), " = connecting");
-    EXPECT_EQ(logged(" connection type changed"), Texts{});
+    EXPECT_EQ(story(PORTFORWARDED),
+              "disk, test 9091, interval 360, disk, test 9091, interval 480, disk, test 9091, "
+              "interval 600, interval 720, disk, test 9091, interval 840, interval 960, disk, "
+              "test 9091, interval 960 = forwarded");
+    clientRuns();
+    gateway.upnp = false;
+    failTest(9091);
+    for (int relayed = 0; relayed < 5; ++relayed) EXPECT_EQ(cycle(), RELAYED);
+    EXPECT_EQ(story(RELAYED),
+              "test :9091 x3, status failed, elapsed 0, status relayed, force 0, elapsed 121, "
+              "force 0, elapsed 241, force 0, elapsed 361, force 0, elapsed 481, force 0, "
+              "interval 360 = 9091 9444 relayed");
+    EXPECT_FALSE(manager().checkDNS(RELAYED)) << "a new type forces a check; no name is known";
 }
 
 TEST_F(ConnectionManagerTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
-    unsigned upnp = 0;
-    unsigned natpmp = 0;
-    manager().getReqPortMappingLifetime(upnp, natpmp);
-    EXPECT_EQ(upnp, 4294967295U);
-    EXPECT_EQ(natpmp, 4294967295U);
+    const auto lifetimes = [this] {
+        std::pair<unsigned, unsigned> asked;
+        manager().getReqPortMappingLifetime(asked.first, asked.second);
+        return asked;
+    };
+    EXPECT_EQ(lifetimes(), std::pair(4294967295U, 4294967295U));
     manager().setReqPortMappingLifetime(600, 700);
-    manager().getReqPortMappingLifetime(upnp, natpmp);
-    EXPECT_EQ(upnp, 600U);
-    EXPECT_EQ(natpmp, 700U);
+    EXPECT_EQ(lifetimes(), std::pair(600U, 700U));
 }
 
-TEST_F(ConnectionManagerTest, WrongNamesTearEverythingDownAndForceATestInTheSameCycle) {
+TEST_F(ConnectionManagerTest, MissingNamesTearEverythingDownAndForceATestInTheSameCycle) {
     givenForwardedPorts();
     diskIsAsleep();
     clientRuns();
-    for (const char* name : {"nas.devicedevice-7350142.kavra.example",
-                             "nas-devicedevice-7350142.kavra.example", support::kSubdomain}) {
-        net.setName(name, {"44.128.0.99"});
-    }
     manager().checkConnection(PORTFORWARDED);
-    EXPECT_EQ(
-        story(FAILED),
-        "failed/portforwarded, status failed, unmap 9091, unmap 9444, record NULL&LAN&0&0, withdraw 8080, stop, force 1 = failed");
-    EXPECT_EQ(story(manager().createConnection()),
-              kSearch + kPublish + ", status portforwarded, force 0" + kKept);
+    EXPECT_EQ(story(FAILED),
+              "failed, status failed, unmap 9091 9444, withdraw LAN, stop, force 1 = failed");
+    EXPECT_EQ(story(manager().createConnection()), "map both, up = forwarded");
+}
+
+class RelayAttempt : public StoryTest {};
+TEST_P(RelayAttempt, TellsAsExpected) {
+    expectStories([this] { return manager().createRelayConnection(); });
+}
+class KillConnection : public StoryTest {};
+TEST_P(KillConnection, TellsAsExpected) {
+    expectStories([this] {
+        manager().killConnection(PORTFORWARDED);
+        return NONE;
+    });
+    log.clear();
+    for (const auto type : {NONE, CONNECTING, FAILED}) manager().killConnection(type);
+    EXPECT_TRUE(log.lines().empty());
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("Port 9"), 0) << "the ports are forgotten";
+}
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
+    Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); },
+        {"connecting/relayed, record NULL&&0&0, drop 8080, start, connected/relayed, status relayed, force 0 = relayed"}},
+    Row{"KeepsARunningTunnelAndEndsAForcedAttempt", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
+    Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
+        {"connecting/relayed, record NULL&&0&0, drop 8080, start, start, start, start, failed/relayed, status failed = failed"}},
+    Row{"KeepsEverythingWhenTheServerAsksForAWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
+    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {" = forwarded"}}), RowName{});
+INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
+    // The gateway object is new at the first, and so is the LAN address.
+    Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
+            w.gateway.table.push_back({9091, kLanIp, 8080, "Kavra"});
+            w.gateway.table.push_back({5000, kLanIp, 22, "ssh"});
+            w.gateway.table.push_back({9093, "192.168.77.66", 80, "Kavra"});
+            w.gateway.table.push_back({9444, kLanIp, 8443, "KavraSSL"});
+        }, {"lanip, unmap 9091 9444, withdraw LAN = 5000 disabled", "withdraw LAN = 5000 disabled"}},
+    Row{"ForgetsThePortsOfTheConnection", [](World& w) { w.givenForwardedPorts(); }, {"unmap 9091 9444, withdraw LAN = disabled"}},
+    Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.upnp = false; }, {" = disabled"}},
+    Row{"WithdrawsTheRecordWhenTheGatewayWentAway",
+        [](World& w) { w.givenForwardedPorts(); w.gateway.upnp = false; w.cycle(); w.forget(); },
+        {"withdraw LAN = 9091 9444 disabled"}},
+    Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
+    Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {
+            w.givenMakersRouter("BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n", "");
+        }, {"remove \"TCP,9091,192.168.77.1,80\", withdraw 192.168.77.1 = disabled"}}), RowName{});
+// clang-format on
+
+TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
+    givenForwardedPorts();
+    ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing
+    relayWorks();
+    web.answer("/forward?", FakeWeb::noAnswer());
+    EXPECT_EQ(story(manager().createRelayConnection()),
+              "connecting/relayed, record NULL&LAN&0&0, start, connected/relayed, status relayed, "
+              "force 0 = 9091 9444 relayed");
+    log.clear();
+    manager().createDirectConnection();
+    EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);
 }
 
 }  // namespace

@@ -1,7 +1,5 @@
 #include "daemon/daemon_control.h"
 
-#include <filesystem>
-
 #include "common/log.h"
 #include "common/termination.h"
 #include "daemon/signals.h"
@@ -10,7 +8,6 @@
 namespace pelorus {
 namespace {
 
-using std::filesystem::exists;
 using support::LogLine;
 
 class DaemonControlTest : public DaemonTest {
@@ -25,17 +22,16 @@ protected:
 };
 
 TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
-    const std::string again =
-        "status connecting, connecting/disabled, status disabled, unmap 9091, record NULL&LAN&0&0, withdraw 8080 = disabled";
-    const std::vector<std::pair<const char*, std::string>> rows{
-        {"failed",
-         "connecting/disabled, status disabled, lanip, unmap 9091, record NULL&LAN&0&0, withdraw 8080 = disabled"},
-        {"", again},
-        {"disabled", again}};
+    const std::string end = "unmap 9091, withdraw LAN = disabled";
+    const std::string switched = "connecting/disabled, status disabled, ";
+    const std::pair<const char*, std::string> rows[]{
+        {"failed", switched + "lanip, " + end},
+        {"", "status connecting, " + switched + end},
+        {"disabled", "status connecting, " + switched + end}};
     for (const auto& [status, wanted] : rows) {
         forget();
         setConfig("COMMUNICATION_STATUS", status);
-        gateway.add({9091, kLanIp, 80, "Kavra"});
+        gateway.table.push_back({9091, kLanIp, 80, "Kavra"});
         control.disableRemoteAccess();
         control.run();
         EXPECT_EQ(story(NONE), wanted);
@@ -43,59 +39,42 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
     EXPECT_TRUE(process.selfKills.empty());
 }
 
-TEST_F(DaemonControlTest, AnEnabledStartRemovesWhatAnEarlierRunLeft) {
+TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
+    const std::vector<std::pair<int, const char*>> periods{
+        {300, "301"}, {300, "300"}, {-1, "30"}, {1000, "30"}};  // own and server's
+    const auto beginCycle = [&](std::size_t cycle) {
+        if (cycle == periods.size()) return terminate();
+        control.setSleepTime(periods[cycle].first);
+        web.answer("/remote_access_status/", std::string{"<action>wait</action><wait_time>"} +
+                                                 periods[cycle].second + "</wait_time>");
+    };
     givenEnabled();
-    gateway.add({9555, kLanIp, 80, "Kavra"});
-    writeFile("client.pid", "999999\n");
-    log.onLine([&](const LogLine& line) {
-        if (line.text.find("DaemonControl::run - nslookup check interval") != 0) return;
-        EXPECT_TRUE(gateway.mappings().empty());
-        EXPECT_FALSE(exists(path("client.pid")));
-        terminate();
+    beginCycle(0);
+    std::string pauses;
+    inEachPause([&](unsigned cycles, const std::string& line) {
+        pauses += line + std::to_string(clock.pauses().back()) + " ";
+        beginCycle(cycles);
     });
     control.run();
-    EXPECT_EQ(process.selfKills.size(), 1U);
+    EXPECT_EQ(pauses,
+              "DaemonControl::run - retry connection after 301 secs.\n301 "
+              "DaemonControl::run - sleep 300 secs.\n300 "
+              "DaemonControl::run - retry connection after 120 secs.\n120 "
+              "DaemonControl::run - sleep 900 secs.\n900 ");
+    EXPECT_EQ(web.count("/remote_access_status/"), 4) << "asked anew in each cycle";
 }
-
-struct PauseRow {
-    const char* name;
-    int ownPeriod;
-    int serverWait;
-    long pause;
-    const char* line = "retry connection after";
-};
-class Pause : public DaemonControlTest, public ::testing::WithParamInterface<PauseRow> {};
-
-TEST_P(Pause, IsTheLongerOfTheTwoPeriods) {
-    givenEnabled(GetParam().ownPeriod);
-    const std::string wait = std::to_string(GetParam().serverWait);
-    web.answer("/remote_access_status/",
-               "<action>wait</action><wait_time>" + wait + "</wait_time>");
-    inPauseOfCycle(2, [this] {
-        EXPECT_EQ(clock.pauses().back(), GetParam().pause);
-        terminate();
-    });
-    control.run();
-    EXPECT_EQ(log.count(LOG_INFO, std::string{"DaemonControl::run - "} + GetParam().line + " " +
-                                      std::to_string(GetParam().pause) + " secs.\n"),
-              2);
-    EXPECT_EQ(web.count("/remote_access_status/"), 2) << "asked anew in each cycle";
-}
-
-// clang-format off
-INSTANTIATE_TEST_SUITE_P(Rows, Pause, ::testing::Values(
-    PauseRow{"ServersWait", 300, 301, 301},
-    PauseRow{"OwnWhenBothAreEqual", 300, 300, 300, "sleep"},
-    PauseRow{"OwnIsAtMost900", 1000, 0, 900, "sleep"},
-    PauseRow{"OwnIsAtLeast30", -1, 0, 120}), RowName{});
-// clang-format on
 
 // Raised between the last look at the flag and the wait.
-TEST_F(DaemonControlTest, ASignalInThePauseEndsItAndTearsDown) {
+TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     givenEnabled(900);
+    gateway.table.push_back({9555, kLanIp, 80, "Kavra"});  // by an earlier run, as is the client
+    clientRuns();
     time_t before = 0;
-    inPauseOfCycle(2, [&] {
-        EXPECT_EQ(gateway.mappings().size(), 2U);
+    inEachPause([&](unsigned cycles, const std::string&) {
+        if (cycles == 1) return;
+        EXPECT_EQ(gateway.calls("unmap ").front(), "unmap TCP 9555") << "before the search";
+        EXPECT_EQ(commands.count("kill"), 0) << "only its file is removed";
+        EXPECT_EQ(gateway.table.size(), 2U);
         forget();
         before = clock.now();
         writeFile("client.pid", "999999\n");  // of a relay client that has ended
@@ -103,14 +82,12 @@ TEST_F(DaemonControlTest, ASignalInThePauseEndsItAndTearsDown) {
     });
     control.run();
     EXPECT_LT(clock.now() - before, 900);
-    support::expectLoggedInOrder(
-        {"sigTrap - sigConnKilled is set to incoming signal.\n",
-         "TavikClient::sendAnalytics - COMMUNICATION status:[disabled]  connectionType:[1]  connectionSubType:[0]\n",
-         "DaemonControl::run - Remote access disabled.\n"});
-    EXPECT_EQ(
-        story(NONE),
-        "status disabled, record NULL&LAN&0&0, withdraw 8080, unmap 9091, unmap 9444, connecting/disabled = disabled");
-    EXPECT_FALSE(exists(path("client.pid")));
+    EXPECT_EQ(story(NONE),
+              "status disabled, withdraw LAN, unmap 9091 9444, connecting/disabled = disabled");
+    const std::string type = "connectionType:[1]  connectionSubType:[0]\n";
+    EXPECT_EQ(log.countPart("COMMUNICATION status:[disabled]  " + type), 1);
+    EXPECT_EQ(log.texts().back(), "DaemonControl::run - Remote access disabled.\n");
+    EXPECT_FALSE(std::filesystem::exists(path("client.pid")));
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
 }
 
@@ -121,14 +98,14 @@ TEST_F(DaemonControlTest, ASignalWhileTheCycleWorksIsNotSleptOver) {
     });
     control.run();
     EXPECT_LT(clock.elapsed(), 900);
-    EXPECT_TRUE(gateway.mappings().empty());
+    EXPECT_TRUE(gateway.table.empty());
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
 }
 
 // The capture fails the test when the handler's line comes within another one.
 TEST_F(DaemonControlTest, NoLineOfAWholeRunLetsASignalIn) {
     givenEnabled();
-    gateway.refuseAllPorts();
+    gateway.refuseAll = true;
     for (const int signal : {SIGINT, SIGQUIT}) {
         std::signal(signal, [](int) { logLine(LOG_INFO, "handler\n"); });
     }

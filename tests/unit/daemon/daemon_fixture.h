@@ -17,10 +17,12 @@ protected:
         return line.text.find("DaemonControl::run - sleep ") == 0 ||
                line.text.find("DaemonControl::run - retry connection after ") == 0;
     }
-    /// Runs @p action within the pause that ends cycle @p number (1: the next one).
-    void inPauseOfCycle(int number, const support::VirtualClock::Action& action) {
-        log.onLine([this, number, action, seen = 0](const support::LogLine& line) mutable {
-            if (endsCycle(line) && ++seen == number) clock.duringPause(1, action);
+    /// Runs @p action within the pause that ends each cycle, with the number of cycles so far.
+    template <typename Action>
+    void inEachPause(Action action) {
+        log.onLine([this, action, cycles = 0U](const support::LogLine& line) mutable {
+            if (!endsCycle(line)) return;
+            clock.duringPause(1, [=, number = ++cycles] { action(number, line.text); });
         });
     }
 

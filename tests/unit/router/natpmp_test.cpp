@@ -10,7 +10,7 @@ const std::string kFetch = "CMnatpmp::retrieveExternalIP  ";
 
 class NatpmpTest : public RouterTest {
 protected:
-    NatpmpTest() { gateway.speakNatpmp(true); }
+    NatpmpTest() { gateway.natpmp = true; }
     bool map(int internalPort, int externalPort, bool isHttps = false) {
         port = externalPort;
         return client.mapPort(internalPort, port, "TCP", "Kavra", isHttps);
@@ -68,7 +68,7 @@ INSTANTIATE_TEST_SUITE_P(, SlowGateway, ::testing::Values(
 TEST_P(SlowGateway, DoesNotMakeARequestSucceedWithTheValuesOfAnother) {
     ASSERT_TRUE(client.retrieveExternalIP(ip));
     slowDown();
-    gateway.refusePort(9091);
+    gateway.refused.insert(9091);
     EXPECT_FALSE(map(80, 9091));
     for (int externalPort : {9092, 9093, 9094}) expectOwn(80, externalPort);
     for (int round = 0; round < 3; ++round) expectRemoved(80);
@@ -138,7 +138,7 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     log.clear();
     ASSERT_TRUE(map(80, 9091) && map(443, 9444, true));
     EXPECT_TRUE(client.unmapPort(22, 9444, "TCP") && client.unmapPort(80, 9444, "TCP"));
-    gateway.grant({{}, {}, 0});  // no time is a removal too
+    gateway.granted = {{}, {}, 0};  // no time is a removal too
     EXPECT_TRUE(map(443, 9444, true));
     EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));
     const std::string gone = "internal_port 80, external_port 9091, lifetime 172800\n";
@@ -148,7 +148,7 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     once("destroyed all mappings");
     once("destroyed HTTPS");
     once("mismatch");
-    gateway.grant({});
+    gateway.granted = {};
     clock.advance(1);
     client.CheckExpiredMappings();
     EXPECT_EQ(gateway.count("natpmp map TCP 0 -> 0 for 172800 s"), 2);
@@ -158,13 +158,13 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
 }
 
 TEST_F(NatpmpTest, TheGrantWinsOverTheRequest) {
-    gateway.grant({40000, 81, 600});
+    gateway.granted = {40000, 81, 600};
     ASSERT_TRUE(map(443, 9444, true));
     EXPECT_EQ(port, 40000);
     once("req_internal_port 443, resp_internal_port 81, external_port 40000");
     once(
         "setting HTTPS PMTracker params.   internalPort[443], mappedExternalPort[40000], lifetime[600]");
-    gateway.grant({{}, {}, 600});
+    gateway.granted = {{}, {}, 600};
     ASSERT_TRUE(map(80, 9091));
     client.setReqPortMappingLifetime(7200);
     gateway.clear();
@@ -176,7 +176,7 @@ TEST_F(NatpmpTest, TheGrantWinsOverTheRequest) {
     client.CheckExpiredMappings();  // the first one starts a new half, the other is still due
     EXPECT_EQ(gateway.calls("natpmp map"), (Texts{"natpmp map TCP 40000 -> 443 for 7200 s",
                                                   "natpmp map TCP 9091 -> 80 for 7200 s"}));
-    gateway.grant({});
+    gateway.granted = {};
     EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));
     clock.advance(1);
     client.CheckExpiredMappings();

@@ -17,25 +17,22 @@ using Mappings = std::vector<Mapping>;
 
 class RouterTest : public support::PelorusTest {
 protected:
-    RouterTest() { gateway.reset(); }
-
-    void SetUp() override { givenConfig(); }
+    RouterTest() {
+        gateway.reset();
+        givenConfig();
+    }
     void TearDown() override {
         gateway.checkReleased();
         PelorusTest::TearDown();
     }
 
-    void discovered() {
+    void discovered(const std::string& protocol = "UPnP") {
+        gateway.upnp = protocol == "UPnP";
+        gateway.natpmp = protocol == "NAT-PMP";
         ASSERT_TRUE(router.discover()) << log.dump();
         log.clear();
         gateway.clear();
     }
-    void discoveredThroughNatpmp() {
-        gateway.speakUpnp(false);
-        gateway.speakNatpmp(true);
-        discovered();
-    }
-
     void once(const char* part) { EXPECT_EQ(log.countPart(part), 1) << part << log.dump(); }
 
     FakeGateway& gateway = FakeGateway::get();

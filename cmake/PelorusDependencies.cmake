@@ -1,3 +1,5 @@
+find_package(Threads REQUIRED)
+
 # The three libraries that a firmware can update on its own; all linked dynamically. With
 # PELORUS_HEADERS_ONLY only their headers are used: the unit tests' fakes replace every call.
 if(PELORUS_HEADERS_ONLY)

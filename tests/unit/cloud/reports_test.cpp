@@ -1,4 +1,7 @@
 // Mapping records, the local address, the status word, analytics and the state of the disk.
+#include <sys/stat.h>
+
+#include <filesystem>
 #include <stdexcept>
 
 #include "cloud_fixture.h"
@@ -129,6 +132,9 @@ TEST_F(ReportsTest, ADiskAsleepOrUnknownSkipsTheTest) {
     };
     support::FakeFiles::get().redirect(support::kIdleMinutesFile, path("minutes"));
     row(1, "state: idle", "", "failed to get open Ostrel sleep count file.\n");
+    mkfifo(path("minutes").c_str(), 0666);  // planted to block
+    row(1, "state: idle", "", "failed to get open Ostrel sleep count file.\n");
+    std::filesystem::remove(path("minutes"));
     writeFile("minutes", "2\n0\n");
     row(1, "state: standby", "5",
         "drive is in standby, port test is suspended, port testing SKIP.\n");

@@ -21,8 +21,9 @@ pid_t startedProcess = 0;
 void reportExit() {
     if (getpid() == startedProcess) return;
     const bool closed = dup(0) < 0 && dup(1) < 0 && dup(2) < 0;
-    dprintf(reportFile, "exit: umask %o, folder %s, streams %s\n", umask(0),
-            fs::current_path().c_str(), closed ? "closed" : "open");
+    dprintf(reportFile, "exit: umask %o, folder %s, streams %s, %s\n", umask(0),
+            fs::current_path().c_str(), closed ? "closed" : "open",
+            prctl(PR_GET_DUMPABLE) == 0 ? "no core" : "core");
     for (const auto& call : support::LogCapture::get().setup)
         dprintf(reportFile, "%s\n", call.c_str());
     if (::testing::Test::HasFailure()) dprintf(reportFile, "a check failed\n");
@@ -87,7 +88,7 @@ TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
         "<5>main - pelorus daemon starting up, Version: [1.7.0-54], PID: [" +
         pid + "], SID: [" + pid + "] \n<6>Getting path for dynamic config file.\n";
     EXPECT_EQ(reported.substr(0, banner.size()), banner);
-    EXPECT_TRUE(holds("exit: umask 77, folder /, streams closed\n")) << reported;
+    EXPECT_TRUE(holds("exit: umask 77, folder /, streams closed, no core\n")) << reported;
     EXPECT_FALSE(holds("openlog") || holds("level"));
     EXPECT_EQ(fs::status(path("pid")).permissions(), fs::perms{0600});
 }
@@ -95,6 +96,10 @@ TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
 TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {
     const std::string target = writeFile("precious", "kept");
     fs::create_symlink(target, path("pid"));
+    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
+    EXPECT_EQ(readFile(target), "kept");
+    fs::remove(path("pid"));
+    fs::create_hard_link(target, path("pid"));
     EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
     EXPECT_EQ(readFile(target), "kept");
     fs::remove(path("pid"));

@@ -1,6 +1,7 @@
 #include "relay/vpn_manager.h"
 
 #include <spawn.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 
 #include <filesystem>
@@ -51,7 +52,8 @@ protected:
 };
 
 TEST_F(VpnManagerTest, StartsTheClientInItsFolderWithFreshCredentials) {
-    writeFile("auth.txt", "an older and longer content\nof three\nlines\n");
+    fs::create_hard_link(writeFile("precious", "kept"), path("auth.txt"));
+    fs::permissions(path("auth.txt"), fs::perms{0666});
     writeFile("client.out", "connecting\n");
     clock.duringPause(3, [this] {
         writeFile("client.out", std::string(70, ' ') + "Initialization Sequence Completed\n");
@@ -62,6 +64,8 @@ TEST_F(VpnManagerTest, StartsTheClientInItsFolderWithFreshCredentials) {
     EXPECT_TRUE(manager.openVPNConnection());
     EXPECT_EQ(fs::current_path(), before);
     EXPECT_EQ(readFile(path("auth.txt")), std::string{kDeviceId} + "\n" + kDeviceAuth + "\n");
+    EXPECT_EQ(fs::status(path("auth.txt")).permissions(), fs::perms{0600});
+    EXPECT_EQ(readFile(path("precious")), "kept");
     EXPECT_EQ(commands.lines(), (Lines{"fetch-relays", "start-client"}));
     EXPECT_EQ(clock.pauses(), (std::vector<long>{10, 10, 10}));
     EXPECT_EQ(logged("openVPN initialization did not complete, waiting...\n"), 2);
@@ -113,7 +117,9 @@ TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
         EXPECT_EQ(log.countPart(warning), 1) << log.dump();
         EXPECT_EQ(log.countPart("isVPNRunning() - unlink stale openVPN pid file "), 1);
     }
+    mkfifo(path("client.pid").c_str(), 0666);  // planted to block
     EXPECT_TRUE(manager.closeVPNConnection());
+    EXPECT_FALSE(pidFileExists());
     EXPECT_EQ(commands.lines(), Lines{});
 }
 
@@ -171,6 +177,9 @@ TEST_F(VpnManagerTest, TheLastReadableRelayAddressWins) {
     writeFile("client.out", "x\n" + peer + "44.1.1.1:1194\n" + peer + "44.1.1.2\n" + peer + "z\n");
     EXPECT_TRUE(manager.fetchOpenVPN_IPAddr(ip));
     EXPECT_EQ(ip, "44.1.1.2");
+    writeFile("client.out", std::string(3'000'000, 'x') + "\n" + peer + "44.1.1.3\n");
+    EXPECT_TRUE(manager.fetchOpenVPN_IPAddr(ip));
+    EXPECT_EQ(ip, "44.1.1.3");
     EXPECT_EQ(log.countPart("failed to fetch openVPN AF_INET IP address from line"), 2);
     EXPECT_EQ(readRelayPeer((peer + " 44.300.007. 0").c_str())->address, "44.300.7.0");
     for (const char* const bad : {"44.-1.0.2", "4294967297.1.1.1", "44.128.0", "44.128.0:1", ""}) {

@@ -1,24 +1,30 @@
 #include "common/bounded_call.h"
 
+#include <dirent.h>
 #include <dlfcn.h>
+#include <fcntl.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <chrono>
-#include <cstdio>
+#include <cstdlib>
+#include <cstring>
 #include <system_error>
 
 #include "common/handles.h"
+#include "common/text.h"
 
 namespace pelorus {
 
 namespace {
 
 constexpr std::chrono::milliseconds kLook{20};
-constexpr int kHighestDescriptor = 1023;
+
+using DirectoryHandle = std::unique_ptr<DIR, Releaser<closedir>>;
 
 bool onlyGateways = false;  // connect() below refuses everybody else
 
@@ -27,14 +33,26 @@ bool isSocket(int descriptor) {
     return fstat(descriptor, &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
+std::set<int> openSockets() {
+    std::set<int> found;
+    const DirectoryHandle list{opendir("/proc/self/fd")};
+    // NOLINTNEXTLINE(concurrency-mt-unsafe): each thread reads a list of its own
+    while (const dirent* entry = list ? readdir(list.get()) : nullptr) {
+        const int descriptor = leadingInt(entry->d_name);
+        if (isSocket(descriptor)) found.insert(descriptor);
+    }
+    return found;
+}
+
 // Bytes, 0 when unknown.
 long residentMemory() {
-    const FileHandle file = openFile("/proc/self/statm", "re");
-    long total = 0;
-    long resident = 0;
-    // NOLINTNEXTLINE(cert-err34-c): the kernel's own numbers
-    if (!file || std::fscanf(file.get(), "%ld %ld", &total, &resident) != 2) return 0;
-    return resident * sysconf(_SC_PAGESIZE);
+    std::array<char, 128> text{};  // total and resident pages first
+    const int file = open("/proc/self/statm", O_RDONLY | O_CLOEXEC);
+    if (file < 0) return 0;
+    const ssize_t size = read(file, text.data(), text.size() - 1);
+    static_cast<void>(close(file));
+    const char* const second = size > 0 ? std::strchr(text.data(), ' ') : nullptr;
+    return second == nullptr ? 0 : std::atol(second) * sysconf(_SC_PAGESIZE);
 }
 
 int libcConnect(int socket, const sockaddr* address, socklen_t size) {
@@ -67,10 +85,8 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
-BoundedCall::BoundedCall(Peer peer, int seconds) : residentBefore{residentMemory()} {
-    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
-        if (isSocket(descriptor)) before.insert(descriptor);
-    }
+BoundedCall::BoundedCall(Peer peer, int seconds)
+    : before{openSockets()}, residentBefore{residentMemory()} {
     onlyGateways = peer == Peer::GATEWAY;
     try {
         watcher = std::thread([this, seconds] { watch(seconds); });
@@ -102,11 +118,9 @@ void BoundedCall::watch(int seconds) {
 }
 
 void BoundedCall::shutSockets() const {
-    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
-        if (before.count(descriptor) == 0 && isSocket(descriptor)) {
-            // Fails for a socket without a peer, and still ends a wait for datagrams.
-            static_cast<void>(shutdown(descriptor, SHUT_RDWR));
-        }
+    for (const int descriptor : openSockets()) {
+        // Fails for a socket without a peer, and still ends a wait for datagrams.
+        if (before.count(descriptor) == 0) static_cast<void>(shutdown(descriptor, SHUT_RDWR));
     }
 }
 

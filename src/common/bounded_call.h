@@ -38,7 +38,7 @@ private:
 
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
-    std::set<int> before;  // descriptors that were open
+    std::set<int> before;  // sockets that were open
     std::mutex mutex;
     std::condition_variable ended;
     long residentBefore;  // bytes

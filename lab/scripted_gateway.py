@@ -10,6 +10,7 @@ import time
 from collections.abc import Callable, Iterable
 from dataclasses import dataclass
 from http.server import BaseHTTPRequestHandler, ThreadingHTTPServer
+from urllib.parse import urlsplit
 from xml.sax.saxutils import escape
 
 from lab import network, packet_filter
@@ -248,6 +249,9 @@ class _Handler(BaseHTTPRequestHandler):
 
     def do_POST(self) -> None:
         """Perform an action of the control service."""
+        if urlsplit(self.path).path != urlsplit(self.server.gateway.personality.control_url).path:
+            self.wfile.write(_head("404 Not Found", 0))
+            return
         body = self.rfile.read(int(self.headers["Content-Length"])).decode()
         action = self.headers["SOAPAction"].strip('"').rpartition("#")[2]
         error, values = self.server.gateway.answer(action, dict(_ARGUMENT.findall(body)))

@@ -1,3 +1,6 @@
+// The fortified recvfrom is an inline function, which could not be replaced below.
+#undef _FORTIFY_SOURCE
+
 #include "common/bounded_call.h"
 
 #include <dlfcn.h>
@@ -6,9 +9,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
+#include <limits>
 #include <system_error>
 
 #include "common/handles.h"
@@ -20,7 +25,10 @@ namespace {
 constexpr std::chrono::milliseconds kLook{20};
 constexpr int kHighestDescriptor = 1023;
 
-bool onlyGateways = false;  // connect() below refuses everybody else
+constexpr long kEverything = std::numeric_limits<long>::max();
+
+bool onlyGateways = false;                  // connect() below refuses everybody else
+std::atomic<long> mayReceive{kEverything};  // bytes; then recvfrom() below finds the end
 
 bool isSocket(int descriptor) {
     struct stat status {};
@@ -37,10 +45,15 @@ long residentMemory() {
     return resident * sysconf(_SC_PAGESIZE);
 }
 
+// The C library's function of this name and type.
+template <typename Function>
+Function* original(const char* name) {
+    return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
+}
+
 int libcConnect(int socket, const sockaddr* address, socklen_t size) {
-    using Connect = int (*)(int, const sockaddr*, socklen_t);
-    static const auto original = reinterpret_cast<Connect>(dlsym(RTLD_NEXT, "connect"));
-    if (original != nullptr) return original(socket, address, size);
+    static const auto call = original<decltype(connect)>("connect");
+    if (call != nullptr) return call(socket, address, size);
     errno = ENOSYS;
     return -1;
 }
@@ -72,6 +85,7 @@ BoundedCall::BoundedCall(Peer peer, int seconds) : residentBefore{residentMemory
         if (isSocket(descriptor)) before.insert(descriptor);
     }
     onlyGateways = peer == Peer::GATEWAY;
+    mayReceive = kMostReceived;
     try {
         watcher = std::thread([this, seconds] { watch(seconds); });
     } catch (const std::system_error&) {
@@ -87,6 +101,7 @@ BoundedCall::~BoundedCall() {
     ended.notify_one();
     if (watcher.joinable()) watcher.join();
     onlyGateways = false;
+    mayReceive = kEverything;
 }
 
 // The library may open further sockets after the first ones were shut, hence every time.
@@ -97,14 +112,16 @@ void BoundedCall::watch(int seconds) {
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
         exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
                    residentMemory() - residentBefore > kMostGrowth;
-        if (exceeded) shutSockets();
+        if (exceeded) endTransfers();
     }
 }
 
-void BoundedCall::shutSockets() const {
+void BoundedCall::endTransfers() const {
+    mayReceive = 0;
     for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
         if (before.count(descriptor) == 0 && isSocket(descriptor)) {
-            // Fails for a socket without a peer, and still ends a wait for datagrams.
+            // Fails for a socket without a peer, and still ends a wait for datagrams. What is
+            // queued stays, and under a flood never ends.
             static_cast<void>(shutdown(descriptor, SHUT_RDWR));
         }
     }
@@ -119,4 +136,20 @@ extern "C" int connect(int socket, const sockaddr* address, socklen_t size) {
         return -1;
     }
     return pelorus::libcConnect(socket, address, size);
+}
+
+// The same for recvfrom: memory must not depend on how soon the watcher looks.
+extern "C" ssize_t recvfrom(
+    int socket, void* buffer, size_t size, int flags, sockaddr* from, socklen_t* fromSize) {
+    static const auto call = pelorus::original<decltype(recvfrom)>("recvfrom");
+    if (call == nullptr) {
+        errno = ENOSYS;
+        return -1;
+    }
+    if (pelorus::mayReceive <= 0) return 0;
+    const ssize_t received = call(socket, buffer, size, flags, from, fromSize);
+    if (received > 0 && pelorus::mayReceive != pelorus::kEverything) {
+        pelorus::mayReceive -= received;
+    }
+    return received;
 }

@@ -20,12 +20,14 @@ enum class Peer {
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
 /// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. Also holds termination signals back and keeps a closed
+/// the peer had closed the connection. That is also what it finds after kMostReceived. Also holds termination signals back and keeps a closed
 /// connection from raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:
     /// Bytes of resident memory.
     static constexpr long kMostGrowth = 8L * 1024 * 1024;
+    /// Bytes that recvfrom returns in one call, on all sockets.
+    static constexpr long kMostReceived = 4L * 1024 * 1024;
 
     BoundedCall(Peer peer, int seconds);
     ~BoundedCall();
@@ -34,7 +36,7 @@ public:
 
 private:
     void watch(int seconds);
-    void shutSockets() const;
+    void endTransfers() const;
 
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;

@@ -9,14 +9,17 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <csignal>
 #include <cstdio>
 #include <limits>
 #include <system_error>
 
 #include "common/handles.h"
+#include "common/stop_budget.h"
 
 namespace pelorus {
 
@@ -29,6 +32,13 @@ constexpr long kEverything = std::numeric_limits<long>::max();
 
 bool onlyGateways = false;                  // connect() below refuses everybody else
 std::atomic<long> mayReceive{kEverything};  // bytes; then recvfrom() below finds the end
+
+bool terminationPending() {
+    sigset_t pending;
+    if (sigpending(&pending) != 0) return false;
+    return sigismember(&pending, SIGINT) == 1 || sigismember(&pending, SIGTERM) == 1 ||
+           sigismember(&pending, SIGQUIT) == 1;
+}
 
 bool isSocket(int descriptor) {
     struct stat status {};
@@ -84,6 +94,7 @@ BoundedCall::BoundedCall(Peer peer, int seconds) : residentBefore{residentMemory
     for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
         if (isSocket(descriptor)) before.insert(descriptor);
     }
+    if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
     onlyGateways = peer == Peer::GATEWAY;
     mayReceive = kMostReceived;
     try {
@@ -106,10 +117,16 @@ BoundedCall::~BoundedCall() {
 
 // The library may open further sockets after the first ones were shut, hence every time.
 void BoundedCall::watch(int seconds) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
     bool exceeded = false;
+    bool terminating = !onlyGateways;  // only gateways are then cut short
     std::unique_lock lock(mutex);
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
+        if (!terminating && terminationPending()) {
+            terminating = true;
+            end = std::min(end,
+                           std::chrono::steady_clock::now() + std::chrono::seconds(kCycleBudget));
+        }
         exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
                    residentMemory() - residentBefore > kMostGrowth;
         if (exceeded) endTransfers();

@@ -20,7 +20,8 @@ enum class Peer {
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
 /// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. That is also what it finds after kMostReceived. Also holds termination signals back and keeps a closed
+/// the peer had closed the connection. That is also what it finds after kMostReceived. A call to a gateway also ends with
+/// the stop budget. Also holds termination signals back and keeps a closed
 /// connection from raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:

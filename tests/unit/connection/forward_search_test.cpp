@@ -1,3 +1,5 @@
+#include "common/stop_budget.h"
+#include "common/termination.h"
 #include "connection_fixture.h"
 
 namespace pelorus {
@@ -25,6 +27,17 @@ TEST_F(ForwardSearchTest, GatewayThatRefusesAllIsAskedABoundedNumberOfTimes) {
     // 100 candidates in the first cycle; the last one is then known as bad.
     EXPECT_EQ(gateway.count(" -> "), 100 + 99 + 99);
     EXPECT_TRUE(web.urls().empty());
+}
+
+TEST_F(ForwardSearchTest, EndsWithTheStopBudgetNotWithTheSignal) {
+    givenGateway();
+    gateway.refuseAllPorts();
+    gateway.onCall([&](const std::string& call) {
+        if (call.find("map TCP 9100 ") == 0) sigConnKilled = SIGTERM;
+        if (call.find("map TCP 9102 ") == 0) renewStopBudget(0);
+    });
+    EXPECT_EQ(search(), "0");
+    EXPECT_EQ(gateway.count(" -> "), 12);
 }
 
 TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOther) {

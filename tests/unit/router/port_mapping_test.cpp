@@ -1,3 +1,7 @@
+#include <csignal>
+
+#include "common/stop_budget.h"
+#include "common/termination.h"
 #include "unit/router/router_fixture.h"
 
 namespace pelorus {
@@ -125,6 +129,18 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     EXPECT_EQ(log.countPart("destroyed HTTP"), 0);
     wait(302401);
     EXPECT_EQ(gateway.calls(), Texts{});
+}
+
+TEST_F(PortMappingTest, AnEndlessTableEndsWithTheStopBudget) {
+    discovered();
+    gateway.lie = {0, "192.168.77.20", "80", "another", "7000", "TCP"};
+    gateway.onCall([&](const std::string& call) {
+        if (call == "entry #5") sigConnKilled = SIGTERM;
+        if (call == "entry #8") renewStopBudget(0);
+    });
+    router.unmapAllPorts("TCP", "Kavra");
+    EXPECT_EQ(gateway.calls().back(), "entry #8");
+    EXPECT_EQ(gateway.calls().size(), 9U);
 }
 
 TEST_F(PortMappingTest, RenewsAfterHalfAWeek) {

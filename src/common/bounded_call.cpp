@@ -5,11 +5,13 @@
 
 #include <dlfcn.h>
 #include <netinet/in.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
@@ -17,6 +19,7 @@
 #include <cstdio>
 #include <limits>
 #include <system_error>
+#include <vector>
 
 #include "common/handles.h"
 #include "common/stop_budget.h"
@@ -43,6 +46,21 @@ bool terminationPending() {
 bool isSocket(int descriptor) {
     struct stat status {};
     return fstat(descriptor, &status) == 0 && S_ISSOCK(status.st_mode);
+}
+
+// One call instead of one for each possible descriptor: many requests are made.
+std::vector<int> openSockets() {
+    std::array<pollfd, kHighestDescriptor + 1> all{};
+    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
+        all[static_cast<std::size_t>(descriptor)].fd = descriptor;
+    }
+    const bool known = poll(all.data(), all.size(), 0) >= 0;
+    std::vector<int> found;
+    for (const pollfd& entry : all) {
+        const bool closed = known && (entry.revents & POLLNVAL) != 0;
+        if (!closed && isSocket(entry.fd)) found.push_back(entry.fd);
+    }
+    return found;
 }
 
 // Bytes, 0 when unknown.
@@ -90,10 +108,8 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
-BoundedCall::BoundedCall(Peer peer, int seconds) : residentBefore{residentMemory()} {
-    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
-        if (isSocket(descriptor)) before.insert(descriptor);
-    }
+BoundedCall::BoundedCall(Peer peer, int seconds)
+    : before{openSockets()}, residentBefore{residentMemory()} {
     if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
     onlyGateways = peer == Peer::GATEWAY;
     mayReceive = kMostReceived;
@@ -135,8 +151,8 @@ void BoundedCall::watch(int seconds) {
 
 void BoundedCall::endTransfers() const {
     mayReceive = 0;
-    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
-        if (before.count(descriptor) == 0 && isSocket(descriptor)) {
+    for (const int descriptor : openSockets()) {
+        if (!std::binary_search(before.begin(), before.end(), descriptor)) {
             // Fails for a socket without a peer, and still ends a wait for datagrams. What is
             // queued stays, and under a flood never ends.
             static_cast<void>(shutdown(descriptor, SHUT_RDWR));

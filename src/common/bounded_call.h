@@ -5,8 +5,8 @@
 
 #include <condition_variable>
 #include <mutex>
-#include <set>
 #include <thread>
+#include <vector>
 
 #include "common/signal_block.h"
 
@@ -41,7 +41,7 @@ private:
 
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
-    std::set<int> before;  // descriptors that were open
+    std::vector<int> before;  // sockets that were open, in order
     std::mutex mutex;
     std::condition_variable ended;
     long residentBefore;  // bytes

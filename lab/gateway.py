@@ -5,7 +5,7 @@ from __future__ import annotations
 import re
 import socket
 import threading
-from dataclasses import dataclass
+from dataclasses import dataclass, replace
 from pathlib import Path
 
 from lab import natpmp, network, packet_filter, web
@@ -140,6 +140,14 @@ class Gateway:
             raise LabError("only the lab's own NAT-PMP server can be told to hang")
         self._natpmp.hang_once(seconds)
         self._timeline.add("gateway", f"will hang for {seconds} s at the next request")
+
+    def behave(self, personality: Personality) -> None:
+        """Let the lab's own UPnP server behave differently from now on."""
+        if not self._scripted:
+            raise LabError("only the lab's own UPnP server has a personality")
+        self._scripted.personality = personality
+        self._setup = replace(self._setup, personality=personality)
+        self._timeline.add("gateway", "behaves differently")
 
     def lose(self, *external_ports: int) -> None:
         """Drop the forwardings of these ports, or all, without notice.

@@ -7,14 +7,14 @@ import socket
 import struct
 import threading
 import time
-from collections.abc import Callable, Iterable
-from dataclasses import dataclass
+from collections.abc import Callable, Iterable, Mapping
+from dataclasses import dataclass, field
 from http.server import BaseHTTPRequestHandler, ThreadingHTTPServer
 from urllib.parse import urlsplit
 from xml.sax.saxutils import escape
 
 from lab import network, packet_filter
-from lab.packet_filter import Mapping
+from lab.packet_filter import Mapping as Forwarding
 
 HTTP_PORT = 5000
 
@@ -90,13 +90,16 @@ class Personality:
     A search is answered once for each URL that `locations` gives for the gateway's own base URL.
     `deliver` cuts the description's head and body into what is sent. The description names
     `control_url`, which may be relative. Each answer of the control service comes `delay` seconds
-    late, in real time.
+    late, in real time; to the actions in `errors` it is that error number. With `endless_list`, the
+    list of its mappings has no end.
     """
 
     locations: Callable[[str], Iterable[str]] = own_description
     deliver: Callable[[bytes, bytes], Iterable[bytes]] = whole
     control_url: str = "/control"
     delay: float = 0
+    errors: Mapping[str, int] = field(default_factory=dict)
+    endless_list: bool = False
 
 
 class ScriptedGateway:
@@ -105,7 +108,7 @@ class ScriptedGateway:
     def __init__(self, personality: Personality, public_address: Callable[[], str]) -> None:
         self.personality = personality
         self._public_address = public_address
-        self._descriptions: dict[Mapping, str] = {}
+        self._descriptions: dict[Forwarding, str] = {}
         self._lock = threading.Lock()
         self._stopping = threading.Event()
         self._actions: dict[str, Callable[[Arguments], Answer]] = {
@@ -149,8 +152,8 @@ class ScriptedGateway:
         """The answer of the control service: an error number or 0, and values."""
         time.sleep(self.personality.delay)
         perform = self._actions.get(action)
-        if perform is None:
-            return _NO_SUCH_ACTION, {}
+        if perform is None or action in self.personality.errors:
+            return self.personality.errors.get(action, _NO_SUCH_ACTION), {}
         with self._lock:
             return perform(arguments)
 
@@ -183,8 +186,8 @@ class ScriptedGateway:
         return 0, {"NewExternalIPAddress": self._public_address()}
 
     def _add(self, arguments: Arguments) -> Answer:
-        wanted = Mapping(arguments["NewProtocol"], int(arguments["NewExternalPort"]),
-                         arguments["NewInternalClient"], int(arguments["NewInternalPort"]))
+        wanted = Forwarding(arguments["NewProtocol"], int(arguments["NewExternalPort"]),
+                            arguments["NewInternalClient"], int(arguments["NewInternalPort"]))
         held = self._held(arguments)
         if held and held.internal_address != wanted.internal_address:
             return _CONFLICT, {}
@@ -207,19 +210,22 @@ class ScriptedGateway:
 
     def _generic_entry(self, arguments: Arguments) -> Answer:
         index, mappings = int(arguments["NewPortMappingIndex"]), packet_filter.mappings()
-        if index >= len(mappings):
+        if self.personality.endless_list:
+            mapping = Forwarding("UDP", index, network.NEIGHBOUR_ADDRESS, index)
+        elif index < len(mappings):
+            mapping = mappings[index]
+        else:
             return _NOT_IN_ARRAY, {}
-        mapping = mappings[index]
         return 0, {"NewRemoteHost": "", "NewExternalPort": str(mapping.external_port),
                    "NewProtocol": mapping.protocol, **self._entry(mapping)}
 
-    def _entry(self, mapping: Mapping) -> Arguments:
+    def _entry(self, mapping: Forwarding) -> Arguments:
         return {"NewInternalPort": str(mapping.internal_port),
                 "NewInternalClient": mapping.internal_address, "NewEnabled": "1",
                 "NewPortMappingDescription": self._descriptions.get(mapping, ""),
                 "NewLeaseDuration": "0"}
 
-    def _held(self, arguments: Arguments) -> Mapping | None:
+    def _held(self, arguments: Arguments) -> Forwarding | None:
         """The forwarding of the external port and protocol, whoever made it."""
         wanted = arguments["NewProtocol"], int(arguments["NewExternalPort"])
         return next((mapping for mapping in packet_filter.mappings()

@@ -163,24 +163,24 @@ void BoundedCall::endTransfers() const {
 }  // namespace pelorus
 
 // Stands in for the C library's connect, also for the libraries that are linked dynamically.
-extern "C" int connect(int socket, const sockaddr* address, socklen_t size) {
-    if (pelorus::onlyGateways && !pelorus::isGatewayAddress(address, size)) {
+extern "C" int connect(int fd, const sockaddr* addr, socklen_t len) {
+    if (pelorus::onlyGateways && !pelorus::isGatewayAddress(addr, len)) {
         errno = EACCES;
         return -1;
     }
-    return pelorus::libcConnect(socket, address, size);
+    return pelorus::libcConnect(fd, addr, len);
 }
 
 // The same for recvfrom: memory must not depend on how soon the watcher looks.
 extern "C" ssize_t recvfrom(
-    int socket, void* buffer, size_t size, int flags, sockaddr* from, socklen_t* fromSize) {
+    int fd, void* buf, size_t n, int flags, sockaddr* addr, socklen_t* len) {
     static const auto call = pelorus::original<decltype(recvfrom)>("recvfrom");
     if (call == nullptr) {
         errno = ENOSYS;
         return -1;
     }
     if (pelorus::mayReceive <= 0) return 0;
-    const ssize_t received = call(socket, buffer, size, flags, from, fromSize);
+    const ssize_t received = call(fd, buf, n, flags, addr, len);
     if (received > 0 && pelorus::mayReceive != pelorus::kEverything) {
         pelorus::mayReceive -= received;
     }

@@ -29,7 +29,7 @@ namespace pelorus {
 namespace {
 
 constexpr std::chrono::milliseconds kLook{20};
-constexpr int kHighestDescriptor = 1023;
+constexpr std::size_t kMostDescriptors = 1024;
 
 constexpr long kEverything = std::numeric_limits<long>::max();
 
@@ -50,10 +50,9 @@ bool isSocket(int descriptor) {
 
 // One call instead of one for each possible descriptor: many requests are made.
 std::vector<int> openSockets() {
-    std::array<pollfd, kHighestDescriptor + 1> all{};
-    for (int descriptor = 0; descriptor <= kHighestDescriptor; ++descriptor) {
-        all[static_cast<std::size_t>(descriptor)].fd = descriptor;
-    }
+    std::array<pollfd, kMostDescriptors> all{};
+    int next = 0;
+    for (pollfd& entry : all) entry.fd = next++;
     const bool known = poll(all.data(), all.size(), 0) >= 0;
     std::vector<int> found;
     for (const pollfd& entry : all) {

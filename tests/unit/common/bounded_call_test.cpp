@@ -16,7 +16,7 @@ protected:
         address.sin_family = AF_INET;
         address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t size = sizeof address;
-        bind(server, reinterpret_cast<sockaddr*>(&address), size);
+        EXPECT_EQ(bind(server, reinterpret_cast<sockaddr*>(&address), size), 0);
         listen(server, 1);
         getsockname(server, reinterpret_cast<sockaddr*>(&address), &size);
     }
@@ -64,7 +64,7 @@ TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
         sockaddr_in here{};
         here.sin_family = AF_INET;
         here.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        bind(receiver, reinterpret_cast<sockaddr*>(&here), sizeof here);
+        EXPECT_EQ(bind(receiver, reinterpret_cast<sockaddr*>(&here), sizeof here), 0);
         socklen_t size = sizeof here;
         getsockname(receiver, reinterpret_cast<sockaddr*>(&here), &size);
         char letters[1000] = {};

@@ -1,4 +1,4 @@
-"""Gateways that attack: the daemon neither hangs nor fills up nor rides into its own device."""
+"""Gateways that attack: the daemon does not hang, fill the memory or ask its own device."""
 
 from __future__ import annotations
 

@@ -5,12 +5,13 @@ from __future__ import annotations
 import re
 import socket
 import threading
-from dataclasses import dataclass
+from dataclasses import dataclass, replace
 from pathlib import Path
 
 from lab import natpmp, network, packet_filter, web
 from lab.natpmp import Grant, NatPmp
 from lab.packet_filter import BY_HAND, Mapping
+from lab.scripted_gateway import Personality, ScriptedGateway
 from lab.server import Server
 from lab.support import LabError, wait_until
 from lab.timeline import Timeline
@@ -34,7 +35,7 @@ class GatewaySetup:
     """What a home router offers; with neither protocol it only masquerades.
 
     `secure` lets clients map to themselves only. With `grant`, the lab's own NAT-PMP server answers
-    and grants that.
+    and grants that. With `personality`, the lab's own UPnP server answers and behaves like that.
     """
 
     upnp: bool = True
@@ -42,15 +43,17 @@ class GatewaySetup:
     permissions: tuple[str, ...] = EVERY_PORT
     secure: bool = True
     grant: Grant | None = None
+    personality: Personality | None = None
 
     @property
     def needs_miniupnpd(self) -> bool:
         """True when miniupnpd speaks one of the protocols."""
-        return self.upnp or (self.natpmp and not self.grant)
+        return (self.upnp and not self.personality) or (self.natpmp and not self.grant)
 
     def __str__(self) -> str:
         protocols = [name for name, on in (("UPnP", self.upnp), ("NAT-PMP", self.natpmp)) if on]
-        rules = "ports of its own choice" if self.grant else ", ".join(self.permissions)
+        own = self.grant or self.personality
+        rules = "ports of its own choice" if own else ", ".join(self.permissions)
         return f"{' and '.join(protocols) or 'no protocol'} ({rules})"
 
 
@@ -78,6 +81,7 @@ class Gateway:
         self._clock = clock
         self._http_port = _FIRST_HTTP_PORT
         self._natpmp: NatPmp | None = None
+        self._scripted: ScriptedGateway | None = None
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
                               "-P", str(folder / "pid")], folder / "log", clock)
@@ -136,6 +140,14 @@ class Gateway:
             raise LabError("only the lab's own NAT-PMP server can be told to hang")
         self._natpmp.hang_once(seconds)
         self._timeline.add("gateway", f"will hang for {seconds} s at the next request")
+
+    def behave(self, personality: Personality) -> None:
+        """Let the lab's own UPnP server behave differently from now on."""
+        if not self._scripted:
+            raise LabError("only the lab's own UPnP server has a personality")
+        self._scripted.personality = personality
+        self._setup = replace(self._setup, personality=personality)
+        self._timeline.add("gateway", "behaves differently")
 
     def lose(self, *external_ports: int) -> None:
         """Drop the forwardings of these ports, or all, without notice.
@@ -229,6 +241,9 @@ class Gateway:
         if self._setup.natpmp and self._setup.grant:
             self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
             self._natpmp.start(self.lan_address)
+        if self._setup.upnp and self._setup.personality:
+            self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address)
+            self._scripted.start(self.lan_address)
         if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())
             self.server.start(self._answers)
@@ -243,6 +258,9 @@ class Gateway:
         if self._natpmp:
             self._natpmp.stop()
             self._natpmp = None
+        if self._scripted:
+            self._scripted.stop()
+            self._scripted = None
 
     def _forget_leases(self, lost: list[Mapping]) -> None:
         """Remove mappings from the file from which miniupnpd restores them at its start."""
@@ -256,7 +274,7 @@ class Gateway:
         yes_no = {True: "yes", False: "no"}
         return "\n".join([
             "ext_ifname=wan", "listening_ip=lan", f"port={self._http_port}",
-            f"enable_upnp={yes_no[self._setup.upnp]}",
+            f"enable_upnp={yes_no[self._setup.upnp and not self._setup.personality]}",
             f"enable_natpmp={yes_no[self._setup.natpmp and not self._setup.grant]}",
             "force_igd_desc_v1=yes", f"secure_mode={yes_no[self._setup.secure]}",
             "system_uptime=no", f"lease_file={self._leases}",
@@ -268,7 +286,7 @@ class Gateway:
 
     def _answers(self) -> bool:
         """True when every protocol on offer answers a client on the LAN."""
-        return ((not self._setup.upnp or _description_is_served())
+        return ((not self._setup.upnp or bool(self._scripted) or _description_is_served())
                 and (not self._setup.natpmp or self._public_address_is_told()))
 
     def _public_address_is_told(self) -> bool:

@@ -2,14 +2,18 @@
  *
  * libfaketime speeds up pauses and the clock. Network peers still answer in real time, so poll
  * waits a fixed fraction of the requested time, whatever the clock's factor: enough for hosts on one
- * machine. libnatpmp waits with select and times its retries with gettimeofday. Both stay in real
- * time; otherwise it would repeat a request before a busy machine has answered.
+ * machine. The same for a wait on a condition with a clock of its own, which libfaketime would leave
+ * to end at a time that never comes. libnatpmp waits with select and times its retries with
+ * gettimeofday. Both stay in real time; otherwise it would repeat a request before a busy machine has
+ * answered.
  *
  * kill fails with EPERM for the signal whose number is in the file REFUSED_SIGNAL.
  */
 #define _GNU_SOURCE
+#include <dlfcn.h>
 #include <errno.h>
 #include <poll.h>
+#include <pthread.h>
 #include <signal.h>
 #include <stdio.h>
 #include <sys/select.h>
@@ -24,6 +28,22 @@ int poll(struct pollfd* fds, nfds_t count, int milliseconds) {
     long long nanoseconds = milliseconds * 1000000LL / FASTER;
     struct timespec limit = {nanoseconds / 1000000000, nanoseconds % 1000000000};
     return (int)syscall(SYS_ppoll, fds, count, milliseconds < 0 ? NULL : &limit, NULL, 0);
+}
+
+int pthread_cond_clockwait(pthread_cond_t* condition, pthread_mutex_t* mutex, clockid_t clock,
+                           const struct timespec* end) {
+    int (*original)(pthread_cond_t*, pthread_mutex_t*, clockid_t, const struct timespec*);
+    struct timespec now, limit;
+    *(void**)&original = dlsym(RTLD_NEXT, "pthread_cond_clockwait");
+    clock_gettime(clock, &now);
+    syscall(SYS_clock_gettime, clock, &limit);
+    long long nanoseconds =
+        limit.tv_nsec +
+        ((end->tv_sec - now.tv_sec) * 1000000000LL + end->tv_nsec - now.tv_nsec) / FASTER;
+    if (nanoseconds < 0) nanoseconds = 0;
+    limit.tv_sec += nanoseconds / 1000000000;
+    limit.tv_nsec = nanoseconds % 1000000000;
+    return original(condition, mutex, clock, &limit);
 }
 
 int select(int count, fd_set* in, fd_set* out, fd_set* other, struct timeval* timeout) {

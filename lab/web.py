@@ -24,7 +24,7 @@ _NO_LINGERING = struct.pack("ii", 1, 0)
 
 @dataclass(frozen=True)
 class Request:
-    """One GET as it came in; `url` is the exact path and query."""
+    """One request as it came in; `url` is the exact path and query."""
 
     when: float
     scheme: str
@@ -58,7 +58,7 @@ Answer = Callable[[Request], Reply]
 
 
 class WebServer(ThreadingHTTPServer):
-    """Serves GET on one address of one host, plain or over TLS."""
+    """Serves GET, and POST alike, on one address of one host, plain or over TLS."""
 
     daemon_threads = True
     request_queue_size = 64
@@ -121,6 +121,9 @@ class _Handler(BaseHTTPRequestHandler):
         self.send_header("Content-Length", str(len(reply.body)))
         self.end_headers()
         self.wfile.write(reply.body)
+
+    def do_POST(self) -> None:
+        self.do_GET()
 
     def log_message(self, *_arguments: object) -> None:
         """Stay silent: requests are recorded where they are answered."""

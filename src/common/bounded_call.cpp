@@ -1,45 +1,64 @@
+// The fortified recvfrom is an inline function, which could not be replaced below.
+#undef _FORTIFY_SOURCE
+
 #include "common/bounded_call.h"
 
-#include <dirent.h>
 #include <dlfcn.h>
 #include <fcntl.h>
 #include <netinet/in.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
+#include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <csignal>
 #include <cstdlib>
 #include <cstring>
+#include <limits>
 #include <system_error>
+#include <vector>
 
-#include "common/handles.h"
-#include "common/text.h"
+#include "common/stop_budget.h"
 
 namespace pelorus {
 
 namespace {
 
 constexpr std::chrono::milliseconds kLook{20};
+constexpr std::size_t kMostDescriptors = 1024;
 
-using DirectoryHandle = std::unique_ptr<DIR, Releaser<closedir>>;
+constexpr long kEverything = std::numeric_limits<long>::max();
 
-bool onlyGateways = false;  // connect() below refuses everybody else
+bool onlyGateways = false;                  // connect() below refuses everybody else
+std::atomic<long> mayReceive{kEverything};  // bytes; then recvfrom() below finds the end
+
+bool terminationPending() {
+    sigset_t pending;
+    if (sigpending(&pending) != 0) return false;
+    return sigismember(&pending, SIGINT) == 1 || sigismember(&pending, SIGTERM) == 1 ||
+           sigismember(&pending, SIGQUIT) == 1;
+}
 
 bool isSocket(int descriptor) {
     struct stat status {};
     return fstat(descriptor, &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
-std::set<int> openSockets() {
-    std::set<int> found;
-    const DirectoryHandle list{opendir("/proc/self/fd")};
-    // NOLINTNEXTLINE(concurrency-mt-unsafe): each thread reads a list of its own
-    while (const dirent* entry = list ? readdir(list.get()) : nullptr) {
-        const int descriptor = leadingInt(entry->d_name);
-        if (isSocket(descriptor)) found.insert(descriptor);
+// One call instead of one for each possible descriptor: many requests are made.
+std::vector<int> openSockets() {
+    std::array<pollfd, kMostDescriptors> all{};
+    int next = 0;
+    for (pollfd& entry : all) entry.fd = next++;
+    const bool known = poll(all.data(), all.size(), 0) >= 0;
+    std::vector<int> found;
+    for (const pollfd& entry : all) {
+        const bool closed = known && (entry.revents & POLLNVAL) != 0;
+        if (!closed && isSocket(entry.fd)) found.push_back(entry.fd);
     }
     return found;
 }
@@ -55,10 +74,15 @@ long residentMemory() {
     return second == nullptr ? 0 : std::atol(second) * sysconf(_SC_PAGESIZE);
 }
 
+// The C library's function of this name and type.
+template <typename Function>
+Function* original(const char* name) {
+    return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
+}
+
 int libcConnect(int socket, const sockaddr* address, socklen_t size) {
-    using Connect = int (*)(int, const sockaddr*, socklen_t);
-    static const auto original = reinterpret_cast<Connect>(dlsym(RTLD_NEXT, "connect"));
-    if (original != nullptr) return original(socket, address, size);
+    static const auto call = original<decltype(connect)>("connect");
+    if (call != nullptr) return call(socket, address, size);
     errno = ENOSYS;
     return -1;
 }
@@ -87,7 +111,9 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 BoundedCall::BoundedCall(Peer peer, int seconds)
     : before{openSockets()}, residentBefore{residentMemory()} {
+    if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
     onlyGateways = peer == Peer::GATEWAY;
+    mayReceive = kMostReceived;
     try {
         watcher = std::thread([this, seconds] { watch(seconds); });
     } catch (const std::system_error&) {
@@ -103,34 +129,61 @@ BoundedCall::~BoundedCall() {
     ended.notify_one();
     if (watcher.joinable()) watcher.join();
     onlyGateways = false;
+    mayReceive = kEverything;
 }
 
 // The library may open further sockets after the first ones were shut, hence every time.
 void BoundedCall::watch(int seconds) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
     bool exceeded = false;
+    bool terminating = !onlyGateways;  // only gateways are then cut short
     std::unique_lock lock(mutex);
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
+        if (!terminating && terminationPending()) {
+            terminating = true;
+            end = std::min(end,
+                           std::chrono::steady_clock::now() + std::chrono::seconds(kCycleBudget));
+        }
         exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
                    residentMemory() - residentBefore > kMostGrowth;
-        if (exceeded) shutSockets();
+        if (exceeded) endTransfers();
     }
 }
 
-void BoundedCall::shutSockets() const {
+void BoundedCall::endTransfers() const {
+    mayReceive = 0;
     for (const int descriptor : openSockets()) {
-        // Fails for a socket without a peer, and still ends a wait for datagrams.
-        if (before.count(descriptor) == 0) static_cast<void>(shutdown(descriptor, SHUT_RDWR));
+        if (!std::binary_search(before.begin(), before.end(), descriptor)) {
+            // Fails for a socket without a peer, and still ends a wait for datagrams. What is
+            // queued stays, and under a flood never ends.
+            static_cast<void>(shutdown(descriptor, SHUT_RDWR));
+        }
     }
 }
 
 }  // namespace pelorus
 
 // Stands in for the C library's connect, also for the libraries that are linked dynamically.
-extern "C" int connect(int socket, const sockaddr* address, socklen_t size) {
-    if (pelorus::onlyGateways && !pelorus::isGatewayAddress(address, size)) {
+extern "C" int connect(int fd, const sockaddr* addr, socklen_t len) {
+    if (pelorus::onlyGateways && !pelorus::isGatewayAddress(addr, len)) {
         errno = EACCES;
         return -1;
     }
-    return pelorus::libcConnect(socket, address, size);
+    return pelorus::libcConnect(fd, addr, len);
+}
+
+// The same for recvfrom: memory must not depend on how soon the watcher looks.
+extern "C" ssize_t recvfrom(
+    int fd, void* buf, size_t n, int flags, sockaddr* addr, socklen_t* len) {
+    static const auto call = pelorus::original<decltype(recvfrom)>("recvfrom");
+    if (call == nullptr) {
+        errno = ENOSYS;
+        return -1;
+    }
+    if (pelorus::mayReceive <= 0) return 0;
+    const ssize_t received = call(fd, buf, n, flags, addr, len);
+    if (received > 0 && pelorus::mayReceive != pelorus::kEverything) {
+        pelorus::mayReceive -= received;
+    }
+    return received;
 }

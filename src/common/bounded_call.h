@@ -5,8 +5,8 @@
 
 #include <condition_variable>
 #include <mutex>
-#include <set>
 #include <thread>
+#include <vector>
 
 #include "common/signal_block.h"
 
@@ -20,12 +20,15 @@ enum class Peer {
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
 /// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. Also holds termination signals back and keeps a closed
-/// connection from raising SIGPIPE. One at a time; not around child processes.
+/// the peer had closed the connection. So it does after kMostReceived, and a call to a gateway when
+/// the stop budget is spent. Also holds termination signals back and keeps a closed connection from
+/// raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:
     /// Bytes of resident memory.
     static constexpr long kMostGrowth = 8L * 1024 * 1024;
+    /// Bytes that recvfrom returns in one call, on all sockets.
+    static constexpr long kMostReceived = 4L * 1024 * 1024;
 
     BoundedCall(Peer peer, int seconds);
     ~BoundedCall();
@@ -34,11 +37,11 @@ public:
 
 private:
     void watch(int seconds);
-    void shutSockets() const;
+    void endTransfers() const;
 
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
-    std::set<int> before;  // sockets that were open
+    std::vector<int> before;  // sockets that were open, in order
     std::mutex mutex;
     std::condition_variable ended;
     long residentBefore;  // bytes

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "common/log.h"
+#include "common/stop_budget.h"
 #include "connection/port_forwarding.h"
 
 namespace pelorus {
@@ -24,7 +25,7 @@ int ForwardSearch::run() {
     if (manager.deviceType == kMakersRouter) {
         if (const auto result = tryPredefinedPorts()) return *result;
     }
-    for (int cycle = 1; cycle <= kSearchCycles; ++cycle) {
+    for (int cycle = 1; cycle <= kSearchCycles && !stopBudgetSpent(); ++cycle) {
         if (mapCandidate()) {
             if (request.type == HTTPS) return externalPort;
             if (const auto result = testCandidate(cycle)) return *result;
@@ -87,7 +88,7 @@ bool ForwardSearch::mapStartPort() {
 }
 
 bool ForwardSearch::mapInExtendedRange() {
-    for (int k = 0; k < kExtendedRangePorts; ++k) {
+    for (int k = 0; k < kExtendedRangePorts && !stopBudgetSpent(); ++k) {
         externalPort = request.extendedStartPort + k;
         if (isBadPort(externalPort)) continue;
         unmapEarlierPorts();

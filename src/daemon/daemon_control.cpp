@@ -9,6 +9,7 @@
 #include "cloud/tavik_client.h"
 #include "common/log.h"
 #include "common/pause.h"
+#include "common/stop_budget.h"
 #include "common/termination.h"
 #include "config/global_config.h"
 #include "connection/connection_manager.h"
@@ -77,6 +78,7 @@ void DaemonControl::shutDown() {
     TavikClient::getInstance()->sendAnalytics("disabled", lastConnectionType, SUBTYPE_NONE);
     TavikClient::getInstance()->updateLocalCommStatus("disabled");
     stopRequested = false;
+    renewStopBudget(kCleanUpBudget);
     ConnectionManager::getInstance()->killConnection(PORTFORWARDED);
     ConnectionManager::getInstance()->killConnection(RELAYED);
     logInfo("DaemonControl::run - Remote access disabled.\n");

@@ -16,6 +16,7 @@
 #include "common/miniupnpc_api.h"
 #include "common/text.h"
 #include "config/scrub.h"
+#include "router/gateway_url.h"
 #include "router/router.h"
 
 namespace pelorus {
@@ -23,6 +24,8 @@ namespace pelorus {
 namespace {
 
 constexpr int kDiscoverDelay = 2000;  // milliseconds
+constexpr int kMostDevices = 100;     // the answers beyond are neither looked at nor logged
+constexpr std::size_t kMostGateways = 8;
 
 using Interfaces = std::unique_ptr<ifaddrs, Releaser<freeifaddrs>>;
 using Devices = std::unique_ptr<UPNPDev, Releaser<freeUPNPDevlist>>;
@@ -69,9 +72,10 @@ std::string textOf(const char* text) {
 
 void logDevices(const UPNPDev* device) {
     logInfo("Router::upnp_discover - List of UPNP devices found on the network :\n");
-    for (; device != nullptr; device = device->pNext) {
+    for (int count = 0; device != nullptr && count < kMostDevices; ++count) {
         logInfo(" desc: %s\n st: %s\n\n", scrubSecrets(textOf(device->descURL)).c_str(),
                 scrubSecrets(textOf(device->st)).c_str());
+        device = device->pNext;
     }
 }
 
@@ -84,12 +88,24 @@ bool isGateway(const UPNPDev& device) {
     return wanted && !contains(textOf(device.descURL), "udhisapi.dll");
 }
 
-// Copies the gateways from the list that starts at @p device, in order. The strings still belong to
-// that list.
+// False, with a line that says so, when a gateway's description is not on another host.
+bool isReachable(const UPNPDev& gateway) {
+    const std::string url = textOf(gateway.descURL);
+    if (leadsToAnotherHost(url)) return true;
+    logNotice(
+        "Router::upnp_discover - gateway ignored, its description is not at another host's IPv4 address: %s\n",
+        scrubSecrets(url).c_str());
+    return false;
+}
+
+// Copies the gateways from the list that starts at @p device, in order, up to the most that are
+// tried. The strings still belong to that list.
 std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
     std::vector<UPNPDev> gateways;
-    for (; device != nullptr; device = device->pNext) {
-        if (isGateway(*device)) gateways.push_back(*device);
+    for (int count = 0; device != nullptr && count < kMostDevices; ++count) {
+        if (isGateway(*device) && isReachable(*device)) gateways.push_back(*device);
+        if (gateways.size() == kMostGateways) break;
+        device = device->pNext;
     }
     UPNPDev* next = nullptr;
     for (auto gateway = gateways.rbegin(); gateway != gateways.rend(); ++gateway) {
@@ -202,8 +218,16 @@ bool Router::useGateway(UPNPDev& gateways) {
         return false;
     }
     const UrlContents contents(&urls);
+    const std::string url = textOf(urls.controlURL);
+    // The description may send us anywhere, whoever served it.
+    if (!leadsToAnotherHost(url)) {
+        logNotice(
+            "Router::upnp_discover - gateway ignored, its control URL is not at another host's IPv4 address: %s\n",
+            scrubSecrets(url).c_str());
+        return false;
+    }
     const char* const type = data.first.servicetype;
-    controlUrl = textOf(urls.controlURL);
+    controlUrl = url;
     serviceType.assign(type, strnlen(type, sizeof data.first.servicetype));
     logChosenDevice(state, controlUrl, lanAddress.data());
     const bool found = findExternalIp();

@@ -6,6 +6,7 @@
 #include <ctime>
 
 #include "common/miniupnpc_api.h"
+#include "common/stop_budget.h"
 
 namespace pelorus {
 
@@ -89,6 +90,7 @@ int Igd::remove(int externalPort, const std::string& protocol) const {
 bool Igd::forEach(const std::function<bool(const IgdEntry&)>& visit) const {
     const std::int64_t end = std::time(nullptr) + kLongestEnumeration;
     for (int index = 0; index <= kLastMappingIndex && std::time(nullptr) <= end; ++index) {
+        if (stopBudgetSpent()) break;
         EntryTexts texts;
         const int status = miniupnpc::call(
             UPNP_GetGenericPortMappingEntry, controlUrl.c_str(), serviceType.c_str(),

@@ -46,8 +46,8 @@ struct Igd {
     /// Removes the mapping of @p externalPort.
     [[nodiscard]] int remove(int externalPort, const std::string& protocol) const;
     /// Hands the gateway's mappings one by one to @p visit, which returns false to stop. True when
-    /// neither the gateway nor the visitor ended the list: it was cut off after 65536 entries or 60
-    /// seconds.
+    /// neither the gateway nor the visitor ended the list: it was cut off after 65536 entries, 60
+    /// seconds, or when the stop budget was spent.
     bool forEach(const std::function<bool(const IgdEntry&)>& visit) const;
 };
 

@@ -16,7 +16,7 @@ protected:
         address.sin_family = AF_INET;
         address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t size = sizeof address;
-        bind(server, reinterpret_cast<sockaddr*>(&address), size);
+        EXPECT_EQ(bind(server, reinterpret_cast<sockaddr*>(&address), size), 0);
         listen(server, 1);
         getsockname(server, reinterpret_cast<sockaddr*>(&address), &size);
     }
@@ -53,6 +53,31 @@ TEST_F(BoundedCallTest, AWaitEndsWhenTheProcessGrows) {
     const BoundedCall bounds{Peer::ANYBODY, 3600};
     const std::string received(BoundedCall::kMostGrowth + 1'000'000, 'x');
     EXPECT_EQ(ask(SOCK_STREAM), 0);
+}
+
+// Its queue is never empty, so that a shutdown alone would not end it.
+TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
+    const int sender = socket(AF_INET, SOCK_DGRAM, 0);
+    for (const int seconds : {0, 3600}) {
+        const BoundedCall bounds{Peer::ANYBODY, seconds};
+        const int receiver = socket(AF_INET, SOCK_DGRAM, 0);
+        sockaddr_in here{};
+        here.sin_family = AF_INET;
+        here.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        EXPECT_EQ(bind(receiver, reinterpret_cast<sockaddr*>(&here), sizeof here), 0);
+        socklen_t size = sizeof here;
+        getsockname(receiver, reinterpret_cast<sockaddr*>(&here), &size);
+        char letters[1000] = {};
+        long total = 0;
+        for (ssize_t received = 1; received > 0; total += received) {
+            sendto(sender, letters, sizeof letters, 0, reinterpret_cast<sockaddr*>(&here), size);
+            sendto(sender, letters, sizeof letters, 0, reinterpret_cast<sockaddr*>(&here), size);
+            received = recvfrom(receiver, letters, sizeof letters, 0, nullptr, nullptr);
+        }
+        EXPECT_LE(total, BoundedCall::kMostReceived + 1000);
+        close(receiver);
+    }
+    close(sender);
 }
 
 TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {

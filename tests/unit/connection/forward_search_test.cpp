@@ -1,3 +1,5 @@
+#include "common/stop_budget.h"
+#include "common/termination.h"
 #include "connection_fixture.h"
 
 namespace pelorus {
@@ -36,6 +38,17 @@ TEST_F(ForwardSearchTest, TestsThreeCandidatesAndRemembersThemUntilItMayWakeTheD
     web.answer("/test?", passed());
     EXPECT_EQ(story(search()), "unmap 0 0, map 9094, disk, test 9094 = 9094 9094");
     EXPECT_EQ(story(search(false, false)), "map 9091, test 9091 = 9094 9091 9091");
+}
+
+TEST_F(ForwardSearchTest, EndsWithTheStopBudgetNotWithTheSignal) {
+    givenGateway();
+    gateway.refuseAll = true;
+    gateway.onCall([&](const std::string& call) {
+        if (call.find("map TCP 9100 ") == 0) sigConnKilled = SIGTERM;
+        if (call.find("map TCP 9102 ") == 0) renewStopBudget(0);
+    });
+    EXPECT_EQ(search(), "0");
+    EXPECT_EQ(gateway.count(" -> "), 12);
 }
 
 TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOther) {

@@ -92,5 +92,34 @@ TEST_F(DiscoveryTest, TheLocalAddressIsChosenAmongTheLanInterfaces) {
     EXPECT_EQ(commands.lines().size(), 2U);
 }
 
+// clang-format off
+struct Announced { const char* name; Texts locations; const char* ownAddress; Texts asked; int refused; };
+class GatewayUrl : public RouterTest, public ::testing::WithParamInterface<Announced> {};
+const char* const kAway = "http://192.168.77.3/";
+INSTANTIATE_TEST_SUITE_P(, GatewayUrl, ::testing::Values(
+    Announced{"OfAnotherHostIsTried", {kAway, "http://10.0.0.1:80", "http://0192.168.77.3/"}, "192.168.77.10", {"igd http://192.168.77.3/ http://10.0.0.1:80"}, 1},
+    Announced{"OnLoopbackIsRefused", {"http://127.0.0.1/", "http://127.9.9.9:8080/a", "http://0.0.0.0/", "http://0.1.2.3/"}, "192.168.77.10", {}, 4},
+    Announced{"OfThisDeviceIsRefused", {"http://192.168.77.10/", "http://192.168.77.10:81/b"}, "192.168.77.10", {}, 2},
+    Announced{"WithoutADottedAddressIsRefused", {"http://localhost/", "http://2130706433/", "http://127.1/", "http://[::1]/", "http://192.168.77.3@127.0.0.1/", "ftp://192.168.77.3/", "192.168.77.3", ""}, "192.168.77.10", {}, 8},
+    Announced{"BeyondTheEighthIsNotTried", Texts(150, kAway), "192.168.77.10", {"igd http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/ http://192.168.77.3/"}, 0},
+    Announced{"BeyondTheHundredthDeviceIsNotLookedAt", Texts(150, "http://127.0.0.1/"), "192.168.77.10", {}, 100},
+    Announced{"ThatLeadsBackToThisDeviceForControlIsRefused", {kAway}, "192.168.77.1", {"igd http://192.168.77.3/"}, 1}), RowName{});
+// clang-format on
+
+TEST_P(GatewayUrl, IsJudged) {
+    const Announced& row = GetParam();
+    const std::string target = gateway.devices[0].second;
+    gateway.devices.clear();
+    for (const std::string& location : row.locations)
+        gateway.devices.emplace_back(location, target);
+    net.interfaces = {{"eth9", "link"}, {"eth0", row.ownAddress}};
+    const bool found = router.upnp_discover();
+    EXPECT_EQ(gateway.calls("igd"), row.asked);
+    EXPECT_EQ(log.countPart("Router::upnp_discover - gateway ignored, its "), row.refused);
+    // Only where none was refused, or others were left, is the control service asked anything.
+    EXPECT_EQ(gateway.count("external ip"), found ? 1 : 0);
+    EXPECT_EQ(found, !row.asked.empty() && std::string(row.ownAddress) != "192.168.77.1");
+}
+
 }  // namespace
 }  // namespace pelorus

@@ -1,0 +1,187 @@
+"""Gateways that attack: the daemon does not hang, fill the memory or ask its own device."""
+
+from __future__ import annotations
+
+import itertools
+import re
+import time
+from collections.abc import Iterable
+from dataclasses import replace
+from pathlib import Path
+
+from lab.checks import (FAST, NO_TUNNEL, NOT_RELAYED, OPTIONS, PAGES, assert_published,
+                        assert_stops_clean, pages_from_outside, start, wait_for_log)
+from lab.gateway import GatewaySetup
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+from lab.scripted_gateway import Personality
+
+# The daemon's time runs ten times as fast, its time limits and the library's included: a gateway
+# that is to be slow for it waits a tenth, and the unit would wait 42 seconds for its end. These are
+# in real time.
+_TENFOLD = 10
+_CYCLE_SECONDS = 15
+_STOP_SECONDS = 10
+_MOST_GROWTH = 32 * 1024  # KiB
+_RESIDENT = re.compile(r"^VmHWM:\s+(\d+) kB$", re.MULTILINE)
+
+_CHUNK = b"x" * 65536
+_SLOW_AND_UNWILLING = Personality(delay=4 / _TENFOLD, errors={"AddPortMapping": 718})
+_INTO_THE_DEVICE = "http://127.0.0.1/local/comm_status?status=ridden"
+
+_ATTACKED = "upnp_discover - List of UPNP devices found"
+_NO_GATEWAY = "upnp_discover - invalid device type"
+_NO_ADDRESS = "upnp_discover - failed to get External IP address"
+_IGNORED = "upnp_discover - gateway ignored, its "
+_REFUSED = "Router::mapPort() - fail - failed to map external port"
+
+
+def _attack(personality: Personality) -> Situation:
+    return Situation(gateway=GatewaySetup(personality=personality), static=NO_TUNNEL,
+                     clock=_TENFOLD, hasty=True)
+
+
+def _drip(head: bytes, body: bytes) -> Iterable[bytes]:
+    """A byte every two seconds."""
+    for letter in head + body:
+        yield bytes([letter])
+        time.sleep(2 / _TENFOLD)
+
+
+def _endless_body(_head: bytes, _body: bytes) -> Iterable[bytes]:
+    return itertools.chain([b"HTTP/1.1 200 OK\r\n\r\n"], itertools.repeat(_CHUNK))
+
+
+def _endless_header(_head: bytes, _body: bytes) -> Iterable[bytes]:
+    return itertools.chain([b"HTTP/1.1 200 OK\r\nX-Filler: "], itertools.repeat(_CHUNK))
+
+
+def _silence(_head: bytes, _body: bytes) -> Iterable[bytes]:
+    time.sleep(60)
+    return []
+
+
+def _many_devices(base: str) -> Iterable[str]:
+    return (f"{base}/{number}.xml" for number in range(150))
+
+
+def _endless_devices(base: str) -> Iterable[str]:
+    return (f"{base}/{number}.xml" for number in itertools.count())
+
+
+@scenario(Situation(gateway=GatewaySetup(personality=Personality()), clock=FAST))
+def scripted_gateway(lab: Lab) -> None:
+    """The lab's own UPnP gateway is as good as another one: it maps both ports."""
+    start(lab, "portforwarded")
+    assert_published(lab)
+    assert pages_from_outside() == PAGES
+    assert_stops_clean(lab)
+
+
+@scenario(_attack(Personality(deliver=_drip)))
+def hostile_drip(lab: Lab) -> None:
+    """The gateway's description comes at a byte in two seconds: it is given up."""
+    _assert_endures(lab, _NO_GATEWAY)
+
+
+@scenario(_attack(Personality(deliver=_endless_body)))
+def hostile_body(lab: Lab) -> None:
+    """The gateway's description has no end: the daemon does not fill up."""
+    _assert_endures(lab, _NO_ADDRESS)
+
+
+@scenario(_attack(Personality(deliver=_endless_header)))
+def hostile_header(lab: Lab) -> None:
+    """The header of the gateway's description has no end: the daemon does not fill up."""
+    _assert_endures(lab, _NO_GATEWAY)
+
+
+@scenario(_attack(Personality(locations=_many_devices, deliver=_silence)))
+def hostile_devices(lab: Lab) -> None:
+    """150 devices answer the search and then keep silent: eight of them are asked."""
+    _assert_endures(lab, _NO_GATEWAY)
+    assert lab.gateway.upnp_requests() <= 3 * 8
+
+
+@scenario(_attack(Personality(locations=lambda _: [_INTO_THE_DEVICE])))
+def hostile_location(lab: Lab) -> None:
+    """The gateway's description is said to be on the device itself: nothing is asked there."""
+    _assert_endures(lab, _IGNORED + "description")
+
+
+@scenario(_attack(Personality(control_url=_INTO_THE_DEVICE)))
+def hostile_control_url(lab: Lab) -> None:
+    """The gateway's control service is said to be on the device itself: nothing is asked there."""
+    _assert_endures(lab, _IGNORED + "control URL")
+
+
+@scenario(_attack(Personality(locations=_endless_devices)))
+def hostile_flood(lab: Lab) -> None:
+    """Answers to the search come without end: the gateway among them is used after all."""
+    lab.start_daemon(*OPTIONS)
+    idle = _most_memory(lab)
+    lab.step("SIGTERM during the flood")
+    time.sleep(0.5)
+    _assert_stops_in_time(lab)
+    lab.step("left alone, the daemon makes the device reachable")
+    start(lab, "portforwarded")
+    assert _most_memory(lab) - idle <= _MOST_GROWTH
+    assert_published(lab)
+    assert_stops_clean(lab)
+
+
+@scenario(_attack(_SLOW_AND_UNWILLING))
+def hostile_delays(lab: Lab) -> None:
+    """Each answer takes four seconds, 300 ports are refused: SIGTERM ends search and clean-up."""
+    lab.start_daemon(*OPTIONS)
+    idle = _most_memory(lab)
+    wait_for_log(lab, _REFUSED, 2)
+    lab.step("SIGTERM during the search; the list of mappings no longer ends")
+    lab.gateway.behave(replace(_SLOW_AND_UNWILLING, endless_list=True))
+    _assert_stops_in_time(lab)
+
+    lab.step("a gateway that is only slow is used")
+    lab.gateway.behave(Personality(delay=4 / _TENFOLD))
+    start(lab, "portforwarded")
+    assert _most_memory(lab) - idle <= _MOST_GROWTH
+    assert_published(lab)
+    _assert_stops_in_time(lab)
+
+
+def _assert_endures(lab: Lab, reason: str) -> None:
+    """SIGTERM ends the attacked daemon; left alone it reports failed soon, and says why."""
+    lab.start_daemon(*OPTIONS)
+    idle = _most_memory(lab)
+    wait_for_log(lab, _ATTACKED)
+    lab.step("SIGTERM during the attack")
+    _assert_stops_in_time(lab)
+
+    lab.step("left alone, the daemon gives the gateway up")
+    lines, began = len(lab.device.messages.all), time.monotonic()
+    failures = lab.device.messages.count(NOT_RELAYED)
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, NOT_RELAYED, failures + 1)
+    assert time.monotonic() - began < _CYCLE_SECONDS
+    assert _most_memory(lab) - idle <= _MOST_GROWTH
+    assert lab.device.status == "failed"
+    # Nobody but the daemon itself reports to the device's back end.
+    assert set(lab.device.statuses_sent()) == {"connecting", "failed", "disabled"}
+    assert any(reason in line for line in lab.device.messages.texts()[lines:])
+    assert_stops_clean(lab)
+
+
+def _assert_stops_in_time(lab: Lab) -> None:
+    """SIGTERM ends the daemon well before the unit would kill it, and leaves nothing mapped."""
+    began = time.monotonic()
+    assert lab.stop_daemon() == "SIGTERM"
+    assert time.monotonic() - began < _STOP_SECONDS
+    assert lab.gateway.mappings() == []
+    assert lab.central.record is None
+    assert lab.device.status == "disabled"
+
+
+def _most_memory(lab: Lab) -> int:
+    """The most resident memory that the daemon has had, in KiB."""
+    found = _RESIDENT.search(Path(f"/proc/{lab.daemon.pid}/status").read_text())
+    assert found
+    return int(found[1])

@@ -57,15 +57,17 @@ TEST_F(DiscoveryTest, AGatewayIsUsedWhenItTellsItsAddress) {
 
 TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {
     const std::string target = gateway.devices[0].second;
-    gateway.devices = {{std::string("http://h3.lan/") + support::kDeviceAuth, support::kSubdomain},
-                       {"http://h4.lan/a.xml", "urn:schemas-upnp-org:service:WANPPPConnection:1"},
-                       {"http://h5.lan/udhisapi.dll?content=1", target},
-                       {"http://h6.lan/b.xml", target + "0"},
-                       {"http://h7.lan/c.xml", "urn:schemas-upnp-org:service:WANIPConnection:1"}};
+    gateway.devices = {
+        {std::string("http://192.168.77.3/") + support::kDeviceAuth, support::kSubdomain},
+        {"http://192.168.77.4/a.xml", "urn:schemas-upnp-org:service:WANPPPConnection:1"},
+        {"http://192.168.77.5/udhisapi.dll?content=1", target},
+        {"http://192.168.77.6/b.xml", target + "0"},
+        {"http://192.168.77.7/c.xml", "urn:schemas-upnp-org:service:WANIPConnection:1"}};
     EXPECT_TRUE(router.upnp_discover());
-    EXPECT_EQ(gateway.calls("igd"), Texts{"igd http://h4.lan/a.xml http://h7.lan/c.xml"});
-    once("http://h3.lan/*AUTH_REMOVED*\n st: *SUBDOMAIN_REMOVED*\n");
-    gateway.devices = {{"http://h5.lan/udhisapi.dll", target}};
+    EXPECT_EQ(gateway.calls("igd"),
+              Texts{"igd http://192.168.77.4/a.xml http://192.168.77.7/c.xml"});
+    once("http://192.168.77.3/*AUTH_REMOVED*\n st: *SUBDOMAIN_REMOVED*\n");
+    gateway.devices = {{"http://192.168.77.5/udhisapi.dll", target}};
     EXPECT_FALSE(router.upnp_discover());
     EXPECT_EQ(gateway.count("igd"), 1);
 }

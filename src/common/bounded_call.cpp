@@ -71,7 +71,7 @@ long residentMemory() {
     const ssize_t size = read(file, text.data(), text.size() - 1);
     static_cast<void>(close(file));
     const char* const second = size > 0 ? std::strchr(text.data(), ' ') : nullptr;
-    return second == nullptr ? 0 : std::atol(second) * sysconf(_SC_PAGESIZE);
+    return second == nullptr ? 0 : std::strtol(second, nullptr, 10) * sysconf(_SC_PAGESIZE);
 }
 
 // The C library's function of this name and type.

@@ -11,7 +11,7 @@
 namespace pelorus {
 
 /// Most that is read of a foreign file, bytes.
-inline constexpr std::size_t kMostForeignBytes = 1024 * 1024;
+inline constexpr std::size_t kMostForeignBytes = 1024UL * 1024;
 
 /// Which part of a file that is too large is read.
 enum class Part { HEAD, TAIL };

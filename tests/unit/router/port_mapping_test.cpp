@@ -116,7 +116,7 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     EXPECT_EQ(renewedAfter(302401), Texts{});
 }
 
-TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
+TEST_F(PortMappingTest, WithANatpmpGatewayAllCallsGoToNatpmp) {
     router.setReqPortMappingLifetime(600, 700);
     discovered("NAT-PMP");
     EXPECT_TRUE(map(443, 9444));

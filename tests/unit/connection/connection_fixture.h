@@ -58,17 +58,16 @@ inline constexpr const char* kShortForms[][2] = {{kWanIp, "WAN"}, {R"(192.168.77
     {R"( -> LAN:8080 Kavra\b)", ""}, {" -> LAN:8443 KavraSSL", " SSL"}, {R"((test \S+), \1, \1)", "$1 x3"}};
 
 /// Publishing: the record of the central server, then the device's own web server.
-inline std::string publish(const std::string& wan, const std::string& lan, int http, int https) {
+inline std::string publish(int http, int https, const std::string& wan = "WAN", const std::string& lan = "LAN") {
     const std::string ports = std::to_string(http) + "&" + std::to_string(https);
     return "record " + wan + "&" + lan + "&" + ports + ", tell " + wan + "&" + ports + "&" + lan + "&8080";
 }
 /// The same two without the ports.
 inline std::string withdraw(const std::string& lan) { return "record NULL&" + lan + "&0&0, drop 8080"; }
 /// The search that succeeds with its first ports.
-inline const std::string kMapAndPublish =
-    "connecting, map 9091, test 9091, map 9444 SSL, " + publish("WAN", "LAN", 9091, 9444);
+inline const std::string kMapAndPublish = "connecting, map 9091, test 9091, map 9444 SSL, " + publish(9091, 9444);
 /// The attempt with the ports that the user forwards himself.
-inline const std::string kPublishByHand = "connecting, test :18080, " + publish("WAN", "LAN", 18080, 18443);
+inline const std::string kPublishByHand = "connecting, test :18080, " + publish(18080, 18443);
 /// The end of an attempt that changed the connection type to PORTFORWARDED; its usual ports and result.
 inline const std::string kReported = "connected, status portforwarded, force 0";
 inline const std::string kForwarded = " = 9091 9444 portforwarded";

@@ -76,13 +76,11 @@ INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
     Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); },
         {"connecting type=relayed, record NULL&&0&0, drop 8080, start, "
          "connected type=relayed, status relayed, force 0 = relayed"}},
-    Row{"KeepsARunningTunnelAndEndsAForcedAttempt", [](World& w) { w.clientRuns(); },
-        {"status relayed, force 0 = relayed"}},
+    Row{"KeepsARunningTunnelAndEndsTheForce", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
     Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
         {"connecting type=relayed, record NULL&&0&0, drop 8080, start, start, start, start, "
          "failed type=relayed, status failed = failed"}},
-    Row{"KeepsEverythingWhenTheServerAsksForAWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); },
-        {" = failed"}},
+    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
     Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
     // The gateway object is new at the first, and so is the LAN address.
@@ -93,14 +91,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
             w.gateway.table.push_back({9444, kLanIp, 8443, "KavraSSL"});
         }, {"lanip, unmap 9091, unmap 9444, " + withdraw("LAN") + " = 5000 disabled",
             withdraw("LAN") + " = 5000 disabled"}},
-    Row{"ForgetsThePortsOfTheConnection", [](World& w) { w.givenForwardedPorts(); },
+    Row{"ForgetsItsPorts", [](World& w) { w.givenForwardedPorts(); },
         {"unmap 9091, unmap 9444, " + withdraw("LAN") + " = disabled"}},
     Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.upnp = false; }, {" = disabled"}},
     Row{"WithdrawsTheRecordWhenTheGatewayWentAway",
         [](World& w) { w.givenForwardedPorts(); w.gateway.upnp = false; w.cycle(); w.forget(); },
         {withdraw("LAN") + " = 9091 9444 disabled"}},
-    Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); },
-        {"lanip = disabled"}},
+    Row{"NoInternalPortKeepsTheRecord", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
     Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {
             w.givenMakersRouter("BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n", "");
         }, {"remove \"TCP,9091,192.168.77.1,80\", " + withdraw("192.168.77.1") + " = disabled"}}), RowName{});

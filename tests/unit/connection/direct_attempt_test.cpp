@@ -41,13 +41,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
         {"connecting, check 9091, range 9092, add \"TCP,9092,192.168.77.1,8080,Kavra\", test 9092 x3, status failed, "
          "remove \"TCP,9092,192.168.77.1,8080\", next port, check 9091, range 9093, "
          "add \"TCP,9093,192.168.77.1,8080,Kavra\", test 9093, check 9444, "
-         "add \"TCP,9444,192.168.77.1,8443,KavraSSL\", " + publish("WAN", "192.168.77.1", 9093, 9444) +
+         "add \"TCP,9444,192.168.77.1,8443,KavraSSL\", " + publish(9093, 9444, "WAN", "192.168.77.1") +
          ", " + kReported + " = portforwarded", "disk, test 9093 = portforwarded"}},
     Row{"PredefinedPortsOfTheMakersRouterComeFirst", [](World& w) {
             w.givenMakersRouter("OTHER,TCP,6000-6001,192.168.77.1,8888,other\n"
                 "OTHER,TCP,7000-7001,192.168.77.1,8080,web\nOTHER,TCP,1,192.168.77.1,8443,web\n");
             w.failTest(7000);
-        }, {"connecting, test 7000 x3, status failed, test 7001, " + publish("WAN", "192.168.77.1", 7001, 1) +
+        }, {"connecting, test 7000 x3, status failed, test 7001, " + publish(7001, 1, "WAN", "192.168.77.1") +
             ", " + kReported + " = portforwarded", "disk, test 7001 = portforwarded"}},
     Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
             w.gateway.refused.insert(9091);
@@ -59,8 +59,7 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
         {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},
-    Row{"CountsThePortsAsOpenWhileTheDiskSleeps", [](World& w) { w.diskIsAsleep(); },
-        {"disk" + kForwarded, "disk" + kForwarded}},
+    Row{"LetsTheDiskSleep", [](World& w) { w.diskIsAsleep(); }, {"disk" + kForwarded, "disk" + kForwarded}},
     Row{"IgnoresDiskAndIntervalWhenForced", [](World& w) { w.diskIsAsleep(); w.manager().setForceConnect(true); },
         {"force 1, connecting, test 9091, connected" + kForwarded, "connecting, test 9091, connected" + kForwarded}},
     Row{"SearchesAgainAfterAFailedRetest", [](World& w) {
@@ -70,13 +69,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
             w.gateway.refused.insert(9092);
         }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091, unmap 9444, map 9092, "
             "unmap 9091, unmap 9444, unmap 9091, unmap 9444, map 9094, disk, test 9094, map 9444 SSL, " +
-            publish("WAN", "LAN", 9094, 9444) + ", " + kReported + " = 9094 9444 portforwarded"}},
+            publish(9094, 9444) + ", " + kReported + " = 9094 9444 portforwarded"}},
     Row{"AddressThatChangesDuringARetestWakesTheDisk", [](World& w) {
             w.failTest(9091);
             const auto change = [&w](auto&) { w.gateway.externalIp = "44.128.0.77"; };
             w.commands.answer("hdparm", {"active/idle\n", 0, false, change});
         }, {"disk, test 9091 x3, status failed, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
-            publish("44.128.0.77", "LAN", 9091, 9444) + ", " + kReported + kForwarded}},
+            publish(9091, 9444, "44.128.0.77") + ", " + kReported + kForwarded}},
     Row{"DoubleNatAtARetestGoesToTheRelay", [](World& w) { w.relayWorks(); w.web.answer("/test?", kOtherNat); },
         {"disk, test 9091, " + kRelayStarts + " = 9091 9444 relayed"}},
     Row{"DoubleNatAtASearchLeavesTheHttpsPort",
@@ -85,21 +84,18 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
          "failed, " + kRelayFails + " = 9444 failed",
          "connecting, map 9091, test 9091, unmap 9091, failed, " + kRelayFails + " = 9444 failed"}},
     // An address change is worth waking the disk.
-    Row{"NewExternalAddressMakesTheMappingsAnew",
-        [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
+    Row{"MapsAnewForANewWanAddress", [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
         {"unmap 9091, unmap 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
-         publish("44.128.0.77", "LAN", 9091, 9444) + ", connected, force 0" + kForwarded, kForwarded}},
-    Row{"NewLocalAddressMakesTheMappingsAnew",
-        [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
+         publish(9091, 9444, "44.128.0.77") + ", connected, force 0" + kForwarded, kForwarded}},
+    Row{"MapsAnewForANewLanAddress", [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
         {"unmap 9091, unmap 9444, connecting, map 9091 -> 192.168.77.11:8080 Kavra, test 9091, "
-         "map 9444 -> 192.168.77.11:8443 KavraSSL, " + publish("WAN", "192.168.77.11", 9091, 9444) +
+         "map 9444 -> 192.168.77.11:8443 KavraSSL, " + publish(9091, 9444, "WAN", "192.168.77.11") +
          ", connected, force 0 = portforwarded"}},
     // A skipped test is no evidence against the ports.
     Row{"TestsThePortsWithoutTheirGateway",
         [](World& w) { w.gateway.upnp = false; w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },
         {kForwarded, "test :9091" + kForwarded}},
-    Row{"ClosedPortsWithoutTheirGatewayAreForgotten",
-        [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
+    Row{"ForgetsPortsWithoutAGateway", [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
         {"test :9091 x3, status failed, elapsed 0, " + kRelayFails + " = 9091 9444 failed", "elapsed 130, " +
             kRelayFails + " = 9091 9444 failed"}}),
     RowName{});
@@ -138,8 +134,7 @@ TEST_F(DirectConnection, StatusOfTheFileIsKeptUntilTheNextSearch) {
     setConfig("COMMUNICATION_STATUS", "relayed");
     EXPECT_EQ(story(manager().createDirectConnection()),
               "connecting, map 9091, test 9091, map 9444 SSL, unmap 0, map 9445 SSL, " +
-                  publish("WAN", "LAN", 9091, 9445) + ", " + kReported +
-                  " = 9091 9445 portforwarded");
+                  publish(9091, 9445) + ", " + kReported + " = 9091 9445 portforwarded");
 }
 
 }  // namespace

@@ -28,8 +28,7 @@ TEST_P(ManualForwarding, DoesThisInOrder) {
 INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"PublishesAndStopsTheRelayThoughTheDiskSleeps", [](World& w) { w.clientRuns(); w.diskIsAsleep(); },
         {"take over, " + kPublishByHand + ", stop, " + kReported + " = portforwarded", " = portforwarded"}},
-    Row{"RelayThatCannotBeStoppedFailsOnlyTheReport",
-        [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
+    Row{"RelayThatCannotBeStoppedFailsTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
         {"take over, " + kPublishByHand + ", stop, stop, stop, failed = portforwarded", " = portforwarded"}},
     Row{"TakingOverRemovesTheAutomaticMappingsAndOnlyThem",
         [](World& w) { w.gateway.table.push_back({5000, kLanIp, 22, "ssh"}); w.cycle(); automaticCycle(w); },
@@ -43,8 +42,7 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"SkippedTestKeepsThePreviousConnectionType",
         [](World& w) { automaticCycle(w); w.web.answer("/remote_access_status/", kWait); },
         {"take over, unmap 9091, unmap 9444, connecting, failed = portforwarded"}},
-    Row{"DoubleNatSeenByTheAutomaticSearchEndsTheAttempt",
-        [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
+    Row{"DoubleNatOfTheSearchEndsTheAttempt", [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
         {"take over, " + kRelayFails + " = failed"}},
     Row{"UnpublishedPortsFailAndAreTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
         {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, " + kRelayFails +
@@ -53,16 +51,14 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
         {"disk, test :18080 = portforwarded", " = portforwarded"}},
     Row{"LetsTheDiskSleep", [](World& w) { published(w, 241); w.diskIsAsleep(); },
         {"disk = portforwarded", "disk = portforwarded"}},
-    Row{"PublishesAChangedHttpPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTP_PORT", "28080"); },
-        {"connecting, test :28080, " + publish("WAN", "LAN", 28080, 18443) + ", connected, force 0 = portforwarded",
+    Row{"PublishesANewHttpPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTP_PORT", "28080"); },
+        {"connecting, test :28080, " + publish(28080, 18443) + ", connected, force 0 = portforwarded",
          " = portforwarded"}},
-    Row{"PublishesAChangedHttpsPort",
-        [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "28443"); },
-        {"connecting, test :18080, " + publish("WAN", "LAN", 18080, 28443) + ", connected, force 0 = portforwarded",
+    Row{"PublishesANewHttpsPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "28443"); },
+        {"connecting, test :18080, " + publish(18080, 28443) + ", connected, force 0 = portforwarded",
          " = portforwarded"}},
     // The server may send anything as an address; the fixture looks for secrets in all lines.
-    Row{"PublishesAChangedAddressAndMasksIt",
-        [](World& w) {
+    Row{"PublishesANewAddressAndMasksIt", [](World& w) {
             w.web.answer("/test?", passed(support::kDeviceId));
             published(w);
             w.web.answer("/test?", passed());

@@ -53,9 +53,10 @@ inline const std::vector<Word> kLogWords{
     {"Port test failed, retries exceeded", "exceeded", ""}, {"mapping port : e-[", "check ", "]"},
     {"extended port range : e-[", "range ", "]"}, {"UPnP not working. Elapsed time ", "elapsed ", ","},
     {"unmapping existing ports", "take over", ""}};
-/// Regular expressions, and what a story() says for them: the usual addresses and mappings, and a repeated test.
+/// Regular expressions, and what a story() says for them: the usual addresses and mappings, and repeated calls.
 inline constexpr const char* kShortForms[][2] = {{kWanIp, "WAN"}, {R"(192.168.77.10\b)", "LAN"},
-    {R"( -> LAN:8080 Kavra\b)", ""}, {" -> LAN:8443 KavraSSL", " SSL"}, {R"((test \S+), \1, \1)", "$1 x3"}};
+    {R"( -> LAN:8080 Kavra\b)", ""}, {" -> LAN:8443 KavraSSL", " SSL"}, {R"((test \S+), \1, \1)", "$1 x3"},
+    {R"((unmap \d+), unmap (\d+))", "$1 $2"}};
 
 /// Publishing: the record of the central server, then the device's own web server.
 inline std::string publish(int http, int https, const std::string& wan = "WAN", const std::string& lan = "LAN") {

@@ -21,16 +21,16 @@ TEST_P(LaterDirectAttempt, DoesThisInOrder) {
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
     Row{"MapsTestsAndPublishesBothServices", [](World& w) { w.clientRuns(); },
-        {"unmap 0, unmap 0, " + kMapAndPublish + ", stop, " + kReported + kForwarded}},
+        {"unmap 0 0, " + kMapAndPublish + ", stop, " + kReported + kForwarded}},
     // "true" is not the word that chooses manual forwarding.
     Row{"UnreadableInternalPortsCountAsTheUsualOnes", [](World& w) {
             w.setConfig("INTERNAL_HTTP_PORT", "http");
             w.setConfig("INTERNAL_HTTPS_PORT", "");
             w.setConfig("MANUAL_PORT_FORWARD", "true");
-        }, {"unmap 0, unmap 0, connecting, map 9091 -> LAN:80 Kavra, test 9091, map 9444 -> LAN:443 KavraSSL, "
+        }, {"unmap 0 0, connecting, map 9091 -> LAN:80 Kavra, test 9091, map 9444 -> LAN:443 KavraSSL, "
             "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, " + kReported + kForwarded}},
     Row{"UnpublishedMappingIsKeptAndTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
-        {"unmap 0, unmap 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, " +
+        {"unmap 0 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, " +
          kRelayFails + ", status failed, lanip = 9091 9444 failed", kMapAndPublish + ", " + kReported + kForwarded}},
     // No port was tested yet: the time elapsed is that since the epoch.
     Row{"MakersRouterWithoutWanReportsFailed", [](World& w) { w.givenMakersRouter("", ""); },
@@ -55,7 +55,7 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
             w.gateway.refused.erase(9091);
             w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
             w.forget();
-        }, {"unmap 9092, unmap 9444, " + kMapAndPublish + ", connected, force 0" + kForwarded}}), RowName{});
+        }, {"unmap 9092 9444, " + kMapAndPublish + ", connected, force 0" + kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
         {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},
@@ -67,8 +67,8 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
             w.gateway.table.push_back({9093, "192.168.77.66", 80});
             w.gateway.refused.insert(9091);
             w.gateway.refused.insert(9092);
-        }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091, unmap 9444, map 9092, "
-            "unmap 9091, unmap 9444, unmap 9091, unmap 9444, map 9094, disk, test 9094, map 9444 SSL, " +
+        }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091 9444, map 9092, "
+            "unmap 9091 9444, unmap 9091 9444, map 9094, disk, test 9094, map 9444 SSL, " +
             publish(9094, 9444) + ", " + kReported + " = 9094 9444 portforwarded"}},
     Row{"AddressThatChangesDuringARetestWakesTheDisk", [](World& w) {
             w.failTest(9091);
@@ -85,10 +85,10 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
          "connecting, map 9091, test 9091, unmap 9091, failed, " + kRelayFails + " = 9444 failed"}},
     // An address change is worth waking the disk.
     Row{"MapsAnewForANewWanAddress", [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
-        {"unmap 9091, unmap 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
+        {"unmap 9091 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
          publish(9091, 9444, "44.128.0.77") + ", connected, force 0" + kForwarded, kForwarded}},
     Row{"MapsAnewForANewLanAddress", [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
-        {"unmap 9091, unmap 9444, connecting, map 9091 -> 192.168.77.11:8080 Kavra, test 9091, "
+        {"unmap 9091 9444, connecting, map 9091 -> 192.168.77.11:8080 Kavra, test 9091, "
          "map 9444 -> 192.168.77.11:8443 KavraSSL, " + publish(9091, 9444, "WAN", "192.168.77.11") +
          ", connected, force 0 = portforwarded"}},
     // A skipped test is no evidence against the ports.
@@ -96,9 +96,8 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
         [](World& w) { w.gateway.upnp = false; w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },
         {kForwarded, "test :9091" + kForwarded}},
     Row{"ForgetsPortsWithoutAGateway", [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
-        {"test :9091 x3, status failed, elapsed 0, " + kRelayFails + " = 9091 9444 failed", "elapsed 130, " +
-            kRelayFails + " = 9091 9444 failed"}}),
-    RowName{});
+        {"test :9091 x3, status failed, elapsed 0, " + kRelayFails + " = 9091 9444 failed",
+         "elapsed 130, " + kRelayFails + " = 9091 9444 failed"}}), RowName{});
 // clang-format on
 
 // A search for a connection that held does not wake the disk, so that its port stays untested.
@@ -111,9 +110,8 @@ TEST_F(DirectConnection, SearchesUntilItsPortIsTestedAndWhileRelayedOncePerInter
     forget();
     for (const char* status : {"portforwarded", "portforwarded", "relayed"}) {
         setConfig("COMMUNICATION_STATUS", status);
-        EXPECT_EQ(
-            story(manager().createDirectConnection()),
-            "connecting, map 9091, disk, unmap 9091, next port, unmap 0, unmap 0, failed = failed");
+        EXPECT_EQ(story(manager().createDirectConnection()),
+                  "connecting, map 9091, disk, unmap 9091, next port, unmap 0 0, failed = failed");
     }
     setConfig("COMMUNICATION_STATUS", "portforwarded");
     EXPECT_EQ(story(manager().createDirectConnection()), " = portforwarded");

@@ -72,10 +72,14 @@ inline const std::string kPublishByHand = "connecting, test :18080, " + publish(
 /// The end of an attempt that changed the connection type to PORTFORWARDED; its usual ports and result.
 inline const std::string kReported = "connected, status portforwarded, force 0";
 inline const std::string kForwarded = " = 9091 9444 portforwarded";
-/// A relay attempt whose tunnel comes up, and one whose tunnel does not.
-inline const std::string kTryRelay = "connecting type=relayed, " + withdraw("LAN") + ", start, ";
-inline const std::string kRelayStarts = kTryRelay + "connected type=relayed, status relayed, force 0";
-inline const std::string kRelayFails = kTryRelay + "failed type=relayed";
+/// A relay attempt whose tunnel comes up.
+inline std::string relayStarts(const std::string& lan = "LAN") {
+    return "connecting type=relayed, " + withdraw(lan) + ", start, connected type=relayed, status relayed, force 0";
+}
+/// A relay attempt whose tunnel does not come up.
+inline std::string relayFails(const std::string& lan = "LAN") {
+    return "connecting type=relayed, " + withdraw(lan) + ", start, failed type=relayed";
+}
 // clang-format on
 
 /// Public, so that the rows of a table can change the world.

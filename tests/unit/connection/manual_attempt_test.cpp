@@ -38,14 +38,14 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
         {kPublishByHand + ", " + kReported + " = portforwarded"}},
     // The user's router may well sit behind another one: only the test counts.
     Row{"ClosedPortFailsAndIsReported", [](World& w) { w.web.answer("/test?", kOtherNat); },
-        {"take over, connecting, test :18080 x3, status failed, failed, " + kRelayFails + ", lanip = failed"}},
+        {"take over, connecting, test :18080 x3, status failed, failed, " + relayFails() + ", lanip = failed"}},
     Row{"SkippedTestKeepsThePreviousConnectionType",
         [](World& w) { automaticCycle(w); w.web.answer("/remote_access_status/", kWait); },
         {"take over, unmap 9091 9444, connecting, failed = portforwarded"}},
     Row{"DoubleNatOfTheSearchEndsTheAttempt", [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
-        {"take over, " + kRelayFails + " = failed"}},
+        {"take over, " + relayFails() + " = failed"}},
     Row{"UnpublishedPortsFailAndAreTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
-        {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, " + kRelayFails +
+        {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, " + relayFails() +
          ", status failed, lanip = failed", "take over, " + kPublishByHand + ", " + kReported + " = portforwarded"}},
     Row{"TestsUnchangedPortsAfterTheInterval", [](World& w) { published(w, 241); },
         {"disk, test :18080 = portforwarded", " = portforwarded"}},
@@ -67,7 +67,7 @@ INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"PublishesWhenForced", [](World& w) { published(w); w.manager().setForceConnect(true); },
         {"force 1, " + kPublishByHand + ", connected, force 0 = portforwarded", " = portforwarded"}},
     Row{"EndsWithTheRelay", [](World& w) { published(w, 241); w.relayWorks(); w.failTest(18080); },
-        {"disk, test :18080 x3, status failed, " + kRelayStarts + ", lanip = relayed",
+        {"disk, test :18080 x3, status failed, " + relayStarts() + ", lanip = relayed",
          "take over, " + kPublishByHand + ", " + kReported + " = portforwarded"}}), RowName{});
 // clang-format on
 

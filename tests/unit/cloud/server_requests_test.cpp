@@ -38,8 +38,7 @@ TEST(AnswersTest, PartsOfAPortTestStandBetweenTheirTags) {
             "<req_device_id>1</req_device_id><resp_device_id>2</resp_device_id>", true, "r", "t", "1,2"},
         {"other case", "success", false, "none", "none", ","},
         {"the first of two", "<external_ip>a</external_ip><external_ip>b</external_ip>", false, "none", "a", ","},
-        {"addresses not closed", "<remote_external_ip>r<external_ip>t", false, "none", "none", ","},
-        {"device not closed", "<req_device_id>1<resp_device_id>2</resp_device_id>", false, "none", "none", ",2"},
+        {"not closed", "<remote_external_ip>r<external_ip>t<req_device_id>1<resp_device_id>2</resp_device_id>", false, "none", "none", ",2"},
         {"remote address not opened", "345678901234567890r</remote_external_ip>", false, "none", "none", ","},
         {"tested address not opened", "Success 0123here</external_ip>", true, "none", "here", ","},
         {"closed before it is opened", "Success</external_ip><external_ip>x", true, "none", "", ","}};
@@ -99,10 +98,7 @@ TEST_F(ServerRequestsTest, ThePublicAddressIsTheBodyAsItCame) {
 class PortTestTest : public CloudTest {
 protected:
     // What a test with these answers returns and leaves, and a line that it must log once.
-    void row(std::string ip,
-             const Answers& answers,
-             const std::string& left,
-             const std::string& line) {
+    void row(std::string ip, const Answers& answers, const std::string& left, const char* line) {
         web.clear();
         log.clear();
         for (const auto& answer : answers) web.answerOnce("/test", answer);
@@ -133,7 +129,7 @@ TEST_F(PortTestTest, TriesThreeTimesUnlessItPassesOrMeetsASecondNat) {
     EXPECT_EQ(web.urls(), (Urls{kPoll, request}));
     row(ip, {"no" + seen("44.128.0.9")}, "fail, 44.128.0.20, , relay", "(double-NAT detected");
     row(ip, {"no" + seen(ip), none, "device-7350142 no" + seen("x")}, failed,
-        "[3] -  failure response from server: [*ID_REMOVED* no" + seen("x"));
+        "[3] -  failure response from server: [*ID_REMOVED* no<");
     EXPECT_EQ(log.countPart("testPort[2] - httpGet for https://web.kavra.example/test?id=*ID_REMOVED*"), 1);
     EXPECT_EQ(web.urls(), (Urls{request, request, request, "http://127.0.0.1:80/status?is=failed"}));
     EXPECT_EQ(clock.pauses(), (std::vector<long>{5, 5, 5, 1}));

@@ -176,7 +176,7 @@ void PortTest::reportFailure() {
     logError("TavikClient::testPort - port map check failed.\n");
 }
 
-// When none was requested; an answer that does not name one leaves it empty.
+// Only if no address was requested. Stays empty if the answer names none.
 void PortTest::takeTestedAddress() {
     if (!input.externalIp.empty()) return;
     if (!reading.testedAddress) {

@@ -21,8 +21,8 @@ std::map<std::string, std::string> Status2LogType;
 const std::array<const char*, 5> ConnType2LogType{"disabled", "portforwarded", "relayed",
                                                   "disabled", "disabled"};
 
-// Defined here because it only fills the tables above. A failure has no type of its own: sendAnalytics
-// takes that of the connection that failed.
+// Defined here because it only fills the tables above. A failure has no type of its own:
+// sendAnalytics takes that of the connection that failed.
 TavikClient::TavikClient() {
     Status2LogState["disabled"] = "connecting";
     Status2LogState["connecting"] = "connecting";

@@ -22,9 +22,9 @@ struct SecretArgument {
 using TemplateArgument = std::variant<int, std::string, SecretArgument>;
 
 /// Fills a printf template from the configuration: %s takes a text, %d, %i and %u a number, %% is a
-/// percent sign. It may use fewer placeholders than there are arguments. One that asks for more,
-/// for another kind or for anything else gives an empty URL and one error line that names @p key,
-/// the setting it came from. Secrets appear with their real values.
+/// percent sign. Arguments may be left over. Too many placeholders, or one of the wrong kind, give
+/// an empty URL and one error line that names @p key, the setting the template came from. Secrets
+/// appear with their real values.
 [[nodiscard]] std::string fillTemplate(const std::string& key,
                                        const std::string& urlTemplate,
                                        std::initializer_list<TemplateArgument> arguments);

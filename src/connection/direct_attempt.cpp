@@ -42,8 +42,8 @@ ConnectionType DirectAttempt::run() {
     now = time(nullptr);
     logInfo(
         "ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.\n",
-        static_cast<std::int64_t>(now - manager.lastPortTestTime), manager.portTestInterval,
-        manager.allocatedHttpPort, manager.allocatedHttpsPort);
+        now - manager.lastPortTestTime, manager.portTestInterval, manager.allocatedHttpPort,
+        manager.allocatedHttpsPort);
     if (const auto result = retestMappedPorts()) return *result;
     if (!searchIsDue()) return manager.connectionType;
     if (const auto result = searchPorts()) return *result;
@@ -144,7 +144,7 @@ void DirectAttempt::decideSleepCheck() {
                    manager.router().hasLocalIpChanged() || manager.forceConnect);
 }
 
-// Ends the attempt when the ports of an earlier one still serve, or when none can.
+// Ends the attempt when the ports mapped earlier still work, or when no port can.
 std::optional<ConnectionType> DirectAttempt::retestMappedPorts() {
     if (manager.allocatedHttpPort < 1 || manager.allocatedHttpsPort < 1) return std::nullopt;
     manager.router().CheckExpiredMappings();
@@ -164,7 +164,7 @@ std::optional<ConnectionType> DirectAttempt::retestMappedPorts() {
     if (manager.forceConnect) {
         reportAnalytics(failed ? "failed" : "portforwarded", SUBTYPE_AUTOMATIC);
     }
-    if (testResult != SKIP_TEST) manager.lastPortTestTime = now;
+    if (testResult != SKIP_TEST) manager.lastPortTestTime = static_cast<time_t>(now);
 
     if (failed && manager.doubleNatDetected) {
         logInfo(
@@ -199,7 +199,8 @@ std::optional<ConnectionType> DirectAttempt::searchPorts() {
     reportAnalytics("connecting", SUBTYPE_AUTOMATIC);
     analyticsSent = true;
     // While relayed, each search starts a new interval.
-    if (manager.connectionType == RELAYED && checkSleep) manager.lastPortTestTime = now;
+    if (manager.connectionType == RELAYED && checkSleep)
+        manager.lastPortTestTime = static_cast<time_t>(now);
     if (testResult == FAIL_TEST) {
         manager.router().discover();
         decideSleepCheck();

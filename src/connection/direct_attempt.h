@@ -44,7 +44,7 @@ private:
     bool defaultPortsOnly = false;  // no other external port may be tried
     int internalHttpPort = 0;
     int internalHttpsPort = 0;
-    time_t now = 0;
+    std::int64_t now = 0;
 };
 
 }  // namespace pelorus

@@ -27,7 +27,7 @@ void lookUp(const std::string& name, std::string& address, const char* failure) 
 }  // namespace
 
 bool DnsCheck::run() {
-    const time_t now = time(nullptr);
+    const std::int64_t now = time(nullptr);
     const bool due =
         manager.forceDNSCheck || now - manager.prevDNSCheckTime >= manager.dnsCheckInterval;
     if (!due || (type != PORTFORWARDED && type != RELAYED)) return true;
@@ -36,8 +36,7 @@ bool DnsCheck::run() {
         "--------------------------------------------------------------------------------------\n");
     logInfo(
         "ConnectionManager::checkDNS - forceDNSCheck or exceeded nslookup check interval, forceDNSCheck %d, prevTime %jd, checkInterval %jd, currentTime %jd, connectionType %d\n",
-        manager.forceDNSCheck, manager.prevDNSCheckTime, manager.dnsCheckInterval,
-        static_cast<std::int64_t>(now), type);
+        manager.forceDNSCheck, manager.prevDNSCheckTime, manager.dnsCheckInterval, now, type);
     if (!buildNames()) return true;
     lookUpNames();
     return namesAgree() && namesLeadHere();
@@ -69,7 +68,7 @@ bool DnsCheck::buildNames() {
     return true;
 }
 
-// The pause follows the last try as well.
+// Also pauses after the last try.
 void DnsCheck::lookUpNames() {
     for (int tries = 0; tries < ConnectionManager::MAX_CHECK_DNS_TRIES; ++tries) {
         lookUp(fourLevel, fourLevelIp,

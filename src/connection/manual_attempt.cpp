@@ -32,8 +32,8 @@ ConnectionType ManualAttempt::run() {
     now = time(nullptr);
     logInfo(
         "ConnectionManager::manualPortForward - Elapsed time %jd, portTestInterval %jd, manualPortForwardChange %d, lastManualPortForward %d, forceConnect %d\n",
-        static_cast<std::int64_t>(now - manager.lastPortTestTime), manager.portTestInterval,
-        changed, manager.lastManualPortForward, manager.forceConnect);
+        now - manager.lastPortTestTime, manager.portTestInterval, changed,
+        manager.lastManualPortForward, manager.forceConnect);
     if (!testIsDue()) {
         result = manager.connectionType;
     } else if (manager.doubleNatDetected) {
@@ -109,7 +109,7 @@ void ManualAttempt::testPort() {
         result = manager.connectionType;
         return;
     }
-    manager.lastPortTestTime = now;
+    manager.lastPortTestTime = static_cast<time_t>(now);
     if (testResult != PASS_TEST) return;
     portTestPassed = true;
     manager.allocatedHttpPort = externalHttpPort;

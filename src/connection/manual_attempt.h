@@ -43,7 +43,7 @@ private:
     bool changed = false;         // ports or addresses differ from what was published
     bool forced = false;          // test now, whatever the interval
     bool portTestPassed = false;  // in this attempt
-    time_t now = 0;
+    std::int64_t now = 0;
     std::string externalIp;  // as the server saw it
     ConnectionType result = FAILED;
 };

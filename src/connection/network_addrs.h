@@ -43,7 +43,7 @@ public:
     [[nodiscard]] const std::string& getLocalIp() const { return localIP; }
 
     /// The external address as the server sees it. Returns 1 and sets @p out, or 0. Waits, without
-    /// a limit, for as long as the server asks for a pause; only a termination signal ends that.
+    /// a limit, as long as the server keeps asking for a pause; only a termination signal ends that.
     int getMyIP(std::string& out);
 
 private:

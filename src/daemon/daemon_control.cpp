@@ -32,7 +32,7 @@ DaemonControl* DaemonControl::getInstance() {
 void DaemonControl::run() {
     lastConnectionType = NONE;
     startClean();
-    // Would spin with both flags false, a state that no public operation leaves behind.
+    // Would spin with both flags false, which no public call can produce.
     while (remoteAccessEnabled || !stopRequested) {
         if (remoteAccessEnabled) runCycle();
     }

@@ -7,7 +7,7 @@
 
 namespace pelorus {
 
-/// A start time (seconds since the epoch) and a duration (seconds). At first (0, 0), which is past
+/// A start time (seconds since the epoch) and a duration (seconds). Initially (0, 0), which is past
 /// halfway and expired.
 class TimeIntervalTrack {
 public:

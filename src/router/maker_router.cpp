@@ -116,7 +116,7 @@ std::optional<_BrenvikPortIp> parseEntry(const std::string& line) {
                           address, *internalPort, fields[5]};
 }
 
-// Runs the helper script with one argument, whatever characters that holds. 0 when no shell could
+// Runs the helper script with one argument, which the shell takes literally. 0 when no shell could
 // be started, else 1; the script's own result is not known.
 int runHelper(const char* action, const std::string& argument) {
     constexpr std::string_view kSpecialInQuotes = "\"$`\\";

@@ -60,12 +60,32 @@ CMnatpmp::~CMnatpmp() {
 }
 
 bool CMnatpmp::init() {
-    if (initialized) return true;
+    return initialized || open(0);
+}
+
+bool CMnatpmp::open(in_addr_t gateway) {
     natpmp = {};
-    const int status = openClient(natpmp, 0);
+    const int status = openClient(natpmp, gateway);
     initialized = status == 0;
     if (!initialized) logError("CMnatpmp::init  initnatpmp failed %d\n", status);
     return initialized;
+}
+
+// The library takes whatever the gateway sends for the answer to its last request. It repeats a
+// request that is not answered at once, so a slow gateway answers it more than once, and the network
+// may duplicate an answer. Late answers go to the port the request came from, so each request gets
+// a socket of its own. The library's try_number counts how often its last request was sent.
+bool CMnatpmp::openForRequest() {
+    if (!initialized || natpmp.try_number == 0) return init();
+    const in_addr_t gateway = natpmp.gateway;
+    natpmp_t fresh{};
+    // Open the new socket before closing the old one, so that the ports differ.
+    const bool isOpen = openClient(fresh, gateway) == 0;
+    close();
+    if (!isOpen) return open(gateway);  // where descriptors are short, there is one more now
+    natpmp = fresh;
+    initialized = true;
+    return true;
 }
 
 bool CMnatpmp::close() {
@@ -75,20 +95,6 @@ bool CMnatpmp::close() {
         initialized = false;
     }
     return true;
-}
-
-// The library takes whatever the gateway sends for the answer to its last request, and it repeats a
-// request that is not answered at once, so that a slow gateway answers more than once. Such answers
-// go to the port they were asked from: the next request is sent from another one.
-void CMnatpmp::leaveLateAnswersBehind() {
-    const bool moreMayCome = natpmp.has_pending_request != 0 || natpmp.try_number > 1;
-    if (!moreMayCome) return;
-    // Opened while the old socket still holds its port. Where that fails, sending may still work.
-    natpmp_t fresh{};
-    if (openClient(fresh, natpmp.gateway) != 0) return;
-    close();
-    natpmp = fresh;
-    initialized = true;
 }
 
 int CMnatpmp::CheckNATPMPResponse() {
@@ -109,11 +115,10 @@ int CMnatpmp::CheckNATPMPResponse() {
 }
 
 bool CMnatpmp::retrieveExternalIP(std::string& ip) {
-    if (!init()) {
+    if (!openForRequest()) {
         logError("CMnatpmp::retrieveExternalIP  libnatpmp was not previously initialized.\n");
         return false;
     }
-    leaveLateAnswersBehind();
     const int sent = sendpublicaddressrequest(&natpmp);
     if (sent < 0) {
         const int error = errno;
@@ -144,7 +149,7 @@ bool CMnatpmp::portMappingRequest(int internalPort,
                                   const std::string& /*description*/,
                                   bool isHttps,
                                   unsigned& lifetime) {
-    if (!init()) {
+    if (!openForRequest()) {
         logError("CMnatpmp::portMappingRequest  libnatpmp was not previously initialized.\n");
         return false;
     }
@@ -172,7 +177,6 @@ std::optional<CMnatpmp::Grant> CMnatpmp::exchangeMapping(int protocol,
                                                          int internalPort,
                                                          int externalPort,
                                                          unsigned lifetime) {
-    leaveLateAnswersBehind();
     const int sent =
         sendnewportmappingrequest(&natpmp, protocol, static_cast<std::uint16_t>(internalPort),
                                   static_cast<std::uint16_t>(externalPort), lifetime);

@@ -12,9 +12,9 @@
 namespace pelorus {
 
 /// NAT-PMP client for the default gateway. The first request opens it, the destructor closes it. A
-/// request blocks for at most three reads of the library's retry schedule (1.75 s). An answer that
-/// comes later is lost: no request takes it for its own. Every failure is logged and returned as
-/// false.
+/// request blocks for at most three reads of the library's retry schedule (1.75 s). Late answers are
+/// dropped; none is taken for the answer to another request. Every failure is logged and returned
+/// as false.
 class CMnatpmp {
 public:
     CMnatpmp() = default;
@@ -76,7 +76,8 @@ private:
         unsigned lifetime;
     };
 
-    void leaveLateAnswersBehind();
+    bool open(in_addr_t gateway);
+    bool openForRequest();
     std::optional<Grant> exchangeMapping(int protocol,
                                          int internalPort,
                                          int externalPort,

@@ -25,7 +25,7 @@ int portNumber(const std::string& text) {
     return scanInt(text.c_str()).value_or(kNoPort);
 }
 
-// Whether an address can be that of another host: it is dotted and does not end in 0.
+// Whether the address can belong to another host: it is dotted and does not end in 0.
 bool namesOneHost(const std::string& client) {
     const std::size_t dot = client.rfind('.');
     if (dot == std::string::npos) return false;
@@ -53,7 +53,10 @@ bool Router::mapPort(int internalPort,
         return false;
     }
     if (isNatPMPGateway()) {
-        return mapThroughNatpmp(internalPort, externalPort, protocol, description, isHttps);
+        const auto granted =
+            mapThroughNatpmp(internalPort, externalPort, protocol, description, isHttps);
+        externalPort = granted.value_or(externalPort);
+        return granted.has_value();
     }
     if (heldByAnother(internalPort, externalPort, protocol)) return false;
     if (!addMapping(internalPort, externalPort, protocol, description)) return false;
@@ -61,27 +64,26 @@ bool Router::mapPort(int internalPort,
     return true;
 }
 
-bool Router::mapThroughNatpmp(int internalPort,
-                              int& externalPort,
-                              const std::string& protocol,
-                              const std::string& description,
-                              bool isHttps) {
-    const bool mapped =
-        pNatpmp->mapPort(internalPort, externalPort, protocol, description, isHttps);
-    if (mapped) {
-        logInfo(
-            "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
-            externalPort, internalPort);
-    } else {
+// The port that the gateway granted.
+std::optional<int> Router::mapThroughNatpmp(int internalPort,
+                                            int externalPort,
+                                            const std::string& protocol,
+                                            const std::string& description,
+                                            bool isHttps) {
+    if (!pNatpmp->mapPort(internalPort, externalPort, protocol, description, isHttps)) {
         logInfo(
             "Router::mapPort() - fail - failed to map external port: %d, to internal port: %d\n",
             externalPort, internalPort);
+        return std::nullopt;
     }
-    return mapped;
+    logInfo(
+        "Router::mapPort() - success - external port: %d has been mapped to internal port: %d  \n",
+        externalPort, internalPort);
+    return externalPort;
 }
 
 // Asks the gateway who has the external port. An entry counts whatever the status of the answer,
-// and one that leads to another port of this device counts as another's.
+// and one that leads to another port of this device counts as taken.
 bool Router::heldByAnother(int internalPort, int externalPort, const std::string& protocol) const {
     const IgdEntry entry = igd().entry(externalPort, protocol);
     if (entry.status == 0) {

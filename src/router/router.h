@@ -65,8 +65,8 @@ public:
     /// The LAN address; asks the maker's router script when none is known yet.
     [[nodiscard]] std::string getLocalIp();
 
-    /// Whether the last discovery assigned a new address. A change that was asked for is cleared
-    /// when the next discovery begins; one that was not survives that discovery.
+    /// Whether the last discovery assigned a new address. A change that has been read is
+    /// cleared by the next discovery; an unread one is kept.
     [[nodiscard]] bool hasExternalIpChanged();
     [[nodiscard]] bool hasLocalIpChanged();
 
@@ -132,11 +132,11 @@ private:
     bool findExternalIp();
     bool takeExternalIp(const std::string& address);
 
-    bool mapThroughNatpmp(int internalPort,
-                          int& externalPort,
-                          const std::string& protocol,
-                          const std::string& description,
-                          bool isHttps);
+    std::optional<int> mapThroughNatpmp(int internalPort,
+                                        int externalPort,
+                                        const std::string& protocol,
+                                        const std::string& description,
+                                        bool isHttps);
     [[nodiscard]] bool heldByAnother(int internalPort,
                                      int externalPort,
                                      const std::string& protocol) const;

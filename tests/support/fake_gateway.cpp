@@ -112,7 +112,9 @@ void transmit(natpmp_t* client) {
     ++client->try_number;
     gateway.connectionRefused = !gateway.natpmp;
     const long arrival = std::max(gateway.natpmpTime + gateway.answerDelay, gateway.hungUntil);
-    if (gateway.pending) gateway.onTheWay.insert({arrival, {gateway.asking, *gateway.pending}});
+    for (int copy = 0; gateway.pending && copy < gateway.copies; ++copy) {
+        gateway.onTheWay.insert({arrival, {gateway.asking, *gateway.pending}});
+    }
 }
 
 int ask(natpmp_t* client, const std::string& call, const std::function<natpmpresp_t()>& answer) {
@@ -253,7 +255,7 @@ int __wrap_UPNP_GetGenericPortMappingEntry(const char* url, const char* service,
 int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
     const in_addr_t found = inet_addr("192.168.77.1");
     EXPECT_EQ(forcedAddress, forced == 0 ? 0 : found) << "another gateway";
-    gateway.note("natpmp open");
+    gateway.note(forced == 0 ? "natpmp open" : "natpmp open at the same gateway");
     *client = {};
     client->gateway = found;
     client->s = clientSocket;

@@ -1,5 +1,5 @@
 // The home gateway of a test. The UPnP calls of miniupnpc, libnatpmp and select end here, in one
-// mapping table; nothing is sent. At first it speaks UPnP only, is connected and has no mapping.
+// mapping table; nothing is sent. Initially it speaks UPnP only, is connected and has no mapping.
 // Only waits for NAT-PMP answers take time. Each call leaves one line, in order:
 //
 //   discover 2000 ms                           natpmp open
@@ -78,6 +78,7 @@ public:
     long answerDelay = 0;  ///< requests are answered so much later
     long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
+    int copies = 1;        ///< of each answer
     /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",
     /// "read".
     std::set<std::string> failing;

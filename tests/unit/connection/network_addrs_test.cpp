@@ -33,6 +33,9 @@ TEST_F(NetworkAddrsTest, TellsWhichAddressChangedUntilItIsClearedOrPublished) {
 
 TEST_F(NetworkAddrsTest, WithoutAGatewayTheServerIsAskedOncePerInterval) {
     gateway.upnp = false;
+    addresses.setNetworkAddrs(kWanIp, kLanIp);
+    clock.advance(720);
+    EXPECT_EQ(discover(), "0");
     addresses.SetIntervalDuration(600);
     addresses.setNetworkAddrs(kWanIp, kLanIp);
     clock.advance(600);

@@ -33,6 +33,7 @@ const std::pair<const char*, std::string> kRows[]{
     {"-f 60 -f 30", ""},
     {"-f 60 -f 29", "Run frequency is 29. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f 901", "Run frequency is 901. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
+    {"-f -4294967236", "Run frequency is -4294967236. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f -u", "Run frequency is -u. It must be between 30 and 900 seconds. A default of 30 secs will be used.\n"},
     {"-f 60 -f", "Run frequency is missing. A default of 30 secs will be used.\n"},
     {"-l 8", "log Invalid syslog severity 8. Default 5 shall be used.\n"},

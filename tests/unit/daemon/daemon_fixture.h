@@ -1,5 +1,5 @@
-// The fixture of the daemon module: all modules, on a device that reaches a direct connection in its
-// first cycle.
+// The fixture of the daemon module: all modules, on a device that reaches a direct connection in
+// its first cycle.
 #ifndef PELORUS_UNIT_DAEMON_FIXTURE_H
 #define PELORUS_UNIT_DAEMON_FIXTURE_H
 

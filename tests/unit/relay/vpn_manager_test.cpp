@@ -98,11 +98,13 @@ TEST_F(VpnManagerTest, AFailureEndsTheStartAtOnce) {
 TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
     const std::string pid = startClient();
     const std::string task = pid + "/task/" + pid;
+    writeFile("exe", "");
     const std::pair<std::string, std::string> rows[]{
         {"", "is empty"},
         {"self\n", "pid self in " + path("client.pid") + " does not match /proc/self/exe symlink"},
         {"%s%n\x01\x02/../..\n", "failed, errno 2"},
         {"device-7350142\nauth-91c2f0aa\n", "stat /proc/*ID_REMOVED*/exe failed"},
+        {".." + folder, "readlink /proc/.." + folder + "/exe failed, errno 22"},
         {std::string(90, '9'), "stat /proc/" + std::string(80, '9') + "/exe failed"},
         {task, "does not match /proc/" + task + "/exe symlink "}};
     for (const auto& [content, warning] : rows) {
@@ -163,7 +165,7 @@ TEST_F(VpnManagerTest, CleanupRemovesThePidFileAndLeavesTheClient) {
 }
 
 TEST_F(VpnManagerTest, TheLastReadableRelayAddressWins) {
-    const std::string peer = std::string(100, ' ') + "Peer Connection Initiated with [AF_INET]";
+    const std::string peer = std::string(470, ' ') + "Peer Connection Initiated with [AF_INET]";
     std::string ip;
     EXPECT_FALSE(manager.fetchOpenVPN_IPAddr(ip));
     writeFile("client.out", peer + "device-7350142%s\n");
@@ -178,7 +180,8 @@ TEST(RelayPeerTest, AnAddressIsFourNumbersNotBelowZero) {
     const std::string peer = "at 12:00 Peer Connection Initiated with [AF_INET]";
     EXPECT_EQ(readRelayPeer((peer + "44.1.1.1:1194").c_str())->address, "44.1.1.1");
     EXPECT_EQ(readRelayPeer((peer + " 44.300.007. 0").c_str())->address, "44.300.7.0");
-    for (const char* const bad : {"44.-1.0.2", "4294967297.1.1.1", "44.128.0", "44.128.0:1", ""}) {
+    for (const char* const bad :
+         {"44.-1.0.2", "44X.1.1.1", "4294967297.1.1.1", "44.128.0", "44.128.0:1", ""}) {
         const auto read = readRelayPeer((peer + bad).c_str());
         EXPECT_TRUE(read && !read->address) << bad;
     }

@@ -42,7 +42,7 @@ TEST_F(MakerRouterTest, TheListDecidesWhetherAPortIsMapped) {
     row(1, added, "OTHER,UDP,9091,192.168.77.7,80,x\n");
     row(0, kept, "OTHER,TCP,9000-65535,192.168.77.1,80,web, cam\n");
     const std::string unreadable =
-        ",,,\n\nNOBODY,TCP,9091,192.168.77.1,80,x\nOTHER,TCP,9091x,192.168.77.7,80,x\n"
+        ",,,\n\nNOBODY,TCP,9091,192.168.77.1,80,x\nOTHER,TCP,9091X,192.168.77.7,80,x\n"
         "OTHER,TCP,9091-65536,192.168.77.7,80,x\nOTHER,TCP,9091,192.168.77.7,80\n"
         "OTHER,TCP,9091,,80,x\n" +
         std::string(5000, 'x') + "\n";

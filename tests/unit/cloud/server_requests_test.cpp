@@ -1,5 +1,7 @@
 // What the central server is asked: whether to wait, the public address, whether a port is open; and
 // how its answers are read.
+#include <tuple>
+
 #include "cloud/port_test_answer.h"
 #include "cloud/public_address.h"
 #include "cloud/sleep_answer.h"
@@ -17,7 +19,7 @@ const std::string kWait = "<action>wait</action>";
 
 // clang-format off
 TEST(AnswersTest, AWaitNeedsATimeBehindItsAction) {
-    struct { const char* text; SleepAnswer::Kind kind; std::optional<int> seconds; } const rows[]{
+    const std::tuple<const char*, SleepAnswer::Kind, std::optional<int>> rows[]{
         {"<action>proceed</action><action>wait</action>x <wait_time> 121s", SleepAnswer::WAIT, 121},
         {"<action>wait</action><wait_time>0</wait_time>", SleepAnswer::WAIT, 0},
         {"<action>wait</action><wait_time>-1", SleepAnswer::BAD_TIME, {}},
@@ -25,9 +27,9 @@ TEST(AnswersTest, AWaitNeedsATimeBehindItsAction) {
         {"<wait_time>300</wait_time><action>wait</action>", SleepAnswer::NO_TIME, {}},
         {"<action>proceed</action><wait_time>300", SleepAnswer::PROCEED, 0},
         {"<ACTION>wait</ACTION><wait_time>300", SleepAnswer::NO_ACTION, {}}};
-    for (const auto& row : rows) {
-        const SleepAnswer answer = readSleepAnswer(row.text);
-        EXPECT_TRUE(answer.kind == row.kind && answer.seconds == row.seconds) << row.text;
+    for (const auto& [text, kind, seconds] : rows) {
+        const SleepAnswer answer = readSleepAnswer(text);
+        EXPECT_TRUE(answer.kind == kind && answer.seconds == seconds) << text;
     }
 }
 
@@ -54,8 +56,7 @@ TEST(AnswersTest, PartsOfAPortTestStandBetweenTheirTags) {
 
 TEST(AnswersTest, AnAddressIsFourNumbersAndNothingElse) {
     EXPECT_TRUE(isIpv4Address("0.0.0.0") && isIpv4Address("255.255.255.255"));
-    const std::string bad[]{"",          "1.2.3.4\n", " 1.2.3.4",       "1.2.3",
-                            "1.2.3.256", "::1",       {"1.2.3.4\0x", 9}};
+    const std::string bad[]{"", "1.2.3.4\n", "1.2.3", "1.2.3.256", "::1", {"1.2.3.4\0x", 9}};
     for (const auto& text : bad) EXPECT_FALSE(isIpv4Address(text)) << text;
 }
 

@@ -24,7 +24,7 @@ TEST_F(SignalBlockTest, ASignalIsDeliveredWhenTheScopeThatBlocksItEnds) {
     EXPECT_EQ(delivered, 1);
 }
 
-TEST_F(SignalBlockTest, ABrokenPipeIsDiscardedButForOneOfTheCaller) {
+TEST_F(SignalBlockTest, DiscardsBrokenPipeSignalsExceptThoseAlreadyPending) {
     {
         const BrokenPipeGuard outer;
         const BrokenPipeGuard inner;

@@ -7,7 +7,7 @@ namespace {
 
 using ScrubTest = PelorusTest;
 
-TEST_F(ScrubTest, MasksStandInPlaceOfSecrets) {
+TEST_F(ScrubTest, ReplacesSecretsByMasks) {
     // clang-format off
     const char* const rows[][5]{  // id, authorisation, subdomain, text, masked text
         {"id", "", "", "any id", "any *ID_REMOVED*"},

@@ -39,29 +39,47 @@ struct Word {
     std::string end = "\n";
 };
 // clang-format off
+/// The port alone is tested at kWanIp; of ":9091" the server chooses the address.
 inline const std::vector<Word> kWords{
-    {"&ip=", "test ", "&auth"}, {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "},
-    {"/delforward?", "drop "}, {"/setstatus?", "status "}, {"/lanip?", "lanip", ""}, {"natpmp map TCP ", "natpmp ", " for"},
+    {"/test?device-7350142&44.128.0.20:", "test ", "&HTTP&auth"}, {"/test?device-7350142&", "test ", "&HTTP&auth"},
+    {"/forward?device-7350142&", "record ", "&auth"}, {"/setforward?", "tell "}, {"/delforward?", "drop "},
+    {"/setstatus?", "status "}, {"/lanip?", "lanip", ""}, {"natpmp map TCP ", "natpmp ", " for"},
     {"unmap TCP ", "unmap "}, {"map TCP ", "map "}, {"helper.sh add ", "add "}, {"helper.sh remove ", "remove "},
     {"hdparm", "disk", ""}, {"start-client", "start", ""}, {"kill -15 ", "stop", ""}};
+/// A state without a type is one of PORTFORWARDED.
 inline const std::vector<Word> kLogWords{
-    {"cloudConnectivity state=", ""}, {"setForceConnect = ", "force "}, {"increased port test interval to ", "interval ", "."},
-    {"Port test failed, trying next port", "next port", ""}, {"Port test failed, retries exceeded", "exceeded", ""},
-    {"mapping port : e-[", "check ", "]"}, {"extended port range : e-[", "range ", "]"},
-    {"UPnP not working. Elapsed time ", "elapsed ", ","}, {"unmapping existing ports", "take over", ""}};
+    {"cloudConnectivity state=", "", " type=portforwarded"}, {"setForceConnect = ", "force "},
+    {"increased port test interval to ", "interval ", "."}, {"Port test failed, trying next port", "next port", ""},
+    {"Port test failed, retries exceeded", "exceeded", ""}, {"mapping port : e-[", "check ", "]"},
+    {"extended port range : e-[", "range ", "]"}, {"UPnP not working. Elapsed time ", "elapsed ", ","},
+    {"unmapping existing ports", "take over", ""}};
+/// Regular expressions, and what a story() says for them: the usual addresses and mappings, and repeated calls.
+inline constexpr const char* kShortForms[][2] = {{kWanIp, "WAN"}, {R"(192.168.77.10\b)", "LAN"},
+    {R"( -> LAN:8080 Kavra\b)", ""}, {" -> LAN:8443 KavraSSL", " SSL"}, {R"((test \S+), \1, \1)", "$1 x3"},
+    {R"((unmap \d+), unmap (\d+))", "$1 $2"}};
 
-/// How a story() abbreviates what mostly goes together; anything else stands in full. A test of
-/// ":9091" leaves it to the server which address to test.
-inline constexpr const char* kPhrases[][2] = {
-    {"^, ", ""}, {kWanIp, "WAN"}, {R"(192.168.77.10\b)", "LAN"}, {" type=portforwarded", ""}, {" type=", "/"},
-    {"WAN&port=", ""}, {"&port=", ":"}, {R"(&HTTP\b)", ""}, {R"((test \S+), \1, \1)", "$1 x3"}, {" -> ", ">"},
-    {R"(>LAN:8080 Kavra\b)", ""}, {">LAN:8443 KavraSSL", " SSL"}, {R"((unmap \d+), unmap (\d+))", "$1 $2"},
-    {R"(record (\S+)&(\S+)&(\d+)&(\d+), tell \1&\3&\4&\2&8080)", "publish $1 $2 $3 $4"},
-    {"connecting, map 9091, test 9091, map 9444 SSL, publish WAN LAN 9091 9444", "map both"},
-    {"connecting, test :18080, publish WAN LAN 18080 18443", "by hand"}, {"connected, status portforwarded, force 0", "up"},
-    {"= 9091 9444 portforwarded", "= forwarded"}, {R"(record NULL&(\S+)&0&0, drop 8080)", "withdraw $1"},
-    {"connecting/relayed, withdraw LAN, start, failed/relayed", "no relay"},
-    {"connecting/relayed, withdraw LAN, start, connected/relayed, status relayed, force 0", "relay up"}};
+/// Publishing: the record of the central server, then the device's own web server.
+inline std::string publish(int http, int https, const std::string& wan = "WAN", const std::string& lan = "LAN") {
+    const std::string ports = std::to_string(http) + "&" + std::to_string(https);
+    return "record " + wan + "&" + lan + "&" + ports + ", tell " + wan + "&" + ports + "&" + lan + "&8080";
+}
+/// The same two without the ports.
+inline std::string withdraw(const std::string& lan) { return "record NULL&" + lan + "&0&0, drop 8080"; }
+/// The search that succeeds with its first ports.
+inline const std::string kMapAndPublish = "connecting, map 9091, test 9091, map 9444 SSL, " + publish(9091, 9444);
+/// The attempt with the ports that the user forwards himself.
+inline const std::string kPublishByHand = "connecting, test :18080, " + publish(18080, 18443);
+/// The end of an attempt that changed the connection type to PORTFORWARDED; its usual ports and result.
+inline const std::string kReported = "connected, status portforwarded, force 0";
+inline const std::string kForwarded = " = 9091 9444 portforwarded";
+/// A relay attempt whose tunnel comes up.
+inline std::string relayStarts(const std::string& lan = "LAN") {
+    return "connecting type=relayed, " + withdraw(lan) + ", start, connected type=relayed, status relayed, force 0";
+}
+/// A relay attempt whose tunnel does not come up.
+inline std::string relayFails(const std::string& lan = "LAN") {
+    return "connecting type=relayed, " + withdraw(lan) + ", start, failed type=relayed";
+}
 // clang-format on
 
 /// Public, so that the rows of a table can change the world.
@@ -78,12 +96,12 @@ public:
         // clang-format off
         const std::string local = "http://127.0.0.1:%d/";
         givenConfig(
-            {{"SERVER_BASE_URL", "https://cloud.kavra.example"}, {"REMOTE_TESTPORTURL", "/test?%s&ip=%s&port=%d&%s&%s"},
+            {{"SERVER_BASE_URL", "https://cloud.kavra.example"}, {"REMOTE_TESTPORTURL", "/test?%s&%s:%d&%s&%s"},
              {"REMOTE_SETFORWARDURL", "/forward?%s&%s&%s&%d&%d&%s"}, {"REMOTE_SETCOMMSTATUSURL", "/lanip?%s&%s&%s"},
-             {"LOCAL_SETFORWARDURL", local + "setforward?%s&%d&%d&%s&%d"}, {"LOCAL_DELFORWARDURL", local + "delforward?%d"},
-             {"LOCAL_SETCOMMSTATUSURL", local + "setstatus?%s"}, {"OPENVPN_AUTH_FILE", path("auth.txt")},
-             {"OPENVPN_PID_FILE", path("client.pid")}, {"STARTCMD_OUTFILE", path("client.out")},
-             {"STARTCMD", "start-client"}, {"LOG_SUCCESS_TEXT", "Completed"}},
+             {"LOCAL_SETFORWARDURL", local + "setforward?%s&%d&%d&%s&%d"},
+             {"LOCAL_DELFORWARDURL", local + "delforward?%d"}, {"LOCAL_SETCOMMSTATUSURL", local + "setstatus?%s"},
+             {"OPENVPN_AUTH_FILE", path("auth.txt")}, {"OPENVPN_PID_FILE", path("client.pid")},
+             {"STARTCMD_OUTFILE", path("client.out")}, {"STARTCMD", "start-client"}, {"LOG_SUCCESS_TEXT", "Completed"}},
             {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
         // clang-format on
     }
@@ -118,7 +136,7 @@ public:
     }
     /// The next test of @p port fails, with all its attempts.
     void failTest(int port) {
-        const std::string part = "&port=" + std::to_string(port) + "&";
+        const std::string part = ":" + std::to_string(port) + "&HTTP&";
         for (int attempt = 0; attempt < 3; ++attempt) web.answerOnce(part, kNotReached);
     }
 
@@ -146,8 +164,8 @@ public:
             if (mapping.client == kLanIp) all += " " + std::to_string(mapping.externalPort);
         }
         all += " " + result;
-        for (const auto& [full, brief] : kPhrases) {
-            all = std::regex_replace(all, std::regex{full}, brief);
+        for (const auto& [pattern, form] : kShortForms) {
+            all = std::regex_replace(all, std::regex{pattern}, form);
         }
         return all;
     }
@@ -176,7 +194,8 @@ private:
             const auto at = line.find(part);
             if (at == std::string::npos) continue;
             const auto rest = line.substr(at + part.size());
-            told += ", " + words + rest.substr(0, rest.find(end));
+            const auto shown = rest.substr(0, std::min(rest.find(end), rest.find('\n')));
+            told += (told.empty() ? "" : ", ") + words + shown;
             return;
         }
     }

@@ -21,7 +21,7 @@ TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneRe
     EXPECT_EQ(story(PORTFORWARDED),
               "disk, test 9091, interval 360, disk, test 9091, interval 480, disk, test 9091, "
               "interval 600, interval 720, disk, test 9091, interval 840, interval 960, disk, "
-              "test 9091, interval 960 = forwarded");
+              "test 9091, interval 960 = 9091 9444 portforwarded");
     clientRuns();
     gateway.upnp = false;
     failTest(9091);
@@ -49,17 +49,17 @@ TEST_F(ConnectionManagerTest, MissingNamesTearEverythingDownAndForceATestInTheSa
     diskIsAsleep();
     clientRuns();
     manager().checkConnection(PORTFORWARDED);
-    EXPECT_EQ(story(FAILED),
-              "failed, status failed, unmap 9091 9444, withdraw LAN, stop, force 1 = failed");
-    EXPECT_EQ(story(manager().createConnection()), "map both, up = forwarded");
+    EXPECT_EQ(story(FAILED), "failed, status failed, unmap 9091 9444, " + withdraw("LAN") +
+                                 ", stop, force 1 = failed");
+    EXPECT_EQ(story(manager().createConnection()), kMapAndPublish + ", " + kReported + kForwarded);
 }
 
 class RelayAttempt : public StoryTest {};
-TEST_P(RelayAttempt, TellsAsExpected) {
+TEST_P(RelayAttempt, DoesThisInOrder) {
     expectStories([this] { return manager().createRelayConnection(); });
 }
 class KillConnection : public StoryTest {};
-TEST_P(KillConnection, TellsAsExpected) {
+TEST_P(KillConnection, DoesThisInOrderAndForgetsThePorts) {
     expectStories([this] {
         manager().killConnection(PORTFORWARDED);
         return NONE;
@@ -72,13 +72,13 @@ TEST_P(KillConnection, TellsAsExpected) {
 }
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
-    Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); },
-        {"connecting/relayed, record NULL&&0&0, drop 8080, start, connected/relayed, status relayed, force 0 = relayed"}},
-    Row{"KeepsARunningTunnelAndEndsAForcedAttempt", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
+    Row{"WithdrawsTheRecordBeforeTheTunnelStarts", [](World& w) { w.relayWorks(); }, {relayStarts("") + " = relayed"}},
+    Row{"KeepsARunningTunnelAndEndsTheForce", [](World& w) { w.clientRuns(); }, {"status relayed, force 0 = relayed"}},
     Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
-        {"connecting/relayed, record NULL&&0&0, drop 8080, start, start, start, start, failed/relayed, status failed = failed"}},
-    Row{"KeepsEverythingWhenTheServerAsksForAWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
-    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {" = forwarded"}}), RowName{});
+        {"connecting type=relayed, " + withdraw("") + ", start, start, start, start, "
+         "failed type=relayed, status failed = failed"}},
+    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
+    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
     // The gateway object is new at the first, and so is the LAN address.
     Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
@@ -86,16 +86,17 @@ INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
             w.gateway.table.push_back({5000, kLanIp, 22, "ssh"});
             w.gateway.table.push_back({9093, "192.168.77.66", 80, "Kavra"});
             w.gateway.table.push_back({9444, kLanIp, 8443, "KavraSSL"});
-        }, {"lanip, unmap 9091 9444, withdraw LAN = 5000 disabled", "withdraw LAN = 5000 disabled"}},
-    Row{"ForgetsThePortsOfTheConnection", [](World& w) { w.givenForwardedPorts(); }, {"unmap 9091 9444, withdraw LAN = disabled"}},
+        }, {"lanip, unmap 9091 9444, " + withdraw("LAN") + " = 5000 disabled", withdraw("LAN") + " = 5000 disabled"}},
+    Row{"ForgetsItsPorts", [](World& w) { w.givenForwardedPorts(); },
+        {"unmap 9091 9444, " + withdraw("LAN") + " = disabled"}},
     Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.upnp = false; }, {" = disabled"}},
     Row{"WithdrawsTheRecordWhenTheGatewayWentAway",
         [](World& w) { w.givenForwardedPorts(); w.gateway.upnp = false; w.cycle(); w.forget(); },
-        {"withdraw LAN = 9091 9444 disabled"}},
-    Row{"LeavesTheRecordWithoutAnInternalPort", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
+        {withdraw("LAN") + " = 9091 9444 disabled"}},
+    Row{"NoInternalPortKeepsTheRecord", [](World& w) { w.setConfig("INTERNAL_HTTP_PORT", ""); }, {"lanip = disabled"}},
     Row{"RemovesThroughTheScriptOfTheMakersRouter", [](World& w) {
             w.givenMakersRouter("BRENVIK,TCP,9091,192.168.77.1,80,Kavra\nOTHER,TCP,9092,192.168.77.66,80,x\n", "");
-        }, {"remove \"TCP,9091,192.168.77.1,80\", withdraw 192.168.77.1 = disabled"}}), RowName{});
+        }, {"remove \"TCP,9091,192.168.77.1,80\", " + withdraw("192.168.77.1") + " = disabled"}}), RowName{});
 // clang-format on
 
 TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
@@ -103,9 +104,10 @@ TEST_F(ConnectionTest, RelayForgetsThePortsThoughTheRecordStays) {
     ASSERT_EQ(manager().createDirectConnection(), PORTFORWARDED);  // maps nothing
     relayWorks();
     web.answer("/forward?", FakeWeb::noAnswer());
-    EXPECT_EQ(story(manager().createRelayConnection()),
-              "connecting/relayed, record NULL&LAN&0&0, start, connected/relayed, status relayed, "
-              "force 0 = 9091 9444 relayed");
+    EXPECT_EQ(
+        story(manager().createRelayConnection()),
+        "connecting type=relayed, record NULL&LAN&0&0, start, connected type=relayed, status relayed, "
+        "force 0 = 9091 9444 relayed");
     log.clear();
     manager().createDirectConnection();
     EXPECT_EQ(log.countPart("allocatedHttpPort 0, allocatedHttpsPort 0."), 1);

@@ -6,93 +6,97 @@ namespace {
 class DirectConnection : public ConnectionTest {};
 
 class FirstDirectAttempt : public StoryTest {};
-TEST_P(FirstDirectAttempt, TellsAsExpected) {
+TEST_P(FirstDirectAttempt, DoesThisInOrder) {
     expectStories([this] { return cycle(300); });
 }
 class LaterDirectAttempt : public StoryTest {};
-TEST_P(LaterDirectAttempt, TellsAsExpected) {
+TEST_P(LaterDirectAttempt, DoesThisInOrder) {
     manager().killConnection(PORTFORWARDED);
     manager().setReqPortMappingLifetime(1200, 1200);
     givenForwardedPorts();
     clock.set(support::VirtualClock::kStart + 240);
-    EXPECT_EQ(story(cycle(1)), " = forwarded");
+    EXPECT_EQ(story(cycle(1)), kForwarded);
     expectStories([this] { return cycle(); });
 }
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
-    Row{"MapsTestsAndPublishesBothServices", [](World& w) { w.clientRuns(); }, {"unmap 0 0, map both, stop, up = forwarded"}},
+    Row{"MapsTestsAndPublishesBothServices", [](World& w) { w.clientRuns(); },
+        {"unmap 0 0, " + kMapAndPublish + ", stop, " + kReported + kForwarded}},
     // "true" is not the word that chooses manual forwarding.
     Row{"UnreadableInternalPortsCountAsTheUsualOnes", [](World& w) {
             w.setConfig("INTERNAL_HTTP_PORT", "http");
             w.setConfig("INTERNAL_HTTPS_PORT", "");
             w.setConfig("MANUAL_PORT_FORWARD", "true");
-        }, {"unmap 0 0, connecting, map 9091>LAN:80 Kavra, test 9091, map 9444>LAN:443 KavraSSL, "
-            "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, up = forwarded"}},
+        }, {"unmap 0 0, connecting, map 9091 -> LAN:80 Kavra, test 9091, map 9444 -> LAN:443 KavraSSL, "
+            "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, " + kReported + kForwarded}},
     Row{"UnpublishedMappingIsKeptAndTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
-        {"unmap 0 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, "
-         "no relay, status failed, lanip = 9091 9444 failed", "map both, up = forwarded"}},
+        {"unmap 0 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, " +
+         relayFails() + ", status failed, lanip = 9091 9444 failed", kMapAndPublish + ", " + kReported + kForwarded}},
     // No port was tested yet: the time elapsed is that since the epoch.
     Row{"MakersRouterWithoutWanReportsFailed", [](World& w) { w.givenMakersRouter("", ""); },
-        {"status failed, elapsed 1700000001, connecting/relayed, withdraw 192.168.77.1, start, failed/relayed = failed"}},
+        {"status failed, elapsed 1700000001, " + relayFails("192.168.77.1") + " = failed"}},
     Row{"MakersRouterMapsThroughItsScript",
         [](World& w) { w.givenMakersRouter("OTHER,TCP,9091,192.168.77.66,80,web\n"); w.failTest(9092); },
         {"connecting, check 9091, range 9092, add \"TCP,9092,192.168.77.1,8080,Kavra\", test 9092 x3, status failed, "
          "remove \"TCP,9092,192.168.77.1,8080\", next port, check 9091, range 9093, "
-         "add \"TCP,9093,192.168.77.1,8080,Kavra\", test 9093, check 9444, add \"TCP,9444,192.168.77.1,8443,KavraSSL\", "
-         "publish WAN 192.168.77.1 9093 9444, up = portforwarded", "disk, test 9093 = portforwarded"}},
+         "add \"TCP,9093,192.168.77.1,8080,Kavra\", test 9093, check 9444, "
+         "add \"TCP,9444,192.168.77.1,8443,KavraSSL\", " + publish(9093, 9444, "WAN", "192.168.77.1") +
+         ", " + kReported + " = portforwarded", "disk, test 9093 = portforwarded"}},
     Row{"PredefinedPortsOfTheMakersRouterComeFirst", [](World& w) {
             w.givenMakersRouter("OTHER,TCP,6000-6001,192.168.77.1,8888,other\n"
                 "OTHER,TCP,7000-7001,192.168.77.1,8080,web\nOTHER,TCP,1,192.168.77.1,8443,web\n");
             w.failTest(7000);
-        }, {"connecting, test 7000 x3, status failed, test 7001, publish WAN 192.168.77.1 7001 1, up = portforwarded",
-            "disk, test 7001 = portforwarded"}},
+        }, {"connecting, test 7000 x3, status failed, test 7001, " + publish(7001, 1, "WAN", "192.168.77.1") +
+            ", " + kReported + " = portforwarded", "disk, test 7001 = portforwarded"}},
     Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
             w.gateway.refused.insert(9091);
             w.cycle();
             w.gateway.refused.erase(9091);
             w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
             w.forget();
-        }, {"unmap 9092 9444, map both, connected, force 0 = forwarded"}}), RowName{});
+        }, {"unmap 9092 9444, " + kMapAndPublish + ", connected, force 0" + kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
-        {"map 9091>LAN:8080 , map 9444>LAN:8443 , disk, test 9091 = forwarded"}},
-    Row{"CountsThePortsAsOpenWhileTheDiskSleeps", [](World& w) { w.diskIsAsleep(); }, {"disk = forwarded", "disk = forwarded"}},
+        {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},
+    Row{"LetsTheDiskSleep", [](World& w) { w.diskIsAsleep(); }, {"disk" + kForwarded, "disk" + kForwarded}},
     Row{"IgnoresDiskAndIntervalWhenForced", [](World& w) { w.diskIsAsleep(); w.manager().setForceConnect(true); },
-        {"force 1, connecting, test 9091, connected = forwarded", "connecting, test 9091, connected = forwarded"}},
+        {"force 1, connecting, test 9091, connected" + kForwarded, "connecting, test 9091, connected" + kForwarded}},
     Row{"SearchesAgainAfterAFailedRetest", [](World& w) {
             w.failTest(9091);
             w.gateway.table.push_back({9093, "192.168.77.66", 80});
             w.gateway.refused.insert(9091);
             w.gateway.refused.insert(9092);
-        }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091 9444, map 9092, unmap 9091 9444, "
-            "unmap 9091 9444, map 9094, disk, test 9094, map 9444 SSL, publish WAN LAN 9094 9444, up = 9094 9444 portforwarded"}},
+        }, {"disk, test 9091 x3, status failed, connecting, map 9091, unmap 9091 9444, map 9092, "
+            "unmap 9091 9444, unmap 9091 9444, map 9094, disk, test 9094, map 9444 SSL, " +
+            publish(9094, 9444) + ", " + kReported + " = 9094 9444 portforwarded"}},
     Row{"AddressThatChangesDuringARetestWakesTheDisk", [](World& w) {
             w.failTest(9091);
-            w.commands.answer("hdparm", {"active/idle\n", 0, false, [&w](auto&) { w.gateway.externalIp = "44.128.0.77"; }});
-        }, {"disk, test 9091 x3, status failed, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, "
-            "publish 44.128.0.77 LAN 9091 9444, up = forwarded"}},
+            const auto change = [&w](auto&) { w.gateway.externalIp = "44.128.0.77"; };
+            w.commands.answer("hdparm", {"active/idle\n", 0, false, change});
+        }, {"disk, test 9091 x3, status failed, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
+            publish(9091, 9444, "44.128.0.77") + ", " + kReported + kForwarded}},
     Row{"DoubleNatAtARetestGoesToTheRelay", [](World& w) { w.relayWorks(); w.web.answer("/test?", kOtherNat); },
-        {"disk, test 9091, relay up = 9091 9444 relayed"}},
+        {"disk, test 9091, " + relayStarts() + " = 9091 9444 relayed"}},
     Row{"DoubleNatAtASearchLeavesTheHttpsPort",
         [](World& w) { w.failTest(9091); w.manager().setForceConnect(true); w.web.answer("/test?", kOtherNat); },
-        {"force 1, connecting, test 9091 x3, status failed, failed, connecting, map 9091, test 9091, unmap 9091, failed, "
-            "no relay = 9444 failed", "connecting, map 9091, test 9091, unmap 9091, failed, no relay = 9444 failed"}},
+        {"force 1, connecting, test 9091 x3, status failed, failed, connecting, map 9091, test 9091, unmap 9091, "
+         "failed, " + relayFails() + " = 9444 failed",
+         "connecting, map 9091, test 9091, unmap 9091, failed, " + relayFails() + " = 9444 failed"}},
     // An address change is worth waking the disk.
-    Row{"NewExternalAddressMakesTheMappingsAnew", [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
-        {"unmap 9091 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, publish 44.128.0.77 LAN 9091 9444, "
-         "connected, force 0 = forwarded", " = forwarded"}},
-    Row{"NewLocalAddressMakesTheMappingsAnew",
-        [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
-        {"unmap 9091 9444, connecting, map 9091>192.168.77.11:8080 Kavra, test 9091, map 9444>192.168.77.11:8443 KavraSSL, "
-         "publish WAN 192.168.77.11 9091 9444, connected, force 0 = portforwarded"}},
+    Row{"MapsAnewForANewWanAddress", [](World& w) { w.diskIsAsleep(); w.gateway.externalIp = "44.128.0.77"; },
+        {"unmap 9091 9444, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
+         publish(9091, 9444, "44.128.0.77") + ", connected, force 0" + kForwarded, kForwarded}},
+    Row{"MapsAnewForANewLanAddress", [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
+        {"unmap 9091 9444, connecting, map 9091 -> 192.168.77.11:8080 Kavra, test 9091, "
+         "map 9444 -> 192.168.77.11:8443 KavraSSL, " + publish(9091, 9444, "WAN", "192.168.77.11") +
+         ", connected, force 0 = portforwarded"}},
     // A skipped test is no evidence against the ports.
     Row{"TestsThePortsWithoutTheirGateway",
         [](World& w) { w.gateway.upnp = false; w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },
-        {" = forwarded", "test :9091 = forwarded"}},
-    Row{"ClosedPortsWithoutTheirGatewayAreForgotten",
-        [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
-        {"test :9091 x3, status failed, elapsed 0, no relay = 9091 9444 failed", "elapsed 130, no relay = 9091 9444 failed"}}),
-    RowName{});
+        {kForwarded, "test :9091" + kForwarded}},
+    Row{"ForgetsPortsWithoutAGateway", [](World& w) { w.gateway.upnp = false; w.web.answer("/test?", kNotReached); },
+        {"test :9091 x3, status failed, elapsed 0, " + relayFails() + " = 9091 9444 failed",
+         "elapsed 130, " + relayFails() + " = 9091 9444 failed"}}), RowName{});
 // clang-format on
 
 // A search for a connection that held does not wake the disk, so that its port stays untested.
@@ -126,8 +130,8 @@ TEST_F(DirectConnection, StatusOfTheFileIsKeptUntilTheNextSearch) {
     }
     setConfig("COMMUNICATION_STATUS", "relayed");
     EXPECT_EQ(story(manager().createDirectConnection()),
-              "connecting, map 9091, test 9091, map 9444 SSL, unmap 0, map 9445 SSL, "
-              "publish WAN LAN 9091 9445, up = 9091 9445 portforwarded");
+              "connecting, map 9091, test 9091, map 9444 SSL, unmap 0, map 9445 SSL, " +
+                  publish(9091, 9445) + ", " + kReported + " = 9091 9445 portforwarded");
 }
 
 }  // namespace

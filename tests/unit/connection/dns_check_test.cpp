@@ -8,7 +8,7 @@ const std::string kThreeLevel = "nas-devicedevice-7350142.kavra.example";
 
 class DnsCheckTest : public ConnectionTest {
 protected:
-    /// Where the three names lead: 'W' here, 'R' to the relay, 'O' elsewhere, '-' nowhere.
+    // Where the three names lead: 'W' here, 'R' to the relay, 'O' elsewhere, '-' nowhere.
     void namesLeadTo(const std::string& places) {
         const std::string names[] = {kFourLevel, kThreeLevel, support::kSubdomain};
         std::map<char, std::string> addresses{

@@ -72,11 +72,12 @@ TEST_F(ForwardSearchTest, GrantedNatpmpPortIsTestedAndTakenBackByItsInternalPort
     gateway.natpmp = true;
     givenGateway();
     gateway.granted = {40001, {}, 600};
-    EXPECT_EQ(story(search()), "natpmp 9091>8080, disk, test 40001 = 40001 40001");
+    EXPECT_EQ(story(search()), "natpmp 9091 -> 8080, disk, test 40001 = 40001 40001");
     failTest(40001);
-    EXPECT_EQ(story(search()),
-              "natpmp 9091>8080, disk, test 40001 x3, status failed, natpmp 0>8080, next port, "
-              "natpmp 0>8080, natpmp 0>8080, natpmp 9092>8080, disk, test 40001 = 40001 40001");
+    EXPECT_EQ(
+        story(search()),
+        "natpmp 9091 -> 8080, disk, test 40001 x3, status failed, natpmp 0 -> 8080, next port, "
+        "natpmp 0 -> 8080, natpmp 0 -> 8080, natpmp 9092 -> 8080, disk, test 40001 = 40001 40001");
 }
 
 TEST_F(ForwardSearchTest, DoubleNatAtAPredefinedPortReturnsTheRelayValue) {

@@ -18,7 +18,7 @@ void published(World& w, long ago = 240) {
 }
 
 class ManualForwarding : public StoryTest {};
-TEST_P(ManualForwarding, TellsAsExpected) {
+TEST_P(ManualForwarding, DoesThisInOrder) {
     setConfig("MANUAL_PORT_FORWARD", "TRUE");
     setConfig("MANUAL_EXTERNAL_HTTP_PORT", "18080");
     setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "18443");
@@ -27,38 +27,48 @@ TEST_P(ManualForwarding, TellsAsExpected) {
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Worlds, ManualForwarding, testing::Values(
     Row{"PublishesAndStopsTheRelayThoughTheDiskSleeps", [](World& w) { w.clientRuns(); w.diskIsAsleep(); },
-        {"take over, by hand, stop, up = portforwarded", " = portforwarded"}},
-    Row{"RelayThatCannotBeStoppedFailsOnlyTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
-        {"take over, by hand, stop, stop, stop, failed = portforwarded", " = portforwarded"}},
+        {"take over, " + kPublishByHand + ", stop, " + kReported + " = portforwarded", " = portforwarded"}},
+    Row{"RelayThatCannotBeStoppedFailsTheReport", [](World& w) { w.clientRuns(); w.commands.answer("kill -", "", 1); },
+        {"take over, " + kPublishByHand + ", stop, stop, stop, failed = portforwarded", " = portforwarded"}},
     Row{"TakingOverRemovesTheAutomaticMappingsAndOnlyThem",
         [](World& w) { w.gateway.table.push_back({5000, kLanIp, 22, "ssh"}); w.cycle(); automaticCycle(w); },
-        {"take over, unmap 9091 9444, by hand, connected, force 0 = 5000 portforwarded", " = 5000 portforwarded"}},
-    Row{"TakingOverWithoutAGatewayRemovesNothing", [](World& w) { w.gateway.upnp = false; }, {"by hand, up = portforwarded"}},
+        {"take over, unmap 9091 9444, " + kPublishByHand + ", connected, force 0 = 5000 portforwarded",
+         " = 5000 portforwarded"}},
+    Row{"TakingOverWithoutAGatewayRemovesNothing", [](World& w) { w.gateway.upnp = false; },
+        {kPublishByHand + ", " + kReported + " = portforwarded"}},
     // The user's router may well sit behind another one: only the test counts.
     Row{"ClosedPortFailsAndIsReported", [](World& w) { w.web.answer("/test?", kOtherNat); },
-        {"take over, connecting, test :18080 x3, status failed, failed, no relay, lanip = failed"}},
-    Row{"SkippedTestKeepsThePreviousConnectionType", [](World& w) { automaticCycle(w); w.web.answer("/remote_access_status/", kWait); },
+        {"take over, connecting, test :18080 x3, status failed, failed, " + relayFails() + ", lanip = failed"}},
+    Row{"SkippedTestKeepsThePreviousConnectionType",
+        [](World& w) { automaticCycle(w); w.web.answer("/remote_access_status/", kWait); },
         {"take over, unmap 9091 9444, connecting, failed = portforwarded"}},
-    Row{"DoubleNatSeenByTheAutomaticSearchEndsTheAttempt", [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
-        {"take over, no relay = failed"}},
+    Row{"DoubleNatOfTheSearchEndsTheAttempt", [](World& w) { w.web.answer("/test?", kOtherNat); automaticCycle(w); },
+        {"take over, " + relayFails() + " = failed"}},
     Row{"UnpublishedPortsFailAndAreTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
-        {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, no relay, status failed, lanip = failed",
-         "take over, by hand, up = portforwarded"}},
+        {"take over, connecting, test :18080, record WAN&LAN&18080&18443, failed, " + relayFails() +
+         ", status failed, lanip = failed", "take over, " + kPublishByHand + ", " + kReported + " = portforwarded"}},
     Row{"TestsUnchangedPortsAfterTheInterval", [](World& w) { published(w, 241); },
         {"disk, test :18080 = portforwarded", " = portforwarded"}},
-    Row{"LetsTheDiskSleep", [](World& w) { published(w, 241); w.diskIsAsleep(); }, {"disk = portforwarded", "disk = portforwarded"}},
-    Row{"PublishesAChangedHttpPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTP_PORT", "28080"); },
-        {"connecting, test :28080, publish WAN LAN 28080 18443, connected, force 0 = portforwarded", " = portforwarded"}},
-    Row{"PublishesAChangedHttpsPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "28443"); },
-        {"connecting, test :18080, publish WAN LAN 18080 28443, connected, force 0 = portforwarded", " = portforwarded"}},
+    Row{"LetsTheDiskSleep", [](World& w) { published(w, 241); w.diskIsAsleep(); },
+        {"disk = portforwarded", "disk = portforwarded"}},
+    Row{"PublishesANewHttpPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTP_PORT", "28080"); },
+        {"connecting, test :28080, " + publish(28080, 18443) + ", connected, force 0 = portforwarded",
+         " = portforwarded"}},
+    Row{"PublishesANewHttpsPort", [](World& w) { published(w); w.setConfig("MANUAL_EXTERNAL_HTTPS_PORT", "28443"); },
+        {"connecting, test :18080, " + publish(18080, 28443) + ", connected, force 0 = portforwarded",
+         " = portforwarded"}},
     // The server may send anything as an address; the fixture looks for secrets in all lines.
-    Row{"PublishesAChangedAddressAndMasksIt",
-        [](World& w) { w.web.answer("/test?", passed(support::kDeviceId)); published(w); w.web.answer("/test?", passed()); },
-        {"by hand, connected, force 0 = portforwarded", " = portforwarded"}},
+    Row{"PublishesANewAddressAndMasksIt", [](World& w) {
+            w.web.answer("/test?", passed(support::kDeviceId));
+            published(w);
+            w.web.answer("/test?", passed());
+        },
+        {kPublishByHand + ", connected, force 0 = portforwarded", " = portforwarded"}},
     Row{"PublishesWhenForced", [](World& w) { published(w); w.manager().setForceConnect(true); },
-        {"force 1, by hand, connected, force 0 = portforwarded", " = portforwarded"}},
+        {"force 1, " + kPublishByHand + ", connected, force 0 = portforwarded", " = portforwarded"}},
     Row{"EndsWithTheRelay", [](World& w) { published(w, 241); w.relayWorks(); w.failTest(18080); },
-        {"disk, test :18080 x3, status failed, relay up, lanip = relayed", "take over, by hand, up = portforwarded"}}), RowName{});
+        {"disk, test :18080 x3, status failed, " + relayStarts() + ", lanip = relayed",
+         "take over, " + kPublishByHand + ", " + kReported + " = portforwarded"}}), RowName{});
 // clang-format on
 
 TEST_F(ConnectionTest, ManuallyForwardedPortsMustBeWithinTheRange) {

@@ -8,7 +8,7 @@ namespace {
 
 class NetworkAddrsTest : public ConnectionTest {
 protected:
-    /// The result of a discovery and which addresses have changed.
+    // The result of a discovery and which addresses have changed.
     std::string discover() {
         const int result = addresses.discoverNetworkAddrs();
         return std::to_string(result) + (addresses.hasExternalIPChanged() ? " external" : "") +

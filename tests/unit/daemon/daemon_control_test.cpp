@@ -23,8 +23,8 @@ protected:
 };
 
 TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
-    const std::string end = "unmap 9091, withdraw LAN = disabled";
-    const std::string switched = "connecting/disabled, status disabled, ";
+    const std::string end = "unmap 9091, " + withdraw("LAN") + " = disabled";
+    const std::string switched = "connecting type=disabled, status disabled, ";
     const std::pair<const char*, std::string> rows[]{
         {"failed", switched + "lanip, " + end},
         {"", "status connecting, " + switched + end},
@@ -83,8 +83,8 @@ TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     });
     control.run();
     EXPECT_LT(clock.now() - before, 900);
-    EXPECT_EQ(story(NONE),
-              "status disabled, withdraw LAN, unmap 9091 9444, connecting/disabled = disabled");
+    EXPECT_EQ(story(NONE), "status disabled, " + withdraw("LAN") +
+                               ", unmap 9091 9444, connecting type=disabled = disabled");
     const std::string type = "connectionType:[1]  connectionSubType:[0]\n";
     EXPECT_EQ(log.countPart("COMMUNICATION status:[disabled]  " + type), 1);
     EXPECT_EQ(log.texts().back(), "DaemonControl::run - Remote access disabled.\n");

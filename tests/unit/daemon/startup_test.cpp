@@ -107,7 +107,7 @@ TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {
     EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
 }
 
-TEST_F(StartupTest, TheLogIsOpenedOnRequestAndNotWhenTheArgumentsEndIt) {
+TEST_F(StartupTest, LogOptionsSetTheLogUnlessTheProgramEndsAtItsArguments) {
     start({"-lc", "0", "-u"});
     EXPECT_EQ(reported.find("<1>main - syslog severity level set to 0.\n"), 0U);
     EXPECT_TRUE(holds("level 1\nopenlog Pelorus 2 128\n")) << reported;
@@ -117,7 +117,7 @@ TEST_F(StartupTest, TheLogIsOpenedOnRequestAndNotWhenTheArgumentsEndIt) {
     EXPECT_EQ(start({"-l", "6", "-x"}) + reported, " exit 1");
 }
 
-TEST_F(StartupTest, AFailureOnTheWayEndsIt) {
+TEST_F(StartupTest, AFailedStepEndsTheStart) {
     EXPECT_EQ(start({"-u"}, {"fork"}) + reported, " exit 1");
     for (const char* call : {"setsid", "chdir"}) {
         EXPECT_EQ(start({"-u"}, {call}), " exit 0 exit 1") << call;
@@ -128,7 +128,7 @@ TEST_F(StartupTest, AFailureOnTheWayEndsIt) {
     EXPECT_TRUE(holds("<3>main - config file failed to load.\nexit: ")) << reported;
 }
 
-TEST_F(StartupTest, OnlyOneAndNoUnmapMakesCyclesRun) {
+TEST_F(StartupTest, CyclesRunOnlyWhenEnabledAndWithoutTheUnmapOption) {
     const std::pair<const char*, Texts> off[]{{"", {}}, {"10", {}}, {"true", {}}, {"1", {"-u"}}};
     for (const auto& [value, arguments] : off) {
         givenSwitch(value);

@@ -183,6 +183,10 @@ TEST_F(VpnManagerTest, TheLastReadableRelayAddressWins) {
     EXPECT_TRUE(manager.fetchOpenVPN_IPAddr(ip));
     EXPECT_EQ(ip, "44.1.1.3");
     EXPECT_EQ(log.countPart("failed to fetch openVPN AF_INET IP address from line"), 2);
+}
+
+TEST(RelayPeerTest, AnAddressIsFourNumbersNotBelowZero) {
+    const std::string peer = "at 12:00 Peer Connection Initiated with [AF_INET]";
     EXPECT_EQ(readRelayPeer((peer + " 44.300.007. 0").c_str())->address, "44.300.7.0");
     for (const char* const bad :
          {"44.-1.0.2", "44X.1.1.1", "4294967297.1.1.1", "44.128.0", "44.128.0:1", ""}) {

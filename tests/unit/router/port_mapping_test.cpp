@@ -133,7 +133,7 @@ TEST_F(PortMappingTest, AnEndlessTableEndsWithTheStopBudget) {
     EXPECT_EQ(gateway.calls().size(), 9U);
 }
 
-TEST_F(PortMappingTest, NatpmpGetsTheCalls) {
+TEST_F(PortMappingTest, WithANatpmpGatewayAllCallsGoToNatpmp) {
     router.setReqPortMappingLifetime(600, 700);
     discovered("NAT-PMP");
     EXPECT_TRUE(map(443, 9444));

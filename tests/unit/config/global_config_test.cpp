@@ -16,8 +16,10 @@ namespace fs = std::filesystem;
 
 class ConfigTest : public PelorusTest {
 protected:
-    ConfigTest() {
-        log.onLine([this](const LogLine& line) { logged += line.text; });
+    // Loads a configuration with a copy.
+    void load(const std::string& dynamicText, const std::string& more = "") {
+        writeFile("dynamicconfig.ini", dynamicText);
+        EXPECT_TRUE(config.loadConfig(writeFile("static.ini", inUse + more)));
     }
     // As another program would, at another second: even an earlier one counts as a change.
     void rewriteCopy(const std::string& text) {
@@ -36,7 +38,7 @@ protected:
 
     GlobalConfig& config = *GlobalConfig::getInstance();
     const std::string copy = path("copy.ini");
-    std::string logged;
+    const std::string inUse = "DYNAMIC_CONFIG=" + folder + "\nDYNAMIC_CONFIG_TMP=" + copy + "\n";
 };
 
 TEST(SettingLine, IsSplitIntoKeyAndValue) {
@@ -66,11 +68,8 @@ TEST_F(ConfigTest, TheDynamicFileIsReadDirectlyWithoutACopy) {
 
 TEST_F(ConfigTest, ACopyIsMadeForAllProgramsAndReadWhenItChanges) {
     const std::string text = "KEY=" + std::string(295, 'x') + "REST=1\nLAST=without line end";
-    writeFile("dynamicconfig.ini", text);
-    const std::string inUse = "DYNAMIC_CONFIG=" + folder + "\nDYNAMIC_CONFIG_TMP=" + copy + "\n";
-    const mode_t before = umask(077);
-    EXPECT_TRUE(config.loadConfig(writeFile("static.ini", inUse)));
-    umask(before);
+    umask(077);
+    load(text);
     EXPECT_EQ(readFile(copy), text);
     EXPECT_EQ(fs::status(copy).permissions(), fs::perms{0666});
     EXPECT_EQ(config.getProperty("LAST"), "without line end");
@@ -85,13 +84,14 @@ TEST_F(ConfigTest, ACopyIsMadeForAllProgramsAndReadWhenItChanges) {
     // Each lookup but that of its path stats the copy, the first one before it exists.
     const std::string noCopy =
         "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [" + copy + "].\n";
-    EXPECT_EQ(logged,
-              "Getting path for dynamic config file.\n" + noCopy +
-                  "Getting path for TEMP dynamic config file.\n"
-                  "Loading TEMP dynamic config file.\nOpening dynamic config file for copy.\n"
-                  "Creating temp copy of dynamic config file.\nCopying dynamic config file.\n"
-                  "Re-opening TEMP dynamic config file.\nReload dynamicconfig.ini file.\n" +
-                  noCopy + noCopy);
+    EXPECT_EQ(
+        log.texts(),
+        (Texts{"Getting path for dynamic config file.\n", noCopy,
+               "Getting path for TEMP dynamic config file.\n",
+               "Loading TEMP dynamic config file.\n", "Opening dynamic config file for copy.\n",
+               "Creating temp copy of dynamic config file.\n", "Copying dynamic config file.\n",
+               "Re-opening TEMP dynamic config file.\n", "Reload dynamicconfig.ini file.\n", noCopy,
+               noCopy}));
     EXPECT_TRUE(config.refresh());
     EXPECT_EQ(readFile(copy), "LAST=new\n");
     rewriteCopy("LAST=unreadable\n");
@@ -116,7 +116,7 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
     fs::current_path(folder);
     writeFile("dynamicconfig.ini", "KEY=v\n");
     EXPECT_FALSE(config.loadConfig("static.ini"));
-    const auto row = [&](const char* text, const std::string& line, rlim_t limit = RLIM_INFINITY) {
+    const auto row = [&](const auto& text, const std::string& line, rlim_t limit = RLIM_INFINITY) {
         writeFile("static.ini", text);
         limitFiles(limit);
         EXPECT_FALSE(config.refresh());
@@ -124,7 +124,6 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
         EXPECT_EQ(log.texts().back(), "GlobalConfig::loadConfig" + line + "\n");
         EXPECT_FALSE(fs::exists(copy));
     };
-    const char* const inUse = "DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=copy.ini\n";
     const std::string noOpen = "() - failed to open dynamic config settings file: ";
     const std::string noCopy = "() - failed to create temporary dynamic config file: ";
     row("nothing\nhere\n", "Settings() - failed to open config file: [static.ini].");
@@ -133,26 +132,15 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
     row("DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=gone/copy.ini\n", noCopy + "gone/copy.ini");
     for (const std::size_t size : {100U, 10'000U}) {
         writeFile("dynamicconfig.ini", std::string(size, 'x') + "\nLAST=1\n");
-        row(inUse, "() - failed to write temporary dynamic config file: copy.ini", size / 2);
+        row(inUse, "() - failed to write temporary dynamic config file: " + copy, size / 2);
     }
     log.onLine([&](const LogLine& last) {
         if (last.text == "Re-opening TEMP dynamic config file.\n") fs::remove(copy);
     });
-    row(inUse, "() - failed to open temp dynamic config settings file: [copy.ini].");
+    row(inUse, "() - failed to open temp dynamic config settings file: [" + copy + "].");
 }
 
-class SharedCopyTest : public ConfigTest {
-protected:
-    // Loads a configuration with a copy.
-    void load(const std::string& dynamicText, const std::string& more = "") {
-        writeFile("dynamicconfig.ini", dynamicText);
-        EXPECT_TRUE(config.loadConfig(
-            writeFile("static.ini",
-                      "DYNAMIC_CONFIG=" + folder + "\nDYNAMIC_CONFIG_TMP=" + copy + "\n" + more)));
-    }
-};
-
-TEST_F(SharedCopyTest, OnlyTheStaticFileSetsTheKeysItReserves) {
+TEST_F(ConfigTest, OnlyTheStaticFileSetsTheKeysItReserves) {
     load("STARTCMD=id\nKEY=v\nSTATIC_ONLY_KEYS=KEY\n",
          "STARTCMD=openvpn\nSTATIC_ONLY_KEYS=STARTCMD GONE\nSTATIC_ONLY_KEYS=OTHER\n");
     EXPECT_EQ(config.getProperty("KEY"), "v");
@@ -165,7 +153,7 @@ TEST_F(SharedCopyTest, OnlyTheStaticFileSetsTheKeysItReserves) {
     EXPECT_EQ(log.countPart("only the static config file may set "), 3);
 }
 
-TEST_F(SharedCopyTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
+TEST_F(ConfigTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
     fs::current_path(folder);
     const std::function<void()> plants[]{[&] { mkfifo(copy.c_str(), 0666); },
                                          [&] { fs::create_symlink("/dev/zero", copy); },
@@ -182,7 +170,7 @@ TEST_F(SharedCopyTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
     }
 }
 
-TEST_F(SharedCopyTest, AHugeCopyCostsNeitherTimeNorMemory) {
+TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     load("KEY=v\n");
     rewriteCopy("KEY=w\n");
     const auto rewritten = fs::last_write_time(copy);
@@ -227,7 +215,7 @@ TEST_F(ConfigTest, OnlyAWriteThroughThatFitsTouchesTheStaticFile) {
     EXPECT_EQ(readFile(file), before + "A=x\n");
     config.setProperty("A", "y", true);
     EXPECT_EQ(commands.lines(), std::vector<std::string>{"sed -i 's/A=x/A=y/g' " + file});
-    logged.clear();
+    log.clear();
     commands.answer("sed", "", 1);
     EXPECT_EQ(config.setProperty("A", "new", true), "new");
     limitFiles(static_cast<rlim_t>(fs::file_size(file)));
@@ -235,10 +223,11 @@ TEST_F(ConfigTest, OnlyAWriteThroughThatFitsTouchesTheStaticFile) {
     limitFiles(RLIM_INFINITY);
     FakeFiles::get().redirect(file, "");
     EXPECT_EQ(config.setProperty("C", "x", true), "x");
-    const std::string failure = "GlobalConfig::setProperty() - failed to ";
-    const std::string target = " config file: " + file + "\n";
-    EXPECT_EQ(logged, failure + "update" + target + failure + "update" + target + failure + "open" +
-                          target);
+    const std::string noUpdate =
+        "GlobalConfig::setProperty() - failed to update config file: " + file + "\n";
+    const std::string noOpen =
+        "GlobalConfig::setProperty() - failed to open config file: " + file + "\n";
+    EXPECT_EQ(log.texts(), (Texts{noUpdate, noUpdate, noOpen}));
 }
 
 }  // namespace

@@ -13,40 +13,39 @@ namespace {
 class BoundedCallTest : public PelorusTest {
 protected:
     BoundedCallTest() {
-        address.sin_family = AF_INET;
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t size = sizeof address;
-        EXPECT_EQ(bind(server, reinterpret_cast<sockaddr*>(&address), size), 0);
+        bindToLoopback(server);
         listen(server, 1);
-        getsockname(server, reinterpret_cast<sockaddr*>(&address), &size);
     }
     void TearDown() override {
         close(server);
         PelorusTest::TearDown();
     }
 
+    // Binds to any port, which is the address to send to from then on.
+    void bindToLoopback(int socket) {
+        address = {AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
+        EXPECT_EQ(bind(socket, target, size), 0);
+        getsockname(socket, target, &size);
+    }
     // Connects and waits for an answer; 0 when the connection was ended.
     ssize_t ask(int type) {
         const int client = socket(AF_INET, type, 0);
-        if (type == SOCK_STREAM) connectTo(client);
+        if (type == SOCK_STREAM) connect(client, target, size);
         char letter = 0;
         const ssize_t received = recv(client, &letter, 1, 0);
         close(client);
         return received;
     }
-    int connectTo(int client) {
-        return connect(client, reinterpret_cast<sockaddr*>(&address), sizeof address);
-    }
 
     const int server = socket(AF_INET, SOCK_STREAM, 0);
     sockaddr_in address{};
+    sockaddr* const target = reinterpret_cast<sockaddr*>(&address);
+    socklen_t size = sizeof address;
 };
 
 TEST_F(BoundedCallTest, AWaitEndsWithTheTimeOfTheCall) {
     const BoundedCall bounds{Peer::ANYBODY, 0};
-    EXPECT_EQ(ask(SOCK_STREAM), 0);
-    EXPECT_EQ(ask(SOCK_STREAM), 0);
-    EXPECT_EQ(ask(SOCK_DGRAM), 0);
+    for (const int type : {SOCK_STREAM, SOCK_STREAM, SOCK_DGRAM}) EXPECT_EQ(ask(type), 0);
 }
 
 TEST_F(BoundedCallTest, AWaitEndsWhenTheProcessGrows) {
@@ -61,17 +60,12 @@ TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
     for (const int seconds : {0, 3600}) {
         const BoundedCall bounds{Peer::ANYBODY, seconds};
         const int receiver = socket(AF_INET, SOCK_DGRAM, 0);
-        sockaddr_in here{};
-        here.sin_family = AF_INET;
-        here.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        EXPECT_EQ(bind(receiver, reinterpret_cast<sockaddr*>(&here), sizeof here), 0);
-        socklen_t size = sizeof here;
-        getsockname(receiver, reinterpret_cast<sockaddr*>(&here), &size);
+        bindToLoopback(receiver);
         char letters[1000] = {};
         long total = 0;
         for (ssize_t received = 1; received > 0; total += received) {
-            sendto(sender, letters, sizeof letters, 0, reinterpret_cast<sockaddr*>(&here), size);
-            sendto(sender, letters, sizeof letters, 0, reinterpret_cast<sockaddr*>(&here), size);
+            sendto(sender, letters, sizeof letters, 0, target, size);
+            sendto(sender, letters, sizeof letters, 0, target, size);
             received = recvfrom(receiver, letters, sizeof letters, 0, nullptr, nullptr);
         }
         EXPECT_LE(total, BoundedCall::kMostReceived + 1000);
@@ -86,7 +80,7 @@ TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {
         const BoundedCall bounds{Peer::GATEWAY, 3600};
         for (const char* own : {"127.0.0.1", "127.3.2.1", "0.0.0.0", "0.1.2.3"}) {
             inet_pton(AF_INET, own, &address.sin_addr);
-            EXPECT_EQ(connectTo(client), -1) << own;
+            EXPECT_EQ(connect(client, target, size), -1) << own;
             EXPECT_EQ(errno, EACCES) << own;
         }
         sockaddr_in6 local{AF_INET6, address.sin_port, 0, in6addr_loopback, 0};
@@ -94,7 +88,7 @@ TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {
         EXPECT_EQ(errno, EACCES);
     }
     inet_pton(AF_INET, "127.0.0.1", &address.sin_addr);
-    EXPECT_EQ(connectTo(client), 0);
+    EXPECT_EQ(connect(client, target, size), 0);
     close(client);
 }
 

@@ -11,16 +11,14 @@ using ShellTest = PelorusTest;
 volatile std::sig_atomic_t delivered = 0;
 
 TEST_F(ShellTest, ASignalThatArrivesDuringACommandIsDeliveredAfterIt) {
-    FakeCommands::Answer command;
-    command.exitStatus = 3;
-    command.action = [](const std::string&) {
+    const auto interrupt = [](const std::string&) {
         for (const int signal : {SIGINT, SIGQUIT}) {
             std::signal(signal, SIG_IGN);  // as the C library does while a command runs
             raise(signal);
             std::signal(signal, [](int) { delivered = delivered + 1; });
         }
     };
-    commands.answer("sleep", command);
+    commands.answer("sleep", FakeCommands::Answer{"", 3, false, interrupt});
     EXPECT_EQ(WEXITSTATUS(runShell("sleep 5")), 3);
     EXPECT_EQ(delivered, 2);
 }

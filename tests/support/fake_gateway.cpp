@@ -20,7 +20,6 @@ constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnecti
 // Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins,
 // since clients may outlive the test that made them.
 const int clientSocket = open("/dev/null", O_RDONLY);
-int clientsMade = 0;
 int openClients = 0;
 
 FakeGateway& gateway = FakeGateway::get();  // NOLINT(cert-err58-cpp): as above
@@ -41,19 +40,8 @@ auto find(int port, const std::string& protocol) {
     });
 }
 
-// The next answer to the client that asked last; answers to clients closed since are lost.
-auto nextAnswer() {
-    return std::find_if(gateway.onTheWay.begin(), gateway.onTheWay.end(),
-                        [](const auto& answer) { return answer.second.client == gateway.asking; });
-}
-
 bool hasArrived() {
-    return nextAnswer() != gateway.onTheWay.end() && nextAnswer()->first <= gateway.natpmpTime;
-}
-
-void checkBrokenPipeBlocked() {
-    expectTerminationHeld();
-    EXPECT_TRUE(areBlocked({SIGPIPE})) << "a closed connection would end the process";
+    return !gateway.onTheWay.empty() && gateway.onTheWay.begin()->first <= gateway.natpmpTime;
 }
 
 void fill(char* buffer, std::size_t size, const std::string& text) {
@@ -62,7 +50,7 @@ void fill(char* buffer, std::size_t size, const std::string& text) {
 
 // Notes a question to the control URL; true when it arrives.
 bool arrives(const char* url, const char* service, const std::string& line) {
-    checkBrokenPipeBlocked();
+    expectBrokenPipeHeld();
     gateway.note(line);
     return gateway.upnp && std::string(url) == kControlUrl && std::string(service) == kServiceType;
 }
@@ -75,35 +63,23 @@ FakeGateway::Reply replyFor(const std::vector<Mapping>::iterator& held, int miss
     return {0, held->client, internalPort, held->description, externalPort, held->protocol};
 }
 
-std::string protocolName(int protocol) {
-    return protocol == NATPMP_PROTOCOL_TCP ? "TCP" : "UDP";
-}
-
-// Makes or removes a mapping; a refusal has a result code.
+// Makes or removes the mapping of an internal port; a refusal has a result code.
 natpmpresp_t map(int type, int privatePort, int publicPort, unsigned lifetime) {
     natpmpresp_t answer{};
     answer.type = static_cast<std::uint16_t>(type);
-    if (lifetime != 0 && refuses(publicPort)) {
-        answer.resultcode = 2;  // not authorized
-        return answer;
-    }
-    const std::string protocol = protocolName(type);
-    const auto isOwn = [&](const Mapping& held) {
-        return held.client == kDeviceAddress && held.protocol == protocol &&
-               (privatePort == 0 || held.internalPort == privatePort);
-    };
-    auto& table = gateway.table;
-    table.erase(std::remove_if(table.begin(), table.end(), isOwn), table.end());
+    answer.resultcode = lifetime != 0 && refuses(publicPort) ? 2 : 0;  // not authorized
+    if (answer.resultcode != 0) return answer;
     const auto& granted = gateway.granted;
-    publicPort = granted.publicPort.value_or(publicPort);
-    if (lifetime != 0) {
-        while (find(publicPort, protocol) != table.end()) ++publicPort;
-        table.push_back({publicPort, kDeviceAddress, privatePort, "", protocol});
-    }
     auto& mapping = answer.pnu.newportmapping;
     mapping.privateport = static_cast<std::uint16_t>(granted.privatePort.value_or(privatePort));
-    mapping.mappedpublicport = static_cast<std::uint16_t>(publicPort);
+    mapping.mappedpublicport = static_cast<std::uint16_t>(granted.publicPort.value_or(publicPort));
     mapping.lifetime = granted.lifetime.value_or(lifetime);
+    auto& table = gateway.table;
+    const auto isOld = [&](const Mapping& held) {
+        return privatePort == 0 || held.internalPort == privatePort;
+    };
+    table.erase(std::remove_if(table.begin(), table.end(), isOld), table.end());
+    if (lifetime != 0) table.push_back({mapping.mappedpublicport, kDeviceAddress, privatePort});
     return answer;
 }
 
@@ -112,17 +88,16 @@ void transmit(natpmp_t* client) {
     gateway.retryTime = gateway.natpmpTime + (250L << client->try_number);
     ++client->try_number;
     gateway.connectionRefused = !gateway.natpmp;
+    if (!gateway.natpmp || gateway.silent) return;
     const long arrival = std::max(gateway.natpmpTime + gateway.answerDelay, gateway.hungUntil);
-    for (int copy = 0; gateway.pending && copy < gateway.copies; ++copy) {
-        gateway.onTheWay.insert({arrival, {gateway.asking, *gateway.pending}});
+    for (int copy = 0; copy < gateway.copies; ++copy) {
+        gateway.onTheWay.emplace(arrival, gateway.pending);
     }
 }
 
-int ask(natpmp_t* client, const std::string& call, const std::function<natpmpresp_t()>& answer) {
-    gateway.asking = client->pending_request_len;
+int ask(natpmp_t* client, const std::string& call, const natpmpresp_t& answer) {
     if (const int status = failure(call)) return status;
-    gateway.pending.reset();
-    if (gateway.natpmp && !gateway.silent) gateway.pending = answer();
+    gateway.pending = answer;
     client->has_pending_request = 1;
     client->try_number = 0;
     transmit(client);
@@ -151,7 +126,7 @@ UPNPDev* __wrap_upnpDiscover(int delay, const char*, const char*, int, int,
 #endif
                              int* error) {
     *error = 0;
-    checkBrokenPipeBlocked();
+    expectBrokenPipeHeld();
     gateway.note("discover " + std::to_string(delay) + " ms");
     auto& listed = gateway.listed;
     if (gateway.upnp) listed.resize(gateway.devices.size());
@@ -174,7 +149,7 @@ int __wrap_UPNP_GetValidIGD(UPNPDev* list, UPNPUrls* urls, IGDdatas* data,
                             , char*, int
 #endif
 ) {
-    checkBrokenPipeBlocked();
+    expectBrokenPipeHeld();
     EXPECT_FALSE(gateway.listed.empty()) << "texts of a list that was released";
     std::string line = "igd";
     for (; list != nullptr; list = list->pNext) line.append(" ").append(list->descURL);
@@ -260,7 +235,6 @@ int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
     *client = {};
     client->gateway = found;
     client->s = clientSocket;
-    client->pending_request_len = ++clientsMade;  // not otherwise used here
     ++openClients;
     const int status = failure("open");  // the library keeps its socket
     if (status == 0) fcntl(clientSocket, F_SETFD, 0);
@@ -269,27 +243,24 @@ int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
 
 int __wrap_closenatpmp(natpmp_t* /*client*/) {
     gateway.note("natpmp close");
+    gateway.onTheWay.clear();  // late answers find no socket
     EXPECT_GT(openClients--, 0) << "a NAT-PMP client that was not opened";
     return failure("close");
 }
 
 int __wrap_sendpublicaddressrequest(natpmp_t* client) {
     gateway.note("natpmp address");
-    return ask(client, "address", [] {
-        natpmpresp_t answer{};
-        inet_pton(AF_INET, gateway.externalIp.c_str(), &answer.pnu.publicaddress.addr);
-        return answer;
-    });
+    natpmpresp_t answer{};
+    inet_pton(AF_INET, gateway.externalIp.c_str(), &answer.pnu.publicaddress.addr);
+    return ask(client, "address", answer);
 }
 
-int __wrap_sendnewportmappingrequest(natpmp_t* client,
-                                     int protocol,
-                                     std::uint16_t privatePort,
-                                     std::uint16_t publicPort,
-                                     std::uint32_t lifetime) {
-    gateway.note("natpmp map " + protocolName(protocol) + " " + std::to_string(publicPort) +
-                 " -> " + std::to_string(privatePort) + " for " + std::to_string(lifetime) + " s");
-    return ask(client, "map", [&] { return map(protocol, privatePort, publicPort, lifetime); });
+int __wrap_sendnewportmappingrequest(natpmp_t* client, int protocol, std::uint16_t privatePort,
+                                     std::uint16_t publicPort, std::uint32_t lifetime) {
+    const std::string name = protocol == NATPMP_PROTOCOL_TCP ? "TCP " : "UDP ";
+    gateway.note("natpmp map " + name + std::to_string(publicPort) + " -> " +
+                 std::to_string(privatePort) + " for " + std::to_string(lifetime) + " s");
+    return ask(client, "map", map(protocol, privatePort, publicPort, lifetime));
 }
 
 int __wrap_getnatpmprequesttimeout(natpmp_t* client, timeval* timeout) {
@@ -303,7 +274,7 @@ int __wrap_readnatpmpresponseorretry(natpmp_t* client, natpmpresp_t* response) {
     if (const int status = failure("read")) return status;
     if (client->has_pending_request == 0) return NATPMP_ERR_NOPENDINGREQ;
     if (hasArrived()) {
-        const natpmpresp_t answer = gateway.onTheWay.extract(nextAnswer()).mapped().answer;
+        const auto answer = gateway.onTheWay.extract(gateway.onTheWay.begin()).mapped();
         if (answer.resultcode != 0) return NATPMP_ERR_NOTAUTHORIZED;  // the request stays pending
         *response = answer;
         client->has_pending_request = 0;
@@ -325,10 +296,9 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
     const long limit = timeout->tv_usec / 1000;
     gateway.note("natpmp wait " + std::to_string(limit) + " ms");
     if (gateway.connectionRefused) return 1;
-    const auto next = nextAnswer();
     const long end = gateway.natpmpTime + limit;
-    gateway.natpmpTime = std::max(
-        gateway.natpmpTime, next == gateway.onTheWay.end() ? end : std::min(end, next->first));
+    const long next = gateway.onTheWay.empty() ? end : gateway.onTheWay.begin()->first;
+    gateway.natpmpTime = std::clamp(next, gateway.natpmpTime, end);
     return hasArrived() ? 1 : 0;
 }
 }

@@ -1,4 +1,4 @@
-// The home gateway of a test. The UPnP calls of miniupnpc, libnatpmp and select end here, in one
+// The home gateway of a test. The UPnP calls of miniupnpc, libnatpmp and select end here; in one
 // mapping table; nothing is sent. Initially it speaks UPnP only, is connected and has no mapping.
 // Only waits for NAT-PMP answers take time. Each call leaves one line, in order:
 //
@@ -93,15 +93,10 @@ public:
     // For the library calls.
     std::vector<UPNPDev> listed;  // handed out and not released
     int urlSets = 0;
-    std::optional<natpmpresp_t> pending;  // the answer to the last request
+    natpmpresp_t pending{};  // the answer to the last request
     long retryTime = 0;
     bool connectionRefused = false;
-    struct Answer {
-        int client;
-        natpmpresp_t answer;
-    };
-    int asking = 0;                        // the client that sent the last request
-    std::multimap<long, Answer> onTheWay;  // by arrival
+    std::multimap<long, natpmpresp_t> onTheWay;  // answers by arrival
 };
 
 }  // namespace pelorus::support

@@ -6,6 +6,7 @@
 #include <stdexcept>
 
 #include "config/global_config.h"
+#include "support/fake_gateway.h"
 
 namespace pelorus::support {
 
@@ -31,6 +32,7 @@ PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescri
 void PelorusTest::TearDown() {
     commands.checkClosed();
     net.checkReleased();
+    FakeGateway::get().checkReleased();
     EXPECT_EQ(openDescriptors(), descriptorsAtStart) << "descriptors now and at the start";
     EXPECT_EQ(blockedSignals(), blockedAtStart) << "blocked signals now and at the start";
     fs::remove_all(folder);

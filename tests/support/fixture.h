@@ -1,7 +1,7 @@
 // The base of every test fixture. The fakes are always in place: no test reaches the shell, the
 // network, the system log or the real clock. Every test fails when a configured secret is in a log
-// line, and when pipes, address lists, descriptors or the signal mask are not as they were. The
-// headers of the fakes name their own checks.
+// line, and when pipes, lists from a library, descriptors or the signal mask are not as they were.
+// The headers of the fakes name their own checks.
 #ifndef PELORUS_SUPPORT_FIXTURE_H
 #define PELORUS_SUPPORT_FIXTURE_H
 
@@ -30,9 +30,8 @@ protected:
     std::string writeFile(const std::string& name, const std::string& content) const;
     [[nodiscard]] static std::string readFile(const std::string& file);
 
-    /// Writes static.ini and dynamicconfig.ini, loads both and clears the log. The device has
-    /// the identity above unless the dynamic settings say otherwise. The dynamic
-    /// file is read directly, without a temporary copy.
+    /// Writes static.ini and dynamicconfig.ini, loads both and clears the log. The dynamic file is
+    /// read directly, without a temporary copy; the identity above is in it unless it has its own.
     void givenConfig(const Settings& settings = {}, const Settings& dynamicSettings = {});
     /// Changes one value in memory, and the secrets with it.
     void setConfig(const std::string& key, const std::string& value);

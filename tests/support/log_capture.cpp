@@ -34,11 +34,6 @@ void LogCapture::take(const LogLine& line) {
     taking = false;
 }
 
-void expectLogged(int priority, const std::string& text) {
-    EXPECT_GT(LogCapture::get().count(priority, text), 0)
-        << "never logged: <" << priority << "> " << text << LogCapture::get().dump();
-}
-
 extern "C" {
 __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const char* format, ...) {
     std::array<char, 16384> text{};

@@ -49,8 +49,6 @@ private:
     bool taking = false;
 };
 
-/// Fails unless exactly this line came (text with its final newline).
-void expectLogged(int priority, const std::string& text);
 /// Fails unless the lines are exactly these.
 inline void expectLogIs(const std::vector<LogLine>& lines) {
     EXPECT_EQ(LogCapture::get().lines(), lines);

@@ -14,10 +14,6 @@ unsigned __real_sleep(unsigned seconds);
 int __real_ppoll(pollfd* fds, nfds_t count, const timespec* timeout, const sigset_t* mask);
 }
 
-void VirtualClock::duringPause(int number, Action action) {
-    actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
-}
-
 bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
     constexpr std::size_t kMostPauses = 100'000;
     asked.push_back(static_cast<long>(waitMicros / kMicrosPerSecond));

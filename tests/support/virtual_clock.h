@@ -29,7 +29,9 @@ public:
 
     /// Runs @p action as the @p number th pause from now begins. A blocked signal raised there ends
     /// the pause if its mask lets it in; one that is not blocked comes too early to end it.
-    void duringPause(int number, Action action);
+    void duringPause(int number, Action action) {
+        actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
+    }
 
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
     bool wait(std::int64_t waitMicros, const sigset_t* mask);

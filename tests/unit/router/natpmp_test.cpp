@@ -39,23 +39,19 @@ struct Slow {
     long delay, hung;  // milliseconds: always, and at the first request only
     bool succeeds;     // what is asked after the first request
     int copies = 1;
-    friend void PrintTo(const Slow& row, std::ostream* out) { *out << row.name; }
 };
 
 class SlowGateway : public NatpmpTest, public ::testing::WithParamInterface<Slow> {
 protected:
-    // What succeeds carries its own values.
+    // What succeeds carries its own values. A lifetime of 0 removes.
     void expectOwn(int internalPort, int externalPort, unsigned lifetime = 600) {
-        const unsigned asked = lifetime;
+        unsigned granted = lifetime;
         port = externalPort;
-        if (client.portMappingRequest(internalPort, port, "TCP", "", false, lifetime)) {
-            EXPECT_TRUE(port == externalPort && lifetime == asked) << port << " " << lifetime;
-        } else {
-            EXPECT_FALSE(GetParam().succeeds) << internalPort;
-        }
+        const bool done = client.portMappingRequest(internalPort, port, "TCP", "", false, granted);
+        EXPECT_TRUE(done || !GetParam().succeeds) << internalPort;
+        EXPECT_TRUE(!done || (port == externalPort && granted == lifetime)) << log.dump();
         EXPECT_EQ(log.countPart("does not match"), 0);
     }
-    void expectRemoved(int internalPort) { expectOwn(internalPort, 0, 0); }
 };
 
 // clang-format off
@@ -74,9 +70,9 @@ TEST_P(SlowGateway, DoesNotMakeARequestSucceedWithTheValuesOfAnother) {
     gateway.refused = {9091};
     EXPECT_FALSE(map(80, 9091));
     for (int externalPort : {9092, 9093, 9094}) expectOwn(80, externalPort);
-    for (int round = 0; round < 3; ++round) expectRemoved(80);
+    for (int round = 0; round < 3; ++round) expectOwn(80, 0, 0);
     expectOwn(80, 9095);
-    expectRemoved(443);
+    expectOwn(443, 0, 0);
     expectOwn(443, 9444);
     EXPECT_TRUE(!client.retrieveExternalIP(ip) || ip == "44.128.0.20") << ip;
     gateway.answerDelay = 0;
@@ -126,19 +122,17 @@ INSTANTIATE_TEST_SUITE_P(, FailingCall, ::testing::Values(
 TEST_P(FailingCall, EndsTheRequest) {
     const Failure& row = GetParam();
     gateway.failing = row.calls;
-    EXPECT_FALSE(client.retrieveExternalIP(ip));
-    EXPECT_EQ(ip, row.ip);
-    EXPECT_FALSE(map(80, 9091));
-    EXPECT_EQ(port, 9091);
+    EXPECT_FALSE(client.retrieveExternalIP(ip) || map(80, 9091));
+    EXPECT_EQ(ip + std::to_string(port), row.ip + "9091");
     EXPECT_EQ(gateway.count("natpmp wait"), row.waits);
     EXPECT_EQ(gateway.count("natpmp open") - gateway.count("natpmp close"),
               1 - row.calls.count("open"));
-    for (const std::string& error : row.errors) expectLogged(LOG_ERR, error);
+    for (const std::string& error : row.errors) EXPECT_GE(log.count(LOG_ERR, error), 1) << error;
 }
 
 TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     EXPECT_FALSE(client.unmapPort(80, 9091, "%s%n"));
-    expectLogged(LOG_ERR, kRequest + "invalid protocol string %s%n\n");
+    EXPECT_EQ(log.count(LOG_ERR, kRequest + "invalid protocol string %s%n\n"), 1);
     EXPECT_TRUE(client.unmapPort(80, 9091, "UDP"));
     log.clear();
     ASSERT_TRUE(map(80, 9091) && map(443, 9444, true));
@@ -146,13 +140,10 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     gateway.granted = {{}, {}, 0};  // no time is a removal too
     EXPECT_TRUE(map(443, 9444, true));
     EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));
-    const std::string gone = "internal_port 80, external_port 9091, lifetime 172800\n";
-    expectLogged(LOG_INFO, kRequest + "destroyed HTTP port mapping. " + gone);
+    once("destroyed HTTP port mapping. internal_port 80, external_port 9091, lifetime 172800\n");
     once("destroyed HTTPS port mapping. internal_port 443, external_port 9444");
     once("tracked_internal_port 443, req_internal_port 22, external_port 9444");
-    once("destroyed all mappings");
-    once("destroyed HTTPS");
-    once("mismatch");
+    for (const char* part : {"destroyed all mappings", "destroyed HTTPS", "mismatch"}) once(part);
     gateway.granted = {};
     clock.advance(1);
     client.CheckExpiredMappings();

@@ -8,7 +8,6 @@
 
 namespace pelorus {
 
-using support::expectLogged;
 using support::FakeGateway;
 using support::RowName;
 using support::Texts;
@@ -17,14 +16,7 @@ using Mappings = std::vector<Mapping>;
 
 class RouterTest : public support::PelorusTest {
 protected:
-    RouterTest() {
-        gateway.reset();
-        givenConfig();
-    }
-    void TearDown() override {
-        gateway.checkReleased();
-        PelorusTest::TearDown();
-    }
+    RouterTest() { givenConfig(); }
 
     void discovered(const std::string& protocol = "UPnP") {
         gateway.upnp = protocol == "UPnP";

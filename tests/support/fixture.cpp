@@ -27,6 +27,7 @@ std::ptrdiff_t openDescriptors() {
 }  // namespace
 
 PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescriptors()} {
+    FakeGateway::get().reset();
 }
 
 void PelorusTest::TearDown() {

@@ -140,7 +140,8 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
     gateway.granted = {{}, {}, 0};  // no time is a removal too
     EXPECT_TRUE(map(443, 9444, true));
     EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));
-    once("destroyed HTTP port mapping. internal_port 80, external_port 9091, lifetime 172800\n");
+    const std::string gone = "internal_port 80, external_port 9091, lifetime 172800\n";
+    EXPECT_EQ(log.count(LOG_INFO, kRequest + "destroyed HTTP port mapping. " + gone), 1);
     once("destroyed HTTPS port mapping. internal_port 443, external_port 9444");
     once("tracked_internal_port 443, req_internal_port 22, external_port 9444");
     for (const char* part : {"destroyed all mappings", "destroyed HTTPS", "mismatch"}) once(part);

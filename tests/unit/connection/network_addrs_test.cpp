@@ -48,10 +48,7 @@ TEST_F(NetworkAddrsTest, WithoutAGatewayTheServerIsAskedOncePerInterval) {
     EXPECT_EQ(discover(), "1 external changed");
     EXPECT_EQ(discover(), "0 external changed");
     EXPECT_EQ(web.count("/myip"), 3);
-    for (const char* line : {"NetworkAddrs::getMyIP - failed to retrieve external IP address\n",
-                             "NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n"}) {
-        EXPECT_EQ(log.count(LOG_ERR, line), 2) << log.dump();
-    }
+    EXPECT_EQ(log.countPart("NetworkAddrs::discoverNetworkAddrs - getMyIP returned false\n"), 2);
 }
 
 TEST_F(NetworkAddrsTest, WaitsAsOftenAsTheServerAsksUntilTerminated) {

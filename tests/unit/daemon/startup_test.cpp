@@ -95,16 +95,15 @@ TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
 
 TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {
     const std::string target = writeFile("precious", "kept");
-    fs::create_symlink(target, path("pid"));
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
-    EXPECT_EQ(readFile(target), "kept");
-    fs::remove(path("pid"));
-    fs::create_hard_link(target, path("pid"));
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
-    EXPECT_EQ(readFile(target), "kept");
-    fs::remove(path("pid"));
-    ASSERT_EQ(mkfifo(path("pid").c_str(), 0600), 0);
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
+    const std::function<void()> plants[]{[&] { fs::create_symlink(target, path("pid")); },
+                                         [&] { fs::create_hard_link(target, path("pid")); },
+                                         [&] { mkfifo(path("pid").c_str(), 0600); }};
+    for (const auto& plant : plants) {
+        plant();
+        EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
+        EXPECT_EQ(readFile(target), "kept");
+        fs::remove(path("pid"));
+    }
 }
 
 TEST_F(StartupTest, LogOptionsSetTheLogUnlessTheProgramEndsAtItsArguments) {

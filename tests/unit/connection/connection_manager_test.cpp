@@ -72,8 +72,7 @@ INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
     Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
         {"connecting type=relayed, " + withdraw("") + ", start, start, start, start, "
          "failed type=relayed, status failed = failed"}},
-    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
-    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {kForwarded}}), RowName{});
+    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
     // The gateway object is new at the first, and so is the LAN address.
     Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {

@@ -11,11 +11,10 @@ protected:
     // Where the three names lead: 'W' here, 'R' to the relay, 'O' elsewhere, '-' nowhere.
     void namesLeadTo(const std::string& places) {
         const std::string names[] = {kFourLevel, kThreeLevel, support::kSubdomain};
-        std::map<char, std::string> addresses{
-            {'W', kWanIp}, {'R', "44.128.0.1"}, {'O', "44.1.1.1"}};
+        std::map<char, std::string> ips{{'W', kWanIp}, {'R', "44.128.0.1"}, {'O', "44.1.1.1"}};
         net.reset();
         for (std::size_t i = 0; i < 3; ++i) {
-            if (places[i] != '-') net.names[names[i]] = {addresses[places[i]]};
+            if (places[i] != '-') net.names[names[i]] = {ips[places[i]]};
         }
     }
     bool forcedCheck(ConnectionType type) {

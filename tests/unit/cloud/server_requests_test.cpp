@@ -64,8 +64,7 @@ TEST_F(ServerRequestsTest, TheRequestedWaitHoldsForOneCycle) {
     const auto row = [&](const std::string& body, int wait, const std::string& line) {
         web.answer(kPoll, body);
         EXPECT_EQ(client.serverRequestedSleep(), wait > 0) << body;
-        EXPECT_EQ(log.lines().back().text.find("TavikClient::pollServerForSleepTime - " + line),
-                  0U);
+        EXPECT_EQ(log.texts().back().find("TavikClient::pollServerForSleepTime - " + line), 0U);
         EXPECT_EQ(client.pollServerForSleepTime(), wait) << body;
         EXPECT_EQ(client.getServerSleepTime(), std::max(wait, 120));
         client.resetServerSleepTime();

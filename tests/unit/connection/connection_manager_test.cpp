@@ -31,12 +31,12 @@ TEST_F(ConnectionTest, SteadyTypeStretchesThePortTestIntervalAndANewOneResetsIt)
 }
 
 TEST_F(ConnectionTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
-    unsigned natpmp = 0, upnp = 0;
-    manager().getReqPortMappingLifetime(natpmp, upnp);
-    EXPECT_TRUE(natpmp == 4294967295U && upnp == 4294967295U);
+    unsigned upnp = 0, natpmp = 0;
+    manager().getReqPortMappingLifetime(upnp, natpmp);
+    EXPECT_TRUE(upnp == 4294967295U && natpmp == 4294967295U);
     manager().setReqPortMappingLifetime(600, 700);
-    manager().getReqPortMappingLifetime(natpmp, upnp);
-    EXPECT_TRUE(natpmp == 600 && upnp == 700);
+    manager().getReqPortMappingLifetime(upnp, natpmp);
+    EXPECT_TRUE(upnp == 600 && natpmp == 700);
 }
 
 TEST_F(ConnectionTest, MissingNamesTearEverythingDownAndForceATestInTheSameCycle) {

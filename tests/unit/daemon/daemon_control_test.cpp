@@ -40,10 +40,10 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
 
 TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
     givenEnabled(300);
-    const int laterPeriods[]{300, -1, 1000};
-    for (const std::string servers : {"301", "300", "30", "30"}) {
+    const int laterPeriods[]{300, -1, 1000};  // own, the server's are in its answers
+    for (const std::string wait : {"301", "300", "30", "30"}) {
         web.answerOnce("/remote_access_status/",
-                       "<action>wait</action><wait_time>" + servers + "</wait_time>");
+                       "<action>wait</action><wait_time>" + wait + "</wait_time>");
     }
     std::string pauses;
     inEachPause([&](unsigned cycles, const std::string& line) {

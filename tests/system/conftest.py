@@ -26,8 +26,7 @@ def pytest_pyfunc_call(pyfuncitem: pytest.Function) -> bool | None:
     """Outside a sandbox, run the test with its own pytest as the first process of a new one."""
     if sandbox.is_inside():
         return None
-    reason = sandbox.why_forbidden()
-    if reason:
+    if reason := sandbox.why_forbidden():
         pytest.skip(f"this machine does not allow network namespaces ({reason})")
     if not sandbox.binary().exists():
         pytest.fail(f"{sandbox.binary()} does not exist; build it or set PELORUS", pytrace=False)

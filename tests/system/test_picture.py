@@ -12,10 +12,8 @@ from lab.timeline import Event, Timeline
 
 pytestmark = pytest.mark.outside
 
-Shape = dict[str, str]
 
-
-def drawn(events: list[Event], kind: str, **wanted: str) -> list[Shape]:
+def drawn(events: list[Event], kind: str, **wanted: str) -> list[dict[str, str]]:
     """The shapes of a kind in the picture of the events: attributes and text, in their order."""
     root = ElementTree.fromstring(svg("A day in the lab", events))
     shapes = [{**shape.attrib, "text": shape.text or ""} for shape in root
@@ -23,7 +21,7 @@ def drawn(events: list[Event], kind: str, **wanted: str) -> list[Shape]:
     return [shape for shape in shapes if wanted.items() <= shape.items()]
 
 
-def ends(shape: Shape) -> tuple[float, float]:
+def ends(shape: dict[str, str]) -> tuple[float, float]:
     """The left and the right end of a shape; a text has no width of its own."""
     left = float(shape["x"])
     return left, left + float(shape.get("width", 7 * len(shape["text"])))

@@ -103,7 +103,6 @@ TEST_F(ReportsTest, OnlyAChangeOfStatusIsSent) {
     EXPECT_EQ(commands.lines(), std::vector<std::string>(3, "touch /tmp/dynamicconfig.ini"));
     EXPECT_EQ(log.countPart("Successful update status.\n\n"), 2);
     EXPECT_EQ(log.countPart("Response: [no *SUBDOMAIN_REMOVED*].\n"), 1);
-    EXPECT_EQ(log.countPart("failed to get response from localhost for url:  [" + url), 1);
 }
 
 TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
@@ -116,7 +115,6 @@ TEST_F(ReportsTest, AnalyticsEmitOneEvent) {
     row("portforwarded", 1, "connected type=portforwarded");
     row("relayed", 1, "connected type=relayed");
     row("failed", 1, "failed type=portforwarded");
-    row("failed", 4, "failed type=disabled");
     row("failed", 5, "failed type=disabled");  // beyond the table
     row("odd", 2, "failed type=disabled");
 }
@@ -131,13 +129,11 @@ TEST_F(ReportsTest, ADiskAsleepOrUnknownSkipsTheTest) {
         EXPECT_EQ(log.countPart(last), log.lines().empty() ? 0 : 1) << log.dump();
     };
     support::FakeFiles::get().redirect(support::kIdleMinutesFile, path("minutes"));
-    row(1, "state: idle", "", "failed to get open Ostrel sleep count file.\n");
     mkfifo(path("minutes").c_str(), 0666);  // planted to block
     row(1, "state: idle", "", "failed to get open Ostrel sleep count file.\n");
     std::filesystem::remove(path("minutes"));
     writeFile("minutes", "2\n0\n");
-    row(1, "state: standby", "5",
-        "drive is in standby, port test is suspended, port testing SKIP.\n");
+    row(1, "state: standby", "5", "drive is in standby, port test is suspended");
     row(1, "", "5", "unable to check drive status, popen() returned NULL.\n");
     row(1, "state: idle", "3", "sleep count > 1, port testing SKIP.\n");
     row(0, "state: idle", "5", "");  // the maker's router counts nothing

@@ -80,7 +80,6 @@ inline std::string relayStarts(const std::string& lan = "LAN") {
 inline std::string relayFails(const std::string& lan = "LAN") {
     return "connecting type=relayed, " + withdraw(lan) + ", start, failed type=relayed";
 }
-// clang-format on
 
 /// Public, so that the rows of a table can change the world.
 class ConnectionTest : public support::PelorusTest {
@@ -93,7 +92,6 @@ public:
         web.answer("", passed());
         commands.answer("hdparm", "drive state is:  active/idle\n");
         support::FakeFiles::get().redirect(support::kIdleMinutesFile, writeFile("minutes", "0\n"));
-        // clang-format off
         const std::string local = "http://127.0.0.1:%d/";
         givenConfig(
             {{"SERVER_BASE_URL", "https://cloud.kavra.example"}, {"REMOTE_TESTPORTURL", "/test?%s&%s:%d&%s&%s"},
@@ -103,8 +101,8 @@ public:
              {"OPENVPN_AUTH_FILE", path("auth.txt")}, {"OPENVPN_PID_FILE", path("client.pid")},
              {"STARTCMD_OUTFILE", path("client.out")}, {"STARTCMD", "start-client"}, {"LOG_SUCCESS_TEXT", "Completed"}},
             {{"INTERNAL_HTTP_PORT", "8080"}, {"INTERNAL_HTTPS_PORT", "8443"}});
-        // clang-format on
     }
+    // clang-format on
 
     void TearDown() override {
         if (client > 0) kill(client, SIGKILL);

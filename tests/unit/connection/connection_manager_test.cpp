@@ -3,19 +3,16 @@
 namespace pelorus {
 namespace {
 
-class ConnectionManagerTest : public ConnectionTest {};
-
-TEST_F(ConnectionManagerTest, WithoutCredentialsItIdlesAndSendsNothing) {
+TEST_F(ConnectionTest, WithoutCredentialsItIdlesAndSendsNothing) {
     for (const char* key : {"DEVICEID", "DEVICEAUTH"}) {
         setConfig(key, "");
         EXPECT_EQ(story(manager().createConnection()), " = failed");
         setConfig(key, "appeared-7741");
     }
     EXPECT_TRUE(gateway.calls().empty());
-    EXPECT_EQ(manager().createConnection(), PORTFORWARDED);
 }
 
-TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneResetsIt) {
+TEST_F(ConnectionTest, SteadyTypeStretchesThePortTestIntervalAndANewOneResetsIt) {
     givenForwardedPorts();
     for (int unchanged = 0; unchanged < 31; ++unchanged) cycle();
     EXPECT_EQ(story(PORTFORWARDED),
@@ -33,18 +30,16 @@ TEST_F(ConnectionManagerTest, SteadyTypeStretchesThePortTestIntervalAndANewOneRe
     EXPECT_FALSE(manager().checkDNS(RELAYED)) << "a new type forces a check; no name is known";
 }
 
-TEST_F(ConnectionManagerTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
-    const auto lifetimes = [this] {
-        std::pair<unsigned, unsigned> asked;
-        manager().getReqPortMappingLifetime(asked.first, asked.second);
-        return asked;
-    };
-    EXPECT_EQ(lifetimes(), std::pair(4294967295U, 4294967295U));
+TEST_F(ConnectionTest, LifetimesAreUnknownUntilThereIsAGatewayObject) {
+    unsigned upnp = 0, natpmp = 0;
+    manager().getReqPortMappingLifetime(upnp, natpmp);
+    EXPECT_TRUE(upnp == 4294967295U && natpmp == 4294967295U);
     manager().setReqPortMappingLifetime(600, 700);
-    EXPECT_EQ(lifetimes(), std::pair(600U, 700U));
+    manager().getReqPortMappingLifetime(upnp, natpmp);
+    EXPECT_TRUE(upnp == 600 && natpmp == 700);
 }
 
-TEST_F(ConnectionManagerTest, MissingNamesTearEverythingDownAndForceATestInTheSameCycle) {
+TEST_F(ConnectionTest, MissingNamesTearEverythingDownAndForceATestInTheSameCycle) {
     givenForwardedPorts();
     diskIsAsleep();
     clientRuns();
@@ -77,18 +72,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, RelayAttempt, testing::Values(
     Row{"ReportsATunnelThatDoesNotComeUp", [](World& w) { w.writeFile("client.out", ""); },
         {"connecting type=relayed, " + withdraw("") + ", start, start, start, start, "
          "failed type=relayed, status failed = failed"}},
-    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}},
-    Row{"DoesNothingWhileBothPortsAreMapped", [](World& w) { w.givenForwardedPorts(); }, {kForwarded}}), RowName{});
+    Row{"DoesNothingWhenToldToWait", [](World& w) { w.web.answer("/remote_access_status/", kWait); }, {" = failed"}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, KillConnection, testing::Values(
     // The gateway object is new at the first, and so is the LAN address.
     Row{"RemovesOwnMappingsAndTheRecordOnly", [](World& w) {
-            w.gateway.table.push_back({9091, kLanIp, 8080, "Kavra"});
-            w.gateway.table.push_back({5000, kLanIp, 22, "ssh"});
-            w.gateway.table.push_back({9093, "192.168.77.66", 80, "Kavra"});
-            w.gateway.table.push_back({9444, kLanIp, 8443, "KavraSSL"});
+            w.gateway.table = {{9091, kLanIp, 8080, "Kavra"}, {5000, kLanIp, 22, "ssh"},
+                               {9093, "192.168.77.66", 80, "Kavra"}, {9444, kLanIp, 8443, "KavraSSL"}};
         }, {"lanip, unmap 9091 9444, " + withdraw("LAN") + " = 5000 disabled", withdraw("LAN") + " = 5000 disabled"}},
-    Row{"ForgetsItsPorts", [](World& w) { w.givenForwardedPorts(); },
-        {"unmap 9091 9444, " + withdraw("LAN") + " = disabled"}},
     Row{"ChangesNothingWithoutAGateway", [](World& w) { w.gateway.upnp = false; }, {" = disabled"}},
     Row{"WithdrawsTheRecordWhenTheGatewayWentAway",
         [](World& w) { w.givenForwardedPorts(); w.gateway.upnp = false; w.cycle(); w.forget(); },

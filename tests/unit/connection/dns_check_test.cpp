@@ -11,11 +11,10 @@ protected:
     // Where the three names lead: 'W' here, 'R' to the relay, 'O' elsewhere, '-' nowhere.
     void namesLeadTo(const std::string& places) {
         const std::string names[] = {kFourLevel, kThreeLevel, support::kSubdomain};
-        std::map<char, std::string> addresses{
-            {'W', kWanIp}, {'R', "44.128.0.1"}, {'O', "44.1.1.1"}};
+        std::map<char, std::string> ips{{'W', kWanIp}, {'R', "44.128.0.1"}, {'O', "44.1.1.1"}};
         net.reset();
         for (std::size_t i = 0; i < 3; ++i) {
-            if (places[i] != '-') net.names[names[i]] = {addresses[places[i]]};
+            if (places[i] != '-') net.names[names[i]] = {ips[places[i]]};
         }
     }
     bool forcedCheck(ConnectionType type) {
@@ -32,7 +31,6 @@ TEST_F(DnsCheckTest, NamesMustAllLeadToTheExternalAddress) {
         EXPECT_EQ(forcedCheck(PORTFORWARDED), places == "WWW") << places;
         EXPECT_EQ(clock.now() - before, places.find('-') < 3 ? 30 : 0) << places;
     }
-    EXPECT_EQ(log.countPart("DNS matches local value"), 1);
 }
 
 TEST_F(DnsCheckTest, OnlyUsedNamesWithoutAnAddressAreLookedUpAgain) {
@@ -50,10 +48,8 @@ TEST_F(DnsCheckTest, OnlyUsedNamesWithoutAnAddressAreLookedUpAgain) {
 TEST_F(DnsCheckTest, RelayedNamesMustLeadToTheRelay) {
     namesLeadTo("RRR");
     EXPECT_TRUE(forcedCheck(RELAYED));  // its address is not known: no evidence against the names
-    EXPECT_EQ(log.countPart("failed to retrieve openVPN server external IP\n"), 1);
     writeFile("client.out", "Peer Connection Initiated with [AF_INET]44.128.0.1:1194\n");
     EXPECT_TRUE(forcedCheck(RELAYED));
-    EXPECT_EQ(log.countPart("DNS matches local value"), 1);
     writeFile("client.out", "Peer Connection Initiated with [AF_INET]44.128.0.2:1194\n");
     EXPECT_FALSE(forcedCheck(RELAYED));
 }
@@ -65,7 +61,6 @@ TEST_F(DnsCheckTest, WithoutAGatewayTheAddressOfTheLastPortTestCounts) {
     gateway.upnp = false;
     EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 0);
     EXPECT_EQ(ip, "");
-    EXPECT_EQ(log.countPart("most recent remote external IP in test port response is empty"), 1);
     gateway.upnp = true;
     manager().createDirectConnection();
     gateway.upnp = false;
@@ -101,7 +96,6 @@ TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
     EXPECT_EQ(manager().buildDeviceDomainName(nullptr, "7", names[0], names[1], names[2]), 0);
     net.hostname = "";
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
-    EXPECT_EQ(log.countPart("cannot generate device domain names"), 1);
     net.hostnameFails = true;
     EXPECT_TRUE(forcedCheck(PORTFORWARDED));
     EXPECT_EQ(log.countPart("failed to retrieve NAS hostname, errno = "), 1);

@@ -9,8 +9,6 @@
 namespace pelorus {
 namespace {
 
-using support::LogLine;
-
 class DaemonControlTest : public DaemonTest {
 protected:
     void givenEnabled(int sleepTime = 30) {
@@ -41,20 +39,17 @@ TEST_F(DaemonControlTest, ADisabledStartOnlyTearsDown) {
 }
 
 TEST_F(DaemonControlTest, ThePauseIsTheLongerOfTheTwoPeriods) {
-    const std::vector<std::pair<int, const char*>> periods{
-        {300, "301"}, {300, "300"}, {-1, "30"}, {1000, "30"}};  // own and server's
-    const auto beginCycle = [&](std::size_t cycle) {
-        if (cycle == periods.size()) return terminate();
-        control.setSleepTime(periods[cycle].first);
-        web.answer("/remote_access_status/", std::string{"<action>wait</action><wait_time>"} +
-                                                 periods[cycle].second + "</wait_time>");
-    };
-    givenEnabled();
-    beginCycle(0);
+    givenEnabled(300);
+    const int laterPeriods[]{300, -1, 1000};  // own, the server's are in its answers
+    for (const std::string wait : {"301", "300", "30", "30"}) {
+        web.answerOnce("/remote_access_status/",
+                       "<action>wait</action><wait_time>" + wait + "</wait_time>");
+    }
     std::string pauses;
     inEachPause([&](unsigned cycles, const std::string& line) {
         pauses += line + std::to_string(clock.pauses().back()) + " ";
-        beginCycle(cycles);
+        if (cycles == 4) return terminate();
+        control.setSleepTime(laterPeriods[cycles - 1]);
     });
     control.run();
     EXPECT_EQ(pauses,
@@ -70,24 +65,19 @@ TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     givenEnabled(900);
     gateway.table.push_back({9555, kLanIp, 80, "Kavra"});  // by an earlier run, as is the client
     clientRuns();
-    time_t before = 0;
-    inEachPause([&](unsigned cycles, const std::string&) {
-        if (cycles == 1) return;
+    inEachPause([&](unsigned, const std::string&) {
         EXPECT_EQ(gateway.calls("unmap ").front(), "unmap TCP 9555") << "before the search";
         EXPECT_EQ(commands.count("kill"), 0) << "only its file is removed";
-        EXPECT_EQ(gateway.table.size(), 2U);
         forget();
-        before = clock.now();
         writeFile("client.pid", "999999\n");  // of a relay client that has ended
         terminate();
     });
     control.run();
-    EXPECT_LT(clock.now() - before, 900);
+    EXPECT_LT(clock.elapsed(), 900);
     EXPECT_EQ(story(NONE), "status disabled, " + withdraw("LAN") +
                                ", unmap 9091 9444, connecting type=disabled = disabled");
     const std::string type = "connectionType:[1]  connectionSubType:[0]\n";
     EXPECT_EQ(log.countPart("COMMUNICATION status:[disabled]  " + type), 1);
-    EXPECT_EQ(log.texts().back(), "DaemonControl::run - Remote access disabled.\n");
     EXPECT_FALSE(std::filesystem::exists(path("client.pid")));
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
 }
@@ -113,7 +103,7 @@ TEST_F(DaemonControlTest, NoLineOfAWholeRunLetsASignalIn) {
     }
     int handled = 0;
     int cycles = 0;
-    log.onLine([&](const LogLine& line) {
+    log.onLine([&](const support::LogLine& line) {
         if (line.text == "handler\n") {
             ++handled;
         } else if (endsCycle(line) && ++cycles == 2) {

@@ -43,8 +43,7 @@ protected:
         if (fork() == 0) {
             process.failing = failingCalls;
             startedProcess = getpid();
-            reportFile =
-                open(path("report").c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+            reportFile = creat(path("report").c_str(), 0600);
             std::atexit(reportExit);
             log.onLine([this](const support::LogLine& line) {
                 dprintf(reportFile, "<%d>%s", line.priority, line.text.c_str());
@@ -65,9 +64,7 @@ protected:
         EXPECT_FALSE(holds("a check failed"));
         return ends + (holds("ConnectionManager::createConnection()") ? " after cycles" : "");
     }
-    [[nodiscard]] bool holds(const std::string& part) const {
-        return reported.find(part) != std::string::npos;
-    }
+    [[nodiscard]] bool holds(const char* part) const { return support::holds(reported, part); }
     void givenSwitch(const std::string& value) const {
         const std::string before = readFile(path("static.ini"));
         writeFile("static.ini", before + "ENABLEREMOTEACCESS=" + value + "\n");
@@ -95,16 +92,15 @@ TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
 
 TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {
     const std::string target = writeFile("precious", "kept");
-    fs::create_symlink(target, path("pid"));
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
-    EXPECT_EQ(readFile(target), "kept");
-    fs::remove(path("pid"));
-    fs::create_hard_link(target, path("pid"));
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
-    EXPECT_EQ(readFile(target), "kept");
-    fs::remove(path("pid"));
-    ASSERT_EQ(mkfifo(path("pid").c_str(), 0600), 0);
-    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
+    const std::function<void()> plants[]{[&] { fs::create_symlink(target, path("pid")); },
+                                         [&] { fs::create_hard_link(target, path("pid")); },
+                                         [&] { mkfifo(path("pid").c_str(), 0600); }};
+    for (const auto& plant : plants) {
+        plant();
+        EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
+        EXPECT_EQ(readFile(target), "kept");
+        fs::remove(path("pid"));
+    }
 }
 
 TEST_F(StartupTest, LogOptionsSetTheLogUnlessTheProgramEndsAtItsArguments) {

@@ -28,8 +28,7 @@ protected:
                      {"OPENVPN_PID_FILE", path("client.pid")}});
     }
     void TearDown() override {
-        if (client > 0) kill(client, SIGKILL);
-        if (client > 0) waitpid(client, nullptr, 0);
+        if (client > 0 && kill(client, SIGKILL) == 0) waitpid(client, nullptr, 0);
         PelorusTest::TearDown();
     }
 
@@ -68,8 +67,6 @@ TEST_F(VpnManagerTest, StartsTheClientInItsFolderWithFreshCredentials) {
     EXPECT_EQ(readFile(path("precious")), "kept");
     EXPECT_EQ(commands.lines(), (Lines{"fetch-relays", "start-client"}));
     EXPECT_EQ(clock.pauses(), (std::vector<long>{10, 10, 10}));
-    EXPECT_EQ(logged("openVPN initialization did not complete, waiting...\n"), 2);
-    EXPECT_EQ(logged("openVPN has started successfully\n"), 1);
 }
 
 TEST_F(VpnManagerTest, GivesUpAfterFourStartsOfSevenChecksAndStopsTheClient) {
@@ -79,7 +76,6 @@ TEST_F(VpnManagerTest, GivesUpAfterFourStartsOfSevenChecksAndStopsTheClient) {
     EXPECT_EQ(commands.lines(), (Lines{"fetch-relays", start, start, start, start}));
     EXPECT_EQ(clock.pauses(), std::vector<long>(28, 10));
     EXPECT_EQ(logged("openVPN process is not running, so return true.\n"), 4);
-    EXPECT_EQ(logged("Failed to establish VPN connection, retries exceeded\n"), 1);
 }
 
 TEST_F(VpnManagerTest, AFailureEndsTheStartAtOnce) {
@@ -117,7 +113,6 @@ TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
         EXPECT_FALSE(manager.isVPNRunning());
         EXPECT_FALSE(pidFileExists());
         EXPECT_EQ(log.countPart(warning), 1) << log.dump();
-        EXPECT_EQ(log.countPart("isVPNRunning() - unlink stale openVPN pid file "), 1);
     }
     mkfifo(path("client.pid").c_str(), 0666);  // planted to block
     EXPECT_TRUE(manager.closeVPNConnection());
@@ -128,13 +123,10 @@ TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
 TEST_F(VpnManagerTest, LeavesARunningClientAloneUntilItIsToBeStopped) {
     const std::string pid = startClient("My-OpenVPN-2.6");
     EXPECT_TRUE(manager.openVPNConnection());
-    EXPECT_EQ(logged("openVPN is already running\n"), 1);
     commands.answer("kill", "", 1);
     EXPECT_FALSE(manager.closeVPNConnection());
     EXPECT_TRUE(pidFileExists());
     EXPECT_EQ(logged("failed to stop openVPN process with PID: " + pid + ", result "), 5);
-    EXPECT_EQ(logged("failed to gracefully stop openVPN, terminating with SIGKILL\n"), 2);
-    EXPECT_EQ(logged("failed to stop openVPN process\n"), 1);
     commands.answer("kill", "");
     commands.answerOnce("kill", {"", 1, false, {}});
     EXPECT_TRUE(manager.closeVPNConnection());
@@ -152,7 +144,6 @@ TEST_F(VpnManagerTest, EndsThePassesWhenThePidFileGoes) {
     });
     EXPECT_TRUE(manager.closeVPNConnection());
     EXPECT_EQ(logged("failed to open PID output file\n"), 1);
-    EXPECT_EQ(logged("openVPN process is running\n"), 1);
 }
 
 TEST_F(VpnManagerTest, CleanupRemovesThePidFileAndLeavesTheClient) {

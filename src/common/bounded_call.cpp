@@ -23,6 +23,7 @@
 #include <system_error>
 #include <vector>
 
+#include "common/own_address.h"
 #include "common/stop_budget.h"
 
 namespace pelorus {
@@ -87,24 +88,11 @@ int libcConnect(int socket, const sockaddr* address, socklen_t size) {
     return -1;
 }
 
-// Traffic to one of the device's own addresses leaves from that same address. Nothing is sent.
-bool isOwnAddress(const sockaddr_in& address) {
-    const int probe = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    if (probe < 0) return true;
-    sockaddr_in local{};
-    socklen_t size = sizeof local;
-    const bool known =
-        libcConnect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 &&
-        getsockname(probe, reinterpret_cast<sockaddr*>(&local), &size) == 0;
-    static_cast<void>(close(probe));
-    return known && local.sin_addr.s_addr == address.sin_addr.s_addr;
-}
-
+// The library may ask a search daemon on this device first, through a socket in the file system.
 bool isGatewayAddress(const sockaddr* address, socklen_t size) {
+    if (address->sa_family == AF_UNIX) return true;
     if (address->sa_family != AF_INET || size < sizeof(sockaddr_in)) return false;
-    const auto& target = *reinterpret_cast<const sockaddr_in*>(address);
-    const in_addr_t network = ntohl(target.sin_addr.s_addr) >> 24;
-    return network != 0 && network != IN_LOOPBACKNET && !isOwnAddress(target);
+    return !isOwnAddress(reinterpret_cast<const sockaddr_in*>(address)->sin_addr);
 }
 
 }  // namespace

@@ -54,11 +54,14 @@ FileHandle streamOf(const std::string& text) {
 
 }  // namespace
 
-FileHandle openForeignFile(const std::string& path, Part part) {
-    const Descriptor file{open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY)};
+FileHandle openForeignFile(const std::string& path, Part part, Link link) {
+    const int noLink = link == Link::REFUSE ? O_NOFOLLOW : 0;
+    const Descriptor file{
+        open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | noLink)};
     struct stat status {};
-    if (file.number < 0 || fstat(file.number, &status) != 0) return nullptr;
-    if (!S_ISREG(status.st_mode)) {
+    const bool isOpen = file.number >= 0 && fstat(file.number, &status) == 0;
+    if (!isOpen && errno != ELOOP) return nullptr;
+    if (!isOpen || !S_ISREG(status.st_mode)) {
         logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
         errno = EINVAL;
         return nullptr;

@@ -16,10 +16,15 @@ inline constexpr std::size_t kMostForeignBytes = 1024UL * 1024;
 /// Which part of a file that is too large is read.
 enum class Part { HEAD, TAIL };
 
+/// Whether a symbolic link in place of a file is followed.
+enum class Link { REFUSE, FOLLOW };
+
 /// Opens a file that another program may write, and reads it at once: what the handle delivers is
 /// what the file held at that moment. Never blocks. Null, and errno set, when the file cannot be
 /// read; EINVAL, and one log line, when it is not a regular file.
-FileHandle openForeignFile(const std::string& path, Part part = Part::HEAD);
+FileHandle openForeignFile(const std::string& path,
+                           Part part = Part::HEAD,
+                           Link link = Link::REFUSE);
 
 /// Creates @p path for writing, in place of whatever has that name (a directory aside), so that
 /// neither a link nor a file of somebody else receives what is written. It has exactly @p mode.

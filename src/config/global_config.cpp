@@ -57,7 +57,7 @@ bool copyFile(std::FILE* from, std::FILE* to) {
 // Makes the first temporary copy. False, with the cause logged, when it cannot be made.
 bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
     logConfigInfo("Opening dynamic config file for copy.\n");
-    const FileHandle dynamicFile = openForeignFile(dynamicPath);
+    const FileHandle dynamicFile = openForeignFile(dynamicPath, Part::HEAD, Link::FOLLOW);
     if (!dynamicFile) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
@@ -123,7 +123,7 @@ bool GlobalConfig::loadStaticConfig() {
 bool GlobalConfig::loadDynamicConfig(const std::string& path) {
     logConfigInfo("OPENING dynamic config file for read: \n");
     logConfigInfo("%s", path.c_str());
-    const FileHandle file = openForeignFile(path);
+    const FileHandle file = openForeignFile(path, Part::HEAD, Link::FOLLOW);
     if (!file) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [%s].\n",

@@ -26,6 +26,7 @@ constexpr unsigned kStartCheckDelay = 10;  // seconds
 constexpr int kMaxStopPasses = 5;
 constexpr int kGracefulStopPasses = 3;
 constexpr unsigned kStopDelay = 3;  // seconds
+constexpr int kMostPids = 16;
 
 constexpr mode_t kCredentialsMode = 0600;
 
@@ -262,7 +263,9 @@ bool VPNManager::stopOnce(int pass) {
             return false;
         }
         std::array<char, kStopPidLineSize> line{};
-        while (std::fgets(line.data(), line.size(), file.get()) != nullptr) {
+        // Each line costs a command: a planted file of many must not hold the daemon.
+        for (int count = 0; count < kMostPids; ++count) {
+            if (std::fgets(line.data(), line.size(), file.get()) == nullptr) break;
             std::string pid;
             if (line.front() == '\0' || !pidIsOpenVPNProcess(line.data(), pid)) continue;
             allStopped = stopProcess(pid, pass) && allStopped;

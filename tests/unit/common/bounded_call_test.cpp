@@ -77,8 +77,10 @@ TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
 TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {
     const int client = socket(AF_INET, SOCK_STREAM, 0);
     {
+        net.interfaces = {{"eth0", "192.0.2.1"}, {"eth0:1", "192.0.2.2"}};
         const BoundedCall bounds{Peer::GATEWAY, 3600};
-        for (const char* own : {"127.0.0.1", "127.3.2.1", "0.0.0.0", "0.1.2.3"}) {
+        for (const char* own :
+             {"192.0.2.1", "192.0.2.2", "127.0.0.1", "127.3.2.1", "0.0.0.0", "0.1.2.3"}) {
             inet_pton(AF_INET, own, &address.sin_addr);
             EXPECT_EQ(connect(client, target, size), -1) << own;
             EXPECT_EQ(errno, EACCES) << own;

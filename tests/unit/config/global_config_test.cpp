@@ -155,8 +155,10 @@ TEST_F(ConfigTest, OnlyTheStaticFileSetsTheKeysItReserves) {
 
 TEST_F(ConfigTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
     fs::current_path(folder);
+    writeFile("stolen.ini", "KEY=stolen\n");
     const std::function<void()> plants[]{[&] { mkfifo(copy.c_str(), 0666); },
                                          [&] { fs::create_symlink("/dev/zero", copy); },
+                                         [&] { fs::create_symlink("stolen.ini", copy); },
                                          [&] { fs::create_symlink("target", copy); }};
     for (const auto& plant : plants) {
         fs::remove(copy);

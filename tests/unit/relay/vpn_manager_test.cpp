@@ -117,6 +117,10 @@ TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
     mkfifo(path("client.pid").c_str(), 0666);  // planted to block
     EXPECT_TRUE(manager.closeVPNConnection());
     EXPECT_FALSE(pidFileExists());
+    fs::create_symlink(writeFile("shadow", "root:hash\n"), path("client.pid"));
+    EXPECT_TRUE(manager.closeVPNConnection());
+    EXPECT_EQ(log.countPart("root:hash"), 0);
+    EXPECT_FALSE(fs::is_symlink(path("client.pid")));
     EXPECT_EQ(commands.lines(), Lines{});
 }
 
@@ -135,6 +139,16 @@ TEST_F(VpnManagerTest, LeavesARunningClientAloneUntilItIsToBeStopped) {
     EXPECT_EQ(commands.lines(), (Lines{gently, gently, gently, hard, hard, gently, gently}));
     EXPECT_EQ(clock.pauses(), std::vector<long>(7, 3));
     EXPECT_FALSE(pidFileExists());
+}
+
+TEST_F(VpnManagerTest, OnlyTheFirstLinesOfAPidFileCount) {
+    const std::string pid = startClient();
+    std::string many;
+    for (int line = 0; line < 1000; ++line) many += pid + "\n";
+    writeFile("client.pid", many);
+    commands.answer("kill", "", 1);
+    EXPECT_FALSE(manager.closeVPNConnection());
+    EXPECT_EQ(commands.lines().size(), 16U * 5) << "a command for each line would take hours";
 }
 
 TEST_F(VpnManagerTest, EndsThePassesWhenThePidFileGoes) {

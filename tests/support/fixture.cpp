@@ -7,6 +7,7 @@
 
 #include "config/global_config.h"
 #include "support/fake_gateway.h"
+#include "support/fake_web.h"
 
 namespace pelorus::support {
 
@@ -33,6 +34,7 @@ PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescri
 void PelorusTest::TearDown() {
     commands.checkClosed();
     net.checkReleased();
+    FakeWeb::get().checkBalance();
     FakeGateway::get().checkReleased();
     EXPECT_EQ(openDescriptors(), descriptorsAtStart) << "descriptors now and at the start";
     EXPECT_EQ(blockedSignals(), blockedAtStart) << "blocked signals now and at the start";

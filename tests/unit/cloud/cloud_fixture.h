@@ -15,11 +15,6 @@ using Urls = std::vector<std::string>;
 
 class CloudTest : public support::PelorusTest {
 protected:
-    void TearDown() override {
-        web.checkBalance();
-        PelorusTest::TearDown();
-    }
-
     const FakeWeb::Answer none = FakeWeb::noAnswer();
     FakeWeb& web = FakeWeb::get();
     TavikClient& client = givenClient();

@@ -30,7 +30,7 @@ protected:
     // Connects and waits for an answer; 0 when the connection was ended.
     ssize_t ask(int type) {
         const int client = socket(AF_INET, type, 0);
-        if (type == SOCK_STREAM) connect(client, target, size);
+        if (type == SOCK_STREAM) static_cast<void>(connect(client, target, size));
         char letter = 0;
         const ssize_t received = recv(client, &letter, 1, 0);
         close(client);

@@ -106,8 +106,6 @@ public:
 
     void TearDown() override {
         if (client > 0) kill(client, SIGKILL);
-        web.checkBalance();
-        gateway.checkReleased();
         PelorusTest::TearDown();
     }
 

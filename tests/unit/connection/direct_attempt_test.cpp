@@ -47,12 +47,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
         }, {"connecting, test 7000 x3, status failed, test 7001, " + publish(7001, 1, "WAN", "192.168.77.1") +
             ", " + kReported + " = portforwarded", "disk, test 7001 = portforwarded"}},
     Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
-            w.gateway.refused.insert(9091);
+            w.gateway.refused = {9091};
             w.cycle();
-            w.gateway.refused.erase(9091);
+            w.cycle();  // from then on no address counts as new
+            w.gateway.refused.clear();
             w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
             w.forget();
-        }, {"unmap 9092 9444, " + kMapAndPublish + ", connected, force 0" + kForwarded}}), RowName{});
+        }, {"unmap 9092 9444 = portforwarded"}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
         {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},

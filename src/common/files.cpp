@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <optional>
 
 #include "common/log.h"
 
@@ -27,19 +28,19 @@ public:
     const int number;
 };
 
-// The bytes from @p offset on, as far as they are read. False, and errno set, on an error.
-bool readFrom(int file, off_t offset, std::string& text) {
-    text.resize(kMostForeignBytes);
+// The bytes from @p offset on, as far as they are read. Nothing, and errno set, on an error.
+std::optional<std::string> readFrom(int file, off_t offset) {
+    std::string text(kMostForeignBytes, '\0');
     std::size_t size = 0;
     while (size < text.size()) {
         const ssize_t count =
             pread(file, &text[size], text.size() - size, offset + static_cast<off_t>(size));
-        if (count < 0) return false;
+        if (count < 0) return std::nullopt;
         if (count == 0) break;
         size += static_cast<std::size_t>(count);
     }
     text.resize(size);
-    return true;
+    return text;
 }
 
 // A stream that owns a copy of @p text.
@@ -72,8 +73,8 @@ FileHandle openForeignFile(const std::string& path, Part part, Link link) {
         logWarning("openForeignFile - only the first %zu bytes of %s are read.\n",
                    kMostForeignBytes, path.c_str());
     }
-    std::string text;
-    return readFrom(file.number, offset, text) ? streamOf(text) : nullptr;
+    const auto text = readFrom(file.number, offset);
+    return text ? streamOf(*text) : nullptr;
 }
 
 FileHandle createFile(const std::string& path, mode_t mode) {

@@ -105,7 +105,7 @@ BoundedCall::BoundedCall(Peer peer, int seconds)
     try {
         watcher = std::thread([this, seconds] { watch(seconds); });
     } catch (const std::system_error&) {
-        // Without a thread the library's own limits must do.
+        mayReceive = 0;  // rather no answer than an unbounded one
     }
 }
 

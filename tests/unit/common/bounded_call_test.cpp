@@ -79,6 +79,25 @@ TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
     close(sender);
 }
 
+TEST_F(BoundedCallTest, WithoutAThreadToWatchItNothingIsReceived) {
+    pthread_attr_t usual;
+    pthread_getattr_default_np(&usual);
+    pthread_attr_t impossible;
+    pthread_attr_init(&impossible);
+    pthread_attr_setstacksize(&impossible, SIZE_MAX / 4 * 3);
+    pthread_setattr_default_np(&impossible);
+    const int receiver = socket(AF_INET, SOCK_DGRAM, 0);
+    bindToLoopback(receiver);
+    sendto(receiver, "x", 1, 0, target, size);
+    {
+        const BoundedCall bounds{Peer::ANYBODY, 3600};
+        char letter = 0;
+        EXPECT_EQ(recvfrom(receiver, &letter, 1, 0, nullptr, nullptr), 0);
+    }
+    close(receiver);
+    pthread_setattr_default_np(&usual);
+}
+
 TEST_F(BoundedCallTest, AGatewayIsNeverThisDevice) {
     const int client = socket(AF_INET, SOCK_STREAM, 0);
     {

@@ -82,7 +82,9 @@ FileHandle createFile(const std::string& path, mode_t mode) {
     const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
     if (file < 0) return nullptr;
     static_cast<void>(fchmod(file, mode));  // whatever the umask
-    return FileHandle{fdopen(file, "w")};
+    std::FILE* const stream = fdopen(file, "w");
+    if (stream == nullptr) static_cast<void>(close(file));
+    return FileHandle{stream};
 }
 
 }  // namespace pelorus

@@ -9,17 +9,25 @@
 
 namespace pelorus {
 
+namespace {
+
+// No control character reaches a terminal, but the texts keep their line feeds. UTF-8 writes those
+// beyond ASCII as 0xC2 and a byte from 0x80 to 0x9F.
+void blankControlCharacters(char* text) {
+    const auto code = [&](int at) { return static_cast<unsigned char>(text[at]); };
+    for (; *text != '\0'; ++text) {
+        if (std::iscntrl(code(0)) != 0 && *text != '\n') *text = ' ';
+        if (code(0) == 0xC2 && code(1) >= 0x80 && code(1) < 0xA0) text[0] = text[1] = ' ';
+    }
+}
+
+}  // namespace
+
 void vlogLine(std::size_t size, int priority, const char* format, va_list args) {
     std::array<char, kLogLineSize> line{};
     const std::size_t capacity = std::min(size, line.size());
     if (std::vsnprintf(line.data(), capacity, format, args) < 0) return;
-    // The texts have line feeds of their own; no other control character reaches a terminal.
-    for (char& letter : line) {
-        if (letter != '\n' && letter != '\0' &&
-            std::iscntrl(static_cast<unsigned char>(letter)) != 0) {
-            letter = ' ';
-        }
-    }
+    blankControlCharacters(line.data());
     const TerminationBlock held;
     syslog(priority, "%s", line.data());
 }

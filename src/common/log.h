@@ -16,6 +16,7 @@ inline constexpr std::size_t kLogLineSize = 1280;
 /// Formats one line and sends it to syslog with @p priority (LOG_ERR, LOG_INFO, ...).
 ///
 /// Text from outside (answers, configured values, names) must be an argument, never the format.
+/// Control characters other than line feeds become blanks.
 /// Safe to call from the termination signal handler, which cannot interrupt a holder of the locks
 /// that the C library takes here: see TerminationBlock. A short line allocates nothing there.
 void logLine(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));

@@ -46,9 +46,7 @@ std::string scrubSecrets(std::string text) {
         return left.first.size() > right.first.size();
     });
     for (const auto& [secret, mask] : secrets) hide(text, secret, mask);
-    std::replace_if(
-        text.begin(), text.end(), [](unsigned char letter) { return std::iscntrl(letter) != 0; },
-        ' ');
+    std::replace(text.begin(), text.end(), '\n', ' ');
     return text;
 }
 

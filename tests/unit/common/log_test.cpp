@@ -15,12 +15,14 @@ TEST_F(LogTest, OutsideTextIsNoFormatAndLongLinesAreCutToTheBuffer) {
     logNotice("%d", 2);
     logInfo("%d", 3);
     logDebug("%d", 4);
+    logDebug("\x1b[2J\r\x7f\n\xc2\x80\xc2\x9f\xc2\xa0\xc3\x80\xc2\n");
     expectLogIs({{LOG_ALERT, "answer 100%s%n, 7 bytes\n"},
                  {LOG_ERR, text.substr(0, 1279)},
                  {LOG_WARNING, "1"},
                  {LOG_NOTICE, "2"},
                  {LOG_INFO, "3"},
-                 {LOG_DEBUG, "4"}});
+                 {LOG_DEBUG, "4"},
+                 {LOG_DEBUG, " [2J  \n    \xc2\xa0\xc3\x80\xc2\n"}});
 }
 
 }  // namespace

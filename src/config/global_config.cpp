@@ -110,6 +110,7 @@ bool GlobalConfig::loadStaticConfig() {
         return false;
     }
     staticOnlyKeys.clear();
+    isFullReported = false;
     const bool parsed = merge(file.get(), Source::STATIC);
     if (properties.empty()) {
         // Says "open", but means a file without a single setting.
@@ -179,12 +180,18 @@ bool GlobalConfig::merge(std::FILE* file, Source source) {
 bool GlobalConfig::isAccepted(const std::string& key, Source source) {
     if (source == Source::STATIC) return true;
     const auto reserved = staticOnlyKeys.find(key);
-    if (reserved == staticOnlyKeys.end()) {
-        return properties.size() < kMostSettings || properties.count(key) != 0;
+    if (reserved != staticOnlyKeys.end()) {
+        if (!std::exchange(reserved->second, true)) {
+            logConfigError(
+                "GlobalConfig::merge() - only the static config file may set %s, ignored.\n",
+                key.c_str());
+        }
+        return false;
     }
-    if (!std::exchange(reserved->second, true)) {
-        logConfigError("GlobalConfig::merge() - only the static config file may set %s, ignored.\n",
-                       key.c_str());
+    if (properties.size() < kMostSettings || properties.count(key) != 0) return true;
+    if (!std::exchange(isFullReported, true)) {
+        logConfigError("GlobalConfig::merge() - %zu settings are the most, further ones ignored.\n",
+                       kMostSettings);
     }
     return false;
 }

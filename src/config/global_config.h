@@ -19,7 +19,7 @@ namespace pelorus {
 /// The copy may be writable by everybody. Keys that the static file lists in STATIC_ONLY_KEYS
 /// (separated by blanks; several such lines add up) are ignored anywhere else; the first time, a
 /// log line names the key. Of a dynamic file at most kMostForeignBytes are read, and the store
-/// takes no new key beyond 10,000.
+/// takes no new key beyond 10,000; a log line says so.
 class GlobalConfig {
 public:
     static GlobalConfig* getInstance();
@@ -76,6 +76,7 @@ private:
     std::string configPath;
     std::map<std::string, std::string> properties;
     std::map<std::string, bool> staticOnlyKeys;  // true: a line elsewhere has been reported
+    bool isFullReported = false;
 };
 
 /// A copy of the value of @p key, for callers that keep it; empty when the key is absent.

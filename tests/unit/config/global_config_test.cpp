@@ -184,6 +184,7 @@ TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     rewriteCopy(many + "KEY=y\n");
     EXPECT_EQ(config.getProperty("K9000") + config.getProperty("K11000"), "x");
     EXPECT_EQ(config.getProperty("KEY"), "y");
+    EXPECT_EQ(log.countPart("() - 10000 settings are the most, further ones ignored.\n"), 1);
 }
 
 // Runs the real shell and the real sed: no character of a value means anything to either.

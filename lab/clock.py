@@ -10,6 +10,7 @@ from lab.support import LabError, run_tool
 
 _PRELOAD = Path("/run/lab/preload.so")
 _REFUSED_SIGNAL = Path("/run/lab/refused_signal")
+_SIGNAL_IN_GMTIME = Path("/run/lab/signal_in_gmtime")
 
 
 def fast_clock(factor: int, ahead: float = 0) -> list[str]:
@@ -27,6 +28,7 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
         return []
     if not _PRELOAD.exists():
         run_tool("cc", "-shared", "-fPIC", f'-DREFUSED_SIGNAL="{_REFUSED_SIGNAL}"',
+                 f'-DSIGNAL_IN_GMTIME="{_SIGNAL_IN_GMTIME}"',
                  "-o", str(_PRELOAD), str(sandbox.PROJECT / "lab/preload.c"))
     return [*_faketime(factor, 0, str(_PRELOAD)),
             f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}"]
@@ -35,6 +37,11 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
 def refuse_signal(number: int) -> None:
     """Make programs with fast pauses fail to send this signal from now on; 0 for none."""
     _REFUSED_SIGNAL.write_text(f"{number}\n")
+
+
+def signal_in_gmtime() -> None:
+    """Make the next program with fast pauses that breaks a time down receive SIGTERM meanwhile."""
+    _SIGNAL_IN_GMTIME.touch()
 
 
 def _faketime(factor: int, ahead: float, *before: str) -> list[str]:

@@ -15,6 +15,7 @@ from lab.checks import (BOTH_MAPPED, FAST, OPTIONS, PAGES, PUBLISHED, RELAYED, S
                         assert_stops_clean, mapping_changes, page_through_the_tunnel,
                         pages_from_outside, start, tunnel_client, wait_for_client_end,
                         wait_for_cycle, wait_for_log, wait_for_next_cycle, wait_for_status)
+from lab.clock import signal_in_gmtime
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -87,6 +88,16 @@ def stopped_in_a_port_test(lab: Lab) -> None:
     assert len(lab.central.port_tests) == len(_SIGNALS)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded",
                                           "disabled"] * len(_SIGNALS)
+
+
+@scenario(Situation(clock=FAST))
+def stopped_in_a_handshake(lab: Lab) -> None:
+    """SIGTERM while OpenSSL holds a lock in a handshake: it ends as at any other time."""
+    signal_in_gmtime()
+    lab.start_daemon(*OPTIONS)
+    assert wait_until(lab.daemon.ended, "the daemon to end", 60) == "SIGTERM"
+    assert lab.device.messages.count("sigTrap - Received SIGTERM signal.") == 1
+    assert_log_is_proper(lab)
 
 
 # When the back end does not accept the ports, the relay is tried while both are mapped.
@@ -189,8 +200,7 @@ def killed_while_relayed(lab: Lab) -> None:
 def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
     """Start the daemon once for each signal, let the caller wait for the phase, and stop it.
 
-    One signal must be enough. While the daemon runs a shell command, the C library ignores SIGINT
-    and SIGQUIT; it runs none in these phases.
+    One signal must be enough.
     """
     # SIGQUIT would leave a core file in the machine's root folder.
     resource.setrlimit(resource.RLIMIT_CORE, (0, 0))

@@ -8,8 +8,8 @@ namespace pelorus {
 
 /// Returns @p text with the configured device identifier, device authorisation and subdomain
 /// replaced by their masks, and each control character, line feeds included, by a blank: nobody
-/// outside can forge a log line or reach the terminal of its reader. Everything that comes from outside (answers, names, file contents)
-/// passes through here on its way to the log.
+/// outside can forge a log line or reach the terminal of its reader. Everything that comes from
+/// outside (answers, names, file contents) passes through here on its way to the log.
 [[nodiscard]] std::string scrubSecrets(std::string text);
 
 }  // namespace pelorus

@@ -17,7 +17,7 @@ from lab.scenarios.registry import scenario
 from lab.scripted_gateway import Personality
 
 # The daemon's time runs ten times as fast, its time limits and the library's included: a gateway
-# that is to be slow for it waits a tenth, and the unit would wait 42 seconds for its end. These are
+# that is to be slow for it waits a tenth, and the unit would wait 60 seconds for its end. These are
 # in real time.
 _TENFOLD = 10
 _CYCLE_SECONDS = 15

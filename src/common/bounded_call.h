@@ -1,5 +1,5 @@
-// Bounds around calls of miniupnpc, which has none of its own: a peer that sends a byte now and then
-// holds it for hours, one that never stops sending fills the memory.
+// Bounds around calls of miniupnpc, which has none of its own: a peer that sends a byte now and
+// then holds it for hours, one that never stops sending fills the memory.
 #ifndef PELORUS_COMMON_BOUNDED_CALL_H
 #define PELORUS_COMMON_BOUNDED_CALL_H
 

@@ -99,11 +99,12 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 BoundedCall::BoundedCall(Peer peer, int seconds)
     : before{openSockets()}, residentBefore{residentMemory()} {
-    if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
     onlyGateways = peer == Peer::GATEWAY;
+    Clock::duration limit = std::chrono::seconds(seconds);
+    if (onlyGateways) limit = std::min(limit, stopBudgetLeft());
     mayReceive = kMostReceived;
     try {
-        watcher = std::thread([this, seconds] { watch(seconds); });
+        watcher = std::thread([this, limit] { watch(limit); });
     } catch (const std::system_error&) {
         mayReceive = 0;  // rather no answer than an unbounded one
     }
@@ -116,23 +117,23 @@ BoundedCall::~BoundedCall() {
     }
     ended.notify_one();
     if (watcher.joinable()) watcher.join();
+    if (onlyGateways) spendStopBudget(Clock::now() - began);
     onlyGateways = false;
     mayReceive = kEverything;
 }
 
 // The library may open further sockets after the first ones were shut, hence every time.
-void BoundedCall::watch(int seconds) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+void BoundedCall::watch(Clock::duration limit) {
+    auto end = began + limit;
     bool exceeded = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short
     std::unique_lock lock(mutex);
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
         if (!terminating && terminationPending()) {
             terminating = true;
-            end = std::min(end,
-                           std::chrono::steady_clock::now() + std::chrono::seconds(kCycleBudget));
+            end = std::min<Clock::time_point>(end, Clock::now() + kCycleBudget);
         }
-        exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
+        exceeded = exceeded || Clock::now() >= end ||
                    residentMemory() - residentBefore > kMostGrowth;
         if (exceeded) endTransfers();
     }

@@ -3,6 +3,7 @@
 #ifndef PELORUS_COMMON_BOUNDED_CALL_H
 #define PELORUS_COMMON_BOUNDED_CALL_H
 
+#include <chrono>
 #include <condition_variable>
 #include <mutex>
 #include <thread>
@@ -36,9 +37,12 @@ public:
     BoundedCall& operator=(const BoundedCall&) = delete;
 
 private:
-    void watch(int seconds);
+    using Clock = std::chrono::steady_clock;
+
+    void watch(Clock::duration limit);
     void endTransfers() const;
 
+    const Clock::time_point began = Clock::now();
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
     std::vector<int> before;  // sockets that were open, in order

@@ -5,6 +5,8 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include "common/stop_budget.h"
+#include "common/termination.h"
 #include "support/fixture.h"
 
 namespace pelorus::support {
@@ -47,6 +49,18 @@ protected:
 TEST_F(BoundedCallTest, AWaitEndsWithTheTimeOfTheCall) {
     const BoundedCall bounds{Peer::ANYBODY, 0};
     for (const int type : {SOCK_STREAM, SOCK_STREAM, SOCK_DGRAM}) EXPECT_EQ(ask(type), 0);
+}
+
+TEST_F(BoundedCallTest, OnlyCallsSpendTheStopBudget) {
+    sigConnKilled = SIGTERM;
+    renewStopBudget(std::chrono::milliseconds{30});
+    EXPECT_EQ(poll(nullptr, 0, 40), 0);
+    EXPECT_FALSE(stopBudgetSpent());
+    {
+        const BoundedCall bounds{Peer::GATEWAY, 3600};
+        EXPECT_EQ(ask(SOCK_DGRAM), 0);
+    }
+    EXPECT_TRUE(stopBudgetSpent());
 }
 
 TEST_F(BoundedCallTest, AWaitEndsWhenTheProcessGrows) {

@@ -40,7 +40,7 @@ TEST_F(ForwardSearchTest, EndsWithTheStopBudgetNotWithTheSignal) {
     gateway.refuseAll = true;
     gateway.onCall([&](const std::string& call) {
         if (call.find("map TCP 9100 ") == 0) sigConnKilled = SIGTERM;
-        if (call.find("map TCP 9102 ") == 0) renewStopBudget(0);
+        if (call.find("map TCP 9102 ") == 0) renewStopBudget({});
     });
     EXPECT_EQ(search(), "0");
     EXPECT_EQ(gateway.count(" -> "), 12);
@@ -77,7 +77,7 @@ TEST_F(ForwardSearchTest, PredefinedPortsEndWithTheStopBudgetOrADoubleNat) {
     web.answer("/test?", kOtherNat);
     EXPECT_EQ(story(search()), "disk, test 7000 = 4");
     sigConnKilled = SIGTERM;
-    renewStopBudget(0);
+    renewStopBudget({});
     EXPECT_EQ(story(search()), " = 0");
 }
 

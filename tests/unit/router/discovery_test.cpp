@@ -62,9 +62,9 @@ TEST_F(DiscoveryTest, ASearchThatTheStopBudgetCutsShortKeepsTheGateway) {
     gateway.upnp = false;
     gateway.natpmp = true;
     sigConnKilled = SIGTERM;
-    renewStopBudget(0);
+    renewStopBudget({});
     EXPECT_TRUE(router.discover() && router.isInitialized() && !router.isNatPMPGateway());
-    renewStopBudget(50);
+    renewStopBudget(kCleanUpBudget);
     EXPECT_TRUE(router.discover() && router.isNatPMPGateway());
 }
 

@@ -71,6 +71,7 @@ class Device:
         self._authority = authority
         self._timeline = timeline
         self._lock = threading.Lock()
+        self._pause = 0.0
 
     def start(self, static: Mapping[str, str], dynamic: Mapping[str, str]) -> None:
         """Write the configuration (the arguments override the defaults) and serve pages."""
@@ -137,6 +138,11 @@ class Device:
         SLEEP_COUNT.write_text(f"{count}\n")
         self._timeline.add("device", f"the disk has been unused for {count} minutes")
 
+    def answer_slowly(self, pause: float) -> None:
+        """Let each byte of the local back end's answers take `pause` seconds from now on."""
+        self._pause = pause
+        self._timeline.add("device", f"the back end sends a byte in {pause:g} s")
+
     def statuses_sent(self) -> list[str]:
         """The status words sent to the local back end, in order."""
         return [request.argument("status") for request in self.local_requests
@@ -199,7 +205,7 @@ class Device:
             self._change(LOCAL_IP=request.argument("address"))
         else:
             return Reply(b"<result>failure</result>", 404)
-        return Reply(b"<result>success</result>")
+        return Reply(b"<result>success</result>", pause=self._pause)
 
 
 def _read_settings(path: Path) -> dict[str, str]:

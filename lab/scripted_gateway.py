@@ -88,14 +88,16 @@ class Personality:
     """How a gateway behaves; a new one names only what differs from a good gateway.
 
     A search is answered once for each URL that `locations` gives for the gateway's own base URL.
-    `deliver` cuts the description's head and body into what is sent. The description names
-    `control_url`, which may be relative. Each answer of the control service comes `delay` seconds
-    late, in real time; to the actions in `errors` it is that error number. With `endless_list`, the
+    `deliver` cuts the description's head and body into what is sent, `deliver_control` an answer of
+    the control service. The description names `control_url`, which may be relative. Each answer of
+    the control service comes `delay` seconds late, in real time; to the actions in `errors` it is
+    that error number. With `endless_list`, the
     list of its mappings has no end.
     """
 
     locations: Callable[[str], Iterable[str]] = own_description
     deliver: Callable[[bytes, bytes], Iterable[bytes]] = whole
+    deliver_control: Callable[[bytes, bytes], Iterable[bytes]] = whole
     control_url: str = "/control"
     delay: float = 0
     errors: Mapping[str, int] = field(default_factory=dict)
@@ -263,7 +265,9 @@ class _Handler(BaseHTTPRequestHandler):
         error, values = self.server.gateway.answer(action, dict(_ARGUMENT.findall(body)))
         answer = _soap(action, error, values).encode()
         status = "500 Internal Server Error" if error else "200 OK"
-        self.wfile.write(_head(status, len(answer)) + answer)
+        deliver = self.server.gateway.personality.deliver_control
+        for piece in deliver(_head(status, len(answer)), answer):
+            self.wfile.write(piece)
 
     def log_message(self, *_arguments: object) -> None:
         """Stay silent: the device's log tells what it asked."""

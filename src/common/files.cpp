@@ -14,6 +14,8 @@ namespace pelorus {
 
 namespace {
 
+constexpr int kMostAttempts = 1000;
+
 class Descriptor {
 public:
     explicit Descriptor(int descriptor) : number{descriptor} {}
@@ -78,8 +80,13 @@ FileHandle openForeignFile(const std::string& path, Part part, Link link) {
 }
 
 FileHandle createFile(const std::string& path, mode_t mode) {
-    static_cast<void>(unlink(path.c_str()));
-    const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+    int file = -1;
+    // Whoever keeps taking the name in a shared folder wins some of the races for it, not all.
+    for (int attempt = 0; attempt < kMostAttempts && file < 0; ++attempt) {
+        static_cast<void>(unlink(path.c_str()));
+        file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+        if (file < 0 && errno != EEXIST) return nullptr;
+    }
     if (file < 0) return nullptr;
     static_cast<void>(fchmod(file, mode));  // whatever the umask
     std::FILE* const stream = fdopen(file, "w");

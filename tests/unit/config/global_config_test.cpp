@@ -128,7 +128,12 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
     const std::string noCopy = "() - failed to create temporary dynamic config file: ";
     row("nothing\nhere\n", "Settings() - failed to open config file: [static.ini].");
     row("DYNAMIC_CONFIG=gone\n", noOpen + "[gone/dynamicconfig.ini].");
-    row("DYNAMIC_CONFIG_TMP=copy.ini\n", noOpen + "gone/dynamicconfig.ini");
+    fs::remove("dynamicconfig.ini");
+    mkfifo("dynamicconfig.ini", 0666);  // planted to block
+    row("DYNAMIC_CONFIG=.\n", noOpen + "[./dynamicconfig.ini].");
+    row("DYNAMIC_CONFIG_TMP=copy.ini\n", noOpen + "./dynamicconfig.ini");
+    fs::remove("dynamicconfig.ini");
+    writeFile("dynamicconfig.ini", "KEY=v\n");
     row("DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=gone/copy.ini\n", noCopy + "gone/copy.ini");
     for (const std::size_t size : {100U, 10'000U}) {
         writeFile("dynamicconfig.ini", std::string(size, 'x') + "\nLAST=1\n");

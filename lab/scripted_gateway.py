@@ -90,14 +90,15 @@ class Personality:
     A search is answered once for each URL that `locations` gives for the gateway's own base URL.
     `deliver` cuts the description's head and body into what is sent. The description names
     `control_url`, which may be relative. Each answer of the control service comes `delay` seconds
-    late, in real time; to the actions in `errors` it is that error number. With `endless_list`, the
-    list of its mappings has no end.
+    late, in real time, and begins with `stuffing`; to the actions in `errors` it is that error
+    number. With `endless_list`, the list of its mappings has no end.
     """
 
     locations: Callable[[str], Iterable[str]] = own_description
     deliver: Callable[[bytes, bytes], Iterable[bytes]] = whole
     control_url: str = "/control"
     delay: float = 0
+    stuffing: str = ""
     errors: Mapping[str, int] = field(default_factory=dict)
     endless_list: bool = False
 
@@ -261,7 +262,8 @@ class _Handler(BaseHTTPRequestHandler):
         body = self.rfile.read(int(self.headers["Content-Length"])).decode()
         action = self.headers["SOAPAction"].strip('"').rpartition("#")[2]
         error, values = self.server.gateway.answer(action, dict(_ARGUMENT.findall(body)))
-        answer = _soap(action, error, values).encode()
+        stuffing = self.server.gateway.personality.stuffing
+        answer = (stuffing + _soap(action, error, values)).encode()
         status = "500 Internal Server Error" if error else "200 OK"
         self.wfile.write(_head(status, len(answer)) + answer)
 

@@ -96,6 +96,12 @@ def hostile_header(lab: Lab) -> None:
     _assert_endures(lab, _NO_GATEWAY)
 
 
+@scenario(_attack(Personality(stuffing="<a></>" * 700_000)))
+def hostile_answers(lab: Lab) -> None:
+    """Answers hold 700,000 empty values, for each of which the library keeps 208 bytes."""
+    _assert_endures(lab, _NO_ADDRESS)
+
+
 @scenario(_attack(Personality(locations=_many_devices, deliver=_silence)))
 def hostile_devices(lab: Lab) -> None:
     """150 devices answer the search and then keep silent: eight of them are asked."""

@@ -27,8 +27,9 @@ class BoundedCall {
 public:
     /// Bytes of resident memory.
     static constexpr long kMostGrowth = 8L * 1024 * 1024;
-    /// Bytes that recvfrom returns in one call, on all sockets.
-    static constexpr long kMostReceived = 4L * 1024 * 1024;
+    /// Bytes that recvfrom returns in one call, on all sockets. Parsing them is not interrupted, and
+    /// may need 35 times as much memory.
+    static constexpr long kMostReceived = 256L * 1024;
 
     BoundedCall(Peer peer, int seconds);
     ~BoundedCall();

@@ -102,6 +102,16 @@ def hostile_answers(lab: Lab) -> None:
     _assert_endures(lab, _NO_ADDRESS)
 
 
+@scenario(_attack(Personality()))
+def hostile_names(lab: Lab) -> None:
+    """The name server wants TCP and then says nothing: SIGTERM still ends the daemon."""
+    asked = lab.names.demand_tcp()
+    lab.start_daemon(*OPTIONS)
+    lab.wait_for(asked, "a lookup", 10)
+    # Waits for as long as the unit would.
+    assert lab.stop_daemon() == "SIGTERM"
+
+
 @scenario(_attack(Personality(locations=_many_devices, deliver=_silence)))
 def hostile_devices(lab: Lab) -> None:
     """150 devices answer the search and then keep silent: eight of them are asked."""

@@ -97,8 +97,8 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
-BoundedCall::BoundedCall(Peer peer, int seconds)
-    : before{openSockets()}, residentBefore{residentMemory()} {
+BoundedCall::BoundedCall(Peer peer, int seconds, long growth)
+    : before{openSockets()}, residentBefore{residentMemory()}, mostGrowth{growth} {
     if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
     onlyGateways = peer == Peer::GATEWAY;
     mayReceive = kMostReceived;
@@ -133,7 +133,7 @@ void BoundedCall::watch(int seconds) {
                            std::chrono::steady_clock::now() + std::chrono::seconds(kCycleBudget));
         }
         exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
-                   residentMemory() - residentBefore > kMostGrowth;
+                   residentMemory() - residentBefore > mostGrowth;
         if (exceeded) endTransfers();
     }
 }

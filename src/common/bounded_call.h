@@ -4,6 +4,7 @@
 #define PELORUS_COMMON_BOUNDED_CALL_H
 
 #include <condition_variable>
+#include <limits>
 #include <mutex>
 #include <thread>
 #include <vector>
@@ -19,19 +20,20 @@ enum class Peer {
 };
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
-/// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. So it does after kMostReceived, and a call to a gateway when
+/// or when the process has grown by @p growth bytes, they are shut down: the library then fails
+/// as if the peer had closed the connection. So it does after kMostReceived, and a call to a gateway when
 /// the stop budget is spent. Also holds termination signals back and keeps a closed connection from
 /// raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:
-    /// Bytes of resident memory.
+    /// Bytes of resident memory; kAnyGrowth for callers that load libraries' tables.
     static constexpr long kMostGrowth = 8L * 1024 * 1024;
+    static constexpr long kAnyGrowth = std::numeric_limits<long>::max();
     /// Bytes that recvfrom returns in one call, on all sockets. Parsing them is not interrupted, and
     /// may need 35 times as much memory.
     static constexpr long kMostReceived = 256L * 1024;
 
-    BoundedCall(Peer peer, int seconds);
+    BoundedCall(Peer peer, int seconds, long growth = kMostGrowth);
     ~BoundedCall();
     BoundedCall(const BoundedCall&) = delete;
     BoundedCall& operator=(const BoundedCall&) = delete;
@@ -46,6 +48,7 @@ private:
     std::mutex mutex;
     std::condition_variable ended;
     long residentBefore;  // bytes
+    long mostGrowth;
     bool over = false;
     std::thread watcher;
 };

@@ -60,6 +60,10 @@ def _endless_header(_head: bytes, _body: bytes) -> Iterable[bytes]:
     return itertools.chain([b"HTTP/1.1 200 OK\r\nX-Filler: "], itertools.repeat(_CHUNK))
 
 
+def _many_values(_head: bytes, body: bytes) -> Iterable[bytes]:
+    return [b"HTTP/1.1 200 OK\r\n\r\n", b"<a></>" * 700_000, body]
+
+
 def _silence(_head: bytes, _body: bytes) -> Iterable[bytes]:
     time.sleep(60)
     return []
@@ -104,6 +108,22 @@ def hostile_body(lab: Lab) -> None:
 def hostile_header(lab: Lab) -> None:
     """The header of the gateway's description has no end: the daemon does not fill up."""
     _assert_endures(lab, _NO_GATEWAY, 30)
+
+
+@scenario(_attack(Personality(deliver_control=_many_values)))
+def hostile_values(lab: Lab) -> None:
+    """Answers hold 700,000 empty values, for each of which the library keeps 208 bytes."""
+    _assert_endures(lab, _NO_ADDRESS, 10)
+
+
+@scenario(_attack(Personality()))
+def hostile_names(lab: Lab) -> None:
+    """The name server wants TCP and then says nothing: SIGTERM still ends the daemon."""
+    asked = lab.names.demand_tcp()
+    lab.start_daemon(*OPTIONS)
+    lab.wait_for(asked, "a lookup", 10)
+    # Waits for as long as the unit would.
+    assert lab.stop_daemon() == "SIGTERM"
 
 
 @scenario(_attack(Personality(locations=_many_devices, deliver=_silence)))

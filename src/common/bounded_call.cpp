@@ -4,7 +4,6 @@
 #include "common/bounded_call.h"
 
 #include <dlfcn.h>
-#include <fcntl.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -17,8 +16,6 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
-#include <cstdlib>
-#include <cstring>
 #include <limits>
 #include <system_error>
 #include <vector>
@@ -64,17 +61,6 @@ std::vector<int> openSockets() {
     return found;
 }
 
-// Bytes, 0 when unknown.
-long residentMemory() {
-    std::array<char, 128> text{};  // total and resident pages first
-    const int file = open("/proc/self/statm", O_RDONLY | O_CLOEXEC);
-    if (file < 0) return 0;
-    const ssize_t size = read(file, text.data(), text.size() - 1);
-    static_cast<void>(close(file));
-    const char* const second = size > 0 ? std::strchr(text.data(), ' ') : nullptr;
-    return second == nullptr ? 0 : std::strtol(second, nullptr, 10) * sysconf(_SC_PAGESIZE);
-}
-
 // The C library's function of this name and type.
 template <typename Function>
 Function* original(const char* name) {
@@ -97,8 +83,7 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
-BoundedCall::BoundedCall(Peer peer, int seconds)
-    : before{openSockets()}, residentBefore{residentMemory()} {
+BoundedCall::BoundedCall(Peer peer, int seconds) : before{openSockets()} {
     onlyGateways = peer == Peer::GATEWAY;
     Clock::duration limit = std::chrono::seconds(seconds);
     if (onlyGateways) limit = std::min(limit, stopBudgetLeft());
@@ -133,8 +118,7 @@ void BoundedCall::watch(Clock::duration limit) {
             terminating = true;
             end = std::min<Clock::time_point>(end, Clock::now() + kCycleBudget);
         }
-        exceeded = exceeded || Clock::now() >= end ||
-                   residentMemory() - residentBefore > kMostGrowth;
+        exceeded = exceeded || Clock::now() >= end;
         if (exceeded) endTransfers();
     }
 }

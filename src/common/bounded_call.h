@@ -19,17 +19,16 @@ enum class Peer {
     GATEWAY,  ///< IPv4 hosts other than this device: its own servers trust local clients
 };
 
-/// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
-/// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. So it does after kMostReceived, and a call to a gateway when
-/// the stop budget is spent. Also holds termination signals back and keeps a closed connection from
-/// raising SIGPIPE. One at a time; not around child processes.
+/// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds
+/// they are shut down: the library then fails as if the peer had closed the connection. So it does
+/// after kMostReceived, and a call to a gateway when the stop budget is spent. Also holds
+/// termination signals back and keeps a closed connection from raising SIGPIPE. One at a time; not
+/// around child processes.
 class BoundedCall {
 public:
-    /// Bytes of resident memory.
-    static constexpr long kMostGrowth = 8L * 1024 * 1024;
-    /// Bytes that recvfrom returns in one call, on all sockets.
-    static constexpr long kMostReceived = 4L * 1024 * 1024;
+    /// Bytes that recvfrom returns in one call, on all sockets. To parse them miniupnpc may need 35
+    /// times as much memory.
+    static constexpr long kMostReceived = 256L * 1024;
 
     BoundedCall(Peer peer, int seconds);
     ~BoundedCall();
@@ -48,7 +47,6 @@ private:
     std::vector<int> before;  // sockets that were open, in order
     std::mutex mutex;
     std::condition_variable ended;
-    long residentBefore;  // bytes
     bool over = false;
     std::thread watcher;
 };

@@ -5,7 +5,9 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
+#include <climits>
 #include <optional>
 
 #include "common/log.h"
@@ -13,6 +15,8 @@
 namespace pelorus {
 
 namespace {
+
+constexpr int kReading = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW;
 
 constexpr int kMostAttempts = 1000;
 
@@ -55,16 +59,43 @@ FileHandle streamOf(const std::string& text) {
     return stream;
 }
 
+// The file that the link @p path leads to; ELOOP unless root made the link, or the file's owner.
+int openLinked(const std::string& path) {
+    const Descriptor link{open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC)};
+    struct stat maker {};
+    std::array<char, PATH_MAX> target{};
+    if (link.number < 0 || fstat(link.number, &maker) != 0) return -1;
+    const ssize_t size = readlinkat(link.number, "", target.data(), target.size());
+    if (size < 0) return -1;
+    std::string name{target.data(), static_cast<std::size_t>(size)};
+    if (name.front() != '/') name.insert(0, path, 0, path.rfind('/') + 1);
+    const int file = open(name.c_str(), kReading);
+    struct stat status {};
+    const bool isOpen = file >= 0 && fstat(file, &status) == 0;
+    if (isOpen && (maker.st_uid == 0 || maker.st_uid == status.st_uid)) return file;
+    if (file >= 0) {
+        static_cast<void>(close(file));
+        errno = ELOOP;
+    }
+    return -1;
+}
+
+int openForReading(const std::string& path, Link link) {
+    const int file = open(path.c_str(), kReading);
+    return file < 0 && errno == ELOOP && link == Link::OWN ? openLinked(path) : file;
+}
+
 }  // namespace
 
 FileHandle openForeignFile(const std::string& path, Part part, Link link) {
-    const int noLink = link == Link::REFUSE ? O_NOFOLLOW : 0;
-    const Descriptor file{
-        open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | noLink)};
+    const Descriptor file{openForReading(path, link)};
     struct stat status {};
     const bool isOpen = file.number >= 0 && fstat(file.number, &status) == 0;
     if (!isOpen && errno != ELOOP) return nullptr;
-    if (!isOpen || !S_ISREG(status.st_mode)) {
+    // Some kernels let everybody give a second name to a file that he may not read.
+    const bool isStolen =
+        link == Link::OWN && status.st_nlink > 1 && (status.st_mode & S_IROTH) == 0;
+    if (!isOpen || !S_ISREG(status.st_mode) || isStolen) {
         logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
         errno = EINVAL;
         return nullptr;

@@ -177,6 +177,32 @@ TEST_F(ConfigTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
     }
 }
 
+// What the daemon reads as the dynamic file, others read in the copy.
+TEST_F(ConfigTest, NobodyCanLinkTheDynamicFileToWhatHeMayNotRead) {
+    constexpr uid_t kBackEnd = 33;
+    writeFile("static.ini", inUse);
+    const std::string dynamic = path("dynamicconfig.ini");
+    const auto isLoaded = [&](uid_t maker, uid_t owner, mode_t mode, const auto& link) {
+        const std::string target = writeFile("target", "KEY=v\n");
+        fs::remove(copy);
+        fs::remove(dynamic);
+        link(target);
+        EXPECT_EQ(chmod(target.c_str(), mode) + chown(target.c_str(), owner, owner) +
+                      lchown(dynamic.c_str(), maker, maker),
+                  0);
+        return config.loadConfig(path("static.ini"));
+    };
+    const auto symbolic = [&](const auto& /*target*/) { fs::create_symlink("target", dynamic); };
+    const auto hard = [&](const auto& target) { fs::create_hard_link(target, dynamic); };
+    if (geteuid() == 0) {
+        EXPECT_FALSE(isLoaded(kBackEnd, 0, 0644, symbolic));
+        EXPECT_TRUE(isLoaded(kBackEnd, kBackEnd, 0600, symbolic));
+        EXPECT_TRUE(isLoaded(0, kBackEnd, 0600, symbolic));
+    }
+    EXPECT_FALSE(isLoaded(geteuid(), geteuid(), 0640, hard));
+    EXPECT_TRUE(isLoaded(geteuid(), geteuid(), 0644, hard));
+}
+
 TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     load("KEY=v\n");
     rewriteCopy("KEY=w\n");

@@ -21,7 +21,7 @@ from lab.web import Reply, Request, WebServer
 HOME = Path("/run/device")
 STATIC_FILE = HOME / "globalconfig.ini"
 DYNAMIC_FILE = HOME / "config/dynamicconfig.ini"
-DYNAMIC_COPY = Path("/tmp/dynamicconfig.ini")
+DYNAMIC_COPY = Path("/run/pelorus/dynamicconfig.ini")
 SLEEP_COUNT = Path("/tmp/minutes_since_disk_access")
 PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 
@@ -36,6 +36,7 @@ _HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {_DR
 _STATIC = {
     "DYNAMIC_CONFIG": str(DYNAMIC_FILE.parent),
     "DYNAMIC_CONFIG_TMP": str(DYNAMIC_COPY),
+    "STATIC_ONLY_KEYS": "DYNAMIC_CONFIG DYNAMIC_CONFIG_TMP SERVER_BASE_URL STARTCMD",
     "DEVICETYPE": "1",
     "ENABLEREMOTEACCESS": "1",
     "SERVER_BASE_URL": f"https://{SERVICE_HOST}",
@@ -162,6 +163,7 @@ class Device:
     def _write_system_files(self) -> None:
         (HOME / "bin").mkdir(parents=True)
         DYNAMIC_FILE.parent.mkdir()
+        DYNAMIC_COPY.parent.mkdir(0o770)
         hdparm = HOME / "bin/hdparm"
         hdparm.write_text(_HDPARM)
         hdparm.chmod(0o755)

@@ -13,7 +13,7 @@ from dataclasses import replace
 from pathlib import Path
 
 from lab.checks import (FAST, NO_TUNNEL, NOT_RELAYED, OPTIONS, PAGES, assert_published,
-                        assert_stops_clean, pages_from_outside, start, wait_for_log)
+                        assert_stops_clean, pages_from_outside, start, wait_for_log, wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -71,6 +71,12 @@ def _silence(_head: bytes, _body: bytes) -> Iterable[bytes]:
 
 def _many_devices(base: str) -> Iterable[str]:
     return (f"{base}/{number}.xml" for number in range(150))
+
+
+def _endless_copies(base: str) -> Iterable[str]:
+    while True:
+        yield f"{base}/rootDesc.xml"
+        time.sleep(1 / _TENFOLD)
 
 
 def _endless_devices(base: str) -> Iterable[str]:
@@ -143,6 +149,21 @@ def hostile_location(lab: Lab) -> None:
 def hostile_control_url(lab: Lab) -> None:
     """The gateway's control service is said to be on the device itself: nothing is asked there."""
     _assert_endures(lab, _IGNORED + "control URL", 0)
+
+
+@scenario(_attack(Personality(locations=_endless_copies)))
+def hostile_copies(lab: Lab) -> None:
+    """The gateway repeats its answer every second: the search ends after 20 s, and finds it."""
+    began = time.monotonic()
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, _ATTACKED)
+    assert (time.monotonic() - began) * _TENFOLD < 20 + _SEARCH_SECONDS
+    wait_for_status(lab, "portforwarded")
+    _assert_stops_in_time(lab)
+    lab.step("SIGTERM during the search")
+    lab.start_daemon(*OPTIONS)
+    time.sleep(0.5)
+    _assert_stops_in_time(lab)
 
 
 @scenario(_attack(Personality(locations=_endless_devices)))

@@ -205,11 +205,11 @@ TEST_F(ConfigTest, NobodyCanLinkTheDynamicFileToWhatHeMayNotRead) {
 
 TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     load("KEY=v\n");
-    rewriteCopy("KEY=w\n");
+    rewriteCopy("KEY=w\n" + std::string(1024 * 1024, '\n') + "BEYOND=x\n");
     const auto rewritten = fs::last_write_time(copy);
     fs::resize_file(copy, 1'000'000'000);
     fs::last_write_time(copy, rewritten);
-    EXPECT_EQ(config.getProperty("KEY"), "w");
+    EXPECT_EQ(config.getProperty("KEY") + config.getProperty("BEYOND"), "w");
     std::string many;
     for (int key = 0; key < 20'000; ++key) many += "K" + std::to_string(key) + "=x\n";
     rewriteCopy(many + "KEY=y\n");

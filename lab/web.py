@@ -46,8 +46,8 @@ class Request:
 class Reply:
     """The reply to a request; without a body the connection ends without an answer.
 
-    It is then closed normally or, with `reset`, reset. The body is sent at once or, with `pause`, at
-    a byte in that many seconds.
+    It is then closed normally or, with `reset`, reset. The body is sent at once or, with `pause`,
+    at a byte in that many seconds.
     """
 
     body: bytes | None

@@ -13,7 +13,8 @@ from dataclasses import replace
 from pathlib import Path
 
 from lab.checks import (FAST, NO_TUNNEL, NOT_RELAYED, OPTIONS, PAGES, assert_published,
-                        assert_stops_clean, pages_from_outside, start, wait_for_log, wait_for_status)
+                        assert_stops_clean, pages_from_outside, start, wait_for_log,
+                        wait_for_status)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario

@@ -59,8 +59,10 @@ int __wrap_open(const char* path, int flags, ...) {
 int __wrap_unlink(const char* path) {
     const int result = __real_unlink(targetOf(path));
     int& replants = FakeFiles::get().replants;
-    if (replants > 0 && --replants >= 0)
+    if (replants > 0) {
+        --replants;
         close(__real_open(targetOf(path), O_CREAT | O_CLOEXEC, 0666));
+    }
     return result;
 }
 

@@ -205,7 +205,7 @@ TEST_F(ConfigTest, NobodyCanLinkTheDynamicFileToWhatHeMayNotRead) {
 
 TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     load("KEY=v\n");
-    rewriteCopy("KEY=w\n" + std::string(1024 * 1024, '\n') + "BEYOND=x\n");
+    rewriteCopy("KEY=w\n" + std::string(1'050'000, '\n') + "BEYOND=x\n");
     const auto rewritten = fs::last_write_time(copy);
     fs::resize_file(copy, 1'000'000'000);
     fs::last_write_time(copy, rewritten);

@@ -55,18 +55,23 @@ class PortTest:
 class Fault:
     """How an operation misbehaves: a different answer, a delay, or no answer at all.
 
-    `drop` closes the connection, `reset` resets it. With `times` the operation recovers after that
-    many requests.
+    `drop` closes the connection, `reset` resets it, `endless` repeats the body without end, and with
+    `pause` a byte takes that many seconds. With `times` the operation recovers after that many
+    requests.
     """
 
     body: str | None = None
     delay: float = 0
     drop: bool = False
     reset: bool = False
+    endless: bool = False
+    pause: float = 0
     times: int = 0
 
     def __str__(self) -> str:
         pause = f" after {self.delay:g} s" if self.delay else ""
+        pause += f", a byte in {self.pause:g} s" if self.pause else ""
+        pause += " without end" if self.endless else ""
         often = f", {self.times} times" if self.times else ""
         return f"{self._ending()}{pause}{often}"
 
@@ -130,10 +135,30 @@ class CentralService:
                 self._faults[operation] = fault
         self._timeline.add("central", f"{operation} now {fault or 'works normally'}")
 
-    def show_certificate_of(self, name: str) -> None:
-        """Present a certificate for `name` from now on; devices reject a wrong one."""
-        self._servers[1].show_certificate(self._authority.sign(name))
-        self._timeline.add("central", f"now presents a certificate for {name}")
+    def show_certificate_of(self, name: str, expired: bool = False, outdated: bool = False) -> None:
+        """Present a certificate for `name` from now on; devices reject a wrong one.
+
+        It may be `expired`, or the server so `outdated` that it offers nothing above TLS 1.0.
+        """
+        self._servers[1].show_certificate(self._authority.sign(name, expired), outdated)
+        self._timeline.add("central", f"now presents {'an expired' if expired else 'a'} certificate"
+                           f" for {name}{' over TLS 1.0' if outdated else ''}")
+
+    def show_certificate_from(self, authority: Authority) -> None:
+        """Present a certificate that somebody else has signed from now on."""
+        self._servers[1].show_certificate(authority.sign(SERVICE_HOST))
+        self._timeline.add("central", "now presents a certificate of an unknown authority")
+
+    def drop_tls(self) -> None:
+        """Speak plain HTTP on the HTTPS port until the next certificate."""
+        self._servers[1].drop_tls()
+        self._timeline.add("central", "speaks plain HTTP on port 443")
+
+    def keep_silent(self, silent: bool = True) -> None:
+        """Accept connections and say nothing on them, not even in a handshake."""
+        for server in self._servers:
+            server.silent = silent
+        self._timeline.add("central", "keeps silent" if silent else "answers again")
 
     def requests_for(self, operation: str) -> list[Request]:
         """The requests for one operation, in order."""
@@ -158,7 +183,7 @@ class CentralService:
             if fault.drop or fault.reset:
                 return Reply(None, reset=fault.reset)
             if fault.body is not None:
-                return Reply(fault.body.encode())
+                return Reply(fault.body.encode(), pause=fault.pause, endless=fault.endless)
         operation = self._operations.get(_operation(request))
         if operation is None:
             return Reply(b"<status>failure</status>", 404)

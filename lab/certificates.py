@@ -5,7 +5,10 @@ from __future__ import annotations
 from dataclasses import dataclass
 from pathlib import Path
 
+from lab.clock import at
 from lab.support import run_tool
+
+_DAYS = 3650
 
 
 @dataclass(frozen=True)
@@ -30,19 +33,21 @@ class Authority:
         """What a client must trust."""
         return self._own.certificate
 
-    def sign(self, host_name: str) -> KeyPair:
-        """Make a server certificate for one name."""
+    def sign(self, host_name: str, expired: bool = False) -> KeyPair:
+        """Make a server certificate for one name; `expired` makes it one that ran out a day ago."""
         pair = KeyPair(self._folder / f"{host_name}.crt", self._folder / f"{host_name}.key")
         _make(pair, host_name,
               [f"subjectAltName=DNS:{host_name}", "extendedKeyUsage=serverAuth",
-               "basicConstraints=critical,CA:FALSE", "keyUsage=digitalSignature"], self._own)
+               "basicConstraints=critical,CA:FALSE", "keyUsage=digitalSignature"], self._own,
+              -(_DAYS + 1) * 24 * 3600 if expired else 0)
         return pair
 
 
-def _make(pair: KeyPair, name: str, extensions: list[str], signer: KeyPair | None = None) -> None:
-    """Make a key and its certificate, self-signed without a signer."""
+def _make(pair: KeyPair, name: str, extensions: list[str], signer: KeyPair | None = None,
+          ahead: int = 0) -> None:
+    """Make a key and its certificate, self-signed without a signer, `ahead` seconds from now."""
     signing = ["-CA", str(signer.certificate), "-CAkey", str(signer.key)] if signer else []
-    run_tool("openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256",
-             "-noenc", "-days", "3650", "-subj", f"/CN={name}", "-keyout", str(pair.key),
+    run_tool("env", *(at(ahead) if ahead else ()), "openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256",
+             "-noenc", "-days", str(_DAYS), "-subj", f"/CN={name}", "-keyout", str(pair.key),
              "-out", str(pair.certificate), *signing,
              *(word for extension in extensions for word in ("-addext", extension)))

@@ -34,6 +34,11 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
             f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}"]
 
 
+def at(ahead: float) -> list[str]:
+    """Environment in which a program's time is `ahead` seconds ahead, or behind if negative."""
+    return _faketime(1, ahead)
+
+
 def refuse_signal(number: int) -> None:
     """Make programs with fast pauses fail to send this signal from now on; 0 for none."""
     _REFUSED_SIGNAL.write_text(f"{number}\n")
@@ -48,4 +53,4 @@ def _faketime(factor: int, ahead: float, *before: str) -> list[str]:
     libraries = glob.glob("/usr/lib/*/faketime/libfaketimeMT.so.1")
     if not libraries:
         raise LabError("libfaketime is not installed")
-    return [f"LD_PRELOAD={' '.join((*before, libraries[0]))}", f"FAKETIME=+{int(ahead)} x{factor}"]
+    return [f"LD_PRELOAD={' '.join((*before, libraries[0]))}", f"FAKETIME={int(ahead):+d} x{factor}"]

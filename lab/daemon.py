@@ -5,8 +5,8 @@ from __future__ import annotations
 import os
 import signal
 import subprocess
-from collections.abc import Iterator
-from contextlib import contextmanager
+from collections.abc import Iterator, Sequence
+from contextlib import contextmanager, suppress
 from pathlib import Path
 
 from lab import device, network, sandbox
@@ -20,25 +20,25 @@ OUTPUT = device.HOME / "pelorus.out"
 class Daemon:
     """One run of the daemon, from its start to its wait status."""
 
-    def __init__(self, options: tuple[str, ...], clock: int, hasty: bool) -> None:
+    def __init__(self, options: tuple[str, ...], clock: int, hasty: bool,
+                 through: Sequence[str] = ()) -> None:
         """Start it and return once it has detached; its time runs `clock` times as fast.
 
-        The time limit of its transfers stays real time unless `hasty`. Once detached it is a child
-        of the sandbox's first process, which is this one.
+        The time limit of its transfers stays real time unless `hasty`. It is started by the command
+        `through`, if any. Once detached it is a child of the sandbox's first process, which is this
+        one.
         """
-        PID_FILE.unlink(missing_ok=True)
         environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
                        *fast_pauses(clock, hasty)]
         argv = network.command(network.DEVICE, "env", "-i", *environment,
-                               str(sandbox.binary()), *options)
+                               *through, str(sandbox.binary()), *options)
         with OUTPUT.open("ab") as output:
             started = subprocess.run(argv, stdin=subprocess.DEVNULL, stdout=output, stderr=output,
                                      check=False)
         if started.returncode != 0:
             raise LabError(f"{argv[-1 - len(options)]} ended with status {started.returncode}: "
                            f"{OUTPUT.read_text()}")
-        self.pid = int(wait_until(lambda: PID_FILE.exists() and PID_FILE.read_text(),
-                                  f"{PID_FILE}", 10))
+        self.pid = wait_until(_detached, "the detached daemon", 10)
         self._status: int | None = None
 
     def ended(self) -> str:
@@ -68,6 +68,20 @@ class Daemon:
         """Send a signal and return how the daemon ended."""
         os.kill(self.pid, number)
         return wait_until(self.ended, f"the daemon to end after signal {number}", 60)
+
+
+def _detached() -> int:
+    """The pid of the daemon, which may already have ended; 0 without one.
+
+    The pid file would not do: there is none when it cannot be written.
+    """
+    name = f"({sandbox.binary().name})"
+    for file in Path("/proc").glob("[0-9]*/stat"):
+        with suppress(OSError):
+            pid, command, _, parent = file.read_text().split()[:4]
+            if (command, int(parent)) == (name, os.getpid()):
+                return int(pid)
+    return 0
 
 
 def running(program: str) -> list[int]:

@@ -2,6 +2,7 @@
 
 from __future__ import annotations
 
+import contextlib
 import re
 import select
 import socket
@@ -12,6 +13,7 @@ from dataclasses import dataclass
 from pathlib import Path
 
 _LOG_SOCKET = "/dev/log"
+_LOOK_SECONDS = 0.2
 _DATAGRAM = re.compile(r"<(\d+)>(?:\w{3} [ \d]\d [\d:]{8} )?([^:\[]+)(?:\[\d+\])?: ?(.*)", re.S)
 _SEVERITIES = ("emerg", "alert", "crit", "err", "warning", "notice", "info", "debug")
 
@@ -41,15 +43,26 @@ class Messages:
         self._kept: list[Message] = []
         self._listeners: list[Callable[[Message], None]] = []
         self._lock = threading.Lock()
-        self._receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        self._receiver: socket.socket | None = None
 
     def start(self) -> None:
         """Open the log socket."""
-        self._receiver.bind(_LOG_SOCKET)
+        receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        receiver.bind(_LOG_SOCKET)
         Path(_LOG_SOCKET).chmod(0o666)
         self.file.parent.mkdir(parents=True, exist_ok=True)
         self.file.touch()
-        threading.Thread(target=self._receive, daemon=True).start()
+        self._receiver = receiver
+        threading.Thread(target=self._receive, args=(receiver,), daemon=True).start()
+
+    def stop(self) -> None:
+        """Remove the log socket: what is sent until the next start is lost."""
+        self._take_waiting()
+        with self._lock:
+            assert self._receiver is not None
+            self._receiver.close()
+            self._receiver = None
+            Path(_LOG_SOCKET).unlink()
 
     @property
     def all(self) -> list[Message]:
@@ -69,15 +82,16 @@ class Messages:
         """How many lines contain `part`."""
         return sum(part in text for text in self.texts())
 
-    def _receive(self) -> None:
-        while True:
-            select.select([self._receiver], [], [])
+    def _receive(self, receiver: socket.socket) -> None:
+        while self._receiver is receiver:
+            with contextlib.suppress(OSError, ValueError):  # closed meanwhile
+                select.select([receiver], [], [], _LOOK_SECONDS)
             self._take_waiting()
 
     def _take_waiting(self) -> None:
         """Store the lines waiting in the socket."""
         with self._lock, self.file.open("a", errors="replace") as file:
-            while True:
+            while self._receiver:
                 try:
                     datagram = self._receiver.recv(65536, socket.MSG_DONTWAIT)
                 except BlockingIOError:

@@ -4,7 +4,7 @@ from __future__ import annotations
 
 import signal
 import socket
-from collections.abc import Callable, Mapping
+from collections.abc import Callable, Mapping, Sequence
 from dataclasses import dataclass, field
 from pathlib import Path
 
@@ -80,10 +80,10 @@ class Lab:
             self.own_router.start(network.GATEWAY_WAN_ADDRESS, network.DEVICE_ADDRESS)
         self.device.start(self.situation.static, self.situation.dynamic)
 
-    def start_daemon(self, *options: str) -> Daemon:
-        """Run the daemon on the device."""
+    def start_daemon(self, *options: str, through: Sequence[str] = ()) -> Daemon:
+        """Run the daemon on the device, by the command `through` if one is given."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
-        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty)
+        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty, through)
         return self._daemon
 
     @property

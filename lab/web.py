@@ -47,13 +47,14 @@ class Reply:
     """The reply to a request; without a body the connection ends without an answer.
 
     It is then closed normally or, with `reset`, reset. The body is sent at once or, with `pause`,
-    at a byte in that many seconds.
+    at a byte in that many seconds; with `endless` it is sent again and again.
     """
 
     body: bytes | None
     status: int = 200
     reset: bool = False
     pause: float = 0
+    endless: bool = False
 
 
 Answer = Callable[[Request], Reply]
@@ -68,6 +69,7 @@ class WebServer(ThreadingHTTPServer):
     def __init__(self, host: str, address: str, port: int, answer: Answer,
                  identity: KeyPair | None = None) -> None:
         self.scheme = "https" if identity else "http"
+        self.silent = False
         self._answer = answer
         self._tls: ssl.SSLContext | None = None
         if identity:
@@ -76,11 +78,25 @@ class WebServer(ThreadingHTTPServer):
             super().__init__((address, port), _Handler)
             threading.Thread(target=self.serve_forever, args=(0.1,), daemon=True).start()
 
-    def show_certificate(self, identity: KeyPair) -> None:
-        """Use this certificate for new connections."""
+    def show_certificate(self, identity: KeyPair, outdated: bool = False) -> None:
+        """Use this certificate for new connections; `outdated` offers nothing above TLS 1.0."""
         context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+        if outdated:
+            context.set_ciphers("ALL:@SECLEVEL=0")
+            context.minimum_version = context.maximum_version = ssl.TLSVersion.TLSv1
         context.load_cert_chain(identity.certificate, identity.key)
         self._tls = context
+
+    def drop_tls(self) -> None:
+        """Speak plain HTTP on new connections."""
+        self._tls = None
+
+    def finish_request(self, request: socket.socket | tuple[bytes, socket.socket],
+                       client_address: object) -> None:
+        """Serve a connection; while `silent`, not even its handshake is answered."""
+        while self.silent:
+            time.sleep(0.1)
+        super().finish_request(request, client_address)
 
     def get_request(self) -> tuple[socket.socket, object]:
         """Accept; the TLS handshake is left to the connection's own thread."""
@@ -120,8 +136,11 @@ class _Handler(BaseHTTPRequestHandler):
             return
         self.send_response(reply.status)
         self.send_header("Content-Type", "text/plain")
-        self.send_header("Content-Length", str(len(reply.body)))
+        if not reply.endless:
+            self.send_header("Content-Length", str(len(reply.body)))
         self.end_headers()
+        while reply.endless:
+            self.wfile.write(reply.body)
         if reply.pause:
             for letter in reply.body:
                 self.wfile.write(bytes([letter]))

@@ -27,7 +27,9 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
     if factor == 1:
         return []
     if not _PRELOAD.exists():
-        run_tool("cc", "-shared", "-fPIC", f'-DREFUSED_SIGNAL="{_REFUSED_SIGNAL}"',
+        # Not in /tmp, which may be full.
+        run_tool("env", f"TMPDIR={_PRELOAD.parent}", "cc", "-shared", "-fPIC",
+                 f'-DREFUSED_SIGNAL="{_REFUSED_SIGNAL}"',
                  f'-DSIGNAL_IN_GMTIME="{_SIGNAL_IN_GMTIME}"',
                  "-o", str(_PRELOAD), str(sandbox.PROJECT / "lab/preload.c"))
     return [*_faketime(factor, 0, str(_PRELOAD)),

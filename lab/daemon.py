@@ -52,6 +52,11 @@ class Daemon:
             return signal.Signals(os.WTERMSIG(self._status)).name
         return f"exit {os.WEXITSTATUS(self._status)}"
 
+    def memory(self, key: str) -> int:
+        """A line of the kernel's account of the daemon, "VmRSS" or "VmHWM", in KiB."""
+        lines = Path(f"/proc/{self.pid}/status").read_text().splitlines()
+        return next(int(line.split()[1]) for line in lines if line.startswith(f"{key}:"))
+
     @contextmanager
     def held(self) -> Iterator[None]:
         """Stop it meanwhile, so that it sees several changes at once and checks see no movement.

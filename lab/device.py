@@ -144,6 +144,12 @@ class Device:
         self._pause = pause
         self._timeline.add("device", f"the back end sends a byte in {pause:g} s")
 
+    def limit_lookups(self, seconds: int = 0) -> None:
+        """Give up a name lookup after this real time, by default after what the C library allows."""
+        options = f"options timeout:{seconds} attempts:1\n" if seconds else ""
+        network.host_file(network.DEVICE, "resolv.conf",
+                          f"nameserver {network.SERVICE_ADDRESS}\n{options}")
+
     def statuses_sent(self) -> list[str]:
         """The status words sent to the local back end, in order."""
         return [request.argument("status") for request in self.local_requests
@@ -169,7 +175,7 @@ class Device:
         hdparm.chmod(0o755)
         _DRIVE_STATE.write_text("active/idle")
         SLEEP_COUNT.write_text("0\n")
-        network.host_file(network.DEVICE, "resolv.conf", f"nameserver {network.SERVICE_ADDRESS}\n")
+        self.limit_lookups()
         network.host_file(network.DEVICE, "ssl/certs/ca-certificates.crt",
                           self._authority.certificate.read_text())
 

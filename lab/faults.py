@@ -139,9 +139,11 @@ def service_gone(lab: Lab) -> Iterator[None]:
 @_of(SERVICE_FAULTS)
 def names_time_out(lab: Lab) -> Iterator[None]:
     """The name server does not answer."""
+    lab.device.limit_lookups(1)
     lab.names.server.send_signal(signal.SIGSTOP)
     yield
     lab.names.server.send_signal(signal.SIGCONT)
+    lab.device.limit_lookups()
 
 
 @_of(SERVICE_FAULTS)

@@ -12,7 +12,10 @@ from collections.abc import Callable
 from dataclasses import dataclass
 from pathlib import Path
 
-_LOG_SOCKET = "/dev/log"
+# A folder of its own, which servers on other hosts do not see.
+FOLDER = Path("/run/syslog")
+_LOG_SOCKET = FOLDER / "socket"
+_LINK = Path("/dev/log")
 _LOOK_SECONDS = 0.2
 _DATAGRAM = re.compile(r"<(\d+)>(?:\w{3} [ \d]\d [\d:]{8} )?([^:\[]+)(?:\[\d+\])?: ?(.*)", re.S)
 _SEVERITIES = ("emerg", "alert", "crit", "err", "warning", "notice", "info", "debug")
@@ -48,8 +51,11 @@ class Messages:
     def start(self) -> None:
         """Open the log socket."""
         receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        receiver.bind(_LOG_SOCKET)
-        Path(_LOG_SOCKET).chmod(0o666)
+        FOLDER.mkdir(exist_ok=True)
+        receiver.bind(str(_LOG_SOCKET))
+        _LOG_SOCKET.chmod(0o666)
+        if not _LINK.is_symlink():
+            _LINK.symlink_to(_LOG_SOCKET)
         self.file.parent.mkdir(parents=True, exist_ok=True)
         self.file.touch()
         self._receiver = receiver
@@ -62,7 +68,7 @@ class Messages:
             assert self._receiver is not None
             self._receiver.close()
             self._receiver = None
-            Path(_LOG_SOCKET).unlink()
+            _LOG_SOCKET.unlink()
 
     @property
     def all(self) -> list[Message]:

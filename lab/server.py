@@ -7,12 +7,12 @@ import time
 from collections.abc import Callable
 from pathlib import Path
 
-from lab import network
+from lab import messages, network
 from lab.clock import fast_clock
 from lab.support import LabError, last_lines, wait_until
 
 # The log socket is the device's; a server on another host must not write to it.
-_NO_SYSLOG = ("sh", "-c", 'mount --bind /dev/null /dev/log && exec "$@"', "sh")
+_NO_SYSLOG = ("sh", "-c", f'mount -t tmpfs no-syslog {messages.FOLDER} && exec "$@"', "sh")
 
 
 class Server:

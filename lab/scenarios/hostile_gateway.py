@@ -99,6 +99,15 @@ def hostile_drip(lab: Lab) -> None:
     _assert_endures(lab, _NO_GATEWAY, 30)
 
 
+@scenario(_attack(Personality()))
+def hostile_change(lab: Lab) -> None:
+    """The gateway's description drips once the ports are mapped: SIGTERM still removes them."""
+    start(lab, "portforwarded")
+    lab.gateway.behave(Personality(deliver=_drip))
+    wait_for_log(lab, _ATTACKED, lab.device.messages.count(_ATTACKED) + 1)
+    _assert_stops_in_time(lab)
+
+
 @scenario(_attack(Personality(deliver_control=_drip)))
 def hostile_answers(lab: Lab) -> None:
     """The gateway's answers come at a byte in two seconds: each is given up after 10 s."""

@@ -161,6 +161,8 @@ class Gateway:
 
     def keep(self, mapping: Mapping) -> None:
         """Have this mapping, as if a client had got it on a better day."""
+        if mapping in self.left():
+            return
         if self._scripted:
             self._scripted.keep(Entry(mapping))
         else:

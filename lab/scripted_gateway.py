@@ -248,7 +248,8 @@ class ScriptedGateway:
 
     def perform(self, call: Call) -> Answer:
         """The answer of a good gateway, after it has done what it says."""
-        if urlsplit(call.path).path != urlsplit(self.personality.control_url).path:
+        where = urlsplit(self.personality.control_url).path
+        if urlsplit(call.path).path.lstrip("/") != where.lstrip("/"):
             return Page()
         if call.action not in self._actions:
             return _NO_SUCH_ACTION, {}

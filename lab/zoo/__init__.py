@@ -6,12 +6,13 @@ from collections.abc import Callable
 
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import Scenario
-from lab.zoo import discovery
+from lab.zoo import description, discovery
 from lab.zoo.player import play
 from lab.zoo.row import CLOCK, SHORT_PAUSES, Row
 
 SUBJECTS: dict[str, tuple[Row, ...]] = {
     "Discovery": discovery.ROWS,
+    "Description and HTTP": description.ROWS,
 }
 
 

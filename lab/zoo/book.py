@@ -45,7 +45,7 @@ those that the gateway gets in four cycles, at most. "Left behind" is what stays
 _TABLE_HEAD = """
 ## {subject}
 
-| Row | The gateway | The device is | within | requests | left behind | What the owner can do |
+| Row | Behaviour | The device is | within | requests | left behind | What the owner can do |
 | --- | --- | --- | --- | --- | --- | --- |
 """
 

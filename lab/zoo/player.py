@@ -78,7 +78,7 @@ def play(lab: Lab, row: Row) -> Played:
 
 def _assert_outcome(lab: Lab, row: Row, seen: Played) -> None:
     """The status is the right one, and true: a page comes through on the path it promises."""
-    assert seen.outcome == row.outcome
+    assert seen.outcome == row.outcome, seen
     assert any(row.why in line for line in lab.device.messages.texts()), f"not logged: {row.why}"
     if row.outcome == REACHED:
         record = lab.central.record
@@ -88,10 +88,10 @@ def _assert_outcome(lab: Lab, row: Row, seen: Played) -> None:
     elif row.outcome == RELAYED:
         assert page_through_the_tunnel(lab) == PAGES[0]
         assert lab.central.record is None
-    assert (seen.reachable is None) == (row.outcome not in (REACHED, RELAYED))
-    assert seen.reachable is None or seen.reachable <= row.seconds + _SLACK
-    assert seen.longest <= row.longest + _SLACK
-    assert seen.requests <= row.requests
+    if row.outcome in (REACHED, RELAYED):
+        assert seen.reachable and seen.reachable <= row.seconds + _SLACK, seen
+    assert seen.longest <= row.longest + _SLACK, seen
+    assert seen.requests <= row.requests, seen
 
 
 def _assert_stops(lab: Lab, row: Row) -> None:

@@ -22,6 +22,8 @@ NO_ANSWER = "upnp_discover - UPnP Discover failed to return any response"
 NO_GATEWAY = "upnp_discover - invalid device type"
 NO_ADDRESS = "upnp_discover - failed to get External IP address"
 NO_MAPPING = "Router::mapPort() - fail - failed to map external port"
+NOT_USED = "createDirectConnection - failed to get connection to local router"
+OTHER_ADDRESS = "testPort - Enforce connection as RELAY (double-NAT detected"
 TEST_FAILED = "testPort - port map check failed"
 
 # What the owner can do.
@@ -47,8 +49,8 @@ class Row:
     advice: str
     outcome: str = REACHED
     why: str = ""
-    seconds: int = 15
+    seconds: int = 40
     longest: int = 60
-    requests: int = 40
+    requests: int = 60
     left: tuple[Forwarding, ...] = ()
     between: Mapping[int, Callable[[Lab], None]] = field(default_factory=dict)

@@ -17,20 +17,20 @@ from lab.scenario import Lab
 from lab.web import Request
 from lab.zoo.row import CLOCK, CYCLES, REACHED, RELAYED, Row
 
-NEIGHBOURS = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 7000)
+# The second port that the daemon would try.
+NEIGHBOURS = Mapping("TCP", 9092, network.NEIGHBOUR_ADDRESS, 7000)
 
 # Seconds of the device. A busy machine may keep it waiting for one real second.
 _SLACK = CLOCK
 _STOPPED_WITHIN = 100
 # From one of these lines to the next of them at most so many seconds pass.
 _BOUNDS = tuple((re.compile(begin), re.compile(end), seconds) for begin, end, seconds in (
-    (r"createConnection\(\) - checking status",
-     r"upnp_discover - (List of UPNP|UPnP Discover failed)", 20),
+    (r"initLocalIp\(\) - Address Name", r"upnp_discover - (List of UPNP|UPnP Discover failed)", 20),
     (r"upnp_discover - List of UPNP",
      r"upnp_discover - (.* found at|gateway ignored|invalid device)", 30),
     (r"upnp_discover - .* found at", r"upnp_discover - .*[eE]xternal IP address", 10),
-    (r"upnp_discover - Router's external IP address: ",
-     r"(createDirectConnection - (Router is init|Don't test)|checkNetworkAddrs)", 10)))
+    (r"mapPort\(\) - UPNP_GetSpecific", r"mapPort\(\) - (success|fail|internal port)", 10),
+    (r"killConnection\(\) - unmapping all ports", r"unmapAllPorts\(\) - (success|fail)", 120)))
 _PAUSE_SECONDS = re.compile(re.escape(PAUSE) + r"(\d+) secs")
 
 
@@ -69,7 +69,6 @@ def play(lab: Lab, row: Row) -> Played:
         seen = Played(lab.device.status, _reachable(lab, began), _longest(lab, began),
                       lab.gateway.requests(), [])
         _assert_outcome(lab, row, seen)
-        _assert_bounds(lab)
         _assert_proven(lab)
     _assert_stops(lab, row)
     left = [mapping for mapping in lab.gateway.left() if mapping != NEIGHBOURS]
@@ -104,6 +103,7 @@ def _assert_stops(lab: Lab, row: Row) -> None:
     assert lab.device.status == "disabled"
     assert daemon.running("pelorus") == []
     _assert_proven(lab)
+    _assert_bounds(lab)
     assert_log_is_proper(lab)
 
 

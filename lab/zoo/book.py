@@ -39,8 +39,9 @@ is published, to the service or on the device, before the service has reached th
 address and HTTP port; what stays at the gateway after SIGTERM; and that the log is complete and
 reveals no secret.
 
-Times are seconds of the device until it can first be reached from outside, at most. Requests are
-those that the gateway gets in four cycles, at most. "Left behind" is what stays at the gateway.
+"Within" is the time until the device can first be reached from outside, at most, on an idle
+machine; a relayed device needs ten seconds of it for its tunnel. Requests are all that the gateway
+gets in four cycles, at most. "Left behind" is what stays at the gateway after SIGTERM.
 """
 _TABLE_HEAD = """
 ## {subject}
@@ -107,9 +108,9 @@ def _document() -> str:
 
 def _line(row: Row) -> str:
     said = f" (`{row.why}`)" if row.why and row.outcome != REACHED else ""
-    within = "-" if row.outcome == FAILED else f"{row.seconds} s"
+    within = "-" if row.outcome == FAILED else f"{row.within} s"
     left = ", ".join(map(str, row.left)) or "nothing"
-    cells = (row.name, row.title, _WORDS[row.outcome] + said, within, str(row.requests), left,
+    cells = (row.name, row.title, _WORDS[row.outcome] + said, within, str(row.most_requests), left,
              row.advice)
     return f"| {' | '.join(cells)} |\n"
 

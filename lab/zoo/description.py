@@ -65,6 +65,10 @@ def _unmeasured(head: bytes, body: bytes) -> Iterable[bytes]:
     wait(15)
 
 
+def _cut(head: bytes, body: bytes) -> Iterable[bytes]:
+    return [head.replace(b"Length: %d" % len(body), b"Length: %d" % (len(body) - 20)) + body]
+
+
 def _chunked(head: bytes, body: bytes) -> Iterable[bytes]:
     lines = [line for line in head.splitlines(keepends=True) if b"Content-Length" not in line]
     yield b"".join(lines[:-1]) + b"Transfer-Encoding: chunked\r\n\r\n"
@@ -136,6 +140,8 @@ ROWS = (
     Row("H9", "No Content-Length, and the connection stays open for 15 s",
         _scripted(Personality(deliver=_unmeasured, deliver_control=_unmeasured)), NOTHING,
         seconds=150, longest=150),
+    Row("H9b", "Content-Length is too small by 20 bytes",
+        _scripted(Personality(deliver=_cut, deliver_control=_cut)), NOTHING),
     Row("H10", "Chunked answers", _scripted(Personality(deliver=_chunked,
                                                         deliver_control=_chunked)), NOTHING),
     Row("H11", "Empty answers with status 500 to everything about mappings",

@@ -16,6 +16,8 @@ SHORT_PAUSES = 6
 CYCLES = 4
 
 REACHED, RELAYED, FAILED = "portforwarded", "relayed", "failed"
+# By outcome: seconds to the first of it, and requests to the gateway in all cycles.
+_USUAL = {REACHED: (15, 50), RELAYED: (40, 30), FAILED: (0, 30)}
 
 # What the log says when the gateway is not used, and why.
 NO_ANSWER = "upnp_discover - UPnP Discover failed to return any response"
@@ -36,11 +38,11 @@ LEFT_BEHIND = tuple(BOTH_MAPPED)
 class Row:
     """One behaviour. `gateway` names only what differs from a good gateway.
 
-    After four cycles the device has the status `outcome`, and the log has a line with `why`; it is
-    first reachable within `seconds`. A cycle takes at most `longest` seconds without its pause, and
-    the gateway gets at most `requests` requests before SIGTERM. All are seconds of the device. What
-    is in `left` stays at the gateway after SIGTERM. What is in `between` happens in the pause after
-    the cycle of that number.
+    After four cycles the device has the status `outcome`, and the log has a line with `why`. It is
+    first reachable within `seconds`, a cycle takes at most `longest` seconds without its pause, and
+    the gateway gets at most `requests` requests before SIGTERM; 0 stands for what is usual with the
+    outcome. All are seconds of the device. What is in `left` stays at the gateway after SIGTERM.
+    What is in `between` happens in the pause after the cycle of that number.
     """
 
     name: str
@@ -49,8 +51,18 @@ class Row:
     advice: str
     outcome: str = REACHED
     why: str = ""
-    seconds: int = 40
+    seconds: int = 0
     longest: int = 60
-    requests: int = 60
+    requests: int = 0
     left: tuple[Forwarding, ...] = ()
     between: Mapping[int, Callable[[Lab], None]] = field(default_factory=dict)
+
+    @property
+    def within(self) -> int:
+        """The seconds until the device must be reachable."""
+        return self.seconds or _USUAL[self.outcome][0]
+
+    @property
+    def most_requests(self) -> int:
+        """The requests that the gateway may get."""
+        return self.requests or _USUAL[self.outcome][1]

@@ -85,12 +85,15 @@ def _drip(head: bytes, body: bytes) -> Iterable[bytes]:
 
 
 def _tired(*actions: str) -> CallHook:
-    """Refuse these actions, or all, less than 0.2 s after the end of the call before."""
+    """Refuse these actions, or all, less than 2 s after the end of the call before.
+
+    Owners report 0.2 s; the lab on a busy machine could not tell that from a call in time.
+    """
     last = 0.0
 
     def answered(call: Call) -> Answer:
         nonlocal last
-        too_early = (time.monotonic() - last) * CLOCK < 0.2
+        too_early = (time.monotonic() - last) * CLOCK < 2
         refused = too_early and (not actions or call.action in actions)
         answer = (_ACTION_FAILED, {}) if refused else call.perform()
         last = time.monotonic()
@@ -159,10 +162,10 @@ ROWS = (
     Row("H13b", "Answers of the control service come at a byte every 4 s",
         _scripted(Personality(deliver_control=_drip)), BY_HAND, RELAYED, NO_ADDRESS, seconds=130,
         longest=130),
-    Row("H14", "Refuses to add a mapping within 0.2 s after another call",
+    Row("H14", "Refuses to add a mapping soon after another call",
         _scripted(Personality(control=_tired("AddPortMapping"))), BY_HAND, RELAYED, NO_MAPPING,
         longest=300, requests=5000),
-    Row("H14b", "Refuses every call within 0.2 s after another",
+    Row("H14b", "Refuses every call that comes soon after another",
         _scripted(Personality(control=_tired())), BY_HAND, RELAYED, NO_ADDRESS),
     Row("H15", "Picky about the request: quotes, upper case, a description, Host with port, ...",
         _scripted(Personality(control=_picky(_meets_every_wish))), NOTHING),

@@ -21,15 +21,15 @@ class Daemon:
     """One run of the daemon, from its start to its wait status."""
 
     def __init__(self, options: tuple[str, ...], clock: int, hasty: bool,
-                 through: Sequence[str] = ()) -> None:
+                 pauses: int = 1, through: Sequence[str] = ()) -> None:
         """Start it and return once it has detached; its time runs `clock` times as fast.
 
-        The time limit of its transfers stays real time unless `hasty`. It is started by the command
-        `through`, if any. Once detached it is a child of the sandbox's first process, which is this
-        one.
+        The time limit of its transfers stays real time unless `hasty`, its pauses take a `pauses`th
+        of their time. It is started by the command `through`, if any. Once detached it is a child
+        of the sandbox's first process, which is this one.
         """
         environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
-                       *fast_pauses(clock, hasty)]
+                       *fast_pauses(clock, hasty, pauses)]
         argv = network.command(network.DEVICE, "env", "-i", *environment,
                                *through, str(sandbox.binary()), *options)
         with OUTPUT.open("ab") as output:

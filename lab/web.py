@@ -19,7 +19,7 @@ from lab.support import wait_until
 
 _ANSWER_SECONDS = 10
 # On, with zero seconds: closing discards unsent data and resets the connection.
-_NO_LINGERING = struct.pack("ii", 1, 0)
+NO_LINGERING = struct.pack("ii", 1, 0)
 
 
 @dataclass(frozen=True)
@@ -131,7 +131,7 @@ class _Handler(BaseHTTPRequestHandler):
         reply = self.server.reply_to(self.client_address[0], self.path)
         if reply.body is None:
             if reply.reset:
-                self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, _NO_LINGERING)
+                self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, NO_LINGERING)
             self.close_connection = True
             return
         self.send_response(reply.status)

@@ -12,19 +12,21 @@ from collections.abc import Iterable
 from dataclasses import replace
 from pathlib import Path
 
+from lab import network
 from lab.checks import (FAST, NO_TUNNEL, NOT_RELAYED, OPTIONS, PAGES, assert_published,
                         assert_stops_clean, pages_from_outside, start, wait_for_log,
                         wait_for_status)
 from lab.gateway import GatewaySetup
+from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
-from lab.scripted_gateway import Personality
+from lab.scripted_gateway import Answer, Call, Entry, Personality, Search, at, numbered
 
 # The daemon's time runs ten times as fast, its time limits and the library's included: a gateway
 # that is to be slow for it waits a tenth, and the unit would wait 60 seconds for its end. These are
 # in real time.
 _TENFOLD = 10
-_STOP_SECONDS = 10
+_STOP_SECONDS = 20
 # For the search itself, in the daemon's time, and what a busy machine adds.
 _SEARCH_SECONDS = 15
 _MOST_GROWTH = 32 * 1024  # KiB
@@ -70,18 +72,25 @@ def _silence(_head: bytes, _body: bytes) -> Iterable[bytes]:
     return []
 
 
-def _many_devices(base: str) -> Iterable[str]:
-    return (f"{base}/{number}.xml" for number in range(150))
+def _many_devices(search: Search) -> Iterable[bytes]:
+    return (search.answer(f"{search.base}/{number}.xml") for number in range(150))
 
 
-def _endless_copies(base: str) -> Iterable[str]:
+def _endless_copies(search: Search) -> Iterable[bytes]:
     while True:
-        yield f"{base}/rootDesc.xml"
+        yield search.answer()
         time.sleep(1 / _TENFOLD)
 
 
-def _endless_devices(base: str) -> Iterable[str]:
-    return (f"{base}/{number}.xml" for number in itertools.count())
+def _endless_devices(search: Search) -> Iterable[bytes]:
+    return (search.answer(f"{search.base}/{number}.xml") for number in itertools.count())
+
+
+def _endless_list(call: Call) -> Answer:
+    if call.action != "GetGenericPortMappingEntry":
+        return call.perform()
+    index = int(call.arguments["NewPortMappingIndex"])
+    return numbered(Entry(Mapping("UDP", index, network.NEIGHBOUR_ADDRESS, index)))
 
 
 @scenario(Situation(gateway=GatewaySetup(personality=Personality()), clock=FAST))
@@ -97,6 +106,15 @@ def scripted_gateway(lab: Lab) -> None:
 def hostile_drip(lab: Lab) -> None:
     """The gateway's description comes at a byte in two seconds: it is given up after 30 s."""
     _assert_endures(lab, _NO_GATEWAY, 30)
+
+
+@scenario(_attack(Personality()))
+def hostile_change(lab: Lab) -> None:
+    """The gateway's description drips once the ports are mapped: SIGTERM still removes them."""
+    start(lab, "portforwarded")
+    lab.gateway.behave(Personality(deliver=_drip))
+    wait_for_log(lab, _ATTACKED, lab.device.messages.count(_ATTACKED) + 1)
+    _assert_stops_in_time(lab)
 
 
 @scenario(_attack(Personality(deliver_control=_drip)))
@@ -133,14 +151,14 @@ def hostile_names(lab: Lab) -> None:
     assert lab.stop_daemon() == "SIGTERM"
 
 
-@scenario(_attack(Personality(locations=_many_devices, deliver=_silence)))
+@scenario(_attack(Personality(search=_many_devices, deliver=_silence)))
 def hostile_devices(lab: Lab) -> None:
     """150 devices answer the search and then keep silent: eight of them are asked."""
     _assert_endures(lab, _NO_GATEWAY, 30)
     assert lab.gateway.upnp_requests() <= 3 * 8
 
 
-@scenario(_attack(Personality(locations=lambda _: [_INTO_THE_DEVICE])))
+@scenario(_attack(Personality(search=at(_INTO_THE_DEVICE))))
 def hostile_location(lab: Lab) -> None:
     """The gateway's description is said to be on the device itself: nothing is asked there."""
     _assert_endures(lab, _IGNORED + "description", 0)
@@ -152,7 +170,7 @@ def hostile_control_url(lab: Lab) -> None:
     _assert_endures(lab, _IGNORED + "control URL", 0)
 
 
-@scenario(_attack(Personality(locations=_endless_copies)))
+@scenario(_attack(Personality(search=_endless_copies)))
 def hostile_copies(lab: Lab) -> None:
     """The gateway repeats its answer every second: the search ends after 20 s, and finds it."""
     began = time.monotonic()
@@ -167,7 +185,7 @@ def hostile_copies(lab: Lab) -> None:
     _assert_stops_in_time(lab)
 
 
-@scenario(_attack(Personality(locations=_endless_devices)))
+@scenario(_attack(Personality(search=_endless_devices)))
 def hostile_flood(lab: Lab) -> None:
     """Answers to the search come without end: the gateway among them is used after all."""
     lab.start_daemon(*OPTIONS)
@@ -189,7 +207,7 @@ def hostile_delays(lab: Lab) -> None:
     idle = _most_memory(lab)
     wait_for_log(lab, _REFUSED, 2)
     lab.step("SIGTERM during the search; the list of mappings no longer ends")
-    lab.gateway.behave(replace(_SLOW_AND_UNWILLING, endless_list=True))
+    lab.gateway.behave(replace(_SLOW_AND_UNWILLING, control=_endless_list))
     _assert_stops_in_time(lab)
 
     lab.step("a gateway that is only slow is used")

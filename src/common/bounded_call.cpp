@@ -103,6 +103,7 @@ BoundedCall::~BoundedCall() {
     ended.notify_one();
     if (watcher.joinable()) watcher.join();
     if (onlyGateways) spendStopBudget(Clock::now() - began);
+    if (cutShort) renewStopBudget({});
     onlyGateways = false;
     mayReceive = kEverything;
 }
@@ -111,14 +112,17 @@ BoundedCall::~BoundedCall() {
 void BoundedCall::watch(Clock::duration limit) {
     auto end = began + limit;
     bool exceeded = false;
+    bool hurried = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short
     std::unique_lock lock(mutex);
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
         if (!terminating && terminationPending()) {
             terminating = true;
-            end = std::min<Clock::time_point>(end, Clock::now() + kCycleBudget);
+            hurried = end > Clock::now() + kCycleBudget;
+            if (hurried) end = Clock::now() + kCycleBudget;
         }
         exceeded = exceeded || Clock::now() >= end;
+        cutShort = exceeded && hurried;
         if (exceeded) endTransfers();
     }
 }

@@ -21,9 +21,10 @@ enum class Peer {
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds
 /// they are shut down: the library then fails as if the peer had closed the connection. So it does
-/// after kMostReceived, and a call to a gateway when the stop budget is spent. Also holds
-/// termination signals back and keeps a closed connection from raising SIGPIPE. One at a time; not
-/// around child processes.
+/// after kMostReceived, and a call to a gateway when the stop budget is spent. One that is running
+/// when a termination signal comes gets kCycleBudget from then on; if that is not enough, nothing is
+/// left for the rest of the cycle. Also holds termination signals back and keeps a closed connection
+/// from raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:
     /// Bytes that recvfrom returns in one call, on all sockets. To parse them miniupnpc may need 35
@@ -48,6 +49,7 @@ private:
     std::mutex mutex;
     std::condition_variable ended;
     bool over = false;
+    bool cutShort = false;  // by a termination signal
     std::thread watcher;
 };
 

@@ -63,20 +63,22 @@ FileHandle streamOf(const std::string& text) {
 int openLinked(const std::string& path) {
     const Descriptor link{open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC)};
     struct stat maker {};
-    std::array<char, PATH_MAX> target{};
+    std::array<char, PATH_MAX> text{};
     if (link.number < 0 || fstat(link.number, &maker) != 0) return -1;
-    const ssize_t size = readlinkat(link.number, "", target.data(), target.size());
-    if (size < 0) return -1;
-    std::string name{target.data(), static_cast<std::size_t>(size)};
+    const ssize_t size = readlinkat(link.number, "", text.data(), text.size());
+    if (size <= 0) return -1;
+    std::string name{text.data(), static_cast<std::size_t>(size)};
     if (name.front() != '/') name.insert(0, path, 0, path.rfind('/') + 1);
-    const int file = open(name.c_str(), kReading);
+    // Opening a device may do something, so what the link leads to is looked at first.
+    const Descriptor target{open(name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC)};
     struct stat status {};
-    const bool isOpen = file >= 0 && fstat(file, &status) == 0;
-    if (isOpen && (maker.st_uid == 0 || maker.st_uid == status.st_uid)) return file;
-    if (file >= 0) {
-        static_cast<void>(close(file));
-        errno = ELOOP;
+    if (target.number < 0 || fstat(target.number, &status) != 0) return -1;
+    const bool isOwn = maker.st_uid == 0 || maker.st_uid == status.st_uid;
+    if (S_ISREG(status.st_mode) && isOwn) {
+        const std::string found = "/proc/self/fd/" + std::to_string(target.number);
+        return open(found.c_str(), kReading & ~O_NOFOLLOW);
     }
+    errno = ELOOP;
     return -1;
 }
 

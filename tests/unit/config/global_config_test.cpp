@@ -1,5 +1,6 @@
 #include "config/global_config.h"
 
+#include <sys/inotify.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -195,7 +196,15 @@ TEST_F(ConfigTest, NobodyCanLinkTheDynamicFileToWhatHeMayNotRead) {
     const auto symbolic = [&](const auto& /*target*/) { fs::create_symlink("target", dynamic); };
     const auto hard = [&](const auto& target) { fs::create_hard_link(target, dynamic); };
     if (geteuid() == 0) {
-        EXPECT_FALSE(isLoaded(kBackEnd, 0, 0644, symbolic));
+        const int opened = inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
+        const auto toForeign = [&](const std::string& target) {
+            symbolic(target);
+            inotify_add_watch(opened, target.c_str(), IN_OPEN);
+        };
+        EXPECT_FALSE(isLoaded(kBackEnd, 0, 0644, toForeign));
+        inotify_event event{};
+        EXPECT_EQ(read(opened, &event, sizeof event), -1) << "opening a device may do something";
+        close(opened);
         EXPECT_TRUE(isLoaded(kBackEnd, kBackEnd, 0600, symbolic));
         EXPECT_TRUE(isLoaded(0, kBackEnd, 0600, symbolic));
     }

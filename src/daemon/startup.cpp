@@ -1,5 +1,6 @@
 #include "daemon/startup.h"
 
+#include <fcntl.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -30,6 +31,14 @@ constexpr const char* kStaticConfigVariable = "TAVIK_STATIC_CONFIG";
 constexpr const char* kDefaultStaticConfig = "/var/www/rest-api/config/globalconfig.ini";
 constexpr mode_t kUmask = 077;
 constexpr mode_t kPidFileMode = 0600;
+
+// Without them, a connection would get one of their numbers, and what a library prints to stderr
+// would be sent there. Also for child processes, hence not close-on-exec.
+void openMissingStreams() {
+    int stream = STDIN_FILENO;
+    while (stream >= 0 && stream < STDERR_FILENO) stream = open("/dev/null", O_RDWR);
+    if (stream > STDERR_FILENO) static_cast<void>(close(stream));
+}
 
 void trapTerminationSignals() {
     if (installSignalHandlers()) return;
@@ -124,6 +133,7 @@ void applyTunables(const Options& options) {
 }  // namespace
 
 void runPelorus(int argc, char** argv) {
+    openMissingStreams();
     trapTerminationSignals();
     const Options options = readCommandLine(argc, argv);
     openLog(options);

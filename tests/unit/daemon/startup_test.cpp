@@ -45,6 +45,7 @@ protected:
             startedProcess = getpid();
             reportFile = creat(path("report").c_str(), 0600);
             std::atexit(reportExit);
+            beforeStart();
             log.onLine([this](const support::LogLine& line) {
                 dprintf(reportFile, "<%d>%s", line.priority, line.text.c_str());
                 if (line.text.find("main - pelorus daemon") == 0) atStart();
@@ -70,6 +71,7 @@ protected:
         writeFile("static.ini", before + "ENABLEREMOTEACCESS=" + value + "\n");
     }
 
+    std::function<void()> beforeStart = [] {};
     std::function<void()> atStart = [] { alarm(30); };  // ends a daemon that hangs
     std::string reported;
 };
@@ -88,6 +90,19 @@ TEST_F(StartupTest, TheDaemonDetachesItselfAndReadsTheUsualConfiguration) {
     EXPECT_TRUE(holds("exit: umask 77, folder /, streams closed, no core\n")) << reported;
     EXPECT_FALSE(holds("openlog") || holds("level"));
     EXPECT_EQ(fs::status(path("pid")).permissions(), fs::perms{0600});
+}
+
+// A library's message to stderr would end up in a request otherwise.
+TEST_F(StartupTest, NoConnectionTakesThePlaceOfAClosedStream) {
+    beforeStart = [] {
+        for (const int stream : {0, 1, 2}) close(stream);
+    };
+    atStart = [] {
+        for (const char* stream : {"0", "1", "2"}) {
+            EXPECT_EQ(fs::canonical(std::string{"/proc/self/fd/"} + stream), "/dev/null");
+        }
+    };
+    EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
 }
 
 TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {

@@ -92,7 +92,7 @@ class _Scale:
         return [count * step for count in range(int((_RIGHT - _LEFT) / self._unit / step) + 1)]
 
 
-class _Sheet:
+class Sheet:
     """The drawing."""
 
     def __init__(self, height: float) -> None:
@@ -134,7 +134,7 @@ def svg(title: str, events: Sequence[Event]) -> str:
     lanes_end = lanes_top + _LANE * (1 + len(actors))
     columns = _columns(entries)
     list_height = max(sum(entry.height() for entry in column) for column in columns)
-    sheet = _Sheet(lanes_end + _AXIS + list_height + 12)
+    sheet = Sheet(lanes_end + _AXIS + list_height + 12)
     sheet.write(textwrap.shorten(title, _TITLE_LETTERS, placeholder=" \u2026"), _COLUMNS[0], 36,
                 font_size=18, font_weight="bold")
     _draw_axis(sheet, scale, lanes_top, lanes_end)
@@ -218,7 +218,7 @@ def _columns(entries: list[_Entry]) -> tuple[list[_Entry], list[_Entry]]:
     return entries[:first], entries[first:]
 
 
-def _draw_axis(sheet: _Sheet, scale: _Scale, top: float, end: float) -> None:
+def _draw_axis(sheet: Sheet, scale: _Scale, top: float, end: float) -> None:
     for tick in scale.ticks():
         x = scale.x(tick)
         sheet.draw("line", x1=x, x2=x, y1=top, y2=end + 6, stroke=_PALE)
@@ -227,7 +227,7 @@ def _draw_axis(sheet: _Sheet, scale: _Scale, top: float, end: float) -> None:
                 font_size=12)
 
 
-def _draw_steps(sheet: _Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]],
+def _draw_steps(sheet: Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]],
                 end: float) -> None:
     if steps:
         sheet.write(STORY, _COLUMNS[0], _HEADINGS_TOP + 14, fill=_STORY, font_weight="bold")
@@ -238,7 +238,7 @@ def _draw_steps(sheet: _Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]]
                     font_weight="bold")
 
 
-def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],
+def _draw_status(sheet: Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],
                  y: float) -> None:
     """A bar from each change to the next, the last one up to the right edge."""
     sheet.write("status", _COLUMNS[0], y + 24, font_weight="bold")
@@ -250,7 +250,7 @@ def _draw_status(sheet: _Sheet, scale: _Scale, changes: Sequence[tuple[float, st
             sheet.write(word, x + 6, y + 24, fill="#ffffff", font_weight="bold")
 
 
-def _draw_lane(sheet: _Sheet, scale: _Scale, entries: Sequence[_Entry], y: float) -> None:
+def _draw_lane(sheet: Sheet, scale: _Scale, entries: Sequence[_Entry], y: float) -> None:
     """A tick at every event, and the marks above the ticks."""
     who, base = entries[0].event.who, y + _LANE - 3
     colour = _ACTOR_COLOURS.get(who, _OTHER)
@@ -263,7 +263,7 @@ def _draw_lane(sheet: _Sheet, scale: _Scale, entries: Sequence[_Entry], y: float
         sheet.mark(mark, y + 7, colour)
 
 
-def _draw_list(sheet: _Sheet, entries: Sequence[_Entry], x: float, y: float) -> None:
+def _draw_list(sheet: Sheet, entries: Sequence[_Entry], x: float, y: float) -> None:
     for entry in entries:
         event, lines = entry.event, entry.lines()
         y += entry.height()

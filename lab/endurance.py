@@ -5,19 +5,21 @@ scripts/endure starts it.
 
 from __future__ import annotations
 
+import os
 import random
+import subprocess
 import sys
-import threading
 import time
+from collections import Counter
 from collections.abc import Callable
-from contextlib import ExitStack
+from concurrent.futures import ThreadPoolExecutor
 from dataclasses import dataclass
 from pathlib import Path
 
 from lab import chart, daemon, faults, network, sandbox
 from lab.chart import Series
-from lab.checks import (NO_TUNNEL, OPTIONS, PAUSE, assert_log_is_proper, assert_published,
-                        assert_stops_clean)
+from lab.checks import (IMPATIENT, OPTIONS, PAGES, PAUSE, TUNNEL_PID_FILE, assert_published,
+                        assert_stops_clean, pages_from_outside)
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
 from lab.support import LabError, wait_until
@@ -27,6 +29,13 @@ _HOUR = 3600
 _PICTURE = sandbox.PROJECT / "docs/long-life.svg"
 # The tunnel comes up in real time, within the five device minutes that it is given.
 _FAST = Situation(relay=True, clock=90)
+
+_TROUBLED = Situation(relay=True, clock=IMPATIENT, hasty=True)
+_FAULTS_IN_A_LAB = 5
+_LAB_SECONDS = 400
+_PATIENCE = 120
+_ONE_LAB = "one-lab"
+_PLAYED = "fault: "
 
 
 @dataclass(frozen=True)
@@ -171,13 +180,89 @@ def _sum_up(samples: list[Sample], requests: list[int], weather: list[str]) -> N
     assert max(quiet) <= 2 * _HOUR // 240
 
 
+def lab_faults(count: int, seed: int) -> int:
+    """Play random faults, some in each of many labs; the number of labs that failed."""
+    shares = [min(_FAULTS_IN_A_LAB, count - done) for done in range(0, count, _FAULTS_IN_A_LAB)]
+
+    def play(number: int) -> subprocess.CompletedProcess[str]:
+        share = [_ONE_LAB, str(shares[number]), str(seed + number)]
+        return sandbox.run("lab.endurance", share, timeout=_LAB_SECONDS, capture=True)
+
+    played: Counter[str] = Counter()
+    failures = 0
+    with ThreadPoolExecutor(os.cpu_count()) as pool:
+        for number, done in enumerate(pool.map(play, range(len(shares)))):
+            played.update(line.removeprefix(_PLAYED) for line in (done.stdout or "").splitlines()
+                          if line.startswith(_PLAYED))
+            if done.returncode != 0:
+                failures += 1
+                print(f"{done.stdout}\nFAILED: scripts/endure lab-faults {shares[number]} "
+                      f"{seed + number}", flush=True)
+    print("lab-faults:", ", ".join(f"{name} {often}" for name, often in sorted(played.items())))
+    print(f"lab-faults: {played.total()} faults of {len(played)} kinds in {len(shares)} labs, "
+          f"{failures} labs failed")
+    return failures
+
+
+def _play_faults(count: int, seed: int) -> None:
+    """Random faults at random moments in this lab; then the device is reached as before."""
+    chance = random.Random(seed)
+    start = chance.choice([(), faults.CLOSED, faults.NO_SIGCHLD, faults.LOCALE])
+    lab = Lab(_TROUBLED, Timeline())
+    try:
+        lab.start_daemon(*OPTIONS, through=(*start, *faults.adjustable_clock(lab)))
+        _assert_reached(lab)
+        for _ in range(count):
+            time.sleep(chance.uniform(0, 4))
+            kind = chance.choice([*faults.ALL])
+            print(f"{_PLAYED}{kind}", flush=True)
+            with faults.ALL[kind](lab):
+                time.sleep(chance.uniform(1, 8))
+                _assert_bounded(lab)
+        _assert_reached(lab)
+        assert_stops_clean(lab)
+        wait_until(lambda: len(daemon.running("openvpn")) == 1, "the tunnel's end", 20)
+    except Exception:
+        print(lab.report())
+        raise
+
+
+def _assert_reached(lab: Lab) -> None:
+    """The daemon makes the device reachable directly, and keeps it so for a cycle."""
+    lab.wait_for(lambda: lab.device.status == "portforwarded" and lab.central.record
+                 and pages_from_outside(lab.central.record.http_port,
+                                        lab.central.record.https_port) == PAGES,
+                 "the device to be reached", _PATIENCE)
+    _assert_bounded(lab)
+
+
+def _assert_bounded(lab: Lab) -> None:
+    """The daemon lives, nothing unproven is published, no secret is told, one tunnel at most."""
+    assert lab.daemon.ended() == ""
+    record = lab.central.record
+    assert record is None or any(
+        test.passed(lab.account) and (test.address, test.port) == (
+            record.external_ip, record.http_port) for test in lab.central.port_tests), record
+    # One of them is the relay's; one that has been told to stop needs a moment.
+    wait_until(lambda: len(daemon.running("openvpn")) <= 2, "at most one tunnel", 10)
+    output = daemon.OUTPUT.read_text(errors="replace")
+    lines = [*lab.device.messages.texts(), *output.splitlines()]
+    assert not [line for line in lines for secret in lab.account.secrets if secret in line]
+    for path in (daemon.PID_FILE, TUNNEL_PID_FILE.with_name("auth.txt")):
+        assert not path.exists() or path.stat().st_mode & 0o777 == 0o600, path
+
+
 def main() -> None:
-    """Play a mode, in this sandbox."""
+    """Play a mode; the labs themselves are in sandboxes."""
     mode, count, seed = sys.argv[1], int(sys.argv[2]), int(sys.argv[3])
-    if not sandbox.is_inside():
-        sys.exit(sandbox.run("lab.endurance", sys.argv[1:]).returncode)
-    if mode == "hours":
+    if mode == "lab-faults":
+        sys.exit(lab_faults(count, seed) != 0)
+    if mode == _ONE_LAB:
+        _play_faults(count, seed)
+    elif sandbox.is_inside():
         hours(count, seed)
+    else:
+        sys.exit(sandbox.run("lab.endurance", sys.argv[1:]).returncode)
 
 
 if __name__ == "__main__":

@@ -25,10 +25,16 @@ Begin = Callable[[Lab], AbstractContextManager[None]]
 _EVERYTHING = (COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT)
 _NOBODY = "44.128.0.99"
 _YEAR = 365 * 24 * 3600
-# The daemon's clock when `adjustable_clock` started it; libfaketime reads it at every look.
+# The clock of a daemon that `adjustable_clock` started; libfaketime reads it at every look.
 _CLOCK = Path("/run/lab/clock")
 _FILLER = "filler"
 _names = (f"box{number}" for number in itertools.count())
+
+# Commands that start the daemon in an unusual way: no descriptor is open, its parent ignores
+# SIGCHLD, or a locale is set.
+CLOSED = ("sh", "-c", 'exec "$@" <&- >&- 2>&-', "sh")
+NO_SIGCHLD = ("env", "--ignore-signal=CHLD")
+LOCALE = ("env", "LC_ALL=tr_TR.UTF-8", "LANG=de_DE@euro", "LANGUAGE=de:tr", "LC_NUMERIC=C.UTF-8")
 
 SERVICE_FAULTS: dict[str, Begin] = {}
 DEVICE_FAULTS: dict[str, Begin] = {}
@@ -237,10 +243,10 @@ def host_renamed(lab: Lab) -> Iterator[None]:
     socket.sethostname(lab.account.host_name)
 
 
-def adjustable_clock(lab: Lab) -> list[str]:
+def adjustable_clock(lab: Lab) -> tuple[str, ...]:
     """A command that starts a daemon whose clock the faults of the clock can move."""
     _set_clock(lab, 0)
-    return ["env", "-u", "FAKETIME", f"FAKETIME_TIMESTAMP_FILE={_CLOCK}", "FAKETIME_NO_CACHE=1"]
+    return "env", "-u", "FAKETIME", f"FAKETIME_TIMESTAMP_FILE={_CLOCK}", "FAKETIME_NO_CACHE=1"
 
 
 @contextmanager
@@ -292,3 +298,6 @@ def _refused(lab: Lab, calls: str, error: str) -> Iterator[None]:
             yield
         finally:
             tracer.send_signal(signal.SIGINT)
+
+
+ALL = {**SERVICE_FAULTS, **DEVICE_FAULTS}

@@ -18,9 +18,6 @@ from lab.scenarios.registry import scenario
 from lab.support import run_tool, wait_until
 
 _NO_RELAY = Situation(static=NO_TUNNEL, clock=FAST)
-_CLOSED = ("sh", "-c", 'exec "$@" <&- >&- 2>&-', "sh")
-_NO_SIGCHLD = ("env", "--ignore-signal=CHLD")
-_LOCALE = ("env", "LC_ALL=tr_TR.UTF-8", "LANG=de_DE@euro", "LANGUAGE=de:tr", "LC_NUMERIC=C.UTF-8")
 _STOPS = "closeVPNConnection() - attempting to stop process with PID"
 _NOT_YET_VALID = "Error: [SSL peer certificate or SSH remote key was not OK]"
 
@@ -28,7 +25,7 @@ _NOT_YET_VALID = "Error: [SSL peer certificate or SSH remote key was not OK]"
 @scenario(_NO_RELAY)
 def started_oddly(lab: Lab) -> None:
     """Started without open descriptors, with SIGCHLD ignored or in a locale: as always."""
-    for through in (_CLOSED, _NO_SIGCHLD, _LOCALE):
+    for through in (faults.CLOSED, faults.NO_SIGCHLD, faults.LOCALE):
         lab.step(f"started through {through[-2:]}")
         _start(lab, through)
         assert lab.device.messages.count("unable to check drive status") == 0
@@ -40,7 +37,7 @@ def started_oddly(lab: Lab) -> None:
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def started_oddly_while_relayed(lab: Lab) -> None:
     """With SIGCHLD ignored and no open descriptors, a tunnel is started and stopped as always."""
-    lab.start_daemon(*OPTIONS, through=(*_CLOSED, *_NO_SIGCHLD))
+    lab.start_daemon(*OPTIONS, through=(*faults.CLOSED, *faults.NO_SIGCHLD))
     wait_for_status(lab, "relayed")
     assert page_through_the_tunnel(lab) == PAGES[0]
     client = tunnel_client()

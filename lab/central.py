@@ -55,8 +55,8 @@ class PortTest:
 class Fault:
     """How an operation misbehaves: a different answer, a delay, or no answer at all.
 
-    `drop` closes the connection, `reset` resets it, `endless` repeats the body without end, and with
-    `pause` a byte takes that many seconds. With `times` the operation recovers after that many
+    `drop` closes the connection, `reset` resets it, `endless` repeats the body without end, and
+    with `pause` a byte takes that many seconds. With `times` the operation recovers after that many
     requests.
     """
 

@@ -47,7 +47,7 @@ def _make(pair: KeyPair, name: str, extensions: list[str], signer: KeyPair | Non
           ahead: int = 0) -> None:
     """Make a key and its certificate, self-signed without a signer, `ahead` seconds from now."""
     signing = ["-CA", str(signer.certificate), "-CAkey", str(signer.key)] if signer else []
-    run_tool("env", *(at(ahead) if ahead else ()), "openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256",
-             "-noenc", "-days", str(_DAYS), "-subj", f"/CN={name}", "-keyout", str(pair.key),
-             "-out", str(pair.certificate), *signing,
+    run_tool("env", *(at(ahead) if ahead else ()), "openssl", "req", "-x509", "-newkey", "ec",
+             "-pkeyopt", "ec_paramgen_curve:P-256", "-noenc", "-days", str(_DAYS),
+             "-subj", f"/CN={name}", "-keyout", str(pair.key), "-out", str(pair.certificate), *signing,
              *(word for extension in extensions for word in ("-addext", extension)))

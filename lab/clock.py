@@ -55,4 +55,5 @@ def _faketime(factor: int, ahead: float, *before: str) -> list[str]:
     libraries = glob.glob("/usr/lib/*/faketime/libfaketimeMT.so.1")
     if not libraries:
         raise LabError("libfaketime is not installed")
-    return [f"LD_PRELOAD={' '.join((*before, libraries[0]))}", f"FAKETIME={int(ahead):+d} x{factor}"]
+    return [f"LD_PRELOAD={' '.join((*before, libraries[0]))}",
+            f"FAKETIME={int(ahead):+d} x{factor}"]

@@ -145,7 +145,7 @@ class Device:
         self._timeline.add("device", f"the back end sends a byte in {pause:g} s")
 
     def limit_lookups(self, seconds: int = 0) -> None:
-        """Give up a name lookup after this real time, by default after what the C library allows."""
+        """Give up a name lookup after this real time; by default the C library decides."""
         options = f"options timeout:{seconds} attempts:1\n" if seconds else ""
         network.host_file(network.DEVICE, "resolv.conf",
                           f"nameserver {network.SERVICE_ADDRESS}\n{options}")

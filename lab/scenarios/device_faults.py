@@ -1,4 +1,4 @@
-"""A device in trouble: the daemon goes on as well as it can, and is back when the trouble is over."""
+"""A device in trouble: the daemon does what it can, and recovers when the trouble is over."""
 
 from __future__ import annotations
 

@@ -49,5 +49,6 @@ def _make(pair: KeyPair, name: str, extensions: list[str], signer: KeyPair | Non
     signing = ["-CA", str(signer.certificate), "-CAkey", str(signer.key)] if signer else []
     run_tool("env", *(at(ahead) if ahead else ()), "openssl", "req", "-x509", "-newkey", "ec",
              "-pkeyopt", "ec_paramgen_curve:P-256", "-noenc", "-days", str(_DAYS),
-             "-subj", f"/CN={name}", "-keyout", str(pair.key), "-out", str(pair.certificate), *signing,
+             "-subj", f"/CN={name}", "-keyout", str(pair.key),
+             "-out", str(pair.certificate), *signing,
              *(word for extension in extensions for word in ("-addext", extension)))

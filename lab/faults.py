@@ -288,10 +288,16 @@ def _limited(lab: Lab, resource: str, limit: int) -> Iterator[None]:
 @contextmanager
 def _refused(lab: Lab, calls: str, error: str) -> Iterator[None]:
     """Let the kernel refuse these calls to the daemon and the children that it starts."""
-    with subprocess.Popen(["strace", "-qq", "-f", "-o", "/dev/null", "-p", str(lab.daemon.pid),
-                           "-e", f"inject={calls}:error={error}"],
+    with traced(lab.daemon.pid, "-o", "/dev/null", "-e", f"inject={calls}:error={error}"):
+        yield
+
+
+@contextmanager
+def traced(pid: int, *options: str) -> Iterator[None]:
+    """Trace a process and the children that it starts, with options of strace."""
+    with subprocess.Popen(["strace", "-qq", "-f", "-p", str(pid), *options],
                           stderr=subprocess.DEVNULL) as tracer:
-        status = Path(f"/proc/{lab.daemon.pid}/status")
+        status = Path(f"/proc/{pid}/status")
         wait_until(lambda: f"TracerPid:\t{tracer.pid}\n" in status.read_text(),
                    "the tracer to be attached", 10)
         try:

@@ -86,7 +86,7 @@ class Lab:
         """Run the daemon on the device, by the command `through` if one is given."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
         self._daemon = Daemon(options, self.situation.clock, self.situation.hasty,
-                               self.situation.pauses, through)
+                              self.situation.pauses, through)
         return self._daemon
 
     @property

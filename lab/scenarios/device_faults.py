@@ -2,6 +2,9 @@
 
 from __future__ import annotations
 
+import re
+from collections.abc import Iterator
+from contextlib import contextmanager
 from pathlib import Path
 
 from lab import daemon, faults
@@ -18,6 +21,11 @@ from lab.scenarios.registry import scenario
 from lab.support import run_tool, wait_until
 
 _NO_RELAY = Situation(static=NO_TUNNEL, clock=FAST)
+_WRITES = re.compile(r"O_WRONLY|O_RDWR|O_CREAT|O_TRUNC| (creat|f?truncate|fallocate|(un)?link(at)?|"
+                     r"symlink(at)?|rename(at2?)?|mk(dir|nod)(at)?|rmdir|f?l?ch(mod|own)(at)?|"
+                     r"utime(s|nsat)?|futimesat|f?l?(set|remove)xattr)\(")
+# What the accelerated clock needs in every process.
+_OF_THE_LAB = re.compile(r'["<]/dev/(null"|shm/)|"/run/lab/signal_in_gmtime"')
 _STOPS = "closeVPNConnection() - attempting to stop process with PID"
 _NOT_YET_VALID = "Error: [SSL peer certificate or SSH remote key was not OK]"
 
@@ -164,12 +172,35 @@ def clock_jumps(lab: Lab) -> None:
     assert_stops_clean(lab)
 
 
+@scenario(_NO_RELAY)
+def quiet_cycle(lab: Lab) -> None:
+    """Cycles in which nothing changes: the kernel sees no file opened for writing, none touched."""
+    start_direct(lab)
+    with _traced(lab) as calls:
+        wait_for_next_cycle(lab, 3)
+    seen = calls.read_text().splitlines()
+    # It does look at files, its own settings among them.
+    assert any(f'"{DYNAMIC_COPY}"' in line for line in seen)
+    written = [line for line in seen if _WRITES.search(line) and not _OF_THE_LAB.search(line)]
+    assert written == [], written
+    assert_stops_clean(lab)
+
+
 def _start(lab: Lab, through: tuple[str, ...] = ()) -> None:
     """Start the daemon, which makes the device reachable."""
     lab.start_daemon(*OPTIONS, through=through)
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     assert lab.gateway.mappings() == BOTH_MAPPED
+
+
+@contextmanager
+def _traced(lab: Lab) -> Iterator[Path]:
+    """Record the calls of the daemon and its children that name a file or could change one."""
+    calls = Path("/run/lab/calls")
+    with faults.traced(lab.daemon.pid, "-o", str(calls), "-y", "-e",
+                       "trace=%file,fchmod,fchown,ftruncate,fallocate,futimesat"):
+        yield calls
 
 
 def _own_file_system(folder: Path) -> None:

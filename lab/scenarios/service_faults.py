@@ -4,14 +4,14 @@ from __future__ import annotations
 
 from lab import faults
 from lab.central import WAIT
-from lab.checks import (FAST, IMPATIENT, NO_TUNNEL, OPTIONS, PAUSE, asked, assert_log_is_proper,
+from lab.checks import (FAST, NO_TUNNEL, OPTIONS, PAUSE, asked, assert_log_is_proper,
                         assert_published, assert_stops_clean, wait_for_log, wait_for_status)
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
 _ONE_PORT = {**NO_TUNNEL, "DEFAULT_PORTS_ONLY": "TRUE"}
-# A transfer ends after 0.75 s of real time.
-_HASTY = Situation(static=_ONE_PORT, clock=IMPATIENT, hasty=True)
+# A transfer ends after half a second of real time.
+_HASTY = Situation(static=_ONE_PORT, clock=FAST, hasty=True)
 _MOST_GROWTH = 16 * 1024  # KiB, of which the libraries at their first use take half
 
 

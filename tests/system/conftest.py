@@ -32,7 +32,8 @@ def pytest_pyfunc_call(pyfuncitem: pytest.Function) -> bool | None:
         pytest.fail(f"{sandbox.binary()} does not exist; build it or set PELORUS", pytrace=False)
     if pyfuncitem.get_closest_marker("outside"):
         return None
-    done = sandbox.run("pytest", ["-q", "--no-header", "-p", "no:cacheprovider",
+    # Captured without a file: scenarios make /tmp read-only.
+    done = sandbox.run("pytest", ["-q", "--no-header", "--capture=sys", "-p", "no:cacheprovider",
                                   f"{pyfuncitem.path}::{pyfuncitem.name}"],
                        timeout=_LAST_RESORT_SECONDS, capture=True)
     if done.returncode != 0:

@@ -211,6 +211,7 @@ def _assert_recovers_from(lab: Lab, trouble: faults.Begin) -> None:
     """The running daemon lives through two cycles of the fault, and then does its work."""
     start_direct(lab)
     with trouble(lab):
+        lab.device.change(NICKNAME="box")  # has the settings read again
         wait_for_next_cycle(lab, 2)
         assert len(daemon.running("pelorus")) == 1
     lab.step("the fault is over")

@@ -198,10 +198,25 @@ class Gateway:
         if running:
             self.server.stop()
         for mapping in lost:
-            packet_filter.remove(mapping)
+            if self._scripted:
+                self._scripted.forget((mapping.protocol, mapping.external_port))
+            else:
+                packet_filter.remove(mapping)
         self._forget_leases(lost)
         if running:
             self.server.start(self._answers)
+
+    def go_offline(self) -> None:
+        """Have no internet address until `go_online`, as before the provider has assigned one."""
+        network.ip_batch(f"address del {self.wan_address}/24 dev wan", host=network.GATEWAY)
+        self._timeline.add("gateway", "has no internet address")
+
+    def go_online(self) -> None:
+        """Have the internet address again."""
+        network.ip_batch(f"address add {self.wan_address}/24 dev wan",
+                         f"route replace default via {network.SERVICE_ADDRESS}",
+                         host=network.GATEWAY)
+        self._timeline.add("gateway", f"has the internet address {self.wan_address} again")
 
     def move_to(self, wan_address: str) -> None:
         """Get another address from the internet provider."""

@@ -13,7 +13,8 @@ from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_MAPPING, NOTHING, RELAYED, TES
 
 _INVALID_ARGUMENTS, _ACTION_FAILED, _NOT_AUTHORIZED = 402, 501, 606
 _CONFLICT, _SAME_PORTS, _ONLY_PERMANENT, _FULL = 718, 724, 725, 728
-_OF_OLD = Mapping("TCP", 9095, network.DEVICE_ADDRESS, 80)
+_OLD = Mapping("TCP", 9095, network.DEVICE_ADDRESS, 80)
+_OLDER = Mapping("TCP", 8080, network.DEVICE_ADDRESS, 80)
 
 
 def _scripted(control: CallHook) -> GatewaySetup:
@@ -73,9 +74,9 @@ def _unseen(port: int) -> CallHook:
 
 def _two_networks(lab: Lab) -> None:
     """The device has an address of another network first, and asks from its second one."""
-    lab.device.move_to("10.9.8.7")
-    network.ip("-n", network.DEVICE, "address", "add", f"{network.DEVICE_ADDRESS}/24", "dev",
-               "eth0")
+    network.ip_batch("address flush dev eth0", "address add 10.9.8.7/24 dev eth0",
+                     f"address add {network.DEVICE_ADDRESS}/24 dev eth0",
+                     f"route add default via {lab.gateway.lan_address}", host=network.DEVICE)
 
 
 def _break_firewall(_lab: Lab) -> None:
@@ -93,8 +94,8 @@ def _refuse_from_now_on(lab: Lab) -> None:
 def _never(name: str, title: str, gateway: GatewaySetup, left: tuple[Mapping, ...] = (),
            between: dict[int, Event] | None = None) -> Row:
     """A gateway that refuses every port, so that all of them are tried in each cycle."""
-    return Row(name, title, gateway, BY_HAND, RELAYED, NO_MAPPING, longest=300, requests=5000,
-               left=left, between=between or {})
+    return Row(name, title, gateway, BY_HAND, RELAYED, NO_MAPPING, seconds=200, longest=300,
+               requests=5000, left=left, between=between or {})
 
 
 ROWS = (
@@ -113,9 +114,12 @@ ROWS = (
            GatewaySetup(), between={0: _two_networks}),
     Row("P7", "Allows one mapping for each internal port (718)",
         _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING),
-    _never("P7b", "Allows one mapping for each internal port (718), and has an old one",
-           _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))),
-           between={0: keep(_OF_OLD)}, left=(_OF_OLD,)),
+    Row("P7b", "Allows one mapping for each internal port (718); an old one is at 9095",
+        _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING, requests=100,
+        between={0: keep(_OLD)}),
+    _never("P7c", "Allows one mapping for each internal port (718); an old one is at 8080",
+           _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), left=(_OLDER,),
+           between={0: keep(_OLDER)}),
     _never("P8", "Is not to be changed by the device (606)", GatewaySetup(permissions=NO_PORT)),
     _never("P9", "Refuses every mapping (501)", _refused(_ACTION_FAILED)),
     _never("P9b", "Refuses every mapping with a number that nobody knows (-911)", _refused(-911)),

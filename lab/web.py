@@ -46,12 +46,14 @@ class Request:
 class Reply:
     """The reply to a request; without a body the connection ends without an answer.
 
-    It is then closed normally or, with `reset`, reset.
+    It is then closed normally or, with `reset`, reset. The body is sent at once or, with `pause`,
+    at a byte in that many seconds.
     """
 
     body: bytes | None
     status: int = 200
     reset: bool = False
+    pause: float = 0
 
 
 Answer = Callable[[Request], Reply]
@@ -120,7 +122,12 @@ class _Handler(BaseHTTPRequestHandler):
         self.send_header("Content-Type", "text/plain")
         self.send_header("Content-Length", str(len(reply.body)))
         self.end_headers()
-        self.wfile.write(reply.body)
+        if reply.pause:
+            for letter in reply.body:
+                self.wfile.write(bytes([letter]))
+                time.sleep(reply.pause)
+        else:
+            self.wfile.write(reply.body)
 
     def do_POST(self) -> None:
         self.do_GET()

@@ -1,4 +1,4 @@
-// Files and process of a test: fopen, open, fork, setsid, chdir and kill. Most go straight through
+// Files and process of a test: fopen, open, unlink, fork, setsid, chdir and kill. Most go straight through
 // to libc. A file opened without close-on-exec fails the test: a child process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
@@ -16,6 +16,9 @@ inline constexpr const char* kIdleMinutesFile = "/tmp/minutes_since_disk_access"
 struct FakeFiles : Single<FakeFiles> {
     /// Opens @p target in place of @p path; an empty target is a missing file.
     void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
+
+    /// How often somebody else takes the name of a file that is unlinked.
+    int replants = 0;
 
     std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
 };

@@ -6,7 +6,7 @@ from collections.abc import Callable
 
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import Scenario
-from lab.zoo import description, discovery, lookup, mapping, natpmp, state, time
+from lab.zoo import bundles, description, discovery, lookup, mapping, natpmp, state, time
 from lab.zoo.player import play
 from lab.zoo.row import CLOCK, SHORT_PAUSES, Row
 
@@ -18,6 +18,7 @@ SUBJECTS: dict[str, tuple[Row, ...]] = {
     "Looking up, listing and deleting": lookup.ROWS,
     "Restarts and cleaning": time.ROWS,
     "NAT-PMP": natpmp.ROWS,
+    "Several at once": bundles.ROWS,
 }
 
 

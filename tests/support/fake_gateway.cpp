@@ -23,7 +23,7 @@ constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnecti
 // any test begins, since clients may outlive the test that made them.
 const auto sockets = [] {
     std::array<int, 2> ends{};
-    socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK, 0, ends.data());
+    socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, ends.data());
     return ends;
 }();
 const int clientSocket = sockets[0], gatewaySocket = sockets[1];

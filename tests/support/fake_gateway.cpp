@@ -252,7 +252,8 @@ int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
 int __wrap_closenatpmp(natpmp_t* /*client*/) {
     gateway.note("natpmp close");
     gateway.onTheWay.clear();  // late answers find no socket
-    while (recv(clientSocket, nullptr, 0, 0) >= 0) continue;
+    while (recv(clientSocket, nullptr, 0, 0) >= 0) {
+    }
     EXPECT_GT(openClients--, 0) << "a NAT-PMP client that was not opened";
     return failure("close");
 }

@@ -26,7 +26,7 @@ from lab.scripted_gateway import Answer, Call, Entry, Personality, Search, at, n
 # that is to be slow for it waits a tenth, and the unit would wait 60 seconds for its end. These are
 # in real time.
 _TENFOLD = 10
-_STOP_SECONDS = 10
+_STOP_SECONDS = 20
 # For the search itself, in the daemon's time, and what a busy machine adds.
 _SEARCH_SECONDS = 15
 _MOST_GROWTH = 32 * 1024  # KiB

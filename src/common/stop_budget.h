@@ -9,7 +9,7 @@ namespace pelorus {
 /// What the calls of a gateway may take together in the cycle that a termination signal ends.
 inline constexpr std::chrono::seconds kCycleBudget{10};
 /// What they may take together in the final clean-up.
-inline constexpr std::chrono::seconds kCleanUpBudget{50};
+inline constexpr std::chrono::seconds kCleanUpBudget{120};
 
 /// What is left for the calls of a gateway, at least 0; without end while no termination signal has
 /// arrived. The first call after the signal starts a budget of kCycleBudget.

@@ -147,6 +147,7 @@ void logChosenDevice(int state, const std::string& controlUrl, const char* lanAd
 bool Router::discover() {
     const bool wasInitialized = std::exchange(initialized, false);
     const bool wasNatPMP = std::exchange(isNatPMP, false);
+    const Igd earlier = igd();
     forgetSeenChanges();
     initLocalIp();
     if (upnp_discover()) return true;
@@ -154,6 +155,8 @@ bool Router::discover() {
     // Cut short: the clean-up still needs the gateway that was found before.
     initialized = true;
     isNatPMP = wasNatPMP;
+    controlUrl = earlier.controlUrl;
+    serviceType = earlier.serviceType;
     return true;
 }
 

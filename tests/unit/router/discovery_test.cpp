@@ -59,10 +59,13 @@ TEST_F(DiscoveryTest, AGatewayIsUsedWhenItTellsItsAddress) {
 
 TEST_F(DiscoveryTest, ASearchThatTheStopBudgetCutsShortKeepsTheGateway) {
     discovered();
-    gateway.upnp = false;
-    gateway.natpmp = true;
+    gateway.table = {{9091}};
     sigConnKilled = SIGTERM;
     renewStopBudget({});
+    gateway.described = false;
+    EXPECT_TRUE(router.discover() && router.unmapPort(80, 9091, "TCP"));
+    gateway.upnp = false;
+    gateway.natpmp = true;
     EXPECT_TRUE(router.discover() && router.isInitialized() && !router.isNatPMPGateway());
     renewStopBudget(kCleanUpBudget);
     EXPECT_TRUE(router.discover() && router.isNatPMPGateway());

@@ -1,11 +1,9 @@
 // The mapping list of the maker's own router.
 #include "fuzz_world.h"
 #include "router/router.h"
-#include "support/fake_gateway.h"
 
 void pelorus::fuzz::tryText(const std::string& text) {
     begin("5");
-    support::FakeGateway::get().reset();
     auto& commands = support::FakeCommands::get();
     commands.answer("tavik_helper.sh list", text);
     commands.answer("getip.sh", text);

@@ -50,18 +50,17 @@ void pelorus::fuzz::tryText(const std::string& text) {
     int wait = 0;
     assert(client.getMyIP(seen, wait) == (wait == 0 && isIpv4Address(text)) && wait >= 0);
     const bool sleeps = client.checkHddStandByMode() != 0;
-    for (std::string address : {"", "44.128.0.20"}) {
-        bool isRelayed = false;
-        const int result =
-            client.testPort(address, 9091, HTTP, false, true, &isRelayed, false, remote);
-        assert((result == SKIP_TEST) == (sleeps || wait > 0));
-        assert(result != PASS_TEST || support::holds(text, "Success"));
-        assert(remote.empty() || isIpv4Address(remote));
-        client.updateServerMapping(address, 9091, 9444, address, 80, 443);
-        client.deleteServerMapping(80, address);
-        client.updateRemoteCommStatus(address);
-        client.updateLocalCommStatus(address.empty() ? "relayed" : "failed");
-    }
+    std::string address = text.size() % 2 == 0 ? "" : "44.128.0.20";
+    bool isRelayed = false;
+    const int result = client.testPort(address, 9091, HTTP, false, true, &isRelayed, false, remote);
+    assert((result == SKIP_TEST) == (sleeps || wait > 0));
+    assert(result != PASS_TEST || support::holds(text, "Success"));
+    assert(remote.empty() || isIpv4Address(remote));
+    client.updateServerMapping(address, 9091, 9444, address, 80, 443);
+    client.deleteServerMapping(80, address);
+    client.updateRemoteCommStatus(address);
+    client.updateLocalCommStatus(result == PASS_TEST ? "portforwarded" : "failed");
+    client.updateLocalCommStatus("relayed");
     const auto isPlain = [](char letter) {
         return std::isalnum(letter) != 0 || support::holds("/:?&%.-_~", {letter});
     };

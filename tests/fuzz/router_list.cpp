@@ -9,6 +9,9 @@ void pelorus::fuzz::tryText(const std::string& text) {
     commands.answer("getip.sh", text);
     Router router;
     router.initLocalIp();
+    const bool isConnected = router.initIpAddrBrenvik() != 0;
+    assert(isConnected != router.getExternalIp().empty());
+    router.mapPortBrenvik(80, 9091, "TCP", "Kavra");
     for (const char* protocol : {"TCP", "UDP"}) {
         for (const auto& entry : router.getPortListBrenvik(protocol)) {
             assert(entry.firstExternal >= 1 && entry.firstExternal <= 65535);

@@ -90,6 +90,7 @@ class Gateway:
         self._natpmp: NatPmp | None = None
         self._scripted: ScriptedGateway | None = None
         self._others: list[ScriptedGateway] = []
+        self._online = True
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
                               "-P", str(folder / "pid")], folder / "log", clock)
@@ -198,10 +199,27 @@ class Gateway:
         if running:
             self.server.stop()
         for mapping in lost:
-            packet_filter.remove(mapping)
+            if self._scripted:
+                self._scripted.forget((mapping.protocol, mapping.external_port))
+            else:
+                packet_filter.remove(mapping)
         self._forget_leases(lost)
         if running:
             self.server.start(self._answers)
+
+    def go_offline(self) -> None:
+        """Have no internet address until `go_online`, as before the provider has assigned one."""
+        network.ip_batch(f"address del {self.wan_address}/24 dev wan", host=network.GATEWAY)
+        self._online = False
+        self._timeline.add("gateway", "has no internet address")
+
+    def go_online(self) -> None:
+        """Have the internet address again."""
+        network.ip_batch(f"address add {self.wan_address}/24 dev wan",
+                         f"route replace default via {network.SERVICE_ADDRESS}",
+                         host=network.GATEWAY)
+        self._online = True
+        self._timeline.add("gateway", f"has the internet address {self.wan_address} again")
 
     def move_to(self, wan_address: str) -> None:
         """Get another address from the internet provider."""
@@ -334,6 +352,8 @@ class Gateway:
 
     def _public_address_is_told(self) -> bool:
         answer = _udp_exchange(_PUBLIC_ADDRESS_REQUEST, self.served_at, natpmp.PORT) or b""
+        if not self._online:
+            return answer[1:2] == b"\x80"
         return answer[1:4] == b"\x80\0\0" and answer[8:12] == socket.inet_aton(self.wan_address)
 
     def _add_lan_address(self, address: str) -> None:

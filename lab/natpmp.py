@@ -6,7 +6,7 @@ import socket
 import struct
 import threading
 import time
-from collections.abc import Callable
+from collections.abc import Callable, Iterable
 from dataclasses import dataclass
 
 from lab import network, packet_filter
@@ -21,6 +21,26 @@ _LOOK_SECONDS = 0.05
 
 
 @dataclass(frozen=True)
+class Request:
+    """A request; one for the public address, with the operation 0, has neither ports nor lease."""
+
+    operation: int
+    internal: int = 0
+    external: int = 0
+    lease: int = 0
+
+
+def granted(_request: Request) -> int:
+    """Do what the request asks for."""
+    return 0
+
+
+def unchanged(_request: Request, answer: bytes) -> Iterable[bytes]:
+    """Send the answer as it is."""
+    return [answer]
+
+
+@dataclass(frozen=True)
 class Grant:
     """How the router answers a request for a mapping.
 
@@ -28,12 +48,18 @@ class Grant:
     port is granted. `lease` is the longest lease in seconds. The external ports in `refused` are
     never granted. From its first request for a mapping on, the device gets each answer `delay`
     seconds late, in real time.
+
+    For the device only: a request to which `result` gives another number than 0 is refused with
+    that; `deliver` turns an answer into the datagrams that are sent, from the port `source`.
     """
 
     port: Callable[[int], int]
     lease: int
     refused: frozenset[int] = frozenset()
     delay: float = 0
+    result: Callable[[Request], int] = granted
+    deliver: Callable[[Request, bytes], Iterable[bytes]] = unchanged
+    source: int = PORT
 
 
 class NatPmp:
@@ -56,9 +82,9 @@ class NatPmp:
     def start(self, address: str) -> None:
         """Answer on this address of the router from now on."""
         with network.inside(network.GATEWAY):
-            self._socket = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
-        self._socket.settimeout(_LOOK_SECONDS)
-        self._socket.bind((address, PORT))
+            self._socket = _bound(address, PORT)
+            self._to_device = (self._socket if self._grant.source == PORT
+                               else _bound(address, self._grant.source))
         self._thread.start()
 
     def hang_once(self, seconds: float) -> None:
@@ -71,7 +97,7 @@ class NatPmp:
         self._thread.join()
 
     def _serve(self) -> None:
-        with self._socket:
+        with self._socket, self._to_device:
             while not self._stopping.is_set():
                 self._expire()
                 self._send_due()
@@ -79,18 +105,17 @@ class NatPmp:
                     request, client = self._socket.recvfrom(1500)
                 except TimeoutError:
                     continue
-                answer = self._answer(request, client[0])
-                if answer:
-                    self._outgoing.append((self._time_to_answer(request, client[0]),
-                                           answer, client))
+                due = self._time_to_answer(request, client[0])
+                self._outgoing += [(due, answer, client)
+                                   for answer in self._answers(request, client[0])]
                 self._send_due()
 
     def _time_to_answer(self, request: bytes, client: str) -> float:
         """When the answer is sent, in real time."""
         now = time.monotonic()
-        if client != network.DEVICE_ADDRESS:
+        if not _is_device(client):
             return now
-        if request[1] in _PROTOCOLS:
+        if request[1:2] in (b"\1", b"\2"):
             self._delay = self._grant.delay
             if self._hang_length:
                 self._hung_until, self._hang_length = now + self._hang_length, 0.0
@@ -100,51 +125,64 @@ class NatPmp:
         now = time.monotonic()
         for due, answer, client in self._outgoing:
             if due <= now:
-                self._socket.sendto(answer, client)
+                sender = self._to_device if _is_device(client[0]) else self._socket
+                sender.sendto(answer, client)
         self._outgoing = [waiting for waiting in self._outgoing if waiting[0] > now]
 
     def _expire(self) -> None:
         for mapping in [mapping for mapping, end in self._ends.items() if end <= self._now()]:
             self._close(mapping)
 
-    def _answer(self, request: bytes, client: str) -> bytes:
-        """The answer to a datagram; empty if it is not a request."""
-        if len(request) < 2 or request[1] >= _REPLY:
-            return b""
-        version, operation = request[:2]
+    def _answers(self, datagram: bytes, client: str) -> Iterable[bytes]:
+        """What is sent for a datagram; nothing if it is not a request."""
+        if len(datagram) < 2 or datagram[1] >= _REPLY:
+            return []
+        version, operation = datagram[:2]
         if version != 0:
-            return self._head(operation, _UNSUPPORTED_VERSION)
-        if operation == 0:
-            return self._head(0) + socket.inet_aton(self._public_address())
-        if operation not in _PROTOCOLS or len(request) < 12:
-            return self._head(operation, _UNSUPPORTED_OPCODE) + request[4:]
-        internal, external, lease = struct.unpack_from(">HHI", request, 4)
-        if lease == 0:
-            return self._unmap(operation, client, internal)
-        if external in self._grant.refused:
-            return (self._head(operation, _NOT_AUTHORIZED)
-                    + struct.pack(">HHI", internal, external, 0))
-        return self._map(operation, client, internal, external, lease)
+            return [self._head(operation, _UNSUPPORTED_VERSION)]
+        if operation not in (0, *_PROTOCOLS) or operation and len(datagram) < 12:
+            return [self._head(operation, _UNSUPPORTED_OPCODE) + datagram[4:]]
+        asked = struct.unpack_from(">HHI", datagram, 4) if operation else ()
+        request = Request(operation, *asked)
+        if not _is_device(client):
+            return [self._perform(request, client)]
+        result = self._grant.result(request)
+        answer = self._refuse(request, result) if result else self._perform(request, client)
+        return self._grant.deliver(request, answer)
 
-    def _map(self, operation: int, client: str, internal: int, external: int,
-             lease: int) -> bytes:
-        protocol, lease = _PROTOCOLS[operation], min(lease, self._grant.lease)
-        held = self._held(protocol, client, internal)
+    def _perform(self, request: Request, client: str) -> bytes:
+        if not request.operation:
+            return self._head(0) + socket.inet_aton(self._public_address())
+        if not request.lease:
+            return self._unmap(request, client)
+        if request.external in self._grant.refused:
+            return self._refuse(request, _NOT_AUTHORIZED)
+        return self._map(request, client)
+
+    def _refuse(self, request: Request, result: int) -> bytes:
+        head = self._head(request.operation, result)
+        if not request.operation:
+            return head + bytes(4)
+        return head + struct.pack(">HHI", request.internal, request.external, 0)
+
+    def _map(self, request: Request, client: str) -> bytes:
+        protocol, lease = _PROTOCOLS[request.operation], min(request.lease, self._grant.lease)
+        held = self._held(protocol, client, request.internal)
         if held:
             mapping = held[0]
         else:
-            granted = self._free(protocol, external or internal)
-            mapping = Mapping(protocol, granted, client, internal)
+            port = self._free(protocol, request.external or request.internal)
+            mapping = Mapping(protocol, port, client, request.internal)
             packet_filter.forward(mapping)
         self._ends[mapping] = self._now() + lease
-        return (self._head(operation)
-                + struct.pack(">HHI", internal, mapping.external_port, lease))
+        return (self._head(request.operation)
+                + struct.pack(">HHI", request.internal, mapping.external_port, lease))
 
-    def _unmap(self, operation: int, client: str, internal: int) -> bytes:
+    def _unmap(self, request: Request, client: str) -> bytes:
         """Close one mapping, or all of the client and protocol for internal port 0."""
-        for mapping in self._held(_PROTOCOLS[operation], client, internal):
+        for mapping in self._held(_PROTOCOLS[request.operation], client, request.internal):
             self._close(mapping)
-        return self._head(operation) + struct.pack(">HHI", internal, 0, 0)
+        return self._head(request.operation) + struct.pack(">HHI", request.internal, 0, 0)
 
     def _held(self, protocol: str, client: str, internal: int) -> list[Mapping]:
         """The forwardings of a client's port, whoever made them; of every port for 0."""
@@ -172,3 +210,15 @@ class NatPmp:
     def _now(self) -> float:
         """The client's time."""
         return time.monotonic() * self._clock
+
+
+def _bound(address: str, port: int) -> socket.socket:
+    """A UDP socket at this address."""
+    made = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+    made.settimeout(_LOOK_SECONDS)
+    made.bind((address, port))
+    return made
+
+
+def _is_device(client: str) -> bool:
+    return client == network.DEVICE_ADDRESS

@@ -29,6 +29,12 @@ class Neighbour:
                       str(internal_port), "tcp", str(_LEASE))
         self._timeline.add("neighbour", f"holds the gateway's TCP port {external_port}")
 
+    def delete(self, external_port: int) -> None:
+        """Remove a mapping, whoever made it; LabError unless the router obeys."""
+        self._ask("UPNP_DeletePortMapping() returned : 0", "upnpc", "-u",
+                  self._gateway.description_url, "-d", str(external_port), "tcp")
+        self._timeline.add("neighbour", f"deletes the gateway's TCP port {external_port}")
+
     def _ask(self, success: str, *argv: str) -> None:
         answer = network.output(network.NEIGHBOUR, *argv)
         if success not in answer:

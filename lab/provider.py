@@ -8,7 +8,6 @@ from lab.timeline import Timeline
 
 HOST = "provider"
 ADDRESS, CUSTOMER_ADDRESS = "44.128.0.21", "44.128.1.20"
-_ROUTER_ADDRESS = "44.128.1.1"
 _CABLE = network.cable_end(network.GATEWAY, "wan")
 
 # The internet cannot open a connection to a customer.
@@ -39,8 +38,9 @@ class Provider:
         self._timeline = timeline
         self._direct_address = ""
 
-    def insert(self) -> None:
-        """Plug the router into the provider's NAT instead of the internet."""
+    def insert(self, customer: str = CUSTOMER_ADDRESS) -> None:
+        """Plug the router into the provider's NAT instead of the internet, at this address."""
+        router = customer.rpartition(".")[0] + ".1"
         network.ip_batch(f"netns add {HOST}")
         network.plug(HOST, "net", network.INTERNET, "net")
         network.ip_batch(f"address add {ADDRESS}/24 dev net",
@@ -48,12 +48,12 @@ class Provider:
         network.enable_forwarding(HOST)
         nft.change(HOST, _RULES)
         network.ip_batch(f"link set {_CABLE} nomaster netns {HOST}", host=network.INTERNET)
-        network.ip_batch(f"address add {_ROUTER_ADDRESS}/24 dev {_CABLE}",
+        network.ip_batch(f"address add {router}/24 dev {_CABLE}",
                          f"link set {_CABLE} up", host=HOST)
         self._direct_address = self._gateway.wan_address
-        self._gateway.take_wan_address(CUSTOMER_ADDRESS, _ROUTER_ADDRESS)
+        self._gateway.take_wan_address(customer, router)
         self._timeline.add("provider",
-                           f"puts the gateway, now {CUSTOMER_ADDRESS}, behind {ADDRESS}")
+                           f"puts the gateway, now {customer}, behind {ADDRESS}")
 
     def remove(self) -> None:
         """Plug the router into the internet again, with its previous address."""

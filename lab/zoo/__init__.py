@@ -6,13 +6,19 @@ from collections.abc import Callable
 
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import Scenario
-from lab.zoo import description, discovery
+from lab.zoo import bundles, description, discovery, lookup, mapping, natpmp, state, time
 from lab.zoo.player import play
 from lab.zoo.row import CLOCK, SHORT_PAUSES, Row
 
 SUBJECTS: dict[str, tuple[Row, ...]] = {
     "Discovery": discovery.ROWS,
     "Description and HTTP": description.ROWS,
+    "State and external address": state.ROWS,
+    "Adding a mapping": mapping.ROWS,
+    "Looking up, listing and deleting": lookup.ROWS,
+    "Restarts and cleaning": time.ROWS,
+    "NAT-PMP": natpmp.ROWS,
+    "Several at once": bundles.ROWS,
 }
 
 

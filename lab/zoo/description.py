@@ -7,9 +7,9 @@ import time
 from collections.abc import Callable, Iterable
 
 from lab.gateway import GatewaySetup
-from lab.scenario import Lab
 from lab.scripted_gateway import (COMMON_SERVICE, IP_SERVICE, PPP_SERVICE, SERVICE, Answer, Call,
                                   Page, Personality, whole)
+from lab.zoo.events import restart
 from lab.zoo.hooks import MAPPING_CALLS, CallHook, replying, wait
 from lab.zoo.row import (BY_HAND, CLOCK, NO_ADDRESS, NO_MAPPING, NOTHING, RELAYED, TEST_FAILED,
                          Row)
@@ -21,10 +21,6 @@ _OLD_SERVICE = "urn:dslforum-org:service:WANIPConnection:1"
 
 def _scripted(personality: Personality) -> GatewaySetup:
     return GatewaySetup(personality=personality)
-
-
-def _restart(lab: Lab) -> None:
-    lab.gateway.become(lab.gateway.setup)
 
 
 def _with_dead_service(text: str) -> str:
@@ -119,7 +115,7 @@ def _picky(wish: Callable[[Call], bool]) -> CallHook:
 
 ROWS = (
     Row("H1", "Restarts, and its description and control URL move to another port",
-        GatewaySetup(), NOTHING, between={1: _restart, 2: _restart, 3: _restart}),
+        GatewaySetup(), NOTHING, between={1: restart, 2: restart, 3: restart}),
     Row("H2", "The description names another port as the base of its URLs",
         _scripted(Personality(describe=lambda text: text.replace(
             "<device>", "<URLBase>http://192.168.77.1:5999/</URLBase><device>", 1))),

@@ -7,9 +7,9 @@ import random
 from collections.abc import Iterable
 
 from lab.gateway import GatewaySetup
-from lab.scenario import Lab
 from lab.scripted_gateway import (ANY_DEVICE, DEVICE_TYPE, PPP_SERVICE, Personality,
                                   Search, at)
+from lab.zoo.events import go_deaf
 from lab.zoo.hooks import late, only, telling, wait
 from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_ADDRESS, NO_ANSWER, NO_GATEWAY, NOT_USED,
                          NOTHING, OTHER_ADDRESS, RELAYED, Row)
@@ -18,7 +18,7 @@ _GOOD = at("{base}/rootDesc.xml")
 _NOWHERE = at("http://[::1]:1900/rootDesc.xml", "http://127.0.0.1:5000/rootDesc.xml",
               "http://192.168.1.1:5000/rootDesc.xml", "http://192.168.77.1:5000")
 # What a device for Wi-Fi Protected Setup says of itself.
-_SETUP_DEVICE = """<?xml version="1.0"?>
+_SETUP_DESCRIPTION = """<?xml version="1.0"?>
 <root xmlns="urn:schemas-upnp-org:device-1-0"><device>
 <deviceType>urn:schemas-wifialliance-org:device:WFADevice:1</deviceType>
 <friendlyName>setup</friendlyName>
@@ -29,8 +29,8 @@ _SETUP_DEVICE = """<?xml version="1.0"?>
 </service></serviceList>
 </device></root>
 """
-_SETUP_ANSWERS = Personality(
-    search=lambda search: [search.answer()], describe=lambda _: _SETUP_DEVICE, forwards=False)
+SETUP_DEVICE = Personality(
+    search=lambda search: [search.answer()], describe=lambda _: _SETUP_DESCRIPTION, forwards=False)
 
 
 def _version_2(text: str) -> str:
@@ -60,6 +60,9 @@ def _garbage(search: Search) -> Iterable[bytes]:
     yield good.replace(b"\r\n\r\n", b"\r\n")
 
 
+COPIES = Personality(search=_copies)
+
+
 def _access_point(address: str) -> GatewaySetup:
     return GatewaySetup(others=(Personality(search=late(0.3, _GOOD), forwards=False,
                                             control=telling(NewExternalIPAddress=address)),))
@@ -67,10 +70,6 @@ def _access_point(address: str) -> GatewaySetup:
 
 def _scripted(gateway: Personality, *others: Personality) -> GatewaySetup:
     return GatewaySetup(personality=gateway, others=others)
-
-
-def _go_deaf(lab: Lab) -> None:
-    lab.gateway.go_deaf()
 
 
 ROWS = (
@@ -88,7 +87,7 @@ ROWS = (
     Row("D4b", "Answers no search, only announces itself unasked",
         _scripted(Personality(search=lambda _: [])), BY_HAND, RELAYED, NO_ANSWER),
     Row("D5", "Repeats its answer to a search every second, without end",
-        _scripted(Personality(search=_copies)), NOTHING, seconds=60),
+        _scripted(COPIES), NOTHING, seconds=60),
     Row("D5b", "Answers a search 400 times, each time under another name",
         _scripted(Personality(search=_many_names)), NOTHING, requests=100),
     Row("D6", "Answers the search from an odd port",
@@ -99,9 +98,9 @@ ROWS = (
         _scripted(Personality(search=_NOWHERE)), BY_HAND, RELAYED, NO_GATEWAY, seconds=100,
         longest=100),
     Row("D9", "A Wi-Fi setup device on the LAN claims every search target, before the gateway",
-        _scripted(Personality(search=late(0.5, _GOOD)), _SETUP_ANSWERS), NOTHING),
+        _scripted(Personality(search=late(0.5, _GOOD)), SETUP_DEVICE), NOTHING),
     Row("D9b", "Silent, while a Wi-Fi setup device on the LAN claims every search target",
-        _scripted(Personality(search=lambda _: []), _SETUP_ANSWERS),
+        _scripted(Personality(search=lambda _: []), SETUP_DEVICE),
         "switch on UPnP on the gateway, or " + BY_HAND, RELAYED, NO_ADDRESS),
     Row("D10", "An access point answers as a gateway as well, later, with a public address",
         _access_point("44.128.0.99"), "switch off UPnP on the access point", RELAYED,
@@ -111,7 +110,7 @@ ROWS = (
     Row("D11", "Goes deaf to searches after a while",
         GatewaySetup(), "restart the gateway; delete mappings that are left behind",
         why="UPnP discovery failed, running port test to see if ports are still open",
-        left=LEFT_BEHIND, between={1: _go_deaf}),
+        left=LEFT_BEHIND, between={1: go_deaf}),
     Row("D12", "Sends garbage and broken headers before its answer to a search",
         _scripted(Personality(search=_garbage)), NOTHING),
 )

@@ -2,6 +2,7 @@
 
 from __future__ import annotations
 
+import itertools
 import time
 from collections.abc import Callable, Iterable
 
@@ -50,3 +51,26 @@ def telling(**values: str) -> CallHook:
 def replying(page: Page, *actions: str) -> CallHook:
     """Answer these actions, or all, with a page, and do nothing."""
     return lambda call: page if not actions or call.action in actions else call.perform()
+
+
+def refusing(error: int, when: Callable[[Call], bool]) -> CallHook:
+    """Answer the calls for which `when` holds with an error, and do nothing."""
+    return lambda call: (error, {}) if when(call) else call.perform()
+
+
+def recoding(action: str, *errors: int) -> CallHook:
+    """Refuse this action, where it must be refused, with these errors in turn."""
+    turns = itertools.cycle(errors)
+
+    def recoded(call: Call) -> Answer:
+        answer = call.perform()
+        if call.action != action or isinstance(answer, Page) or not answer[0]:
+            return answer
+        return next(turns), {}
+
+    return recoded
+
+
+def adding(hook: CallHook) -> CallHook:
+    """Answer the requests for a mapping like this, and all others as a good gateway."""
+    return lambda call: hook(call) if call.action == "AddPortMapping" else call.perform()

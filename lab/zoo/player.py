@@ -55,6 +55,8 @@ class Played:
 def play(lab: Lab, row: Row) -> Played:
     """Play a row; AssertionError or LabError if it does not end as it says."""
     lab.gateway.keep(NEIGHBOURS)
+    row.between.get(0, _nothing)(lab)
+    by_hand = lab.gateway.by_hand()
     began = time.monotonic()
     lab.start_daemon(*OPTIONS)
     for cycle in range(1, CYCLES + 1):
@@ -72,8 +74,13 @@ def play(lab: Lab, row: Row) -> Played:
         _assert_outcome(lab, row, seen)
         _assert_proven(lab)
     _assert_stops(lab, row)
+    assert lab.gateway.by_hand() == by_hand
     left = [mapping for mapping in lab.gateway.left() if mapping != NEIGHBOURS]
     return Played(seen.outcome, seen.reachable, seen.longest, seen.requests, left)
+
+
+def _nothing(_lab: Lab) -> None:
+    pass
 
 
 def _assert_outcome(lab: Lab, row: Row, seen: Played) -> None:

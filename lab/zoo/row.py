@@ -24,6 +24,7 @@ NO_ANSWER = "upnp_discover - UPnP Discover failed to return any response"
 NO_GATEWAY = "upnp_discover - invalid device type"
 NO_ADDRESS = "upnp_discover - failed to get External IP address"
 NO_MAPPING = "Router::mapPort() - fail - failed to map external port"
+NO_NATPMP = "Router::natpmp_discover - failed to get External IP address"
 NOT_USED = "createDirectConnection - failed to get connection to local router"
 OTHER_ADDRESS = "testPort - Enforce connection as RELAY (double-NAT detected"
 TEST_FAILED = "testPort - port map check failed"
@@ -31,6 +32,7 @@ TEST_FAILED = "testPort - port map check failed"
 # What the owner can do.
 NOTHING = "nothing: it works"
 BY_HAND = "forward two ports by hand and enter them in the settings"
+ASK_PROVIDER = "ask the provider for a public address"
 LEFT_BEHIND = tuple(BOTH_MAPPED)
 
 
@@ -42,7 +44,7 @@ class Row:
     first reachable within `seconds`, a cycle takes at most `longest` seconds without its pause, and
     the gateway gets at most `requests` requests before SIGTERM; 0 stands for what is usual with the
     outcome. All are seconds of the device. What is in `left` stays at the gateway after SIGTERM.
-    What is in `between` happens in the pause after the cycle of that number.
+    What is in `between` happens in the pause after the cycle of that number; 0 is before the first.
     """
 
     name: str

@@ -3,6 +3,7 @@
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <sys/select.h>
+#include <sys/socket.h>
 
 #include <array>
 #include <cerrno>
@@ -19,6 +20,8 @@ namespace {
 
 constexpr int kMaxReads = 3;
 constexpr int kSelectDescriptors = FD_SETSIZE;
+constexpr ssize_t kAddressAnswerSize = 12;
+constexpr ssize_t kMappingAnswerSize = 16;
 
 // The protocol's number for "TCP" or "UDP", 0 for anything else.
 int protocolNumber(const std::string& protocol) {
@@ -51,6 +54,22 @@ void waitForAnswer(int socket, timeval timeout) {
     if (socket >= 0 && socket < kSelectDescriptors) FD_SET(socket, &readable);
     // Whatever ends the wait, the read that follows finds out.
     static_cast<void>(select(kSelectDescriptors, &readable, nullptr, nullptr, &timeout));
+}
+
+// 0 when the library may read from the socket of @p client, else the status in its place. The
+// library does not look at the length of an answer: what a short one lacks would be whatever the
+// stack held before. Such an answer fails with EBADMSG.
+int peekAnswer(const natpmp_t& client) {
+    std::array<char, kMappingAnswerSize> answer{};
+    const ssize_t size = recv(client.s, answer.data(), answer.size(), MSG_PEEK | MSG_DONTWAIT);
+    if (size < 0) {
+        if (errno == ECONNREFUSED) return NATPMP_ERR_NOGATEWAYSUPPORT;  // reported only once
+        return 0;
+    }
+    const bool isMapping = client.pending_request[1] != 0;
+    if (size >= (isMapping ? kMappingAnswerSize : kAddressAnswerSize)) return 0;
+    errno = EBADMSG;
+    return NATPMP_ERR_UNDEFINEDERROR;
 }
 
 }  // namespace
@@ -109,7 +128,8 @@ int CMnatpmp::CheckNATPMPResponse() {
             return status;
         }
         waitForAnswer(natpmp.s, timeout);
-        status = readnatpmpresponseorretry(&natpmp, &response);
+        status = peekAnswer(natpmp);
+        if (status == 0) status = readnatpmpresponseorretry(&natpmp, &response);
     }
     return status;
 }

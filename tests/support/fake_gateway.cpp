@@ -4,7 +4,9 @@
 #include <fcntl.h>
 #include <miniupnpc/upnpcommands.h>
 #include <sys/select.h>
+#include <sys/socket.h>
 
+#include <array>
 #include <cerrno>
 #include <cstring>
 
@@ -17,9 +19,14 @@ namespace {
 constexpr const char* kControlUrl = "http://192.168.77.1:5000/ctl/IPConn";
 constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnection:1";
 
-// Stands for the socket of every NAT-PMP client; nothing is sent. Open before any test begins,
-// since clients may outlive the test that made them.
-const int clientSocket = open("/dev/null", O_RDONLY);
+// Stands for the socket of every NAT-PMP client; only truncated answers come out of it. Open before
+// any test begins, since clients may outlive the test that made them.
+const auto sockets = [] {
+    std::array<int, 2> ends{};
+    socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, ends.data());
+    return ends;
+}();
+const int clientSocket = sockets[0], gatewaySocket = sockets[1];
 int openClients = 0;
 
 FakeGateway& gateway = FakeGateway::get();  // NOLINT(cert-err58-cpp): as above
@@ -99,6 +106,7 @@ int ask(natpmp_t* client, const std::string& call, const natpmpresp_t& answer) {
     if (const int status = failure(call)) return status;
     gateway.pending = answer;
     client->has_pending_request = 1;
+    client->pending_request[1] = static_cast<unsigned char>(answer.type);
     client->try_number = 0;
     transmit(client);
     return 0;
@@ -244,6 +252,8 @@ int __wrap_initnatpmp(natpmp_t* client, int forced, in_addr_t forcedAddress) {
 int __wrap_closenatpmp(natpmp_t* /*client*/) {
     gateway.note("natpmp close");
     gateway.onTheWay.clear();  // late answers find no socket
+    while (recv(clientSocket, nullptr, 0, 0) >= 0) {
+    }
     EXPECT_GT(openClients--, 0) << "a NAT-PMP client that was not opened";
     return failure("close");
 }
@@ -299,6 +309,9 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
     const long end = gateway.natpmpTime + limit;
     const long next = gateway.onTheWay.empty() ? end : gateway.onTheWay.begin()->first;
     gateway.natpmpTime = std::clamp(next, gateway.natpmpTime, end);
+    if (hasArrived() && gateway.truncated) {
+        send(gatewaySocket, std::array<char, 16>{}.data(), *gateway.truncated, 0);
+    }
     return hasArrived() ? 1 : 0;
 }
 }

@@ -80,6 +80,8 @@ public:
     long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
     int copies = 1;        ///< of each answer
+    /// Bytes of each answer that arrive, if not all.
+    std::optional<std::size_t> truncated;
     /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",
     /// "read".
     std::set<std::string> failing;

@@ -57,7 +57,7 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
     va_start(argument, number);
     // NOLINTBEGIN(clang-analyzer-valist.Uninitialized): a false alarm, see the line above
     if (option == CURLOPT_WRITEFUNCTION) {
-        transfer.writer = va_arg(argument, curl_write_callback);
+        transfer.writer = va_arg(argument, decltype(transfer.writer));
     } else if (option == CURLOPT_WRITEDATA) {
         transfer.context = va_arg(argument, void*);
     } else if (option == CURLOPT_URL) {

@@ -94,6 +94,19 @@ TEST_F(NatpmpTest, EachRequestHasASocketOfItsOwn) {
     EXPECT_EQ(gateway.natpmpTime, 1750);
 }
 
+TEST_F(NatpmpTest, AnAnswerWithoutAllItsValuesIsAnError) {
+    for (std::size_t size : {0U, 2U, 11U}) {
+        gateway.truncated = size;
+        EXPECT_FALSE(client.retrieveExternalIP(ip) || map(80, 9091)) << size;
+    }
+    EXPECT_EQ(log.countPart("errno " + std::to_string(EBADMSG) + "\n"), 6);
+    gateway.truncated = 12;
+    EXPECT_TRUE(client.retrieveExternalIP(ip) && !map(80, 9091));
+    EXPECT_EQ(gateway.natpmpTime, 0);
+    gateway.truncated = 16;
+    EXPECT_TRUE(map(80, 9091));
+}
+
 TEST_F(NatpmpTest, NothingIsAskedWithoutANewSocket) {
     gateway.answerDelay = 2000;
     EXPECT_FALSE(map(80, 9091));

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <optional>
 
@@ -13,6 +14,8 @@
 namespace pelorus {
 
 namespace {
+
+constexpr std::size_t kPieceSize = 4096;  // bytes
 
 class Descriptor {
 public:
@@ -30,16 +33,16 @@ public:
 
 // The bytes from @p offset on, as far as they are read. Nothing, and errno set, on an error.
 std::optional<std::string> readFrom(int file, off_t offset) {
-    std::string text(kMostForeignBytes, '\0');
-    std::size_t size = 0;
-    while (size < text.size()) {
+    std::string text;
+    std::array<char, kPieceSize> piece{};  // most files are short
+    while (text.size() < kMostForeignBytes) {
         const ssize_t count =
-            pread(file, &text[size], text.size() - size, offset + static_cast<off_t>(size));
+            pread(file, piece.data(), std::min(piece.size(), kMostForeignBytes - text.size()),
+                  offset + static_cast<off_t>(text.size()));
         if (count < 0) return std::nullopt;
         if (count == 0) break;
-        size += static_cast<std::size_t>(count);
+        text.append(piece.data(), static_cast<std::size_t>(count));
     }
-    text.resize(size);
     return text;
 }
 

@@ -17,6 +17,8 @@ struct FakeFiles : Single<FakeFiles> {
     /// Opens @p target in place of @p path; an empty target is a missing file.
     void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
 
+    /// Runs before each file is opened; other than 0 it is the errno of a failure.
+    std::function<int(const std::string& path, bool forWriting)> onOpen{};
     std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
 };
 

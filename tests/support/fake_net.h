@@ -29,6 +29,7 @@ struct FakeNet : Single<FakeNet> {
     std::string hostname = "nas";
     bool hostnameFails = false;
     std::map<std::string, Texts> names;            ///< their addresses; others are not known
+    std::function<void(const std::string&)> onLookup{};  ///< runs before a name is looked up
     Texts lookups;                                 ///< the names that were looked up
     std::map<void*, std::shared_ptr<void>> lists;  ///< not yet released, by their first entry
 };

@@ -57,7 +57,7 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
     va_start(argument, number);
     // NOLINTBEGIN(clang-analyzer-valist.Uninitialized): a false alarm, see the line above
     if (option == CURLOPT_WRITEFUNCTION) {
-        transfer.writer = va_arg(argument, curl_write_callback);
+        transfer.writer = va_arg(argument, decltype(transfer.writer));
     } else if (option == CURLOPT_WRITEDATA) {
         transfer.context = va_arg(argument, void*);
     } else if (option == CURLOPT_URL) {
@@ -73,7 +73,7 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
     expectTerminationHeld();
-    const FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
+    FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
     if (now.url.empty()) return CURLE_URL_MALFORMAT;
     FakeWeb::Answer answer = FakeWeb::get().ask(now.url);
     constexpr std::size_t kPieceSize = 1000;  // bytes

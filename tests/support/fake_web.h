@@ -43,7 +43,7 @@ public:
     struct Transfer {
         Options options;
         std::string url;
-        curl_write_callback writer = nullptr;
+        std::size_t (*writer)(void*, std::size_t, std::size_t, void*) = nullptr;
         void* context = nullptr;
     };
     Transfer& transferOf(CURL* handle);

@@ -1,0 +1,90 @@
+// Twenty cycles of the whole daemon in a random world, or fewer when that sends a signal, and the
+// shutdown. Built without access control: the singletons begin each run anew.
+#include <filesystem>
+
+#include "cloud/tavik_client.h"
+#include "common/stop_budget.h"
+#include "common/termination.h"
+#include "connection/connection_manager.h"
+#include "connection/network_addrs.h"
+#include "daemon/daemon_control.h"
+#include "daemon/signals.h"
+#include "fuzz_world.h"
+#include "support/random_world.h"
+
+namespace {
+
+template <class Singleton>
+void renew() {
+    Singleton* const instance = Singleton::getInstance();
+    instance->~Singleton();
+    new (instance) Singleton;
+}
+
+void renewAll(const std::string& folder) {
+    using namespace pelorus;
+    renew<GlobalConfig>();
+    assert(GlobalConfig::getInstance()->loadConfig(folder + "/static.ini"));
+    renew<TavikClient>();
+    TavikClient::getInstance()->initialize();
+    renew<ConnectionManager>();
+    renew<NetworkAddrs>();
+    renew<DaemonControl>();
+}
+
+std::string makeFolder() {
+    std::string name = (std::filesystem::temp_directory_path() / "pelorus-cycle-XXXXXX").string();
+    assert(mkdtemp(name.data()) != nullptr);
+    return name;
+}
+
+}  // namespace
+
+// No watcher of a bounded call: no call here takes long, and starting threads would. The linker's
+// name for std::thread's start, which libFuzzer needs for itself.
+#define START_THREAD(prefix) \
+    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
+bool isRunning = false;
+extern "C" {
+void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
+void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
+    if (!isRunning) START_THREAD(__real_)(thread, state, depend);
+}
+}
+
+void pelorus::fuzz::tryText(const std::string& text) {
+    using support::RandomWorld;
+    static const struct Folder {
+        std::string path = makeFolder();
+        ~Folder() { std::filesystem::remove_all(path); }
+    } folder;
+    GTEST_FLAG_SET(break_on_failure, true);
+    support::Stream stream{std::vector<std::uint8_t>{text.begin(), text.end()}};
+    const auto kind = static_cast<support::Kind>(stream.below(support::kKinds));
+    const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
+    const unsigned noise = stream.below(256);
+    RandomWorld world{std::move(stream), kind, {noise, 300, false, true, true}, folder.path};
+    bool isSent = false;
+    const auto terminate = [&] {
+        if (!isRunning || std::exchange(isSent, true)) return;
+        world.settle();
+        renewStopBudget(kCycleBudget);
+        raise(SIGTERM);
+    };
+    world.atEvent = [&] {
+        if (signalAt != 0 && world.events >= signalAt) terminate();
+    };
+    world.atCycleEnd = [&] {
+        if (world.cycles == 20) terminate();
+    };
+    sigConnKilled = kNoSignal;
+    assert(installSignalHandlers());
+    renewAll(folder.path);
+    DaemonControl::getInstance()->enableRemoteAccess();
+    DaemonControl::getInstance()->setSleepTime(30);
+    isRunning = true;
+    DaemonControl::getInstance()->run();
+    isRunning = false;
+    assert(world.client == 0);
+    renewAll(folder.path);  // what it holds of this world goes before it
+}

@@ -81,6 +81,7 @@ int __wrap_kill(pid_t pid, int signal) {
     FakeProcess& process = FakeProcess::get();
     if (pid != getpid()) return __real_kill(pid, signal);
     process.selfKills.push_back(signal);
+    if (process.onSelfKill) process.onSelfKill();
     return process.killForReal ? __real_kill(pid, signal) : 0;
 }
 }

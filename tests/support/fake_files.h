@@ -23,9 +23,10 @@ struct FakeFiles : Single<FakeFiles> {
 };
 
 struct FakeProcess : Single<FakeProcess> {
-    std::set<std::string> failing;  ///< of "fork", "setsid", "chdir"
-    std::vector<int> selfKills;     ///< signals this process sent to itself
-    bool killForReal = false;       ///< also delivers those
+    std::set<std::string> failing;       ///< of "fork", "setsid", "chdir"
+    std::vector<int> selfKills;          ///< signals this process sent to itself
+    bool killForReal = false;            ///< also delivers those
+    std::function<void()> onSelfKill{};  ///< runs before
 };
 
 }  // namespace pelorus::support

@@ -58,7 +58,7 @@ unsigned Stream::byte() {
 }
 
 RandomWorld::RandomWorld(Stream decisions, Kind reachedBy, Climate typical, std::string where)
-    : stream{std::move(decisions)}, kind{reachedBy}, climate{typical}, folder{std::move(where)} {
+    : stream{std::move(decisions)}, climate{typical}, kind{reachedBy}, folder{std::move(where)} {
     current = this;
     for (const char* name : {"/pid", "/client.pid", "/client.out", "/auth.txt", "/copy.ini"}) {
         fs::remove(folder + name);
@@ -129,7 +129,8 @@ void RandomWorld::fault(const char* what) {
 }
 
 bool RandomWorld::has(unsigned trouble) const {
-    unsigned lasting = kind == Kind::RELAYED || kind == Kind::FAILING ? NO_GATEWAY : 0;
+    unsigned lasting = 0;
+    if (kind == Kind::RELAYED || kind == Kind::FAILING) lasting |= NO_GATEWAY;
     if (kind == Kind::FAILING) lasting |= NO_TUNNEL;
     if (!settled) lasting |= climate.steadyGateway ? weather & ~NO_GATEWAY : weather;
     return (lasting & trouble) != 0;
@@ -219,6 +220,13 @@ void RandomWorld::changeWeather() {
                              "REMOTE_TESTPORTURL=%s%s%s%s%s%s%n"};
     const unsigned pick = stream.below(static_cast<unsigned>(2 * lines.size()));
     otherLines = pick < lines.size() ? lines[pick] : oddText();
+    writeSettings("");
+}
+
+void RandomWorld::move(Kind newKind) {
+    ++oddities;
+    kind = newKind;
+    otherLines = kind == Kind::BY_HAND ? "MANUAL_PORT_FORWARD=TRUE" : "MANUAL_PORT_FORWARD=FALSE";
     writeSettings("");
 }
 
@@ -355,9 +363,9 @@ CommandAnswer RandomWorld::run(const std::string& command) {
     event();
     const auto runs = [&](const char* part) { return holds(command, part); };
     CommandAnswer answer;
-    if (isOdd()) {
-        answer.fails = stream.below(2) == 1;
-        answer.exitStatus = static_cast<int>(stream.below(256));
+    if (isOdd() || shellFails) {
+        answer.fails = shellFails || stream.below(2) == 1;
+        answer.exitStatus = 1 + static_cast<int>(stream.below(255));
         answer.output = oddText();
         return answer;
     }
@@ -392,10 +400,12 @@ void RandomWorld::startClient() {
     posix_spawn_file_actions_destroy(&streams);
     if (!starts) return;
     kept = client;
-    std::ofstream{folder + "/client.pid"} << client << "\n";
     std::ofstream{folder + "/client.out"} << "Peer Connection Initiated with [AF_INET]" << kRelay
                                           << ":1194\n"
                                           << (has(NO_TUNNEL) ? "" : "Completed\n");
+    std::ofstream pidFile{folder + "/client.pid"};
+    // Like the real one, it does not run without.
+    if (!(pidFile << client << std::endl)) stopClient();
 }
 
 void RandomWorld::stopClient() {

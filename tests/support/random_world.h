@@ -73,7 +73,12 @@ public:
     /// Ends the process: the daemon did what it must not do.
     [[noreturn]] static void fault(const char* what);
 
+    /// Another way to be reached, with the settings for it.
+    void move(Kind newKind);
+
     Stream stream;
+    Climate climate;
+    bool shellFails = false;                                ///< no command can be run
     unsigned weather = 0;                                   ///< a set of troubles
     long events = 0, cycles = 0, requests = 0, opened = 0;  ///< opened: files, for writing
     long oddities = 0;                                      ///< odd answers and changes so far
@@ -103,7 +108,6 @@ private:
     void stopClient();
 
     Kind kind;
-    Climate climate;
     std::string folder, wan = "44.128.0.20";
     std::atomic<bool> settled{false};
     std::string published;   // the record's address

@@ -66,7 +66,10 @@ bool installSignalHandlers() {
         if (std::signal(sig, sigTrap) == SIG_ERR) return false;
         sigaddset(&handled, sig);
     }
-    // Whoever started the daemon may have blocked them.
+    // Whoever started the daemon may have ignored this one: the C library could not tell how a
+    // command ended.
+    if (std::signal(SIGCHLD, SIG_DFL) == SIG_ERR) return false;
+    // Or blocked the others.
     return pthread_sigmask(SIG_UNBLOCK, &handled, nullptr) == 0;
 }
 

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 
+#include "common/shell.h"
 #include "common/signal_block.h"
 #include "common/termination.h"
 #include "daemon_fixture.h"
@@ -43,6 +44,13 @@ TEST_F(SignalsTest, ASignalDuringATransferIsHandledAfterIt) {
     std::free(TavikClient::getInstance()->httpGet("https://cloud.kavra.example/x", size));
     EXPECT_EQ(size, 7);
     EXPECT_TRUE(terminationRequested());
+}
+
+// With SIGCHLD ignored the C library cannot tell how a command ended.
+TEST_F(SignalsTest, CommandsAreWaitedForWhateverTheParentIgnored) {
+    std::signal(SIGCHLD, SIG_IGN);
+    ASSERT_TRUE(installSignalHandlers());
+    EXPECT_EQ(runShell("kill -15 1"), 0);
 }
 
 TEST_F(SignalsTest, OtherNumbersAreNotInstalledAndDoNotTerminate) {

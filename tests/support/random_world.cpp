@@ -116,6 +116,8 @@ void RandomWorld::takeFakes() {
 }
 
 void RandomWorld::takeLine(int /*priority*/, const char* text) {
+    static const bool shown = std::getenv("WORLD_LOG") != nullptr;
+    if (shown) static_cast<void>(!write(STDERR_FILENO, text, std::strlen(text)));
     for (const char* secret : {kDeviceId, kDeviceAuth, kSubdomain}) {
         if (std::strstr(text, secret) != nullptr) fault(text);
     }
@@ -198,7 +200,8 @@ void RandomWorld::changeWeather() {
     wan = "44.128.0." + std::to_string(20 + stream.below(2));
     auto& net = FakeNet::get();
     net.hostname = stream.below(8) == 1 ? oddText() : "nas";
-    net.interfacesFail = stream.below(16) == 1;
+    // Then no gateway counts as another host.
+    net.interfacesFail = stream.below(16) == 1 && !climate.steadyGateway;
     net.interfaces.resize(1);
     if (!has(NO_INTERFACE)) net.interfaces.push_back({"eth0", kDeviceAddress});
     if (stream.below(16) == 1) net.interfaces.push_back({"eth1", "fe80::77"});
@@ -363,7 +366,8 @@ CommandAnswer RandomWorld::run(const std::string& command) {
     event();
     const auto runs = [&](const char* part) { return holds(command, part); };
     CommandAnswer answer;
-    if (isOdd() || shellFails) {
+    const bool ofGateway = runs("helper.sh") || runs("getip.sh");
+    if (shellFails || (!(ofGateway && climate.steadyGateway) && isOdd())) {
         answer.fails = shellFails || stream.below(2) == 1;
         answer.exitStatus = 1 + static_cast<int>(stream.below(255));
         answer.output = oddText();

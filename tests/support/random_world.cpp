@@ -200,11 +200,12 @@ void RandomWorld::changeWeather() {
     wan = "44.128.0." + std::to_string(20 + stream.below(2));
     auto& net = FakeNet::get();
     net.hostname = stream.below(8) == 1 ? oddText() : "nas";
-    // Then no gateway counts as another host.
-    net.interfacesFail = stream.below(16) == 1 && !climate.steadyGateway;
+    const unsigned broken = climate.steadyGateway ? 0 : stream.below(16);
+    net.interfacesFail = broken == 1;  // then no gateway counts as another host
     net.interfaces.resize(1);
     if (!has(NO_INTERFACE)) net.interfaces.push_back({"eth0", kDeviceAddress});
-    if (stream.below(16) == 1) net.interfaces.push_back({"eth1", "fe80::77"});
+    // Mappings of another address are not this device's: those of before stay.
+    if (broken == 2) net.interfaces.push_back({"eth1", "fe80::77"});
     std::ofstream{folder + "/minutes"} << (stream.below(4) == 1 ? oddText() : "0\n");
     if (stream.below(16) == 1)
         VirtualClock::get().advance((365L * 86400) * (stream.below(2) * 2L - 1));

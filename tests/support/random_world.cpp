@@ -144,27 +144,12 @@ bool RandomWorld::isOdd() {
     return odd;
 }
 
+// clang-format off
 std::string RandomWorld::oddText() {
-    static const Texts texts{"",
-                             "0.0.0.0",
-                             "44.128.0.21",
-                             "44.128.0.20\r\n",
-                             "::1",
-                             "%s%n%d",
-                             "<action>wait</action><wait_time>300</wait_time>",
-                             "<action>wait</action><wait_time>2147483647</wait_time>",
-                             "Success<remote_external_ip>",
-                             "</external_ip></resp_device_id>",
-                             kDeviceId,
-                             kDeviceAuth,
-                             "-1",
-                             "9092",
-                             "99999999999999999999",
-                             "TCP",
-                             "http://127.0.0.1:80/",
-                             "standby",
-                             "\n\n",
-                             "Completed"};
+    static const Texts texts{"", "0.0.0.0", "44.128.0.21", "44.128.0.20\r\n", "::1", "%s%n%d", "-1", "9092", "TCP",
+        "99999999999999999999", "http://127.0.0.1:80/", "standby", "Completed", "\n\n", kDeviceId, kDeviceAuth,
+        "<action>wait</action><wait_time>300</wait_time>", "<action>wait</action><wait_time>2147483647</wait_time>",
+        "Success<remote_external_ip>", "</external_ip></resp_device_id>"};
     const auto known = static_cast<unsigned>(texts.size());
     const unsigned pick = stream.below(2 * known);
     if (pick < known) return texts[pick];
@@ -173,6 +158,8 @@ std::string RandomWorld::oddText() {
     while (pick == known && !text.empty() && text.size() < 20'000) text += text;
     return text;
 }
+
+// clang-format on
 
 void RandomWorld::event() {
     ++events;
@@ -210,18 +197,11 @@ void RandomWorld::changeWeather() {
     if (stream.below(16) == 1)
         VirtualClock::get().advance((365L * 86400) * (stream.below(2) * 2L - 1));
     if (!climate.oddSettings) return;
-    static const Texts lines{"",
-                             "MANUAL_PORT_FORWARD=TRUE",
-                             "MANUAL_PORT_FORWARD=FALSE",
-                             "DEFAULT_PORTS_ONLY=TRUE",
-                             "INTERNAL_HTTP_PORT=99999999999",
-                             "INTERNAL_HTTP_PORT=",
-                             "MANUAL_EXTERNAL_HTTP_PORT=70000",
-                             "DEVICEAUTH=",
-                             "SUBDOMAIN=",
-                             "COMMUNICATION_STATUS=connecting",
-                             "SERVER_BASE_URL=x",
-                             "REMOTE_TESTPORTURL=%s%s%s%s%s%s%n"};
+    // clang-format off
+    static const Texts lines{"", "MANUAL_PORT_FORWARD=TRUE", "MANUAL_PORT_FORWARD=FALSE", "DEFAULT_PORTS_ONLY=TRUE",
+        "INTERNAL_HTTP_PORT=99999999999", "INTERNAL_HTTP_PORT=", "MANUAL_EXTERNAL_HTTP_PORT=70000", "DEVICEAUTH=",
+        "SUBDOMAIN=", "COMMUNICATION_STATUS=connecting", "SERVER_BASE_URL=x", "REMOTE_TESTPORTURL=%s%s%s%s%s%s%n"};
+    // clang-format on
     const unsigned pick = stream.below(static_cast<unsigned>(2 * lines.size()));
     otherLines = pick < lines.size() ? lines[pick] : oddText();
     writeSettings("");
@@ -267,48 +247,23 @@ void RandomWorld::makeGatewayOdd(const std::string& call) {
     auto& gateway = FakeGateway::get();
     static const Texts calls{"open", "close", "address", "map", "timeout", "read"};
     const unsigned number = stream.below(256);
-    switch (stream.below(11)) {
-        case 0:
-            gateway.upnp = !gateway.upnp;
-            break;
-        case 1:
-            gateway.natpmp = !gateway.natpmp;
-            break;
-        case 2:
-            gateway.externalIp = oddText();
-            break;
-        case 3:
-            gateway.externalIpStatus = static_cast<int>(number) - 5;
-            break;
-        case 4:
-            gateway.igdState = static_cast<int>(number % 6);
-            break;
-        case 5:
-            gateway.refuseAll = true;
-            break;
-        case 6:
-            gateway.silent = true;
-            break;
-        case 7:
-            gateway.failing.insert(calls[number % calls.size()]);
-            break;
-        case 8:
-            gateway.granted = {static_cast<int>(number) * 257, {}, number % 2 * 100};
-            break;
-        case 9:
-            gateway.answerDelay = number * 30L;
-            gateway.copies = static_cast<int>(number % 4);
-            break;
+    const int part = static_cast<int>(number);
+    const auto text = [this] { return oddText(); };
+    switch (stream.below(11)) {  // clang-format off
+        case 0: gateway.upnp = !gateway.upnp; break;
+        case 1: gateway.natpmp = !gateway.natpmp; break;
+        case 2: gateway.externalIp = text(); break;
+        case 3: gateway.externalIpStatus = part - 5; break;
+        case 4: gateway.igdState = part % 6; break;
+        case 5: gateway.refuseAll = true; break;
+        case 6: gateway.silent = true; break;
+        case 7: gateway.failing.insert(calls[number % calls.size()]); break;
+        case 8: gateway.granted = {part * 257, {}, number % 2 * 100}; break;
+        case 9: gateway.answerDelay = part * 30L; gateway.copies = part % 4; break;
         default:
-            gateway.lie = {static_cast<int>(number % 3),
-                           oddText(),
-                           oddText(),
-                           oddText(),
-                           oddText(),
-                           oddText()};
-            if (call == "discover 2000 ms")
-                gateway.devices.assign(number % 12, {oddText(), gateway.devices[0].second});
-    }
+            gateway.lie = {part % 3, text(), text(), text(), text(), text()};
+            if (call == "discover 2000 ms") gateway.devices.assign(number % 12, {text(), gateway.devices[0].second});
+    }  // clang-format on
 }
 
 WebAnswer RandomWorld::answerTo(const std::string& url) {
@@ -327,14 +282,10 @@ WebAnswer RandomWorld::answerTo(const std::string& url) {
             fault("an unproven port is published\n");
     }
     if (odd) {
-        static constexpr CURLcode codes[]{CURLE_OK,
-                                          CURLE_COULDNT_RESOLVE_HOST,
-                                          CURLE_OPERATION_TIMEDOUT,
-                                          CURLE_SSL_CONNECT_ERROR,
-                                          CURLE_PEER_FAILED_VERIFICATION,
-                                          CURLE_RECV_ERROR,
-                                          CURLE_OK,
-                                          CURLE_PARTIAL_FILE};
+        // clang-format off
+        static constexpr CURLcode codes[]{CURLE_OK, CURLE_COULDNT_RESOLVE_HOST, CURLE_OPERATION_TIMEDOUT, CURLE_OK,
+            CURLE_SSL_CONNECT_ERROR, CURLE_PEER_FAILED_VERIFICATION, CURLE_RECV_ERROR, CURLE_PARTIAL_FILE};
+        // clang-format on
         if (stream.below(4) == 1) VirtualClock::get().advance(30);
         std::string text = oddText();
         if (asks("/test?") && holds(text, "Success"))

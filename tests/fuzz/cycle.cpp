@@ -40,18 +40,6 @@ std::string makeFolder() {
 
 }  // namespace
 
-// No watcher of a bounded call: no call here takes long, and starting threads would. The linker's
-// name for std::thread's start, which libFuzzer needs for itself.
-#define START_THREAD(prefix) \
-    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
-bool isRunning = false;
-extern "C" {
-void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
-void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
-    if (!isRunning) START_THREAD(__real_)(thread, state, depend);
-}
-}
-
 void pelorus::fuzz::tryText(const std::string& text) {
     using support::RandomWorld;
     static const struct Folder {
@@ -64,6 +52,7 @@ void pelorus::fuzz::tryText(const std::string& text) {
     const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
     const unsigned noise = stream.below(256);
     RandomWorld world{std::move(stream), kind, {noise, 300, false, true, true}, folder.path};
+    bool isRunning = false;
     bool isSent = false;
     const auto terminate = [&] {
         if (!isRunning || std::exchange(isSent, true)) return;

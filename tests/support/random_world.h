@@ -55,7 +55,8 @@ struct Climate {
     unsigned changes = 0;       ///< changes of the weather, per mille of the cycles
     bool steadyGateway = true;  ///< which is there and answers well
     bool oddSettings = false;   ///< other programs write strange ones
-    bool keepClient = false;    ///< one process stands for all clients: starting one takes long
+    /// One process stands for all clients of the relay, and no thread watches a bounded call.
+    bool quick = false;
 };
 
 class RandomWorld {
@@ -113,6 +114,7 @@ private:
     std::string published;   // the record's address
     std::string otherLines;  // settings that other programs wrote
     std::set<int> reached;   // ports that passed a test
+    bool obeys = true;       // no signal to the client was lost
     Texts helperList;        // of the maker's router
 };
 

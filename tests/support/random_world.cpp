@@ -46,6 +46,11 @@ std::string settingsOf(Kind kind, const std::string& folder) {
            "MANUAL_EXTERNAL_HTTPS_PORT=18443\nDEFAULT_PORTS_ONLY=FALSE\n";
 }
 
+// The number after the last colon.
+int portIn(const std::string& url) {
+    return static_cast<int>(std::strtol(url.c_str() + url.rfind(':') + 1, nullptr, 10));
+}
+
 bool isRunning(pid_t process) {
     return process > 0 && waitpid(process, nullptr, WNOHANG) == 0;
 }
@@ -289,7 +294,7 @@ WebAnswer RandomWorld::answerTo(const std::string& url) {
         const std::string address = url.substr(url.find('&') + 1);
         published = address.substr(0, address.find('&'));
         if (published == "NULL") published.clear();
-        const int port = std::atoi(url.c_str() + url.find("&:") + 2);
+        const int port = portIn(url);
         if (!published.empty() && reached.count(port) == 0)
             fault("an unproven port is published\n");
     }
@@ -300,14 +305,13 @@ WebAnswer RandomWorld::answerTo(const std::string& url) {
         // clang-format on
         if (stream.below(4) == 1) VirtualClock::get().advance(30);
         std::string text = oddText();
-        if (asks("/test?") && holds(text, "Success"))
-            reached.insert(std::atoi(url.c_str() + url.rfind(':') + 1));
+        if (asks("/test?") && holds(text, "Success")) reached.insert(portIn(url));
         return {text, codes[stream.below(8)]};
     }
     if (asks("/status?")) writeSettings(url.substr(url.find('?') + 1));
     if (asks("/remote_access_status/")) return "<action>proceed</action>";
     if (asks("/myip")) return {wan};
-    if (asks("/test?")) return testPort(std::atoi(url.c_str() + url.rfind(':') + 1));
+    if (asks("/test?")) return testPort(portIn(url));
     return local ? "success" : "Success";
 }
 

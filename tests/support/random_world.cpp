@@ -227,6 +227,7 @@ void RandomWorld::changeWeather() {
 void RandomWorld::move(Kind newKind) {
     ++oddities;
     kind = newKind;
+    FakeGateway::get().table.assign(std::begin(kNeighbours), std::end(kNeighbours));
     otherLines = kind == Kind::BY_HAND ? "MANUAL_PORT_FORWARD=TRUE" : "MANUAL_PORT_FORWARD=FALSE";
     writeSettings("");
 }

@@ -74,7 +74,7 @@ public:
     /// Ends the process: the daemon did what it must not do.
     [[noreturn]] static void fault(const char* what);
 
-    /// Another way to be reached, with the settings for it.
+    /// To another home: another gateway, another way to be reached, and the settings for it.
     void move(Kind newKind);
 
     Stream stream;

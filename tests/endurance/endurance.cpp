@@ -43,7 +43,7 @@ constexpr long kNever = std::numeric_limits<long>::max();
 
 // What a run tells the process that plays it, in memory that both share.
 struct Report {
-    std::atomic<pid_t> daemon, client;
+    std::atomic<pid_t> daemon;
     std::atomic<int> signal;     // that has to end it; 0: it exits
     std::atomic<bool> mayExit;   // the files cannot be opened at the start
     std::atomic<bool> isSecond;  // a second signal ends it at once
@@ -81,7 +81,6 @@ void note(const RandomWorld& world) {
     const pid_t self = getpid();
     if (std::exchange(known, self) != self) alarm(kDeadline);  // not inherited
     report->daemon = self;
-    report->client = world.client;
     report->events = world.events;
 }
 
@@ -255,7 +254,8 @@ std::string watch(Player play, Seed seed, const std::string& folder) {
         }
         usleep(outside ? 10 : 300);
     }
-    if (report->client > 0) kill(report->client, SIGKILL);
+    // A client that is left is in the daemon's session.
+    if (report->daemon > 0) kill(-report->daemon, SIGKILL);
     while (waitpid(-1, nullptr, 0) > 0) continue;
     sums->events += report->events;
     return judge(status, folder);

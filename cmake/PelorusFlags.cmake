@@ -25,11 +25,11 @@ if(PELORUS_SANITIZE)
   string(REPLACE "fuzzer-no-link," "" PELORUS_SANITIZE_LINK "${PELORUS_SANITIZE}")
   target_link_options(pelorus_flags INTERFACE -fsanitize=${PELORUS_SANITIZE_LINK})
 elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
-  # Fortify does not work with the sanitizers.
+  # Fortify does not work with the sanitizers. Distributions set another level for their packages.
   set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
   target_compile_options(pelorus_flags INTERFACE
-    -D_FORTIFY_SOURCE=3 -D_GLIBCXX_ASSERTIONS -fstack-protector-strong -fstack-clash-protection
-    -fPIE -ffunction-sections -fdata-sections)
+    -U_FORTIFY_SOURCE -D_FORTIFY_SOURCE=3 -D_GLIBCXX_ASSERTIONS
+    -fstack-protector-strong -fstack-clash-protection -fPIE -ffunction-sections -fdata-sections)
   check_cxx_compiler_flag(-ftrivial-auto-var-init=zero PELORUS_HAVE_AUTO_VAR_INIT)
   if(PELORUS_HAVE_AUTO_VAR_INIT)
     target_compile_options(pelorus_flags INTERFACE -ftrivial-auto-var-init=zero)

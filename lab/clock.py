@@ -18,11 +18,11 @@ def fast_clock(factor: int, ahead: float = 0) -> list[str]:
     return _faketime(factor, ahead) if factor != 1 else []
 
 
-def fast_pauses(factor: int, hasty: bool) -> list[str]:
+def fast_pauses(factor: int, hasty: bool, divisor: int = 1) -> list[str]:
     """`fast_clock` for a program that talks to real servers and must give them time to answer.
 
     The time limit of its transfers stays real time unless `hasty`: libcurl measures it by the
-    monotonic clock.
+    monotonic clock. Its pauses take only a `divisor`th, and its clock jumps over the rest.
     """
     if factor == 1:
         return []
@@ -31,7 +31,7 @@ def fast_pauses(factor: int, hasty: bool) -> list[str]:
                  f'-DSIGNAL_IN_GMTIME="{_SIGNAL_IN_GMTIME}"',
                  "-o", str(_PRELOAD), str(sandbox.PROJECT / "lab/preload.c"))
     return [*_faketime(factor, 0, str(_PRELOAD)),
-            f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}"]
+            f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}", f"SHORT_PAUSES={divisor}"]
 
 
 def refuse_signal(number: int) -> None:

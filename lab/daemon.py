@@ -20,15 +20,17 @@ OUTPUT = device.HOME / "pelorus.out"
 class Daemon:
     """One run of the daemon, from its start to its wait status."""
 
-    def __init__(self, options: tuple[str, ...], clock: int, hasty: bool) -> None:
+    def __init__(self, options: tuple[str, ...], clock: int, hasty: bool,
+                 pauses: int = 1) -> None:
         """Start it and return once it has detached; its time runs `clock` times as fast.
 
-        The time limit of its transfers stays real time unless `hasty`. Once detached it is a child
+        The time limit of its transfers stays real time unless `hasty`, its pauses take a `pauses`th
+        of their time. Once detached it is a child
         of the sandbox's first process, which is this one.
         """
         PID_FILE.unlink(missing_ok=True)
         environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
-                       *fast_pauses(clock, hasty)]
+                       *fast_pauses(clock, hasty, pauses)]
         argv = network.command(network.DEVICE, "env", "-i", *environment,
                                str(sandbox.binary()), *options)
         with OUTPUT.open("ab") as output:

@@ -23,28 +23,30 @@ from lab.scenario import Lab, Situation
 from lab.scenarios import SCENARIOS
 from lab.support import LabError
 from lab.timeline import Timeline
+from lab.zoo import ZOO
 
 _PATIENCE = 55
 _INTERRUPTED = 130
 _PICTURE = "PELORUS_LAB_PICTURE"
+_KNOWN = {**SCENARIOS, **ZOO}
 _MAIN_JOB = Situation(gateway=GatewaySetup(upnp=True, natpmp=True))
 
 
 def main() -> int:
     """Outside a sandbox: build the daemon and open one. Inside: play the demo."""
     arguments = _parse()
-    if arguments.list:
-        width = max(map(len, SCENARIOS))
-        for scenario in SCENARIOS.values():
+    if arguments.list or arguments.zoo:
+        shown = ZOO if arguments.zoo else SCENARIOS
+        width = max(map(len, shown))
+        for scenario in shown.values():
             print(f"{scenario.name:<{width}}  {scenario.title}")
         return 0
     if sandbox.is_inside():
         return _show(arguments.scenario, arguments.stay)
-    obstacle = _obstacle(arguments.scenario)
-    if obstacle:
-        print(f"demo: {obstacle}")
+    if reason := obstacle(arguments.scenario):
+        print(f"demo: {reason}")
         return sandbox.FORBIDDEN
-    if "PELORUS" not in os.environ and not _build():
+    if "PELORUS" not in os.environ and not build():
         return 1
     kept: tuple[int, ...] = ()
     if arguments.svg:
@@ -58,28 +60,30 @@ def _parse() -> argparse.Namespace:
     parser = argparse.ArgumentParser(prog="scripts/demo", description=__doc__,
                                      formatter_class=argparse.RawDescriptionHelpFormatter)
     parser.add_argument("scenario", nargs="?", metavar="SCENARIO",
-                        help="a name from --list")
+                        help="a name from --list or --zoo")
     parser.add_argument("--list", action="store_true", help="list the scenarios, one per line")
+    parser.add_argument("--zoo", action="store_true",
+                        help="list the behaviours of home gateways, one per line")
     parser.add_argument("--svg", metavar="FILE", help="save the timeline as an SVG picture")
     parser.add_argument("--stay", action="store_true",
                         help="keep the lab up until Ctrl-C, to look around")
     arguments = parser.parse_args()
-    if arguments.scenario and arguments.scenario not in SCENARIOS:
-        parser.error(f"no scenario {arguments.scenario!r}; see --list")
+    if arguments.scenario and arguments.scenario not in _KNOWN:
+        parser.error(f"no scenario {arguments.scenario!r}; see --list and --zoo")
     return arguments
 
 
-def _obstacle(name: str | None) -> str:
+def obstacle(name: str | None) -> str:
     """Why this machine cannot play it; empty when it can."""
     reason = sandbox.why_forbidden()
     if reason:
         return f"this machine does not allow network namespaces ({reason})"
-    if name and SCENARIOS[name].situation.relay and not TUNNEL_DEVICE.exists():
+    if name and _KNOWN[name].situation.relay and not TUNNEL_DEVICE.exists():
         return f"{name} needs a tunnel, and there is no {TUNNEL_DEVICE}"
     return ""
 
 
-def _build() -> bool:
+def build() -> bool:
     """Build the release preset; its output is shown only when it fails."""
     print("building pelorus (release)", flush=True)
     for argv in (["cmake", "--preset", "release"], ["cmake", "--build", "--preset", "release"]):
@@ -96,7 +100,7 @@ def _show(name: str | None, stay: bool) -> int:
     signal.signal(signal.SIGINT, signal.default_int_handler)
     timeline = Timeline()
     timeline.listen(lambda event: print(event, flush=True))
-    title = SCENARIOS[name].title if name else "A device behind a home router becomes reachable"
+    title = _KNOWN[name].title if name else "A device behind a home router becomes reachable"
     print(f"{title}\n")
     try:
         _play(name, timeline)
@@ -114,8 +118,8 @@ def _show(name: str | None, stay: bool) -> int:
 
 
 def _play(name: str | None, timeline: Timeline) -> None:
-    story: Callable[[Lab], None] = SCENARIOS[name].play if name else _reach_the_device
-    lab = Lab(SCENARIOS[name].situation if name else _MAIN_JOB, timeline)
+    story: Callable[[Lab], None] = _KNOWN[name].play if name else _reach_the_device
+    lab = Lab(_KNOWN[name].situation if name else _MAIN_JOB, timeline)
     timeline.add("lab", "device, gateway, central service and name server are up")
     try:
         story(lab)

@@ -21,7 +21,7 @@ from lab.web import Reply, Request, WebServer
 HOME = Path("/run/device")
 STATIC_FILE = HOME / "globalconfig.ini"
 DYNAMIC_FILE = HOME / "config/dynamicconfig.ini"
-DYNAMIC_COPY = Path("/tmp/dynamicconfig.ini")
+DYNAMIC_COPY = Path("/run/pelorus/dynamicconfig.ini")
 SLEEP_COUNT = Path("/tmp/minutes_since_disk_access")
 PATH = f"{HOME}/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 
@@ -36,6 +36,7 @@ _HDPARM = f"#!/bin/sh\necho\necho /dev/sda:\necho \" drive state is:  $(cat {_DR
 _STATIC = {
     "DYNAMIC_CONFIG": str(DYNAMIC_FILE.parent),
     "DYNAMIC_CONFIG_TMP": str(DYNAMIC_COPY),
+    "STATIC_ONLY_KEYS": "DYNAMIC_CONFIG DYNAMIC_CONFIG_TMP SERVER_BASE_URL STARTCMD",
     "DEVICETYPE": "1",
     "ENABLEREMOTEACCESS": "1",
     "SERVER_BASE_URL": f"https://{SERVICE_HOST}",
@@ -71,6 +72,7 @@ class Device:
         self._authority = authority
         self._timeline = timeline
         self._lock = threading.Lock()
+        self._pause = 0.0
 
     def start(self, static: Mapping[str, str], dynamic: Mapping[str, str]) -> None:
         """Write the configuration (the arguments override the defaults) and serve pages."""
@@ -137,6 +139,11 @@ class Device:
         SLEEP_COUNT.write_text(f"{count}\n")
         self._timeline.add("device", f"the disk has been unused for {count} minutes")
 
+    def answer_slowly(self, pause: float) -> None:
+        """Let each byte of the local back end's answers take `pause` seconds from now on."""
+        self._pause = pause
+        self._timeline.add("device", f"the back end sends a byte in {pause:g} s")
+
     def statuses_sent(self) -> list[str]:
         """The status words sent to the local back end, in order."""
         return [request.argument("status") for request in self.local_requests
@@ -156,6 +163,7 @@ class Device:
     def _write_system_files(self) -> None:
         (HOME / "bin").mkdir(parents=True)
         DYNAMIC_FILE.parent.mkdir()
+        DYNAMIC_COPY.parent.mkdir(0o770)
         hdparm = HOME / "bin/hdparm"
         hdparm.write_text(_HDPARM)
         hdparm.chmod(0o755)
@@ -199,7 +207,7 @@ class Device:
             self._change(LOCAL_IP=request.argument("address"))
         else:
             return Reply(b"<result>failure</result>", 404)
-        return Reply(b"<result>success</result>")
+        return Reply(b"<result>success</result>", pause=self._pause)
 
 
 def _read_settings(path: Path) -> dict[str, str]:

@@ -5,13 +5,14 @@ from __future__ import annotations
 import re
 import socket
 import threading
-from dataclasses import dataclass, replace
+from collections.abc import Mapping as Settings
+from dataclasses import dataclass, field, replace
 from pathlib import Path
 
 from lab import natpmp, network, packet_filter, web
 from lab.natpmp import Grant, NatPmp
 from lab.packet_filter import BY_HAND, Mapping
-from lab.scripted_gateway import Personality, ScriptedGateway
+from lab.scripted_gateway import Entry, Personality, ScriptedGateway
 from lab.server import Server
 from lab.support import LabError, wait_until
 from lab.timeline import Timeline
@@ -36,6 +37,9 @@ class GatewaySetup:
 
     `secure` lets clients map to themselves only. With `grant`, the lab's own NAT-PMP server answers
     and grants that. With `personality`, the lab's own UPnP server answers and behaves like that.
+    `settings` are further lines of miniupnpd's configuration. The protocols are served at the
+    address `served_at` of the LAN if the default route is not where they are. `others` are further
+    UPnP servers on the LAN, each at an address of its own (192.168.77.2 and on).
     """
 
     upnp: bool = True
@@ -44,6 +48,9 @@ class GatewaySetup:
     secure: bool = True
     grant: Grant | None = None
     personality: Personality | None = None
+    settings: Settings[str, str] = field(default_factory=dict)
+    served_at: str = ""
+    others: tuple[Personality, ...] = ()
 
     @property
     def needs_miniupnpd(self) -> bool:
@@ -82,6 +89,7 @@ class Gateway:
         self._http_port = _FIRST_HTTP_PORT
         self._natpmp: NatPmp | None = None
         self._scripted: ScriptedGateway | None = None
+        self._others: list[ScriptedGateway] = []
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
                               "-P", str(folder / "pid")], folder / "log", clock)
@@ -94,7 +102,12 @@ class Gateway:
     @property
     def description_url(self) -> str:
         """Where the router describes itself to UPnP clients."""
-        return f"http://{self.lan_address}:{self._http_port}/rootDesc.xml"
+        return f"http://{self.served_at}:{self._http_port}/rootDesc.xml"
+
+    @property
+    def served_at(self) -> str:
+        """The LAN address at which the protocols are served."""
+        return self._setup.served_at or self.lan_address
 
     def start(self) -> None:
         """Route and masquerade; offer the protocols of the setup and wait until they answer."""
@@ -102,7 +115,14 @@ class Gateway:
                          daemon=True).start()
         network.enable_forwarding(network.GATEWAY)
         packet_filter.load()
+        if self._setup.served_at:
+            self._add_lan_address(self._setup.served_at)
         self._serve()
+        for number, personality in enumerate(self._setup.others, start=2):
+            self._add_lan_address(address := f"192.168.77.{number}")
+            other = ScriptedGateway(personality, lambda: self.wan_address)
+            other.start(address)
+            self._others.append(other)
 
     def become(self, setup: GatewaySetup) -> None:
         """Offer something else from now on, as after a change in the router's settings.
@@ -133,6 +153,20 @@ class Gateway:
         packet_filter.change("add rule inet lab silence meta l4proto { tcp, udp } drop\n")
         self._stop()
         self._timeline.add("gateway", "no longer answers the mapping protocols")
+
+    def go_deaf(self) -> None:
+        """Receive no search any more until `become` or `reboot`; all else still works."""
+        packet_filter.change("add rule inet lab silence udp dport 1900 drop\n")
+        self._timeline.add("gateway", "no longer hears searches")
+
+    def keep(self, mapping: Mapping) -> None:
+        """Have this mapping, as if a client had got it on a better day."""
+        if mapping in self.left():
+            return
+        if self._scripted:
+            self._scripted.keep(Entry(mapping))
+        else:
+            packet_filter.forward(mapping)
 
     def hang_once(self, seconds: float) -> None:
         """Let the lab's NAT-PMP server hang when the device next asks for a mapping."""
@@ -216,6 +250,12 @@ class Gateway:
         """The forwardings that clients requested, read from the packet filter."""
         return packet_filter.mappings()
 
+    def left(self) -> list[Mapping]:
+        """What is forwarded or, by one of the lab's own UPnP servers, listed for clients."""
+        servers = [*self._others, *([self._scripted] if self._scripted else [])]
+        entries = [entry.mapping for server in servers for entry in server.table.values()]
+        return sorted({*self.mappings(), *entries})
+
     def listing(self) -> list[Listed]:
         """The mappings as the router lists them to a UPnP client."""
         listing = network.output(network.NEIGHBOUR, "upnpc", "-u", self.description_url, "-l")
@@ -240,10 +280,10 @@ class Gateway:
         packet_filter.change("flush chain inet lab silence\n")
         if self._setup.natpmp and self._setup.grant:
             self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
-            self._natpmp.start(self.lan_address)
+            self._natpmp.start(self.served_at)
         if self._setup.upnp and self._setup.personality:
             self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address)
-            self._scripted.start(self.lan_address)
+            self._scripted.start(self.served_at)
         if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())
             self.server.start(self._answers)
@@ -272,17 +312,20 @@ class Gateway:
 
     def _configuration(self) -> str:
         yes_no = {True: "yes", False: "no"}
-        return "\n".join([
-            "ext_ifname=wan", "listening_ip=lan", f"port={self._http_port}",
-            f"enable_upnp={yes_no[self._setup.upnp and not self._setup.personality]}",
-            f"enable_natpmp={yes_no[self._setup.natpmp and not self._setup.grant]}",
-            "force_igd_desc_v1=yes", f"secure_mode={yes_no[self._setup.secure]}",
-            "system_uptime=no", f"lease_file={self._leases}",
-            "uuid=6c0b7c7a-2f0e-4e5c-9f6b-7d2f8a1c4e77",
-            "upnp_table_name=gate", "upnp_nat_table_name=gate",
-            f"upnp_forward_chain={packet_filter.ASKED_FOR.admit}",
-            f"upnp_nat_chain={packet_filter.ASKED_FOR.redirect}",
-            "upnp_nat_postrouting_chain=postrouting_miniupnpd", *self._setup.permissions, ""])
+        settings = {
+            "ext_ifname": "wan", "listening_ip": self._setup.served_at or "lan",
+            "port": str(self._http_port),
+            "enable_upnp": yes_no[self._setup.upnp and not self._setup.personality],
+            "enable_natpmp": yes_no[self._setup.natpmp and not self._setup.grant],
+            "force_igd_desc_v1": "yes", "secure_mode": yes_no[self._setup.secure],
+            "system_uptime": "no", "lease_file": str(self._leases),
+            "uuid": "6c0b7c7a-2f0e-4e5c-9f6b-7d2f8a1c4e77",
+            "upnp_table_name": "gate", "upnp_nat_table_name": "gate",
+            "upnp_forward_chain": packet_filter.ASKED_FOR.admit,
+            "upnp_nat_chain": packet_filter.ASKED_FOR.redirect,
+            "upnp_nat_postrouting_chain": "postrouting_miniupnpd", **self._setup.settings}
+        return "\n".join([*(f"{key}={value}" for key, value in settings.items()),
+                          *self._setup.permissions, ""])
 
     def _answers(self) -> bool:
         """True when every protocol on offer answers a client on the LAN."""
@@ -290,8 +333,11 @@ class Gateway:
                 and (not self._setup.natpmp or self._public_address_is_told()))
 
     def _public_address_is_told(self) -> bool:
-        answer = _udp_exchange(_PUBLIC_ADDRESS_REQUEST, self.lan_address, natpmp.PORT) or b""
+        answer = _udp_exchange(_PUBLIC_ADDRESS_REQUEST, self.served_at, natpmp.PORT) or b""
         return answer[1:4] == b"\x80\0\0" and answer[8:12] == socket.inet_aton(self.wan_address)
+
+    def _add_lan_address(self, address: str) -> None:
+        network.ip_batch(f"address add {address}/24 dev lan", host=network.GATEWAY)
 
     def _take_lan_address(self, address: str) -> None:
         network.ip_batch(f"address del {self.lan_address}/24 dev lan",
@@ -323,5 +369,5 @@ def _description_is_served() -> bool:
     for line in (found or b"").decode(errors="replace").splitlines():
         name, _, location = line.partition(":")
         if name.upper() == "LOCATION":
-            return "WANIPConnection:1" in (web.fetch(network.NEIGHBOUR, location.strip()) or "")
+            return "WANIPConnection:" in (web.fetch(network.NEIGHBOUR, location.strip()) or "")
     return False

@@ -2,11 +2,12 @@
 
 from __future__ import annotations
 
+import select
 import signal
 import socket
 import struct
 import threading
-from collections.abc import Iterable
+from collections.abc import Callable, Iterable
 from pathlib import Path
 
 from lab import network
@@ -38,6 +39,26 @@ class Names:
     def start(self) -> None:
         """Start the server and wait until it answers, if only with 'no such name'."""
         self.server.start(lambda: self._ask("nobody.example") is not None)
+
+    def demand_tcp(self) -> Callable[[], object]:
+        """From now on cut every answer off, and be silent to the TCP that is then tried.
+
+        What is returned tells whether somebody has tried it.
+        """
+        self.server.stop()
+        with network.inside(network.INTERNET):
+            asked = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+            silent = socket.create_server((network.SERVICE_ADDRESS, 53))
+        asked.bind((network.SERVICE_ADDRESS, 53))
+
+        def cut_off() -> None:
+            while True:
+                query, client = asked.recvfrom(512)
+                end = query.index(b"\0", 12) + 5
+                asked.sendto(query[:2] + b"\x83\x80\0\1\0\0\0\0\0\0" + query[12:end], client)
+
+        threading.Thread(target=cut_off, daemon=True).start()
+        return lambda: select.select([silent], [], [], 0)[0]
 
     def set(self, table: dict[str, str]) -> None:
         """Add or change names and wait until the server serves them; a pinned name stays."""

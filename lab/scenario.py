@@ -32,8 +32,9 @@ class Situation:
     """How a run differs from the default.
 
     `static` and `dynamic` are settings of the device's two files. The device's time runs `clock`
-    times as fast, with `hasty` also the time limit of its transfers. With `own_router` the device
-    is itself the home router.
+    times as fast, with `hasty` also the time limit of its transfers. Its pauses take only a
+    `pauses`th of that, and its clock jumps over the rest. With `own_router` the device is itself
+    the home router.
     """
 
     gateway: GatewaySetup = GatewaySetup()
@@ -42,6 +43,7 @@ class Situation:
     dynamic: Mapping[str, str] = field(default_factory=dict)
     clock: int = 1
     hasty: bool = False
+    pauses: int = 1
     own_router: bool = False
 
 
@@ -83,7 +85,8 @@ class Lab:
     def start_daemon(self, *options: str) -> Daemon:
         """Run the daemon on the device."""
         self.timeline.add("device", f"pelorus starts with {' '.join(options)}")
-        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty)
+        self._daemon = Daemon(options, self.situation.clock, self.situation.hasty,
+                              self.situation.pauses)
         return self._daemon
 
     @property

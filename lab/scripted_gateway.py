@@ -9,48 +9,53 @@ import threading
 import time
 from collections.abc import Callable, Iterable, Mapping
 from dataclasses import dataclass, field
+from email.message import Message
 from http.server import BaseHTTPRequestHandler, ThreadingHTTPServer
 from urllib.parse import urlsplit
-from xml.sax.saxutils import escape
+from xml.sax.saxutils import escape, unescape
 
 from lab import network, packet_filter
 from lab.packet_filter import Mapping as Forwarding
+from lab.web import NO_LINGERING
 
 HTTP_PORT = 5000
+SEARCH_PORT = 1900
+DEVICE_TYPE = "urn:schemas-upnp-org:device:InternetGatewayDevice:1"
+IP_SERVICE = "urn:schemas-upnp-org:service:WANIPConnection:1"
+PPP_SERVICE = "urn:schemas-upnp-org:service:WANPPPConnection:1"
+COMMON_SERVICE = "urn:schemas-upnp-org:service:WANCommonInterfaceConfig:1"
+ANY_DEVICE, EVERYTHING = "upnp:rootdevice", "ssdp:all"
 
-_SSDP_GROUP, _SSDP_PORT = "239.255.255.250", 1900
-_DEVICE_TYPE = "urn:schemas-upnp-org:device:InternetGatewayDevice:1"
-_SERVICE_TYPE = "urn:schemas-upnp-org:service:WANIPConnection:1"
+_SSDP_GROUP = "239.255.255.250"
+_TARGETS = (DEVICE_TYPE, IP_SERVICE, ANY_DEVICE, EVERYTHING)
 _LOOK_SECONDS = 0.05
 
 _NO_SUCH_ACTION, _NOT_IN_ARRAY, _NOT_MAPPED, _CONFLICT = 401, 713, 714, 718
 
-_ANNOUNCEMENT = f"""HTTP/1.1 200 OK\r
+_ANNOUNCEMENT = """HTTP/1.1 200 OK\r
 CACHE-CONTROL: max-age=120\r
 EXT:\r
-LOCATION: {{location}}\r
-ST: {_DEVICE_TYPE}\r
-USN: uuid:2c6e5b52-2f0e-4e5c-9f6b-5a0f2d6c1e10::{_DEVICE_TYPE}\r
+LOCATION: {location}\r
+ST: {target}\r
+USN: uuid:2c6e5b52-2f0e-4e5c-9f6b-5a0f2d6c1e10::{target}\r
 \r
 """
 
+SERVICE = """<service>
+<serviceType>{type}</serviceType>
+<serviceId>urn:upnp-org:serviceId:{id}</serviceId>
+<controlURL>{control_url}</controlURL><eventSubURL>/event</eventSubURL>
+<SCPDURL>/service.xml</SCPDURL>
+</service>"""
+
 _DESCRIPTION = f"""<?xml version="1.0"?>
 <root xmlns="urn:schemas-upnp-org:device-1-0"><device>
-<deviceType>{_DEVICE_TYPE}</deviceType>
+<deviceType>{DEVICE_TYPE}</deviceType>
 <friendlyName>home router</friendlyName>
 <deviceList><device><deviceType>urn:schemas-upnp-org:device:WANDevice:1</deviceType>
-<serviceList><service>
-<serviceType>urn:schemas-upnp-org:service:WANCommonInterfaceConfig:1</serviceType>
-<serviceId>urn:upnp-org:serviceId:WANCommonIFC1</serviceId>
-<controlURL>/common</controlURL><eventSubURL>/event</eventSubURL><SCPDURL>/common.xml</SCPDURL>
-</service></serviceList>
+<serviceList>{{common}}</serviceList>
 <deviceList><device><deviceType>urn:schemas-upnp-org:device:WANConnectionDevice:1</deviceType>
-<serviceList><service>
-<serviceType>{_SERVICE_TYPE}</serviceType>
-<serviceId>urn:upnp-org:serviceId:WANIPConn1</serviceId>
-<controlURL>{{control_url}}</controlURL><eventSubURL>/event</eventSubURL>
-<SCPDURL>/connection.xml</SCPDURL>
-</service></serviceList>
+<serviceList>{{connection}}</serviceList>
 </device></deviceList></device></deviceList></device></root>
 """
 
@@ -60,8 +65,7 @@ _ENVELOPE = """<?xml version="1.0"?>
 {body}
 </s:Body></s:Envelope>
 """
-_RESPONSE = (f'<u:{{action}}Response xmlns:u="{_SERVICE_TYPE}">{{values}}'
-             '</u:{action}Response>')
+_RESPONSE = '<u:{action}Response xmlns:u="{service}">{values}</u:{action}Response>'
 _FAULT = ('<s:Fault><faultcode>s:Client</faultcode><faultstring>UPnPError</faultstring><detail>'
           '<UPnPError xmlns="urn:schemas-upnp-org:control-1-0"><errorCode>{error}</errorCode>'
           '<errorDescription>refused</errorDescription></UPnPError></detail></s:Fault>')
@@ -70,7 +74,76 @@ _FAULT = ('<s:Fault><faultcode>s:Client</faultcode><faultstring>UPnPError</fault
 _ARGUMENT = re.compile(r"<(New\w+)>(.*?)</")
 
 Arguments = dict[str, str]
-Answer = tuple[int, Arguments]
+
+
+@dataclass(frozen=True)
+class Page:
+    """An answer that is no SOAP, or none at all: without a body the connection is reset."""
+
+    status: str = "404 Not Found"
+    body: bytes | None = b"<html><body>This page does not exist.</body></html>"
+
+
+# An error number or 0, and values; or a page instead.
+Answer = tuple[int, Arguments] | Page
+
+
+@dataclass(frozen=True)
+class Search:
+    """A search as a client sent it, the `number`th since the start, counted from 1.
+
+    `base` is the beginning of the gateway's own URLs.
+    """
+
+    target: str
+    base: str
+    number: int
+
+    def answer(self, location: str = "", target: str = "") -> bytes:
+        """The answer of a good gateway, unless it is to name something else."""
+        own = DEVICE_TYPE if self.target == EVERYTHING else self.target
+        return _ANNOUNCEMENT.format(location=location or f"{self.base}/rootDesc.xml",
+                                    target=target or own).encode()
+
+
+@dataclass(frozen=True)
+class Call:
+    """An action as a client requested it.
+
+    `path` includes the query; `service` is the service's type and `body` the whole request.
+    """
+
+    gateway: ScriptedGateway
+    path: str
+    headers: Message
+    body: str
+    action: str
+    service: str
+    arguments: Arguments
+
+    def perform(self) -> Answer:
+        """Do what a good gateway does, and return its answer."""
+        return self.gateway.perform(self)
+
+
+@dataclass(frozen=True)
+class Entry:
+    """A line of the gateway's list of mappings; `lease` is in seconds, 0 for ever."""
+
+    mapping: Forwarding
+    description: str = ""
+    lease: int = 0
+
+
+def at(*locations: str) -> Callable[[Search], Iterable[bytes]]:
+    """Answer a search once for each of these URLs; in them {base} is the gateway's own."""
+    return lambda search: (search.answer(location.format(base=search.base))
+                           for location in locations if search.target in _TARGETS)
+
+
+def unchanged(text: str) -> str:
+    """Leave the description as it is."""
+    return text
 
 
 def whole(head: bytes, body: bytes) -> Iterable[bytes]:
@@ -78,37 +151,48 @@ def whole(head: bytes, body: bytes) -> Iterable[bytes]:
     return [head + body]
 
 
-def own_description(base: str) -> Iterable[str]:
-    """Announce the gateway's own description."""
-    return [f"{base}/rootDesc.xml"]
+def performed(call: Call) -> Answer:
+    """Answer as a good gateway does."""
+    return call.perform()
 
 
 @dataclass(frozen=True)
 class Personality:
     """How a gateway behaves; a new one names only what differs from a good gateway.
 
-    A search is answered once for each URL that `locations` gives for the gateway's own base URL.
-    `deliver` cuts the description's head and body into what is sent. The description names
-    `control_url`, which may be relative. Each answer of the control service comes `delay` seconds
-    late, in real time; to the actions in `errors` it is that error number. With `endless_list`, the
-    list of its mappings has no end.
+    Datagrams: a search is answered with those that `search` gives, sent from UDP `search_port`.
+    Description: `describe` changes its text, `deliver` cuts head and body into what is sent.
+    Control: `control_url` is where, and may be relative; `control` gives the answer to a call, and
+    `deliver_control` cuts it into what is sent. Each answer comes `delay` seconds late; to the
+    actions in `errors` it is that error number, and `control` is not asked.
+    State: unless it `forwards`, mappings are listed only.
+
+    Generators may sleep between two pieces. All times are real times.
     """
 
-    locations: Callable[[str], Iterable[str]] = own_description
+    search: Callable[[Search], Iterable[bytes]] = at("{base}/rootDesc.xml")
+    search_port: int = SEARCH_PORT
+    describe: Callable[[str], str] = unchanged
     deliver: Callable[[bytes, bytes], Iterable[bytes]] = whole
     control_url: str = "/control"
+    control: Callable[[Call], Answer] = performed
+    deliver_control: Callable[[bytes, bytes], Iterable[bytes]] = whole
     delay: float = 0
     errors: Mapping[str, int] = field(default_factory=dict)
-    endless_list: bool = False
+    forwards: bool = True
 
 
 class ScriptedGateway:
-    """The server on the router's LAN side; its mappings are rules in the router's packet filter."""
+    """The server on the router's LAN side; what it forwards are rules in the packet filter.
+
+    Its list of mappings, `table`, is its own: by protocol and external port.
+    """
 
     def __init__(self, personality: Personality, public_address: Callable[[], str]) -> None:
+        """Forwardings that exist already are on the list of a gateway that forwards."""
         self.personality = personality
+        self.table: dict[tuple[str, int], Entry] = {}
         self._public_address = public_address
-        self._descriptions: dict[Forwarding, str] = {}
         self._lock = threading.Lock()
         self._stopping = threading.Event()
         self._actions: dict[str, Callable[[Arguments], Answer]] = {
@@ -119,20 +203,23 @@ class ScriptedGateway:
             "GetSpecificPortMappingEntry": self._specific_entry,
             "GetGenericPortMappingEntry": self._generic_entry,
         }
+        if personality.forwards:
+            for mapping in packet_filter.mappings():
+                self.table[_key(mapping)] = Entry(mapping)
 
     def start(self, address: str) -> None:
         """Answer on this address of the router from now on."""
         self._base = f"http://{address}:{HTTP_PORT}"
         with network.inside(network.GATEWAY):
             self._web = _WebServer((address, HTTP_PORT), self)
-            self._search = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
-            self._search.settimeout(_LOOK_SECONDS)
-            self._search.bind(("", _SSDP_PORT))
+            self._searched = _datagram_socket("", SEARCH_PORT)
+            self._searched.settimeout(_LOOK_SECONDS)
             membership = struct.pack("4s4s", socket.inet_aton(_SSDP_GROUP),
                                      socket.inet_aton(address))
-            self._search.setsockopt(socket.IPPROTO_IP, socket.IP_ADD_MEMBERSHIP, membership)
+            self._searched.setsockopt(socket.IPPROTO_IP, socket.IP_ADD_MEMBERSHIP, membership)
             # Threads, and the sockets they open, stay on the host of the thread that starts them.
-            self._searching = threading.Thread(target=self._answer_searches, daemon=True)
+            self._searching = threading.Thread(target=self._answer_searches, daemon=True,
+                                               args=(address,))
             self._searching.start()
             threading.Thread(target=self._web.serve_forever, args=(_LOOK_SECONDS,),
                              daemon=True).start()
@@ -146,35 +233,63 @@ class ScriptedGateway:
 
     def description(self) -> bytes:
         """The description of the gateway and its connection service."""
-        return _DESCRIPTION.format(control_url=escape(self.personality.control_url)).encode()
+        text = _DESCRIPTION.format(
+            common=SERVICE.format(type=COMMON_SERVICE, id="WANCommonIFC1", control_url="/common"),
+            connection=SERVICE.format(type=IP_SERVICE, id="WANIPConn1",
+                                      control_url=escape(self.personality.control_url)))
+        return self.personality.describe(text).encode("latin-1")
 
-    def answer(self, action: str, arguments: Arguments) -> Answer:
-        """The answer of the control service: an error number or 0, and values."""
+    def answer(self, call: Call) -> Answer:
+        """The answer to a call."""
         time.sleep(self.personality.delay)
-        perform = self._actions.get(action)
-        if perform is None or action in self.personality.errors:
-            return self.personality.errors.get(action, _NO_SUCH_ACTION), {}
-        with self._lock:
-            return perform(arguments)
+        if call.action in self.personality.errors:
+            return self.personality.errors[call.action], {}
+        return self.personality.control(call)
 
-    def _answer_searches(self) -> None:
-        with self._search:
+    def perform(self, call: Call) -> Answer:
+        """The answer of a good gateway, after it has done what it says."""
+        where = urlsplit(self.personality.control_url).path
+        if urlsplit(call.path).path.lstrip("/") != where.lstrip("/"):
+            return Page()
+        if call.action not in self._actions:
+            return _NO_SUCH_ACTION, {}
+        with self._lock:
+            return self._actions[call.action](call.arguments)
+
+    def keep(self, entry: Entry) -> None:
+        """Put a mapping on the list, and forward unless this gateway does not."""
+        self.forget(_key(entry.mapping))
+        if self.personality.forwards:
+            packet_filter.forward(entry.mapping)
+        self.table[_key(entry.mapping)] = entry
+
+    def forget(self, key: tuple[str, int]) -> None:
+        """Take a mapping off the list, if it is there, and forward it no longer."""
+        held = self.table.pop(key, None)
+        if held and self.personality.forwards:
+            packet_filter.remove(held.mapping)
+
+    def _answer_searches(self, address: str) -> None:
+        number = 0
+        with self._searched:
             while not self._stopping.is_set():
                 try:
-                    request, client = self._search.recvfrom(1500)
+                    request, client = self._searched.recvfrom(1500)
                 except TimeoutError:
                     continue
-                target = _header(request, "ST")
-                if request.startswith(b"M-SEARCH ") and target in (_DEVICE_TYPE, "ssdp:all"):
-                    threading.Thread(target=self._announce, args=(client,), daemon=True).start()
+                if request.startswith(b"M-SEARCH "):
+                    number += 1
+                    search = Search(_header(request, "ST"), self._base, number)
+                    threading.Thread(target=self._announce, args=(search, address, client),
+                                     daemon=True).start()
 
-    def _announce(self, client: tuple[str, int]) -> None:
+    def _announce(self, search: Search, address: str, client: tuple[str, int]) -> None:
         """Answer one search, until there is no more to say or nobody listens any more."""
-        with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as sender:
+        with _datagram_socket(address, self.personality.search_port) as sender:
             sender.connect(client)
-            for location in self.personality.locations(self._base):
+            for datagram in self.personality.search(search):
                 try:
-                    sender.send(_ANNOUNCEMENT.format(location=location).encode())
+                    sender.send(datagram)
                 except OSError:
                     return
 
@@ -188,48 +303,41 @@ class ScriptedGateway:
     def _add(self, arguments: Arguments) -> Answer:
         wanted = Forwarding(arguments["NewProtocol"], int(arguments["NewExternalPort"]),
                             arguments["NewInternalClient"], int(arguments["NewInternalPort"]))
-        held = self._held(arguments)
-        if held and held.internal_address != wanted.internal_address:
+        held = self.table.get(_key(wanted))
+        if held and held.mapping.internal_address != wanted.internal_address:
             return _CONFLICT, {}
-        if held:
-            packet_filter.remove(held)
-        packet_filter.forward(wanted)
-        self._descriptions[wanted] = arguments["NewPortMappingDescription"]
+        self.keep(Entry(wanted, arguments["NewPortMappingDescription"],
+                        int(arguments["NewLeaseDuration"] or 0)))
         return 0, {}
 
     def _delete(self, arguments: Arguments) -> Answer:
-        held = self._held(arguments)
-        if not held:
+        key = _wanted(arguments)
+        if key not in self.table:
             return _NOT_MAPPED, {}
-        packet_filter.remove(held)
+        self.forget(key)
         return 0, {}
 
     def _specific_entry(self, arguments: Arguments) -> Answer:
-        held = self._held(arguments)
-        return (0, self._entry(held)) if held else (_NOT_MAPPED, {})
+        held = self.table.get(_wanted(arguments))
+        return (0, listed(held)) if held else (_NOT_MAPPED, {})
 
     def _generic_entry(self, arguments: Arguments) -> Answer:
-        index, mappings = int(arguments["NewPortMappingIndex"]), packet_filter.mappings()
-        if self.personality.endless_list:
-            mapping = Forwarding("UDP", index, network.NEIGHBOUR_ADDRESS, index)
-        elif index < len(mappings):
-            mapping = mappings[index]
-        else:
-            return _NOT_IN_ARRAY, {}
-        return 0, {"NewRemoteHost": "", "NewExternalPort": str(mapping.external_port),
-                   "NewProtocol": mapping.protocol, **self._entry(mapping)}
+        index, entries = int(arguments["NewPortMappingIndex"]), list(self.table.values())
+        return numbered(entries[index]) if index < len(entries) else (_NOT_IN_ARRAY, {})
 
-    def _entry(self, mapping: Forwarding) -> Arguments:
-        return {"NewInternalPort": str(mapping.internal_port),
-                "NewInternalClient": mapping.internal_address, "NewEnabled": "1",
-                "NewPortMappingDescription": self._descriptions.get(mapping, ""),
-                "NewLeaseDuration": "0"}
 
-    def _held(self, arguments: Arguments) -> Forwarding | None:
-        """The forwarding of the external port and protocol, whoever made it."""
-        wanted = arguments["NewProtocol"], int(arguments["NewExternalPort"])
-        return next((mapping for mapping in packet_filter.mappings()
-                     if (mapping.protocol, mapping.external_port) == wanted), None)
+def listed(entry: Entry) -> Arguments:
+    """What a lookup says about an entry."""
+    return {"NewInternalPort": str(entry.mapping.internal_port),
+            "NewInternalClient": entry.mapping.internal_address, "NewEnabled": "1",
+            "NewPortMappingDescription": entry.description,
+            "NewLeaseDuration": str(entry.lease)}
+
+
+def numbered(entry: Entry) -> Answer:
+    """What the list says about an entry."""
+    return 0, {"NewRemoteHost": "", "NewExternalPort": str(entry.mapping.external_port),
+               "NewProtocol": entry.mapping.protocol, **listed(entry)}
 
 
 class _WebServer(ThreadingHTTPServer):
@@ -239,6 +347,10 @@ class _WebServer(ThreadingHTTPServer):
     def __init__(self, address: tuple[str, int], gateway: ScriptedGateway) -> None:
         self.gateway = gateway
         super().__init__(address, _Handler)
+
+    def shutdown_request(self, request: socket.socket | tuple[bytes, socket.socket]) -> None:
+        """Close without a shutdown: a connection to be reset must not be ended normally first."""
+        self.close_request(request)
 
     def handle_error(self, request: object, client_address: object) -> None:
         """Ignore clients that disconnect early."""
@@ -250,23 +362,49 @@ class _Handler(BaseHTTPRequestHandler):
     def do_GET(self) -> None:
         """Deliver the description, whatever the path."""
         gateway, body = self.server.gateway, self.server.gateway.description()
-        for piece in gateway.personality.deliver(_head("200 OK", len(body)), body):
-            self.wfile.write(piece)
+        self._send(gateway.personality.deliver(_head("200 OK", len(body)), body))
 
     def do_POST(self) -> None:
         """Perform an action of the control service."""
-        if urlsplit(self.path).path != urlsplit(self.server.gateway.personality.control_url).path:
-            self.wfile.write(_head("404 Not Found", 0))
-            return
+        gateway = self.server.gateway
         body = self.rfile.read(int(self.headers["Content-Length"])).decode()
-        action = self.headers["SOAPAction"].strip('"').rpartition("#")[2]
-        error, values = self.server.gateway.answer(action, dict(_ARGUMENT.findall(body)))
-        answer = _soap(action, error, values).encode()
-        status = "500 Internal Server Error" if error else "200 OK"
-        self.wfile.write(_head(status, len(answer)) + answer)
+        service, _, action = self.headers["SOAPAction"].strip('"').rpartition("#")
+        arguments = {name: unescape(value) for name, value in _ARGUMENT.findall(body)}
+        answer = gateway.answer(Call(gateway, self.path, self.headers, body, action, service,
+                                     arguments))
+        if isinstance(answer, Page):
+            status, text = answer.status, answer.body
+        else:
+            status = "500 Internal Server Error" if answer[0] else "200 OK"
+            text = _soap(action, service, *answer).encode()
+        if text is None:
+            self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, NO_LINGERING)
+            return
+        self._send(gateway.personality.deliver_control(_head(status, len(text)), text))
+
+    def _send(self, pieces: Iterable[bytes]) -> None:
+        for piece in pieces:
+            self.wfile.write(piece)
 
     def log_message(self, *_arguments: object) -> None:
         """Stay silent: the device's log tells what it asked."""
+
+
+def _datagram_socket(address: str, port: int) -> socket.socket:
+    """A UDP socket on a port that others may use too."""
+    made = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+    made.setsockopt(socket.SOL_SOCKET, socket.SO_REUSEADDR, 1)
+    made.bind((address, port))
+    return made
+
+
+def _key(mapping: Forwarding) -> tuple[str, int]:
+    return mapping.protocol, mapping.external_port
+
+
+def _wanted(arguments: Arguments) -> tuple[str, int]:
+    """The external port, whoever holds it."""
+    return arguments["NewProtocol"], int(arguments["NewExternalPort"])
 
 
 def _header(message: bytes, name: str) -> str:
@@ -283,7 +421,8 @@ def _head(status: str, size: int) -> bytes:
             "Connection: close\r\n\r\n").encode()
 
 
-def _soap(action: str, error: int, values: Arguments) -> str:
+def _soap(action: str, service: str, error: int, values: Arguments) -> str:
     told = "".join(f"<{name}>{escape(value)}</{name}>" for name, value in values.items())
     form = _FAULT if error else _RESPONSE
-    return _ENVELOPE.format(body=form.format(action=action, values=told, error=error))
+    filled = form.format(action=action, service=service, values=told, error=error)
+    return _ENVELOPE.format(body=filled)

@@ -19,7 +19,7 @@ from lab.support import wait_until
 
 _ANSWER_SECONDS = 10
 # On, with zero seconds: closing discards unsent data and resets the connection.
-_NO_LINGERING = struct.pack("ii", 1, 0)
+NO_LINGERING = struct.pack("ii", 1, 0)
 
 
 @dataclass(frozen=True)
@@ -46,12 +46,14 @@ class Request:
 class Reply:
     """The reply to a request; without a body the connection ends without an answer.
 
-    It is then closed normally or, with `reset`, reset.
+    It is then closed normally or, with `reset`, reset. The body is sent at once or, with `pause`,
+    at a byte in that many seconds.
     """
 
     body: bytes | None
     status: int = 200
     reset: bool = False
+    pause: float = 0
 
 
 Answer = Callable[[Request], Reply]
@@ -113,14 +115,19 @@ class _Handler(BaseHTTPRequestHandler):
         reply = self.server.reply_to(self.client_address[0], self.path)
         if reply.body is None:
             if reply.reset:
-                self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, _NO_LINGERING)
+                self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, NO_LINGERING)
             self.close_connection = True
             return
         self.send_response(reply.status)
         self.send_header("Content-Type", "text/plain")
         self.send_header("Content-Length", str(len(reply.body)))
         self.end_headers()
-        self.wfile.write(reply.body)
+        if reply.pause:
+            for letter in reply.body:
+                self.wfile.write(bytes([letter]))
+                time.sleep(reply.pause)
+        else:
+            self.wfile.write(reply.body)
 
     def do_POST(self) -> None:
         self.do_GET()

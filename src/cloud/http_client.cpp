@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "cloud/tavik_client.h"
+#include "common/bounded_call.h"
 #include "common/handles.h"
 #include "common/log.h"
 #include "common/signal_block.h"
@@ -24,6 +25,9 @@ namespace {
 constexpr std::size_t kReceiveBlockSize = 10240;  // bytes
 constexpr std::size_t kLargestAnswer = 10238;     // bytes
 constexpr long kTransferTimeout = 30000;          // milliseconds, for the whole transfer
+// The resolver has no limit of its own when a name server wants TCP and then says nothing; libcurl
+// waits for its end.
+constexpr int kResolverLimit = 31;  // seconds, also for a transfer
 constexpr long kVerifyPeer = 1;
 
 using CurlHandle = std::unique_ptr<CURL, Releaser<curl_easy_cleanup>>;
@@ -49,6 +53,11 @@ const void* addressOf(const addrinfo& entry) {
     if (entry.ai_family == AF_INET) return &static_cast<const sockaddr_in*>(address)->sin_addr;
     if (entry.ai_family == AF_INET6) return &static_cast<const sockaddr_in6*>(address)->sin6_addr;
     return nullptr;
+}
+
+int lookUp(const std::string& hostname, addrinfo*& found) {
+    const BoundedCall bounds{Peer::ANYBODY, kResolverLimit};
+    return getaddrinfo(hostname.c_str(), nullptr, nullptr, &found);
 }
 
 std::string firstAddress(const addrinfo* list) {
@@ -188,7 +197,7 @@ char* TavikClient::httpGet(const char* url, int& size) {
     }
     rcvBuffer = {};
     try {
-        const TerminationBlock held;
+        const BoundedCall bounds{Peer::ANYBODY, kResolverLimit};
         const CurlHandle handle{curl_easy_init()};
         if (handle) {
             setOptions(handle.get(), url, rcvBuffer);
@@ -217,7 +226,7 @@ std::optional<Answer> TavikClient::fetchCentral(const MaskedUrl& url) {
 std::string TavikClient::nsLookup(const std::string& hostname) const {
     const TerminationBlock held;
     addrinfo* found = nullptr;
-    const int error = getaddrinfo(hostname.c_str(), nullptr, nullptr, &found);
+    const int error = lookUp(hostname, found);
     if (error != 0) {
         logError("TavikClient::nsLookup() - getAddrInfo failed with error: %s\n",
                  gai_strerror(error));

@@ -113,8 +113,8 @@ public:
     void clearPortTestSuccess() { portMapCheckSuccess = false; }
 
     /// Asks the server for the public address of this device. True when @p ip now is an IPv4
-    /// address; any other answer is stored in @p ip as well. @p waitSeconds is the wait the server asked
-    /// for instead of answering, else 0.
+    /// address; any other answer is stored in @p ip as well. @p waitSeconds is the wait the server
+    /// asked for instead of answering, else 0.
     bool getMyIP(std::string& ip, int& waitSeconds);
 
     // --- mapping records ---------------------------------------------------------------------

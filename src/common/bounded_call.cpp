@@ -4,7 +4,6 @@
 #include "common/bounded_call.h"
 
 #include <dlfcn.h>
-#include <fcntl.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -17,8 +16,6 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
-#include <cstdlib>
-#include <cstring>
 #include <limits>
 #include <system_error>
 #include <vector>
@@ -64,17 +61,6 @@ std::vector<int> openSockets() {
     return found;
 }
 
-// Bytes, 0 when unknown.
-long residentMemory() {
-    std::array<char, 128> text{};  // total and resident pages first
-    const int file = open("/proc/self/statm", O_RDONLY | O_CLOEXEC);
-    if (file < 0) return 0;
-    const ssize_t size = read(file, text.data(), text.size() - 1);
-    static_cast<void>(close(file));
-    const char* const second = size > 0 ? std::strchr(text.data(), ' ') : nullptr;
-    return second == nullptr ? 0 : std::strtol(second, nullptr, 10) * sysconf(_SC_PAGESIZE);
-}
-
 // The C library's function of this name and type.
 template <typename Function>
 Function* original(const char* name) {
@@ -97,13 +83,13 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
-BoundedCall::BoundedCall(Peer peer, int seconds)
-    : before{openSockets()}, residentBefore{residentMemory()} {
-    if (peer == Peer::GATEWAY) seconds = std::min(seconds, stopBudgetLeft());
+BoundedCall::BoundedCall(Peer peer, int seconds) : before{openSockets()} {
     onlyGateways = peer == Peer::GATEWAY;
+    Clock::duration limit = std::chrono::seconds(seconds);
+    if (onlyGateways) limit = std::min(limit, stopBudgetLeft());
     mayReceive = kMostReceived;
     try {
-        watcher = std::thread([this, seconds] { watch(seconds); });
+        watcher = std::thread([this, limit] { watch(limit); });
     } catch (const std::system_error&) {
         mayReceive = 0;  // rather no answer than an unbounded one
     }
@@ -116,24 +102,27 @@ BoundedCall::~BoundedCall() {
     }
     ended.notify_one();
     if (watcher.joinable()) watcher.join();
+    if (onlyGateways) spendStopBudget(Clock::now() - began);
+    if (cutShort) renewStopBudget({});
     onlyGateways = false;
     mayReceive = kEverything;
 }
 
 // The library may open further sockets after the first ones were shut, hence every time.
-void BoundedCall::watch(int seconds) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+void BoundedCall::watch(Clock::duration limit) {
+    auto end = began + limit;
     bool exceeded = false;
+    bool hurried = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short
     std::unique_lock lock(mutex);
     while (!ended.wait_for(lock, kLook, [this] { return over; })) {
         if (!terminating && terminationPending()) {
             terminating = true;
-            end = std::min(end,
-                           std::chrono::steady_clock::now() + std::chrono::seconds(kCycleBudget));
+            hurried = end > Clock::now() + kCycleBudget;
+            if (hurried) end = Clock::now() + kCycleBudget;
         }
-        exceeded = exceeded || std::chrono::steady_clock::now() >= end ||
-                   residentMemory() - residentBefore > kMostGrowth;
+        exceeded = exceeded || Clock::now() >= end;
+        cutShort = exceeded && hurried;
         if (exceeded) endTransfers();
     }
 }

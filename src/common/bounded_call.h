@@ -1,8 +1,9 @@
-// Bounds around calls of miniupnpc, which has none of its own: a peer that sends a byte now and then
-// holds it for hours, one that never stops sending fills the memory.
+// Bounds around calls of miniupnpc, which has none of its own: a peer that sends a byte now and
+// then holds it for hours, one that never stops sending fills the memory.
 #ifndef PELORUS_COMMON_BOUNDED_CALL_H
 #define PELORUS_COMMON_BOUNDED_CALL_H
 
+#include <chrono>
 #include <condition_variable>
 #include <mutex>
 #include <thread>
@@ -18,17 +19,17 @@ enum class Peer {
     GATEWAY,  ///< IPv4 hosts other than this device: its own servers trust local clients
 };
 
-/// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds,
-/// or when the process has grown by kMostGrowth, they are shut down: the library then fails as if
-/// the peer had closed the connection. So it does after kMostReceived, and a call to a gateway when
-/// the stop budget is spent. Also holds termination signals back and keeps a closed connection from
-/// raising SIGPIPE. One at a time; not around child processes.
+/// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds
+/// they are shut down: the library then fails as if the peer had closed the connection. So it does
+/// after kMostReceived, and a call to a gateway when the stop budget is spent. One that is running
+/// when a termination signal comes gets kCycleBudget from then on; if that is not enough, nothing is
+/// left for the rest of the cycle. Also holds termination signals back and keeps a closed connection
+/// from raising SIGPIPE. One at a time; not around child processes.
 class BoundedCall {
 public:
-    /// Bytes of resident memory.
-    static constexpr long kMostGrowth = 8L * 1024 * 1024;
-    /// Bytes that recvfrom returns in one call, on all sockets.
-    static constexpr long kMostReceived = 4L * 1024 * 1024;
+    /// Bytes that recvfrom returns in one call, on all sockets. To parse them miniupnpc may need 35
+    /// times as much memory.
+    static constexpr long kMostReceived = 256L * 1024;
 
     BoundedCall(Peer peer, int seconds);
     ~BoundedCall();
@@ -36,16 +37,19 @@ public:
     BoundedCall& operator=(const BoundedCall&) = delete;
 
 private:
-    void watch(int seconds);
+    using Clock = std::chrono::steady_clock;
+
+    void watch(Clock::duration limit);
     void endTransfers() const;
 
+    const Clock::time_point began = Clock::now();
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
     std::vector<int> before;  // sockets that were open, in order
     std::mutex mutex;
     std::condition_variable ended;
-    long residentBefore;  // bytes
     bool over = false;
+    bool cutShort = false;  // by a termination signal
     std::thread watcher;
 };
 

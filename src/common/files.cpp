@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <climits>
 #include <optional>
 
 #include "common/log.h"
@@ -16,6 +17,9 @@ namespace pelorus {
 namespace {
 
 constexpr std::size_t kPieceSize = 4096;  // bytes
+constexpr int kReading = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW;
+
+constexpr int kMostAttempts = 1000;
 
 class Descriptor {
 public:
@@ -56,16 +60,45 @@ FileHandle streamOf(const std::string& text) {
     return stream;
 }
 
+// The file that the link @p path leads to; ELOOP unless root made the link, or the file's owner.
+int openLinked(const std::string& path) {
+    const Descriptor link{open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC)};
+    struct stat maker {};
+    std::array<char, PATH_MAX> text{};
+    if (link.number < 0 || fstat(link.number, &maker) != 0) return -1;
+    const ssize_t size = readlinkat(link.number, "", text.data(), text.size());
+    if (size <= 0) return -1;
+    std::string name{text.data(), static_cast<std::size_t>(size)};
+    if (name.front() != '/') name.insert(0, path, 0, path.rfind('/') + 1);
+    // Opening a device may do something, so what the link leads to is looked at first.
+    const Descriptor target{open(name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC)};
+    struct stat status {};
+    if (target.number < 0 || fstat(target.number, &status) != 0) return -1;
+    const bool isOwn = maker.st_uid == 0 || maker.st_uid == status.st_uid;
+    if (S_ISREG(status.st_mode) && isOwn) {
+        const std::string found = "/proc/self/fd/" + std::to_string(target.number);
+        return open(found.c_str(), kReading & ~O_NOFOLLOW);
+    }
+    errno = ELOOP;
+    return -1;
+}
+
+int openForReading(const std::string& path, Link link) {
+    const int file = open(path.c_str(), kReading);
+    return file < 0 && errno == ELOOP && link == Link::OWN ? openLinked(path) : file;
+}
+
 }  // namespace
 
 FileHandle openForeignFile(const std::string& path, Part part, Link link) {
-    const int noLink = link == Link::REFUSE ? O_NOFOLLOW : 0;
-    const Descriptor file{
-        open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | noLink)};
+    const Descriptor file{openForReading(path, link)};
     struct stat status {};
     const bool isOpen = file.number >= 0 && fstat(file.number, &status) == 0;
     if (!isOpen && errno != ELOOP) return nullptr;
-    if (!isOpen || !S_ISREG(status.st_mode)) {
+    // Some kernels let everybody give a second name to a file that he may not read.
+    const bool isStolen =
+        link == Link::OWN && status.st_nlink > 1 && (status.st_mode & S_IROTH) == 0;
+    if (!isOpen || !S_ISREG(status.st_mode) || isStolen) {
         logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
         errno = EINVAL;
         return nullptr;
@@ -81,8 +114,13 @@ FileHandle openForeignFile(const std::string& path, Part part, Link link) {
 }
 
 FileHandle createFile(const std::string& path, mode_t mode) {
-    static_cast<void>(unlink(path.c_str()));
-    const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+    int file = -1;
+    // Whoever keeps taking the name in a shared folder wins some of the races for it, not all.
+    for (int attempt = 0; attempt < kMostAttempts && file < 0; ++attempt) {
+        static_cast<void>(unlink(path.c_str()));
+        file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+        if (file < 0 && errno != EEXIST) return nullptr;
+    }
     if (file < 0) return nullptr;
     static_cast<void>(fchmod(file, mode));  // whatever the umask
     std::FILE* const stream = fdopen(file, "w");

@@ -16,12 +16,15 @@ inline constexpr std::size_t kMostForeignBytes = 1024UL * 1024;
 /// Which part of a file that is too large is read.
 enum class Part { HEAD, TAIL };
 
-/// Whether a symbolic link in place of a file is followed.
-enum class Link { REFUSE, FOLLOW };
+/// Whether a link in place of a file is followed.
+enum class Link {
+    REFUSE,  ///< no symbolic link
+    OWN,     ///< one of root, or of the file's owner; neither does a hard link give others access
+};
 
 /// Opens a file that another program may write, and reads it at once: what the handle delivers is
 /// what the file held at that moment. Never blocks. Null, and errno set, when the file cannot be
-/// read; EINVAL, and one log line, when it is not a regular file.
+/// read; EINVAL, and one log line, when it is not a regular file or a link is refused.
 FileHandle openForeignFile(const std::string& path,
                            Part part = Part::HEAD,
                            Link link = Link::REFUSE);

@@ -1,8 +1,6 @@
 #include "common/stop_budget.h"
 
 #include <algorithm>
-#include <chrono>
-#include <limits>
 #include <optional>
 
 #include "common/termination.h"
@@ -11,25 +9,28 @@ namespace pelorus {
 
 namespace {
 
-using Clock = std::chrono::steady_clock;
+using std::chrono::nanoseconds;
 
-std::optional<Clock::time_point> budgetEnd;
+std::optional<nanoseconds> left;
 
 }  // namespace
 
-int stopBudgetLeft() {
-    if (!terminationRequested()) return std::numeric_limits<int>::max();
-    if (!budgetEnd) renewStopBudget(kCycleBudget);
-    const auto left = std::chrono::ceil<std::chrono::seconds>(*budgetEnd - Clock::now());
-    return std::max(0, static_cast<int>(left.count()));
+nanoseconds stopBudgetLeft() {
+    if (!terminationRequested()) return nanoseconds::max();
+    if (!left) left = kCycleBudget;
+    return std::max(*left, nanoseconds::zero());
 }
 
 bool stopBudgetSpent() {
-    return stopBudgetLeft() == 0;
+    return stopBudgetLeft() == nanoseconds::zero();
 }
 
-void renewStopBudget(int seconds) {
-    budgetEnd = Clock::now() + std::chrono::seconds(seconds);
+void spendStopBudget(nanoseconds time) {
+    if (left) *left -= time;
+}
+
+void renewStopBudget(nanoseconds budget) {
+    left = budget;
 }
 
 }  // namespace pelorus

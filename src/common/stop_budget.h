@@ -2,21 +2,25 @@
 #ifndef PELORUS_COMMON_STOP_BUDGET_H
 #define PELORUS_COMMON_STOP_BUDGET_H
 
+#include <chrono>
+
 namespace pelorus {
 
-/// Seconds for all that a cycle still asks of a gateway after a termination signal.
-inline constexpr int kCycleBudget = 10;
-/// Seconds for what the final clean-up asks of it.
-inline constexpr int kCleanUpBudget = 50;
+/// What the calls of a gateway may take together in the cycle that a termination signal ends.
+inline constexpr std::chrono::seconds kCycleBudget{10};
+/// What they may take together in the final clean-up.
+inline constexpr std::chrono::seconds kCleanUpBudget{120};
 
-/// Seconds left, INT_MAX while no termination signal has arrived. The first call after the signal
-/// starts a budget of kCycleBudget.
-[[nodiscard]] int stopBudgetLeft();
+/// What is left for the calls of a gateway, at least 0; without end while no termination signal has
+/// arrived. The first call after the signal starts a budget of kCycleBudget.
+[[nodiscard]] std::chrono::nanoseconds stopBudgetLeft();
 /// True when nothing is left: searches and enumerations end. A request may still be made; it fails
 /// unless it is answered at once.
 [[nodiscard]] bool stopBudgetSpent();
-/// Replaces what is left by @p seconds from now.
-void renewStopBudget(int seconds);
+/// Takes @p time from what is left. Pauses, and what the daemon asks of others, do not count.
+void spendStopBudget(std::chrono::nanoseconds time);
+/// Replaces what is left.
+void renewStopBudget(std::chrono::nanoseconds budget);
 
 }  // namespace pelorus
 

@@ -57,7 +57,7 @@ bool copyFile(std::FILE* from, std::FILE* to) {
 // Makes the first temporary copy. False, with the cause logged, when it cannot be made.
 bool createTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
     logConfigInfo("Opening dynamic config file for copy.\n");
-    const FileHandle dynamicFile = openForeignFile(dynamicPath, Part::HEAD, Link::FOLLOW);
+    const FileHandle dynamicFile = openForeignFile(dynamicPath, Part::HEAD, Link::OWN);
     if (!dynamicFile) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s\n",
@@ -124,7 +124,7 @@ bool GlobalConfig::loadStaticConfig() {
 bool GlobalConfig::loadDynamicConfig(const std::string& path) {
     logConfigInfo("OPENING dynamic config file for read: \n");
     logConfigInfo("%s", path.c_str());
-    const FileHandle file = openForeignFile(path, Part::HEAD, Link::FOLLOW);
+    const FileHandle file = openForeignFile(path, Part::HEAD, Link::OWN);
     if (!file) {
         logConfigError(
             "GlobalConfig::loadConfig() - failed to open dynamic config settings file: [%s].\n",

@@ -51,8 +51,8 @@ std::optional<int> ForwardSearch::tryPredefinedPorts() {
         "ConnectionManager::forwardPort - BEGIN Port Test pre-defined list - [%d] by Brenvik router.\n",
         static_cast<int>(entries.size()));
     for (const auto& entry : entries) {
-        for (externalPort = entry.firstExternal;
-             externalPort <= entry.lastExternal && !stopBudgetSpent(); ++externalPort) {
+        for (externalPort = entry.firstExternal; externalPort <= entry.lastExternal;
+             ++externalPort) {
             const bool serves = entry.internalPort == request.internalPort &&
                                 (request.type == HTTPS || testPort() == PASS_TEST);
             if (manager.doubleNatDetected) {

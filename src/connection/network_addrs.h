@@ -42,8 +42,9 @@ public:
     [[nodiscard]] const std::string& getExternalIp() const { return externalIP; }
     [[nodiscard]] const std::string& getLocalIp() const { return localIP; }
 
-    /// The external address as the server sees it. Returns 1 and sets @p out, or 0. Waits, without
-    /// a limit, as long as the server keeps asking for a pause; only a termination signal ends that.
+    /// The external address as the server sees it. Returns 1 and sets @p out, or 0. Waits,
+    /// without a limit, as long as the server keeps asking for a pause; only a termination signal
+    /// ends that.
     int getMyIP(std::string& out);
 
 private:

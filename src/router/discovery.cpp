@@ -9,11 +9,13 @@
 #include <memory>
 #include <new>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "common/handles.h"
 #include "common/log.h"
 #include "common/miniupnpc_api.h"
+#include "common/stop_budget.h"
 #include "common/text.h"
 #include "config/scrub.h"
 #include "router/gateway_url.h"
@@ -143,11 +145,19 @@ void logChosenDevice(int state, const std::string& controlUrl, const char* lanAd
 }  // namespace
 
 bool Router::discover() {
-    initialized = false;
-    isNatPMP = false;
+    const bool wasInitialized = std::exchange(initialized, false);
+    const bool wasNatPMP = std::exchange(isNatPMP, false);
+    const Igd earlier = igd();
     forgetSeenChanges();
     initLocalIp();
-    return upnp_discover() || natpmp_discover();
+    if (upnp_discover()) return true;
+    if (!wasInitialized || !stopBudgetSpent()) return natpmp_discover();
+    // Cut short: the clean-up still needs the gateway that was found before.
+    initialized = true;
+    isNatPMP = wasNatPMP;
+    controlUrl = earlier.controlUrl;
+    serviceType = earlier.serviceType;
+    return true;
 }
 
 void Router::forgetSeenChanges() {

@@ -12,9 +12,9 @@
 namespace pelorus {
 
 /// NAT-PMP client for the default gateway. The first request opens it, the destructor closes it. A
-/// request blocks for at most three reads of the library's retry schedule (1.75 s). Late answers are
-/// dropped; none is taken for the answer to another request. Every failure is logged and returned
-/// as false.
+/// request blocks for at most three reads of the library's retry schedule (1.75 s). Late answers
+/// are dropped; none is taken for the answer to another request. Every failure is logged and
+/// returned as false.
 class CMnatpmp {
 public:
     CMnatpmp() = default;

@@ -43,6 +43,7 @@ void checkCloseOnExec(bool closes, const char* path) {
 
 extern "C" {
 std::FILE* __real_fopen(const char* path, const char* mode);
+int __real_unlink(const char* path);
 pid_t __real_fork();
 pid_t __real_setsid();
 int __real_chdir(const char* path);
@@ -63,6 +64,16 @@ int __wrap_open(const char* path, int flags, ...) {
     checkCloseOnExec((flags & O_CLOEXEC) != 0, path);
     if (openFails(path, (flags & O_ACCMODE) != O_RDONLY)) return -1;
     return __real_open(targetOf(path), flags, mode);
+}
+
+int __wrap_unlink(const char* path) {
+    const int result = __real_unlink(targetOf(path));
+    int& replants = FakeFiles::get().replants;
+    if (replants > 0) {
+        --replants;
+        close(__real_open(targetOf(path), O_CREAT | O_CLOEXEC, 0666));
+    }
+    return result;
 }
 
 pid_t __wrap_fork() {

@@ -1,4 +1,4 @@
-// Files and process of a test: fopen, open, fork, setsid, chdir and kill. Most go straight through
+// Files and process of a test: fopen, open, unlink, fork, setsid, chdir and kill. Most go straight through
 // to libc. A file opened without close-on-exec fails the test: a child process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
@@ -19,6 +19,9 @@ struct FakeFiles : Single<FakeFiles> {
 
     /// Runs before each file is opened; other than 0 it is the errno of a failure.
     std::function<int(const std::string& path, bool forWriting)> onOpen{};
+    /// How often somebody else takes the name of a file that is unlinked.
+    int replants = 0;
+
     std::map<std::string, std::string> targets{{kIdleMinutesFile, ""}};
 };
 

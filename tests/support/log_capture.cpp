@@ -36,6 +36,7 @@ void LogCapture::take(const LogLine& line) {
 
 extern "C" {
 __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const char* format, ...) {
+    expectTerminationHeld();
     std::array<char, 16384> text{};
     va_list args;
     va_start(args, format);
@@ -46,11 +47,13 @@ __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const cha
 }
 
 void __wrap_openlog(const char* ident, int option, int facility) {
+    expectTerminationHeld();
     LogCapture::get().setup.push_back(std::string{"openlog "} + ident + " " +
                                       std::to_string(option) + " " + std::to_string(facility));
 }
 
 int __wrap_setlogmask(int mask) {
+    expectTerminationHeld();
     LogCapture::get().setup.push_back("level " + std::to_string(mask));
     return 0xff;
 }

@@ -9,7 +9,7 @@ import pytest
 
 sys.path.insert(0, str(Path(__file__).resolve().parents[2]))
 
-pytest.register_assert_rewrite("lab.checks", "lab.scenarios")
+pytest.register_assert_rewrite("lab.checks", "lab.scenarios", "lab.zoo")
 
 from lab import sandbox  # noqa: E402
 

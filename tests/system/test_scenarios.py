@@ -1,4 +1,4 @@
-"""Plays every scenario in a lab of its own."""
+"""Plays every scenario, and a choice of the gateways in the zoo, each in a lab of its own."""
 
 from __future__ import annotations
 
@@ -8,20 +8,24 @@ from lab.relay import TUNNEL_DEVICE
 from lab.scenario import Lab
 from lab.scenarios import SCENARIOS
 from lab.timeline import Timeline
+from lab.zoo import ZOO
 
+# The others are played by scripts/zoo.
+CHOSEN = tuple(f"zoo-{row}" for row in ("D9", "D10", "D11", "H1", "H4", "H8b", "H11", "H15"))
+PLAYED = {**SCENARIOS, **{name: ZOO[name] for name in CHOSEN}}
 NEEDS_TUNNEL = pytest.mark.skipif(not TUNNEL_DEVICE.exists(),
                                   reason="this machine has no tunnel device")
 # Scenarios over ten leases take longest, so they start first.
-LONGEST_FIRST = sorted(SCENARIOS.values(), key=lambda scenario: "leases" not in scenario.name)
+LONGEST_FIRST = sorted(PLAYED.values(), key=lambda scenario: "leases" not in scenario.name)
 
 
 @pytest.mark.parametrize("name", [
     pytest.param(scenario.name, marks=NEEDS_TUNNEL if scenario.situation.relay else ())
     for scenario in LONGEST_FIRST])
 def test_scenario(name: str) -> None:
-    lab = Lab(SCENARIOS[name].situation, Timeline())
+    lab = Lab(PLAYED[name].situation, Timeline())
     try:
-        SCENARIOS[name].play(lab)
+        PLAYED[name].play(lab)
     except Exception:
         print(lab.report())
         raise

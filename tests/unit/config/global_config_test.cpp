@@ -1,5 +1,6 @@
 #include "config/global_config.h"
 
+#include <sys/inotify.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -128,7 +129,12 @@ TEST_F(ConfigTest, AFailedLoadIsNamedInTheLogAndLeavesNoCopy) {
     const std::string noCopy = "() - failed to create temporary dynamic config file: ";
     row("nothing\nhere\n", "Settings() - failed to open config file: [static.ini].");
     row("DYNAMIC_CONFIG=gone\n", noOpen + "[gone/dynamicconfig.ini].");
-    row("DYNAMIC_CONFIG_TMP=copy.ini\n", noOpen + "gone/dynamicconfig.ini");
+    fs::remove("dynamicconfig.ini");
+    mkfifo("dynamicconfig.ini", 0666);  // planted to block
+    row("DYNAMIC_CONFIG=.\n", noOpen + "[./dynamicconfig.ini].");
+    row("DYNAMIC_CONFIG_TMP=copy.ini\n", noOpen + "./dynamicconfig.ini");
+    fs::remove("dynamicconfig.ini");
+    writeFile("dynamicconfig.ini", "KEY=v\n");
     row("DYNAMIC_CONFIG=.\nDYNAMIC_CONFIG_TMP=gone/copy.ini\n", noCopy + "gone/copy.ini");
     for (const std::size_t size : {100U, 10'000U}) {
         writeFile("dynamicconfig.ini", std::string(size, 'x') + "\nLAST=1\n");
@@ -172,13 +178,47 @@ TEST_F(ConfigTest, APlantedCopyIsReplacedAtTheStartAndIgnoredLater) {
     }
 }
 
+// What the daemon reads as the dynamic file, others read in the copy.
+TEST_F(ConfigTest, NobodyCanLinkTheDynamicFileToWhatHeMayNotRead) {
+    constexpr uid_t kBackEnd = 33;
+    writeFile("static.ini", inUse);
+    const std::string dynamic = path("dynamicconfig.ini");
+    const auto isLoaded = [&](uid_t maker, uid_t owner, mode_t mode, const auto& link) {
+        const std::string target = writeFile("target", "KEY=v\n");
+        fs::remove(copy);
+        fs::remove(dynamic);
+        link(target);
+        EXPECT_EQ(chmod(target.c_str(), mode) + chown(target.c_str(), owner, owner) +
+                      lchown(dynamic.c_str(), maker, maker),
+                  0);
+        return config.loadConfig(path("static.ini"));
+    };
+    const auto symbolic = [&](const auto& /*target*/) { fs::create_symlink("target", dynamic); };
+    const auto hard = [&](const auto& target) { fs::create_hard_link(target, dynamic); };
+    if (geteuid() == 0) {
+        const int opened = inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
+        const auto toForeign = [&](const std::string& target) {
+            symbolic(target);
+            inotify_add_watch(opened, target.c_str(), IN_OPEN);
+        };
+        EXPECT_FALSE(isLoaded(kBackEnd, 0, 0644, toForeign));
+        inotify_event event{};
+        EXPECT_EQ(read(opened, &event, sizeof event), -1) << "opening a device may do something";
+        close(opened);
+        EXPECT_TRUE(isLoaded(kBackEnd, kBackEnd, 0600, symbolic));
+        EXPECT_TRUE(isLoaded(0, kBackEnd, 0600, symbolic));
+    }
+    EXPECT_FALSE(isLoaded(geteuid(), geteuid(), 0640, hard));
+    EXPECT_TRUE(isLoaded(geteuid(), geteuid(), 0644, hard));
+}
+
 TEST_F(ConfigTest, AHugeCopyCostsNeitherTimeNorMemory) {
     load("KEY=v\n");
-    rewriteCopy("KEY=w\n");
+    rewriteCopy("KEY=w\n" + std::string(1'050'000, '\n') + "BEYOND=x\n");
     const auto rewritten = fs::last_write_time(copy);
     fs::resize_file(copy, 1'000'000'000);
     fs::last_write_time(copy, rewritten);
-    EXPECT_EQ(config.getProperty("KEY"), "w");
+    EXPECT_EQ(config.getProperty("KEY") + config.getProperty("BEYOND"), "w");
     std::string many;
     for (int key = 0; key < 20'000; ++key) many += "K" + std::to_string(key) + "=x\n";
     rewriteCopy(many + "KEY=y\n");

@@ -86,7 +86,7 @@ TEST_F(DaemonControlTest, ASignalWhileTheCycleWorksIsNotSleptOver) {
     givenEnabled(900);
     gateway.onCall([](const std::string& call) {
         if (call.find("map TCP 9091") == 0) terminate();
-        if (call.find("map TCP 9444") == 0) renewStopBudget(0);  // the clean-up has its own
+        if (call.find("map TCP 9444") == 0) renewStopBudget({});  // the clean-up has its own
     });
     control.run();
     EXPECT_LT(clock.elapsed(), 900);

@@ -33,7 +33,9 @@ TEST_F(SignalsTest, ATerminationSignalDisablesAndIsKeptForTheEnd) {
 
 TEST_F(SignalsTest, ASignalDuringATransferIsHandledAfterIt) {
     const TerminationBlock inherited;  // from whoever started the daemon
+    setenv("TZ", "XYZ3", 1);
     ASSERT_TRUE(installSignalHandlers());
+    EXPECT_STREQ(tzname[0], "XYZ") << "no time zone is read in the handler";
     support::FakeWeb::Answer answer("Success");
     answer.action = [] {
         raise(SIGTERM);

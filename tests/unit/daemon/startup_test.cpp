@@ -94,11 +94,14 @@ TEST_F(StartupTest, APlantedPidFileIsNeitherFollowedNorWaitedFor) {
     const std::string target = writeFile("precious", "kept");
     const std::function<void()> plants[]{[&] { fs::create_symlink(target, path("pid")); },
                                          [&] { fs::create_hard_link(target, path("pid")); },
-                                         [&] { mkfifo(path("pid").c_str(), 0600); }};
+                                         [&] { mkfifo(path("pid").c_str(), 0600); },
+                                         [] { support::FakeFiles::get().replants = 50; }};
     for (const auto& plant : plants) {
         plant();
         EXPECT_EQ(start({"-u"}), " exit 0 exit 0");
         EXPECT_EQ(readFile(target), "kept");
+        ASSERT_TRUE(fs::is_regular_file(fs::symlink_status(path("pid"))));
+        EXPECT_TRUE(holds(("PID: [" + readFile(path("pid")) + "]").c_str())) << reported;
         fs::remove(path("pid"));
     }
 }

@@ -93,6 +93,10 @@ TEST_F(VpnManagerTest, AFailureEndsTheStartAtOnce) {
         setConfig(key, before);
     }
     EXPECT_EQ(commands.lines(), (Lines{"fetch-relays", "start-client"})) << "of the first row";
+    mkfifo(path("client.out").c_str(), 0666);  // planted to block
+    EXPECT_FALSE(manager.openVPNConnection());
+    std::string ip;
+    EXPECT_FALSE(manager.fetchOpenVPN_IPAddr(ip));
 }
 
 TEST_F(VpnManagerTest, RemovesAPidFileThatNamesNoClient) {
@@ -154,7 +158,9 @@ TEST_F(VpnManagerTest, OnlyTheFirstLinesOfAPidFileCount) {
 TEST_F(VpnManagerTest, EndsThePassesWhenThePidFileGoes) {
     startClient();
     log.onLine([this](const LogLine& line) {
-        if (line.text.find("process is running") != line.text.npos) fs::remove(path("client.pid"));
+        if (line.text.find("process is running") == line.text.npos) return;
+        fs::remove(path("client.pid"));
+        mkfifo(path("client.pid").c_str(), 0666);  // planted to block
     });
     EXPECT_TRUE(manager.closeVPNConnection());
     EXPECT_EQ(logged("failed to open PID output file\n"), 1);

@@ -125,7 +125,7 @@ TEST_F(PortMappingTest, AnEndlessTableEndsWithTheStopBudget) {
     gateway.lie = {0, "192.168.77.20", "80", "another", "7000", "TCP"};
     gateway.onCall([&](const std::string& call) {
         if (call == "entry #5") sigConnKilled = SIGTERM;
-        if (call == "entry #8") renewStopBudget(0);
+        if (call == "entry #8") renewStopBudget({});
     });
     router.unmapAllPorts("TCP", "Kavra");
     EXPECT_EQ(gateway.calls().back(), "entry #8");

@@ -12,7 +12,7 @@
 #include "fuzz_world.h"
 #include "support/random_world.h"
 
-namespace {
+namespace pelorus::fuzz {
 
 template <class Singleton>
 void renew() {
@@ -21,8 +21,7 @@ void renew() {
     new (instance) Singleton;
 }
 
-void renewAll(const std::string& folder) {
-    using namespace pelorus;
+static void renewAll(const std::string& folder) {
     renew<GlobalConfig>();
     assert(GlobalConfig::getInstance()->loadConfig(folder + "/static.ini"));
     renew<TavikClient>();
@@ -32,18 +31,10 @@ void renewAll(const std::string& folder) {
     renew<DaemonControl>();
 }
 
-std::string makeFolder() {
-    std::string name = (std::filesystem::temp_directory_path() / "pelorus-cycle-XXXXXX").string();
-    assert(mkdtemp(name.data()) != nullptr);
-    return name;
-}
-
-}  // namespace
-
-void pelorus::fuzz::tryText(const std::string& text) {
-    using support::RandomWorld;
-    static const struct Folder {
-        std::string path = makeFolder();
+void tryText(const std::string& text) {
+    static struct Folder {
+        std::string path = std::filesystem::temp_directory_path() / "pelorus-cycle-XXXXXX";
+        Folder() { assert(mkdtemp(path.data()) != nullptr); }
         ~Folder() { std::filesystem::remove_all(path); }
     } folder;
     GTEST_FLAG_SET(break_on_failure, true);
@@ -51,20 +42,14 @@ void pelorus::fuzz::tryText(const std::string& text) {
     const auto kind = static_cast<support::Kind>(stream.below(support::kKinds));
     const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
     const unsigned noise = stream.below(256);
-    RandomWorld world{std::move(stream), kind, {noise, 300, false, true, true}, folder.path};
-    bool isRunning = false;
-    bool isSent = false;
-    const auto terminate = [&] {
-        if (!isRunning || std::exchange(isSent, true)) return;
+    support::RandomWorld world{std::move(stream), kind, {noise, 300, true, true}, folder.path};
+    bool isRunning = false, isSent = false;
+    world.atEvent = [&] {
+        const bool isTime = (signalAt != 0 && world.events >= signalAt) || world.cycles >= 20;
+        if (!isTime || !isRunning || std::exchange(isSent, true)) return;
         world.settle();
         renewStopBudget(kCycleBudget);
         raise(SIGTERM);
-    };
-    world.atEvent = [&] {
-        if (signalAt != 0 && world.events >= signalAt) terminate();
-    };
-    world.atCycleEnd = [&] {
-        if (world.cycles == 20) terminate();
     };
     sigConnKilled = kNoSignal;
     assert(installSignalHandlers());
@@ -77,3 +62,5 @@ void pelorus::fuzz::tryText(const std::string& text) {
     assert(world.client == 0);
     renewAll(folder.path);  // what it holds of this world goes before it
 }
+
+}  // namespace pelorus::fuzz

@@ -37,25 +37,15 @@ private:
 enum class Kind : unsigned { UPNP, NATPMP, BY_HAND, MAKERS_ROUTER, RELAYED, FAILING };
 inline constexpr unsigned kKinds = 6;
 
-/// What goes wrong for a while; a set of bits.
-enum Trouble : unsigned {
-    NO_SERVER = 1,
-    NO_BACK_END = 2,
-    DISK_ASLEEP = 4,
-    NO_INTERFACE = 8,
-    WRONG_NAMES = 16,
-    PORT_CLOSED = 32,
-    OTHER_NAT = 64,
-    NO_TUNNEL = 128,
-    NO_GATEWAY = 256
-};
+/// What goes wrong for a while; bits of the weather.
+enum Trouble : unsigned { SERVER, BACK_END, DISK, INTERFACE, NAMES, PORT, NAT, TUNNEL, GATEWAY };
 
 struct Climate {
-    unsigned noise = 0;         ///< odd answers, per mille
-    unsigned changes = 0;       ///< changes of the weather, per mille of the cycles
-    bool steadyGateway = true;  ///< which is there and answers well
-    bool oddSettings = false;   ///< other programs write strange ones
-    /// One process stands for all clients of the relay, and no thread watches a bounded call.
+    unsigned noise = 0;        ///< odd answers, per mille
+    unsigned changes = 0;      ///< changes of the weather, per mille of the cycles
+    bool oddSettings = false;  ///< other programs write strange ones
+    /// The gateway is odd, too. One process stands for all clients of the relay, and no thread
+    /// watches a bounded call.
     bool quick = false;
 };
 
@@ -71,9 +61,6 @@ public:
     void settle() { settled = true; }
     /// What a shutdown should have removed; empty when there is nothing.
     [[nodiscard]] std::string leftOver() const;
-    /// Ends the process: the daemon did what it must not do.
-    [[noreturn]] static void fault(const char* what);
-
     /// To another home: another gateway, another way to be reached, and the settings for it.
     void move(Kind newKind);
 
@@ -84,6 +71,7 @@ public:
     long events = 0, cycles = 0, requests = 0, opened = 0;  ///< opened: files, for writing
     long oddities = 0;                                      ///< odd answers and changes so far
     pid_t client = 0;                                       ///< of the relay, while it runs
+    std::string published;                                  ///< the record's address
     /// Each call that reaches a fake and each log line. Runs in signal handlers, too.
     std::function<void()> atEvent = [] {};
     std::function<void()> atCycleEnd = [] {};                          ///< as its pause begins
@@ -91,19 +79,18 @@ public:
 
 private:
     static void takeLine(int priority, const char* text);
-    static void resetFakes();
     void takeFakes();
-    [[nodiscard]] bool has(unsigned trouble) const;
+    void writeStaticSettings() const;
+    void writeSettings(const std::string& status) const;
+    [[nodiscard]] bool has(Trouble trouble) const;
     bool isOdd();
     std::string oddText();
     void event();
     void turn(long seconds);
     void changeWeather();
-    void writeSettings(const std::string& status) const;
     void prepareGateway(const std::string& call);
-    void makeGatewayOdd(const std::string& call);
     WebAnswer answerTo(const std::string& url);
-    WebAnswer testPort(int port);
+    [[nodiscard]] bool leadsHere(int port) const;
     CommandAnswer run(const std::string& command);
     void startClient();
     void stopClient();
@@ -111,7 +98,6 @@ private:
     Kind kind;
     std::string folder, wan = "44.128.0.20";
     std::atomic<bool> settled{false};
-    std::string published;   // the record's address
     std::string otherLines;  // settings that other programs wrote
     std::set<int> reached;   // ports that passed a test
     bool obeys = true;       // no signal to the client was lost

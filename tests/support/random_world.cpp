@@ -50,23 +50,16 @@ template <class... Fakes>
 void resetEach() {
     (Fakes::get().reset(), ...);
 }
-void resetFakes() {
-    resetEach<FakeGateway, FakeWeb, FakeCommands, VirtualClock, FakeNet, FakeFiles, FakeProcess,
-              LogCapture>();
-}
+constexpr auto resetFakes = resetEach<FakeGateway,
+                                      FakeWeb,
+                                      FakeCommands,
+                                      VirtualClock,
+                                      FakeNet,
+                                      FakeFiles,
+                                      FakeProcess,
+                                      LogCapture>;
 
 }  // namespace
-
-// How the linker calls the start of a std::thread.
-#define START_THREAD(prefix) \
-    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
-extern "C" {
-void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
-void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
-    const bool watches = current == nullptr || !current->climate.quick;
-    if (watches) START_THREAD(__real_)(thread, state, depend);
-}
-}
 
 unsigned Stream::byte() {
     if (generator) return (*generator)() & 0xffU;
@@ -112,6 +105,7 @@ void RandomWorld::writeSettings(const std::string& status) const {
     const std::string copy = folder + kCopy;
     if (!fs::exists(copy)) return;
     std::ofstream{copy} << (status.empty() ? "" : "COMMUNICATION_STATUS=" + status + "\n")
+                        << "MANUAL_PORT_FORWARD=" << (kind == Kind::BY_HAND ? "TRUE\n" : "FALSE\n")
                         << otherLines << "\n";
     const timespec times[]{{++changes, 0}, {changes, 0}};
     utimensat(AT_FDCWD, copy.c_str(), times, 0);
@@ -170,8 +164,8 @@ bool RandomWorld::isOdd() {
 
 std::string RandomWorld::oddText() {
     // clang-format off
-    static const Texts texts{"", "0.0.0.0", "44.128.0.21", "44.128.0.20\r\n", "::1", "%s%n%d", "-1", "9092", "TCP", kDeviceId, "TRUE",
-        "99999999999999999999", "standby", "Initialization Sequence Completed", "\n\n", kDeviceAuth,
+    static const Texts texts{"", "0.0.0.0", "44.128.0.21", "44.128.0.20\r\n", "::1", "%s%n%d", "-1", "9092", "TRUE",
+        "99999999999999999999", "standby", "Initialization Sequence Completed", "\n\n", kDeviceId, kDeviceAuth,
         "<action>wait</action><wait_time>300</wait_time>", "<action>wait</action><wait_time>2147483647</wait_time>",
         "Success<remote_external_ip>", "</external_ip></resp_device_id>"};
     // clang-format on
@@ -212,19 +206,15 @@ void RandomWorld::changeWeather() {
     std::ofstream{folder + "/minutes"} << (!good && stream.below(4) == 1 ? oddText() : "0\n");
     constexpr long kYear = 365L * 86400;
     if (stream.below(16) == 1) VirtualClock::get().advance(stream.below(2) == 0 ? kYear : -kYear);
-    if (!climate.oddSettings) return;
+    if (!climate.quick) return;
+    if (stream.below(32) == 1) {  // to another home
+        kind = static_cast<Kind>(stream.below(kKinds));
+        FakeGateway::get().table = kNeighbours;
+    }
     static const Texts keys{
         "MANUAL_PORT_FORWARD", "DEFAULT_PORTS_ONLY",        "DEVICEAUTH",     "SUBDOMAIN",
         "INTERNAL_HTTP_PORT",  "MANUAL_EXTERNAL_HTTP_PORT", "SERVER_BASE_URL"};
-    otherLines = keys[stream.below(7)] + "=" + oddText();
-    writeSettings("");
-}
-
-void RandomWorld::move(Kind newKind) {
-    ++oddities;
-    kind = newKind;
-    FakeGateway::get().table = kNeighbours;
-    otherLines = kind == Kind::BY_HAND ? "MANUAL_PORT_FORWARD=TRUE" : "MANUAL_PORT_FORWARD=FALSE";
+    if (climate.oddSettings) otherLines = keys[stream.below(7)] + "=" + oddText();
     writeSettings("");
 }
 
@@ -311,8 +301,8 @@ CommandAnswer RandomWorld::run(const std::string& command) {
     event();
     const auto runs = [&](const char* part) { return holds(command, part); };
     CommandAnswer answer;
-    const bool ofGateway = runs("helper.sh") || runs("getip.sh");
-    if (shellFails || ((climate.quick || !ofGateway) && isOdd())) {
+    const bool isSteady = !climate.quick && (runs("helper.sh") || runs("getip.sh"));
+    if (shellFails || (!isSteady && isOdd())) {
         obeys = obeys && !runs("kill -");
         answer.fails = shellFails || stream.below(2) == 1;
         answer.exitStatus = 1 + static_cast<int>(stream.below(255));

@@ -44,8 +44,7 @@ struct Climate {
     unsigned noise = 0;        ///< odd answers, per mille
     unsigned changes = 0;      ///< changes of the weather, per mille of the cycles
     bool oddSettings = false;  ///< other programs write strange ones
-    /// The gateway is odd, too. One process stands for all clients of the relay, and no thread
-    /// watches a bounded call.
+    /// The gateway is odd, too, the device moves, and one process stands for all relay clients.
     bool quick = false;
 };
 
@@ -61,8 +60,6 @@ public:
     void settle() { settled = true; }
     /// What a shutdown should have removed; empty when there is nothing.
     [[nodiscard]] std::string leftOver() const;
-    /// To another home: another gateway, another way to be reached, and the settings for it.
-    void move(Kind newKind);
 
     Stream stream;
     Climate climate;

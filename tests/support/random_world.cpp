@@ -69,7 +69,7 @@ unsigned Stream::byte() {
 RandomWorld::RandomWorld(Stream decisions, Kind reachedBy, Climate typical, std::string where)
     : stream{std::move(decisions)}, climate{typical}, kind{reachedBy}, folder{std::move(where)} {
     current = this;
-    fs::copy_file("/usr/bin/tail", folder + "/openvpn", fs::copy_options::skip_existing);
+    fs::copy_file("/bin/sleep", folder + "/openvpn", fs::copy_options::skip_existing);
     std::ofstream{folder + "/minutes"} << "0\n";
     std::ofstream{folder + "/dynamicconfig.ini"} << "COMMUNICATION_STATUS=\n";
     writeStaticSettings();
@@ -330,15 +330,19 @@ void RandomWorld::startClient() {
     if (isRunning(client) && obeys) fault("a second client is started\n");
     stopClient();
     obeys = true;
-    // It ends with this process, whatever becomes of that.
-    std::string program = folder + "/openvpn", follow = "-f", device = "/dev/null",
-                owner = "--pid=" + std::to_string(getpid());
-    char* const arguments[]{program.data(), follow.data(), device.data(), owner.data(), nullptr};
-    static pid_t kept = 0;
-    const bool isKept = climate.quick && kept != 0;
-    if (!isKept && posix_spawn(&kept, program.c_str(), nullptr, nullptr, arguments, nullptr) != 0)
-        kept = 0;
-    client = kept;
+    static struct Process {
+        pid_t id = 0;
+        ~Process() {
+            if (id != 0) kill(id, SIGKILL);
+        }
+    } kept;
+    std::string program = folder + "/openvpn", seconds = "36000";  // longer than any run
+    char* const arguments[]{program.data(), seconds.data(), nullptr};
+    const bool isKept = climate.quick && kept.id != 0;
+    if (!isKept &&
+        posix_spawn(&kept.id, program.c_str(), nullptr, nullptr, arguments, nullptr) != 0)
+        kept.id = 0;
+    client = kept.id;
     if (client == 0) return;
     std::ofstream{folder + kClientOutput}
         << "Peer Connection Initiated with [AF_INET]" << kRelay << ":1194\n"

@@ -29,7 +29,9 @@ RandomWorld* current = nullptr;
 
 // The first one in @p url.
 int portIn(const std::string& url) {
-    return static_cast<int>(std::strtol(url.c_str() + url.find("port=") + 5, nullptr, 10));
+    const std::size_t at = url.find("port=");
+    if (at == std::string::npos) return 0;
+    return static_cast<int>(std::strtol(url.c_str() + at + 5, nullptr, 10));
 }
 
 bool isRunning(pid_t process) {

@@ -44,7 +44,8 @@ struct Climate {
     unsigned noise = 0;        ///< odd answers, per mille
     unsigned changes = 0;      ///< changes of the weather, per mille of the cycles
     bool oddSettings = false;  ///< other programs write strange ones
-    /// The gateway is odd, too, the device moves, and one process stands for all relay clients.
+    /// The gateway is odd, too, the device moves, one process stands for all relay clients, and no
+    /// thread watches a bounded call.
     bool quick = false;
 };
 

@@ -221,7 +221,8 @@ void RandomWorld::changeWeather() {
     if (stream.below(16) == 1) VirtualClock::get().advance(stream.below(2) == 0 ? kYear : -kYear);
     if (!climate.quick) return;
     if (stream.below(32) == 1) {  // to another home
-        kind = static_cast<Kind>(stream.below(kKinds));
+        static constexpr Kind kHomes[]{Kind::UPNP, Kind::NATPMP, Kind::BY_HAND, Kind::RELAYED};
+        kind = kHomes[stream.below(4)];
         FakeGateway::get().table = kNeighbours;
     }
     static const Texts keys{

@@ -16,6 +16,7 @@ namespace pelorus {
 
 namespace {
 
+constexpr std::size_t kPieceSize = 4096;  // bytes
 constexpr int kReading = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW;
 
 constexpr int kMostAttempts = 1000;
@@ -36,16 +37,16 @@ public:
 
 // The bytes from @p offset on, as far as they are read. Nothing, and errno set, on an error.
 std::optional<std::string> readFrom(int file, off_t offset) {
-    std::string text(kMostForeignBytes, '\0');
-    std::size_t size = 0;
-    while (size < text.size()) {
+    std::string text;
+    std::array<char, kPieceSize> piece{};  // most files are short
+    while (text.size() < kMostForeignBytes) {
         const ssize_t count =
-            pread(file, &text[size], text.size() - size, offset + static_cast<off_t>(size));
+            pread(file, piece.data(), std::min(piece.size(), kMostForeignBytes - text.size()),
+                  offset + static_cast<off_t>(text.size()));
         if (count < 0) return std::nullopt;
         if (count == 0) break;
-        size += static_cast<std::size_t>(count);
+        text.append(piece.data(), static_cast<std::size_t>(count));
     }
-    text.resize(size);
     return text;
 }
 

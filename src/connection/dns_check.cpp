@@ -50,7 +50,8 @@ bool DnsCheck::buildNames() {
         return false;
     }
     std::array<char, kHostnameSize> hostname{};
-    if (gethostname(hostname.data(), hostname.size()) != 0) {
+    // A longer name may come without its end.
+    if (gethostname(hostname.data(), hostname.size() - 1) != 0) {
         const int error = errno;
         logError("ConnectionManager::checkDNS - failed to retrieve NAS hostname, errno = %d\n",
                  error);

@@ -21,7 +21,11 @@ int __wrap_system(const char* command) {
     EXPECT_TRUE(areBlocked({SIGINT, SIGQUIT})) << "would be lost during: " << command;
     const FakeCommands::Answer answer = fake.run(command);
     if (holds(command, fake.realPart)) return __real_system(command);
-    return answer.fails ? -1 : W_EXITCODE(answer.exitStatus, 0);
+    errno = ECHILD;
+    // Where that is ignored the C library waits in vain for the shell, which has run.
+    struct sigaction child {};
+    sigaction(SIGCHLD, nullptr, &child);
+    return answer.fails || child.sa_handler == SIG_IGN ? -1 : W_EXITCODE(answer.exitStatus, 0);
 }
 
 std::FILE* __wrap_popen(const char* command, const char* mode) {
@@ -30,6 +34,7 @@ std::FILE* __wrap_popen(const char* command, const char* mode) {
     errno = EMFILE;
     if (answer.fails) return nullptr;
     std::FILE* pipe = std::tmpfile();
+    if (pipe == nullptr) return nullptr;
     std::fwrite(answer.output.data(), 1, answer.output.size(), pipe);
     std::rewind(pipe);
     return *FakeCommands::get().openPipes.insert(pipe).first;

@@ -22,6 +22,14 @@ const char* targetOf(const char* path) {
     return found == targets.end() ? path : found->second.c_str();
 }
 
+// True, and errno set, when the test wants it to fail.
+bool openFails(const char* path, bool forWriting) {
+    const auto& hook = FakeFiles::get().onOpen;
+    const int error = hook ? hook(path, forWriting) : 0;
+    if (error != 0) errno = error;
+    return error != 0;
+}
+
 bool fails(const char* call) {
     errno = EPERM;
     return FakeProcess::get().failing.count(call) != 0;
@@ -47,6 +55,7 @@ int __real_kill(pid_t pid, int signal);
 
 std::FILE* __wrap_fopen(const char* path, const char* mode) {
     checkCloseOnExec(std::strchr(mode, 'e') != nullptr, path);
+    if (openFails(path, std::strchr(mode, 'r') == nullptr)) return nullptr;
     return __real_fopen(targetOf(path), mode);
 }
 
@@ -56,6 +65,7 @@ int __wrap_open(const char* path, int flags, ...) {
     const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
     va_end(args);
     checkCloseOnExec((flags & O_CLOEXEC) != 0, path);
+    if (openFails(path, (flags & O_ACCMODE) != O_RDONLY)) return -1;
     return __real_open(targetOf(path), flags, mode);
 }
 
@@ -85,6 +95,7 @@ int __wrap_kill(pid_t pid, int signal) {
     FakeProcess& process = FakeProcess::get();
     if (pid != getpid()) return __real_kill(pid, signal);
     process.selfKills.push_back(signal);
+    if (process.onSelfKill) process.onSelfKill();
     return process.killForReal ? __real_kill(pid, signal) : 0;
 }
 }

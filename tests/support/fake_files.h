@@ -17,6 +17,8 @@ struct FakeFiles : Single<FakeFiles> {
     /// Opens @p target in place of @p path; an empty target is a missing file.
     void redirect(const std::string& path, const std::string& target) { targets[path] = target; }
 
+    /// Runs before each file is opened; other than 0 it is the errno of a failure.
+    std::function<int(const std::string& path, bool forWriting)> onOpen{};
     /// How often somebody else takes the name of a file that is unlinked.
     int replants = 0;
 
@@ -24,9 +26,10 @@ struct FakeFiles : Single<FakeFiles> {
 };
 
 struct FakeProcess : Single<FakeProcess> {
-    std::set<std::string> failing;  ///< of "fork", "setsid", "chdir"
-    std::vector<int> selfKills;     ///< signals this process sent to itself
-    bool killForReal = false;       ///< also delivers those
+    std::set<std::string> failing;       ///< of "fork", "setsid", "chdir"
+    std::vector<int> selfKills;          ///< signals this process sent to itself
+    bool killForReal = false;            ///< also delivers those
+    std::function<void()> onSelfKill{};  ///< runs before
 };
 
 }  // namespace pelorus::support

@@ -83,7 +83,8 @@ natpmpresp_t map(int type, int privatePort, int publicPort, unsigned lifetime) {
     mapping.lifetime = granted.lifetime.value_or(lifetime);
     auto& table = gateway.table;
     const auto isOld = [&](const Mapping& held) {
-        return privatePort == 0 || held.internalPort == privatePort;
+        return held.client == kDeviceAddress &&
+               (privatePort == 0 || held.internalPort == privatePort);
     };
     table.erase(std::remove_if(table.begin(), table.end(), isOld), table.end());
     if (lifetime != 0) table.push_back({mapping.mappedpublicport, kDeviceAddress, privatePort});

@@ -40,6 +40,7 @@ void __real_freeaddrinfo(addrinfo* list);
 int __wrap_getaddrinfo(const char* name, const char*, const addrinfo* hints, addrinfo** list) {
     expectTerminationHeld();
     FakeNet& net = FakeNet::get();
+    if (net.onLookup) net.onLookup(name);
     addrinfo numeric = hints != nullptr ? *hints : addrinfo{};
     numeric.ai_flags = AI_NUMERICHOST;
     *list = nullptr;

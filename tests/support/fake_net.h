@@ -28,9 +28,10 @@ struct FakeNet : Single<FakeNet> {
     bool interfacesFail = false;
     std::string hostname = "nas";
     bool hostnameFails = false;
-    std::map<std::string, Texts> names;            ///< their addresses; others are not known
-    Texts lookups;                                 ///< the names that were looked up
-    std::map<void*, std::shared_ptr<void>> lists;  ///< not yet released, by their first entry
+    std::map<std::string, Texts> names;                  ///< their addresses; others are not known
+    std::function<void(const std::string&)> onLookup{};  ///< runs before a name is looked up
+    Texts lookups;                                       ///< the names that were looked up
+    std::map<void*, std::shared_ptr<void>> lists;        ///< not yet released, by their first entry
 };
 
 }  // namespace pelorus::support

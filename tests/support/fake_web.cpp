@@ -73,7 +73,7 @@ CURLcode __wrap_curl_easy_setopt(CURL* handle, unsigned number, ...) {
 
 CURLcode __wrap_curl_easy_perform(CURL* handle) {
     expectTerminationHeld();
-    const FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
+    FakeWeb::Transfer& now = FakeWeb::get().transferOf(handle);
     if (now.url.empty()) return CURLE_URL_MALFORMAT;
     FakeWeb::Answer answer = FakeWeb::get().ask(now.url);
     constexpr std::size_t kPieceSize = 1000;  // bytes

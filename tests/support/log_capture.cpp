@@ -42,6 +42,7 @@ __attribute__((format(printf, 2, 3))) void __wrap_syslog(int priority, const cha
     va_start(args, format);
     static_cast<void>(std::vsnprintf(text.data(), text.size(), format, args));
     va_end(args);
+    if (const auto sink = LogCapture::get().sink) return sink(priority, text.data());
     LogCapture::get().take({priority, text.data()});
 }
 

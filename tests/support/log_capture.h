@@ -39,6 +39,8 @@ public:
     [[nodiscard]] std::string dump() const;
     /// Runs @p action inside every following syslog call, as a signal would.
     void onLine(std::function<void(const LogLine&)> action) { onCall(std::move(action)); }
+    /// Takes every line in place of the record, without allocating: for a signal at any moment.
+    void (*sink)(int priority, const char* text) = nullptr;
     void addSecret(const std::string& secret) { secrets.push_back(secret); }
     void take(const LogLine& line);
 

@@ -22,6 +22,7 @@ bool VirtualClock::wait(std::int64_t waitMicros, const sigset_t* mask) {
         std::abort();
     }
     if (const auto found = actions.find(asked.size()); found != actions.end()) found->second();
+    if (hook) hook(static_cast<long>(waitMicros / kMicrosPerSecond));
     const timespec moment{0, 1};  // delivers a pending signal that the mask lets in
     if (mask != nullptr && __real_ppoll(nullptr, 0, &moment, mask) != 0) return true;
     micros += waitMicros;

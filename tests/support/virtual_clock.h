@@ -33,6 +33,11 @@ public:
         actions[asked.size() + static_cast<std::size_t>(number)] = std::move(action);
     }
 
+    /// Runs @p action, with the length in seconds, as each following pause begins.
+    void onPause(std::function<void(long)> action) { hook = std::move(action); }
+    /// Forgets the lengths of the pauses so far, not the time.
+    void clear() { asked.clear(); }
+
     /// Pauses; true when a signal ended it, at once. A null mask lets none in.
     bool wait(std::int64_t waitMicros, const sigset_t* mask);
 
@@ -41,6 +46,7 @@ public:
 private:
     std::vector<long> asked;
     std::map<std::size_t, Action> actions;
+    std::function<void(long)> hook;
 };
 
 }  // namespace pelorus::support

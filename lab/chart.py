@@ -46,5 +46,12 @@ def _panel(sheet: Sheet, series: Series, top: float, unit: float) -> None:
         sheet.draw("line", x1=_LEFT, x2=_RIGHT, y1=y, y2=y, stroke=_PALE)
         sheet.write(f"{value:,.0f}", _LEFT - 8, y + 5, text_anchor="end")
     line = " ".join(f"{_LEFT + hour * unit:.1f},{base - value / most * _PANEL:.1f}"
-                    for hour, value in series.points)
+                    for hour, value in _corners(series.points))
     sheet.draw("polyline", points=line, fill="none", stroke=_LINE, stroke_width=2)
+
+
+def _corners(points: Sequence[tuple[float, float]]) -> Sequence[tuple[float, float]]:
+    """The points without those in the middle of a level stretch."""
+    around = zip([None, *points], points, [*points[1:], None])
+    return [point for before, point, after in around
+            if not before or not after or not before[1] == point[1] == after[1]]

@@ -281,8 +281,7 @@ def _limited(lab: Lab, resource: str, limit: int) -> Iterator[None]:
                             capture_output=True, text=True, check=True).stdout.strip()
     run_tool("prlimit", pid, f"--{resource}={limit}:")
     yield
-    with suppress(Exception):
-        run_tool("prlimit", pid, f"--{resource}={before}:")
+    run_tool("prlimit", pid, f"--{resource}={before}:")
 
 
 @contextmanager

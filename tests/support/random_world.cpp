@@ -344,19 +344,17 @@ void RandomWorld::startClient() {
     if (isRunning(client) && obeys) fault("a second client is started\n");
     stopClient();
     obeys = true;
-    static struct Process {
-        pid_t id = 0;
-        ~Process() {
-            if (id != 0) kill(id, SIGKILL);
-        }
-    } kept;
+    static pid_t kept = 0;
+    static const int endsWithUs = std::atexit([] {
+        if (kept > 0) kill(kept, SIGKILL);
+    });
+    EXPECT_EQ(endsWithUs, 0);
     std::string program = folder + "/openvpn", seconds = "36000";  // longer than any run
     char* const arguments[]{program.data(), seconds.data(), nullptr};
-    const bool isKept = climate.quick && kept.id != 0;
-    if (!isKept &&
-        posix_spawn(&kept.id, program.c_str(), nullptr, nullptr, arguments, nullptr) != 0)
-        kept.id = 0;
-    client = kept.id;
+    const bool isKept = climate.quick && kept != 0;
+    if (!isKept && posix_spawn(&kept, program.c_str(), nullptr, nullptr, arguments, nullptr) != 0)
+        kept = 0;
+    client = kept;
     if (client == 0) return;
     std::ofstream{folder + kClientOutput}
         << "Peer Connection Initiated with [AF_INET]" << kRelay << ":1194\n"

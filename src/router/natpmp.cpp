@@ -20,6 +20,7 @@ namespace {
 
 constexpr int kMaxReads = 3;
 constexpr int kSelectDescriptors = FD_SETSIZE;
+constexpr ssize_t kRefusalSize = 8;
 constexpr ssize_t kAddressAnswerSize = 12;
 constexpr ssize_t kMappingAnswerSize = 16;
 
@@ -67,7 +68,8 @@ int peekAnswer(const natpmp_t& client) {
         return 0;
     }
     const bool isMapping = client.pending_request[1] != 0;
-    if (size >= (isMapping ? kMappingAnswerSize : kAddressAnswerSize)) return 0;
+    const bool isRefusal = size >= kRefusalSize && (answer[2] != 0 || answer[3] != 0);
+    if (isRefusal || size >= (isMapping ? kMappingAnswerSize : kAddressAnswerSize)) return 0;
     errno = EBADMSG;
     return NATPMP_ERR_UNDEFINEDERROR;
 }

@@ -311,7 +311,9 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
     const long next = gateway.onTheWay.empty() ? end : gateway.onTheWay.begin()->first;
     gateway.natpmpTime = std::clamp(next, gateway.natpmpTime, end);
     if (hasArrived() && gateway.truncated) {
-        send(gatewaySocket, std::array<char, 16>{}.data(), *gateway.truncated, 0);
+        std::array<char, 16> answer{};
+        answer[3] = static_cast<char>(gateway.onTheWay.begin()->second.resultcode);
+        send(gatewaySocket, answer.data(), *gateway.truncated, 0);
     }
     return hasArrived() ? 1 : 0;
 }

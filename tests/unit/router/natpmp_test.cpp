@@ -99,7 +99,14 @@ TEST_F(NatpmpTest, AnAnswerWithoutAllItsValuesIsAnError) {
         gateway.truncated = size;
         EXPECT_FALSE(client.retrieveExternalIP(ip) || map(80, 9091)) << size;
     }
-    EXPECT_EQ(log.countPart("errno " + std::to_string(EBADMSG) + "\n"), 6);
+    const std::string incomplete = "errno " + std::to_string(EBADMSG) + "\n";
+    EXPECT_EQ(log.countPart(incomplete), 6);
+    gateway.refused.insert(9091);
+    gateway.truncated = 8;
+    errno = 0;
+    EXPECT_FALSE(map(80, 9091));
+    EXPECT_EQ(log.countPart(incomplete), 6) << "a refusal has no values";
+    gateway.refused.clear();
     gateway.truncated = 12;
     EXPECT_TRUE(client.retrieveExternalIP(ip) && !map(80, 9091));
     EXPECT_EQ(gateway.natpmpTime, 0);

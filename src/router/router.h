@@ -51,8 +51,8 @@ public:
 
     /// Looks for the gateway again. True when one answered with its external address; until then
     /// the mapping operations fail. On failure the addresses of an earlier discovery are kept.
-    /// When the stop budget cuts it short, so is its gateway, and the result is true. Takes some
-    /// seconds.
+    /// When the stop budget cuts it short, an earlier gateway is kept, too, and the result is true.
+    /// Takes some seconds.
     bool discover();
     /// Chooses the device's LAN address from its interfaces; IPv4 before IPv6, and the address in
     /// use stays as long as an interface has it.

@@ -156,7 +156,7 @@ void RandomWorld::takeLine(int /*priority*/, const char* text) {
     static const bool shown = std::getenv("WORLD_LOG") != nullptr;
     if (shown) static_cast<void>(!write(STDERR_FILENO, text, std::strlen(text)));
     for (const char* secret : {kDeviceId, kDeviceAuth, kSubdomain}) {
-        if (std::strstr(text, secret) != nullptr) fault(text);
+        if (current->ownSecrets && std::strstr(text, secret) != nullptr) fault(text);
     }
     if (std::strncmp(text, "sigTrap - sigConnKilled", 23) == 0) current->settle();
     current->event();
@@ -229,6 +229,8 @@ void RandomWorld::changeWeather() {
         "MANUAL_PORT_FORWARD", "DEFAULT_PORTS_ONLY",        "DEVICEAUTH",     "SUBDOMAIN",
         "INTERNAL_HTTP_PORT",  "MANUAL_EXTERNAL_HTTP_PORT", "SERVER_BASE_URL"};
     if (climate.oddSettings) otherLines = keys[stream.below(7)] + "=" + oddText();
+    ownSecrets =
+        ownSecrets && !holds(otherLines, "DEVICEAUTH=") && !holds(otherLines, "SUBDOMAIN=");
     writeSettings("");
 }
 

@@ -97,6 +97,7 @@ private:
     std::string folder, wan = "44.128.0.20";
     std::atomic<bool> settled{false};
     std::string otherLines;  // settings that other programs wrote
+    bool ownSecrets = true;  // they left the secrets alone
     std::set<int> reached;   // ports that passed a test
     bool obeys = true;       // no signal to the client was lost
     Texts helperList;        // of the maker's router

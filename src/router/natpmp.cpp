@@ -59,13 +59,14 @@ void waitForAnswer(int socket, timeval timeout) {
 
 // 0 when the library may read from the socket of @p client, else the status in its place. The
 // library does not look at the length of an answer: what a short one lacks would be whatever the
-// stack held before. Such an answer fails with EBADMSG.
+// stack held before. Such an answer fails with EBADMSG. A failure of the socket is reported only
+// once, here.
 int peekAnswer(const natpmp_t& client) {
     std::array<char, kMappingAnswerSize> answer{};
     const ssize_t size = recv(client.s, answer.data(), answer.size(), MSG_PEEK | MSG_DONTWAIT);
     if (size < 0) {
-        if (errno == ECONNREFUSED) return NATPMP_ERR_NOGATEWAYSUPPORT;  // reported only once
-        return 0;
+        if (errno == EAGAIN) return 0;
+        return errno == ECONNREFUSED ? NATPMP_ERR_NOGATEWAYSUPPORT : NATPMP_ERR_RECVFROM;
     }
     const bool isMapping = client.pending_request[1] != 0;
     const bool isRefusal = size >= kRefusalSize && (answer[2] != 0 || answer[3] != 0);

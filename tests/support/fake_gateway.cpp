@@ -97,9 +97,8 @@ void transmit(natpmp_t* client) {
     ++client->try_number;
     gateway.connectionRefused = !gateway.natpmp;
     if (!gateway.natpmp || gateway.silent) return;
-    const long arrival = std::max(gateway.natpmpTime + gateway.answerDelay, gateway.hungUntil);
     for (int copy = 0; copy < gateway.copies; ++copy) {
-        gateway.onTheWay.emplace(arrival, gateway.pending);
+        gateway.onTheWay.emplace(gateway.natpmpTime + gateway.answerDelay, gateway.pending);
     }
 }
 

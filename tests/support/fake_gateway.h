@@ -77,7 +77,6 @@ public:
 
     bool silent = false;   ///< requests from now on are lost
     long answerDelay = 0;  ///< requests are answered so much later
-    long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
     int copies = 1;        ///< of each answer
     /// Bytes of each answer that arrive, if not all.

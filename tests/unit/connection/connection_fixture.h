@@ -123,13 +123,6 @@ public:
         ASSERT_EQ(posix_spawn(&client, program.c_str(), nullptr, nullptr, arguments, nullptr), 0);
         writeFile("client.pid", std::to_string(client) + "\n");
     }
-    /// The device is the maker's router; an empty @p wan: without a connection.
-    void givenMakersRouter(const std::string& list, const std::string& wan = kWanIp) {
-        setConfig("DEVICETYPE", "5");
-        commands.answer("getip.sh wan", wan);
-        commands.answer("getip.sh lan", "192.168.77.1\n");
-        commands.answer("tavik_helper.sh list", list);
-    }
     /// The next test of @p port fails, with all its attempts.
     void failTest(int port) {
         const std::string part = ":" + std::to_string(port) + "&HTTP&";

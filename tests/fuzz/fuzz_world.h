@@ -10,6 +10,7 @@
 #include <fstream>
 
 #include "config/global_config.h"
+#include "support/fake_files.h"
 #include "support/fake_gateway.h"
 #include "support/fake_web.h"
 #include "support/fixture.h"
@@ -71,6 +72,8 @@ inline void begin(const char* deviceType) {
     support::FakeNet::get().reset();
     support::FakeGateway::get().reset();
     support::FakeWeb::get().reset();
+    // A watcher for each library call would take most of the time; the fakes answer at once.
+    support::FakeProcess::get().startsThreads = false;
     auto* config = GlobalConfig::getInstance();
     config->setProperty("DEVICETYPE", deviceType, false);
     log.addSecret(config->setProperty("DEVICEID", kDeviceId, false));

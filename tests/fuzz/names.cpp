@@ -3,7 +3,6 @@
 #include "cloud/tavik_client.h"
 #include "connection/connection_manager.h"
 #include "fuzz_world.h"
-#include "unwatched.h"
 
 // The server's base URL, the host name and the address that the names have.
 void pelorus::fuzz::tryText(const std::string& text) {

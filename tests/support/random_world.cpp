@@ -63,17 +63,6 @@ constexpr auto resetFakes = resetEach<FakeGateway,
 
 }  // namespace
 
-// How the linker calls the start of a std::thread.
-#define START_THREAD(prefix) \
-    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
-extern "C" {
-void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
-void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
-    const bool watches = current == nullptr || !current->climate.quick;
-    if (watches) START_THREAD(__real_)(thread, state, depend);
-}
-}
-
 unsigned Stream::byte() {
     if (generator) return (*generator)() & 0xffU;
     return next < bytes.size() ? bytes[next++] : 0U;
@@ -150,6 +139,7 @@ void RandomWorld::takeFakes() {
         return atOpen(writing);
     };
     LogCapture::get().sink = takeLine;
+    FakeProcess::get().startsThreads = !climate.quick;
 }
 
 void RandomWorld::takeLine(int /*priority*/, const char* text) {

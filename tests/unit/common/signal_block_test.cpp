@@ -7,8 +7,6 @@ namespace {
 
 using SignalBlockTest = PelorusTest;  // checks that the mask is restored
 
-volatile std::sig_atomic_t delivered = 0;
-
 TEST_F(SignalBlockTest, DiscardsBrokenPipeSignalsExceptThoseAlreadyPending) {
     {
         const BrokenPipeGuard outer;

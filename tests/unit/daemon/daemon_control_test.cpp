@@ -1,8 +1,5 @@
 #include "daemon/daemon_control.h"
 
-#include "common/log.h"
-#include "common/stop_budget.h"
-#include "common/termination.h"
 #include "daemon/signals.h"
 #include "daemon_fixture.h"
 

@@ -44,23 +44,6 @@ bool isRunning(pid_t process) {
     std::abort();
 }
 
-template <class... Fakes>
-void clearEach() {
-    (Fakes::get().clear(), ...);
-}
-template <class... Fakes>
-void resetEach() {
-    (Fakes::get().reset(), ...);
-}
-constexpr auto resetFakes = resetEach<FakeGateway,
-                                      FakeWeb,
-                                      FakeCommands,
-                                      VirtualClock,
-                                      FakeNet,
-                                      FakeFiles,
-                                      FakeProcess,
-                                      LogCapture>;
-
 }  // namespace
 
 unsigned Stream::byte() {
@@ -190,7 +173,10 @@ void RandomWorld::turn(long seconds) {
     event();
     if (seconds < kShortestCycle) return;
     ++cycles;
-    clearEach<FakeGateway, FakeWeb, FakeCommands, VirtualClock>();
+    FakeGateway::get().clear();
+    FakeWeb::get().clear();
+    FakeCommands::get().clear();
+    VirtualClock::get().clear();
     FakeNet::get().lookups.clear();
     FakeNet::get().names.clear();
     if (!settled && stream.chance(climate.changes)) changeWeather();

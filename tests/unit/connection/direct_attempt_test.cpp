@@ -26,8 +26,13 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
             w.setConfig("INTERNAL_HTTPS_PORT", "");
             w.setConfig("MANUAL_PORT_FORWARD", "true");
         }, {"unmap 0 0, connecting, map 9091 -> LAN:80 Kavra, test 9091, map 9444 -> LAN:443 KavraSSL, "
-            "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, " + kReported + kForwarded}}), RowName{});
+            "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, " + kReported + kForwarded}},
+    Row{"UnpublishedMappingIsKeptAndTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
+        {"unmap 0 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, " +
+         relayFails() + ", status failed, lanip = 9091 9444 failed", kMapAndPublish + ", " + kReported + kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
+    Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
+        {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},
     Row{"IgnoresDiskAndIntervalWhenForced", [](World& w) { w.diskIsAsleep(); w.manager().setForceConnect(true); },
         {"force 1, connecting, test 9091, connected" + kForwarded, "connecting, test 9091, connected" + kForwarded}},
     Row{"SearchesAgainAfterAFailedRetest", [](World& w) {

@@ -6,12 +6,12 @@ namespace {
 class ForwardSearchTest : public ConnectionTest {
 protected:
     // Finds the gateway and searches a port on it.
-    std::string search(bool checkSleep = true) {
+    std::string search(bool defaultPortsOnly = false, bool checkSleep = true) {
         std::string ip;
         EXPECT_EQ(manager().fetchLocalDeviceDomainIPAddr(PORTFORWARDED, ip), 1);
         forget();
-        return std::to_string(
-            manager().forwardPort(8080, 9091, 9092, kWanIp, HTTP, "Kavra", false, checkSleep));
+        return std::to_string(manager().forwardPort(8080, 9091, 9092, kWanIp, HTTP, "Kavra",
+                                                    defaultPortsOnly, checkSleep));
     }
 };
 
@@ -31,7 +31,16 @@ TEST_F(ForwardSearchTest, TestsThreeCandidatesAndRemembersThemUntilItMayWakeTheD
               "map 9093, disk, test 9093 x3, unmap 9093, exceeded = 0");
     web.answer("/test?", passed());
     EXPECT_EQ(story(search()), "unmap 0 0, map 9094, disk, test 9094 = 9094 9094");
-    EXPECT_EQ(story(search(false)), "map 9091, test 9091 = 9094 9091 9091");
+    EXPECT_EQ(story(search(false, false)), "map 9091, test 9091 = 9094 9091 9091");
+}
+
+TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOtherAndRemembers99BadPorts) {
+    gateway.refused.insert(9091);
+    EXPECT_EQ(story(search(true)), "map 9091, map 9091, map 9091 = 0");
+    for (int round = 1; round < 34; ++round) search(true);
+    EXPECT_EQ(log.countPart("Cleared bad port vector"), 0);  // the last one found 99
+    search(true);
+    EXPECT_EQ(log.countPart("Cleared bad port vector"), 1);
 }
 
 TEST_F(ForwardSearchTest, DoubleNatAtAPredefinedPortReturnsTheRelayValue) {

@@ -164,7 +164,7 @@ int __wrap_UPNP_GetValidIGD(UPNPDev* list, UPNPUrls* urls, IGDdatas* data,
     gateway.note(line);
     if (gateway.igdState == 0) return 0;
     ++gateway.urlSets;
-    urls->controlURL = strdup(gateway.described ? kControlUrl : "http://192.168.77.1:5000/other");
+    urls->controlURL = strdup(kControlUrl);
     fill(data->first.servicetype, sizeof data->first.servicetype, kServiceType);
     fill(lanAddress, static_cast<std::size_t>(size), kDeviceAddress);
     const bool shifted = MINIUPNPC_API_VERSION >= 18 && gateway.igdState >= 2;

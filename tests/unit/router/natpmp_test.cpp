@@ -115,5 +115,31 @@ TEST_F(NatpmpTest, ARemovalForgetsTheMappingOfItsInternalPort) {
                      "natpmp map TCP 0 -> 80 for 0 s", "natpmp map TCP 0 -> 0 for 0 s"}));
 }
 
+TEST_F(NatpmpTest, TheGrantWinsOverTheRequest) {
+    gateway.granted = {40000, 81, 600};
+    ASSERT_TRUE(map(443, 9444, true));
+    EXPECT_EQ(port, 40000);
+    once("req_internal_port 443, resp_internal_port 81, external_port 40000");
+    once(
+        "setting HTTPS PMTracker params.   internalPort[443], mappedExternalPort[40000], lifetime[600]");
+    gateway.granted = {{}, {}, 600};
+    ASSERT_TRUE(map(80, 9091));
+    client.setReqPortMappingLifetime(7200);
+    gateway.clear();
+    clock.advance(300);
+    client.CheckExpiredMappings();
+    EXPECT_EQ(gateway.calls(), Texts{});
+    clock.advance(1);
+    client.renewPortMapping("HTTPS");
+    client.CheckExpiredMappings();  // the first one starts a new half, the other is still due
+    EXPECT_EQ(gateway.calls("natpmp map"), (Texts{"natpmp map TCP 40000 -> 443 for 7200 s",
+                                                  "natpmp map TCP 9091 -> 80 for 7200 s"}));
+    gateway.granted = {};
+    EXPECT_TRUE(client.unmapAllPorts("TCP", "Kavra"));
+    clock.advance(1);
+    client.CheckExpiredMappings();
+    EXPECT_EQ(gateway.count("natpmp map TCP 0 -> 0 for 7200 s"), 2);
+}
+
 }  // namespace
 }  // namespace pelorus

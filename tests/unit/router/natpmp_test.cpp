@@ -21,6 +21,15 @@ protected:
     std::string ip = "old";
 };
 
+TEST_F(NatpmpTest, OnlyAnOpenClientIsClosed) {
+    {
+        CMnatpmp other;
+        EXPECT_TRUE(other.close() && other.init() && other.init() && other.close() && other.init());
+    }
+    EXPECT_EQ(gateway.calls(),
+              (Texts{"natpmp open", "natpmp close", "natpmp open", "natpmp close"}));
+}
+
 TEST_F(NatpmpTest, EachRequestHasASocketOfItsOwn) {
     gateway.silent = true;
     EXPECT_FALSE(client.retrieveExternalIP(ip));

@@ -1,9 +1,8 @@
 // What servers and the disk answer, in whole exchanges: every reader is given the same text.
+#include "cloud/port_test_answer.h"
 #include "cloud/public_address.h"
 #include "cloud/tavik_client.h"
 #include "fuzz_world.h"
-#include "support/fake_files.h"
-#include "unwatched.h"
 
 namespace {
 
@@ -22,9 +21,22 @@ void receiveInPieces(std::string text) {
     std::free(buffer.data);  // NOLINT(*-no-malloc): allocated by curlRcvData
 }
 
+// The positions go into the log; the addresses themselves are what stands between them.
+void readPortTest(const std::string& text) {
+    const pelorus::PortTestAnswer test = pelorus::readPortTestAnswer(text);
+    for (const auto& part : {test.remoteAddress, test.testedAddress}) {
+        if (!part || part->text.empty()) continue;
+        assert(text.substr(part->start, part->end - part->start) == part->text);
+    }
+    for (const auto& device : {test.requestedDevice, test.respondingDevice}) {
+        assert(pelorus::support::holds(text, device));
+    }
+}
+
 }  // namespace
 
 void pelorus::fuzz::tryText(const std::string& text) {
+    readPortTest(text);
     begin("3");
     auto& config = *GlobalConfig::getInstance();
     config.setProperty("SERVER_BASE_URL", "https://web.kavra.example", false);

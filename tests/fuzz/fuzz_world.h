@@ -10,6 +10,7 @@
 #include <fstream>
 
 #include "config/global_config.h"
+#include "support/fake_files.h"
 #include "support/fake_gateway.h"
 #include "support/fake_web.h"
 #include "support/fixture.h"
@@ -63,14 +64,11 @@ struct TemporaryFile {
 /// Begins an input with empty records, on a device of the given type.
 inline void begin(const char* deviceType) {
     GTEST_FLAG_SET(break_on_failure, true);  // the fakes' own checks end the run, too
+    support::resetFakes();
     auto& log = support::LogCapture::get();
-    log.reset();
     log.onLine(checkLine);
-    support::VirtualClock::get().reset();
-    support::FakeCommands::get().reset();
-    support::FakeNet::get().reset();
-    support::FakeGateway::get().reset();
-    support::FakeWeb::get().reset();
+    // A watcher for each library call would take most of the time; the fakes answer at once.
+    support::FakeProcess::get().startsThreads = false;
     auto* config = GlobalConfig::getInstance();
     config->setProperty("DEVICETYPE", deviceType, false);
     log.addSecret(config->setProperty("DEVICEID", kDeviceId, false));

@@ -2,7 +2,6 @@
 #include "common/text.h"
 #include "fuzz_world.h"
 #include "router/router.h"
-#include "unwatched.h"
 
 // Three numbers, the address, seven texts of a mapping, the address of another interface, then URLs
 // and search targets.

@@ -23,6 +23,8 @@ void pelorus::fuzz::tryText(const std::string& text) {
     auto& client = *VPNManager::getInstance();
     std::string ip;
     assert(client.fetchOpenVPN_IPAddr(ip) != ip.empty());
+    // Numbers above 255 are passed on as they stand; other characters are not.
+    assert(ip.empty() || std::count(ip.begin(), ip.end(), '.') == 3);
     assert(ip.find_first_not_of("0123456789.") == std::string::npos);
     auto& commands = support::FakeCommands::get();
     commands.answer("kill", "", static_cast<int>(text.size() % 2));

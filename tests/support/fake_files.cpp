@@ -91,6 +91,14 @@ int __wrap_chdir(const char* path) {
     return fails("chdir") ? -1 : __real_chdir(path);
 }
 
+// How the linker calls the start of a std::thread.
+#define START_THREAD(prefix) \
+    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
+void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
+void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
+    if (FakeProcess::get().startsThreads) START_THREAD(__real_)(thread, state, depend);
+}
+
 int __wrap_kill(pid_t pid, int signal) {
     FakeProcess& process = FakeProcess::get();
     if (pid != getpid()) return __real_kill(pid, signal);

@@ -1,5 +1,5 @@
-// Files and process of a test: fopen, open, unlink, fork, setsid, chdir and kill. Most go straight through
-// to libc. A file opened without close-on-exec fails the test: a child process would inherit it.
+// Files and process of a test: fopen, open, unlink, fork, setsid, chdir, kill and std::thread. Most go
+// straight through. A file opened without close-on-exec fails the test: a child process would inherit it.
 #ifndef PELORUS_SUPPORT_FAKE_FILES_H
 #define PELORUS_SUPPORT_FAKE_FILES_H
 
@@ -28,6 +28,7 @@ struct FakeFiles : Single<FakeFiles> {
 struct FakeProcess : Single<FakeProcess> {
     std::set<std::string> failing;       ///< of "fork", "setsid", "chdir"
     std::vector<int> selfKills;          ///< signals this process sent to itself
+    bool startsThreads = true;           ///< off: a std::thread does nothing
     bool killForReal = false;            ///< also delivers those
     std::function<void()> onSelfKill{};  ///< runs before
 };

@@ -97,9 +97,8 @@ void transmit(natpmp_t* client) {
     ++client->try_number;
     gateway.connectionRefused = !gateway.natpmp;
     if (!gateway.natpmp || gateway.silent) return;
-    const long arrival = std::max(gateway.natpmpTime + gateway.answerDelay, gateway.hungUntil);
     for (int copy = 0; copy < gateway.copies; ++copy) {
-        gateway.onTheWay.emplace(arrival, gateway.pending);
+        gateway.onTheWay.emplace(gateway.natpmpTime + gateway.answerDelay, gateway.pending);
     }
 }
 
@@ -165,7 +164,7 @@ int __wrap_UPNP_GetValidIGD(UPNPDev* list, UPNPUrls* urls, IGDdatas* data,
     gateway.note(line);
     if (gateway.igdState == 0) return 0;
     ++gateway.urlSets;
-    urls->controlURL = strdup(gateway.described ? kControlUrl : "http://192.168.77.1:5000/other");
+    urls->controlURL = strdup(kControlUrl);
     fill(data->first.servicetype, sizeof data->first.servicetype, kServiceType);
     fill(lanAddress, static_cast<std::size_t>(size), kDeviceAddress);
     const bool shifted = MINIUPNPC_API_VERSION >= 18 && gateway.igdState >= 2;

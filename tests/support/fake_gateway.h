@@ -73,11 +73,9 @@ public:
          "urn:schemas-upnp-org:device:InternetGatewayDevice:1"}};
     /// The library's choice: 0 none, 1 connected, 2 not connected, 3 no gateway.
     int igdState = 1;
-    bool described = true;  ///< off: the description leads to a wrong control URL
 
     bool silent = false;   ///< requests from now on are lost
     long answerDelay = 0;  ///< requests are answered so much later
-    long hungUntil = 0;    ///< what comes before this time is answered at it
     long natpmpTime = 0;   ///< spent waiting for answers
     int copies = 1;        ///< of each answer
     /// Bytes of each answer that arrive, if not all.

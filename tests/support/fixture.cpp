@@ -6,6 +6,7 @@
 #include <stdexcept>
 
 #include "config/global_config.h"
+#include "support/fake_files.h"
 #include "support/fake_gateway.h"
 #include "support/fake_web.h"
 
@@ -26,6 +27,17 @@ std::ptrdiff_t openDescriptors() {
 }
 
 }  // namespace
+
+void resetFakes() {
+    FakeGateway::get().reset();
+    FakeWeb::get().reset();
+    FakeCommands::get().reset();
+    VirtualClock::get().reset();
+    FakeNet::get().reset();
+    FakeFiles::get().reset();
+    FakeProcess::get().reset();
+    LogCapture::get().reset();
+}
 
 PelorusTest::PelorusTest() : folder{makeFolder()}, descriptorsAtStart{openDescriptors()} {
     FakeGateway::get().reset();

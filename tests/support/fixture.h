@@ -17,6 +17,9 @@ inline constexpr const char* kDeviceId = "device-7350142";
 inline constexpr const char* kDeviceAuth = "auth-91c2f0aa";
 inline constexpr const char* kSubdomain = "homecloud-smith";
 
+/// Puts every fake back into its first state, without records, rules and hooks.
+void resetFakes();
+
 class PelorusTest : public ::testing::Test {
 protected:
     using Settings = std::map<std::string, std::string>;

@@ -23,15 +23,11 @@ std::string LogCapture::dump() const {
 }
 
 void LogCapture::take(const LogLine& line) {
-    EXPECT_FALSE(taking) << "sent while another line held the log: " << line.text;
-    if (taking) return;
     for (const std::string& secret : secrets) {
         if (secret.size() < 3) continue;  // turns up in ordinary words
         EXPECT_FALSE(holds(line, secret)) << secret << " in: " << line.text;
     }
-    taking = true;
     note(line);
-    taking = false;
 }
 
 extern "C" {

@@ -26,8 +26,8 @@ inline bool holds(const LogLine& line, const std::string& part) {
     return holds(line.text, part);
 }
 
-/// A line that holds a secret fails the test. So does one that is sent while another is being
-/// sent: with the real log it would wait for a lock forever.
+/// Fails the test on a line that holds a secret, or while a termination signal could come: the
+/// handler's own line would wait for the log's lock forever.
 class LogCapture : public Single<LogCapture>, public Calls<LogLine> {
 public:
     [[nodiscard]] const Lines& lines() const { return calls(); }
@@ -48,7 +48,6 @@ public:
 
 private:
     Texts secrets;
-    bool taking = false;
 };
 
 /// Fails unless the lines are exactly these.

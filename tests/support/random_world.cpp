@@ -44,35 +44,7 @@ bool isRunning(pid_t process) {
     std::abort();
 }
 
-template <class... Fakes>
-void clearEach() {
-    (Fakes::get().clear(), ...);
-}
-template <class... Fakes>
-void resetEach() {
-    (Fakes::get().reset(), ...);
-}
-constexpr auto resetFakes = resetEach<FakeGateway,
-                                      FakeWeb,
-                                      FakeCommands,
-                                      VirtualClock,
-                                      FakeNet,
-                                      FakeFiles,
-                                      FakeProcess,
-                                      LogCapture>;
-
 }  // namespace
-
-// How the linker calls the start of a std::thread.
-#define START_THREAD(prefix) \
-    prefix##_ZNSt6thread15_M_start_threadESt10unique_ptrINS_6_StateESt14default_deleteIS1_EEPFvvE
-extern "C" {
-void START_THREAD(__real_)(void* thread, void* state, void (*depend)());
-void START_THREAD(__wrap_)(void* thread, void* state, void (*depend)()) {
-    const bool watches = current == nullptr || !current->climate.quick;
-    if (watches) START_THREAD(__real_)(thread, state, depend);
-}
-}
 
 unsigned Stream::byte() {
     if (generator) return (*generator)() & 0xffU;
@@ -150,6 +122,7 @@ void RandomWorld::takeFakes() {
         return atOpen(writing);
     };
     LogCapture::get().sink = takeLine;
+    FakeProcess::get().startsThreads = !climate.quick;
 }
 
 void RandomWorld::takeLine(int /*priority*/, const char* text) {
@@ -200,7 +173,10 @@ void RandomWorld::turn(long seconds) {
     event();
     if (seconds < kShortestCycle) return;
     ++cycles;
-    clearEach<FakeGateway, FakeWeb, FakeCommands, VirtualClock>();
+    FakeGateway::get().clear();
+    FakeWeb::get().clear();
+    FakeCommands::get().clear();
+    VirtualClock::get().clear();
     FakeNet::get().lookups.clear();
     FakeNet::get().names.clear();
     if (!settled && stream.chance(climate.changes)) changeWeather();

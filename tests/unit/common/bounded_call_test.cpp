@@ -71,26 +71,6 @@ TEST_F(BoundedCallTest, AWaitWithinTheBoundsGoesOn) {
     close(client);
 }
 
-// Its queue is never empty, so that a shutdown alone would not end it.
-TEST_F(BoundedCallTest, AFloodEndsWithTheTimeOfTheCallOrItsBytes) {
-    const int sender = socket(AF_INET, SOCK_DGRAM, 0);
-    for (const int seconds : {0, 3600}) {
-        const BoundedCall bounds{Peer::ANYBODY, seconds};
-        const int receiver = socket(AF_INET, SOCK_DGRAM, 0);
-        bindToLoopback(receiver);
-        char letters[1000] = {};
-        long total = 0;
-        for (ssize_t received = 1; received > 0; total += received) {
-            sendto(sender, letters, sizeof letters, 0, target, size);
-            sendto(sender, letters, sizeof letters, 0, target, size);
-            received = recvfrom(receiver, letters, sizeof letters, 0, nullptr, nullptr);
-        }
-        EXPECT_LE(total, BoundedCall::kMostReceived + 1000);
-        close(receiver);
-    }
-    close(sender);
-}
-
 TEST_F(BoundedCallTest, WithoutAThreadToWatchItNothingIsReceived) {
     pthread_attr_t usual;
     pthread_getattr_default_np(&usual);

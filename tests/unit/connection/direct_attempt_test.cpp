@@ -29,35 +29,10 @@ INSTANTIATE_TEST_SUITE_P(Worlds, FirstDirectAttempt, testing::Values(
             "record WAN&LAN&9091&9444, tell WAN&9091&9444&LAN&80, " + kReported + kForwarded}},
     Row{"UnpublishedMappingIsKeptAndTriedAgain", [](World& w) { w.web.answerOnce("/forward?", FakeWeb::noAnswer()); },
         {"unmap 0 0, connecting, map 9091, test 9091, map 9444 SSL, record WAN&LAN&9091&9444, failed, " +
-         relayFails() + ", status failed, lanip = 9091 9444 failed", kMapAndPublish + ", " + kReported + kForwarded}},
-    // No port was tested yet: the time elapsed is that since the epoch.
-    Row{"MakersRouterWithoutWanReportsFailed", [](World& w) { w.givenMakersRouter("", ""); },
-        {"status failed, elapsed 1700000001, " + relayFails("192.168.77.1") + " = failed"}},
-    Row{"MakersRouterMapsThroughItsScript",
-        [](World& w) { w.givenMakersRouter("OTHER,TCP,9091,192.168.77.66,80,web\n"); w.failTest(9092); },
-        {"connecting, check 9091, range 9092, add \"TCP,9092,192.168.77.1,8080,Kavra\", test 9092 x3, status failed, "
-         "remove \"TCP,9092,192.168.77.1,8080\", next port, check 9091, range 9093, "
-         "add \"TCP,9093,192.168.77.1,8080,Kavra\", test 9093, check 9444, "
-         "add \"TCP,9444,192.168.77.1,8443,KavraSSL\", " + publish(9093, 9444, "WAN", "192.168.77.1") +
-         ", " + kReported + " = portforwarded", "disk, test 9093 = portforwarded"}},
-    Row{"PredefinedPortsOfTheMakersRouterComeFirst", [](World& w) {
-            w.givenMakersRouter("OTHER,TCP,6000-6001,192.168.77.1,8888,other\n"
-                "OTHER,TCP,7000-7001,192.168.77.1,8080,web\nOTHER,TCP,1,192.168.77.1,8443,web\n");
-            w.failTest(7000);
-        }, {"connecting, test 7000 x3, status failed, test 7001, " + publish(7001, 1, "WAN", "192.168.77.1") +
-            ", " + kReported + " = portforwarded", "disk, test 7001 = portforwarded"}},
-    Row{"LeavesAPortOnlyWhereTheDefaultIsWanted", [](World& w) {
-            w.gateway.refused = {9091};
-            w.cycle();
-            w.cycle();  // from then on no address counts as new
-            w.gateway.refused.clear();
-            w.setConfig("DEFAULT_PORTS_ONLY", "TRUE");
-            w.forget();
-        }, {"unmap 9092 9444 = portforwarded"}}), RowName{});
+         relayFails() + ", status failed, lanip = 9091 9444 failed", kMapAndPublish + ", " + kReported + kForwarded}}), RowName{});
 INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
     Row{"RenewsMappingsPastHalfOfTheirLease", [](World& w) { w.clock.advance(360); },
         {"map 9091 -> LAN:8080 , map 9444 -> LAN:8443 , disk, test 9091" + kForwarded}},
-    Row{"LetsTheDiskSleep", [](World& w) { w.diskIsAsleep(); }, {"disk" + kForwarded, "disk" + kForwarded}},
     Row{"IgnoresDiskAndIntervalWhenForced", [](World& w) { w.diskIsAsleep(); w.manager().setForceConnect(true); },
         {"force 1, connecting, test 9091, connected" + kForwarded, "connecting, test 9091, connected" + kForwarded}},
     Row{"SearchesAgainAfterAFailedRetest", [](World& w) {
@@ -73,18 +48,11 @@ INSTANTIATE_TEST_SUITE_P(Worlds, LaterDirectAttempt, testing::Values(
             w.commands.answer("hdparm", {"active/idle\n", 0, false, change});
         }, {"disk, test 9091 x3, status failed, connecting, map 9091, test 44.128.0.77:9091, map 9444 SSL, " +
             publish(9091, 9444, "44.128.0.77") + ", " + kReported + kForwarded}},
-    Row{"DoubleNatAtARetestGoesToTheRelay", [](World& w) { w.relayWorks(); w.web.answer("/test?", kOtherNat); },
-        {"disk, test 9091, " + relayStarts() + " = 9091 9444 relayed"}},
     Row{"DoubleNatAtASearchLeavesTheHttpsPort",
         [](World& w) { w.failTest(9091); w.manager().setForceConnect(true); w.web.answer("/test?", kOtherNat); },
         {"force 1, connecting, test 9091 x3, status failed, failed, connecting, map 9091, test 9091, unmap 9091, "
          "failed, " + relayFails() + " = 9444 failed",
          "connecting, map 9091, test 9091, unmap 9091, failed, " + relayFails() + " = 9444 failed"}},
-    // An address change is worth waking the disk.
-    Row{"MapsAnewForANewLanAddress", [](World& w) { w.diskIsAsleep(); w.net.interfaces = {{"eth0", "192.168.77.11"}}; },
-        {"unmap 9091 9444, connecting, map 9091 -> 192.168.77.11:8080 Kavra, test 9091, "
-         "map 9444 -> 192.168.77.11:8443 KavraSSL, " + publish(9091, 9444, "WAN", "192.168.77.11") +
-         ", connected, force 0 = portforwarded"}},
     // A skipped test is no evidence against the ports.
     Row{"TestsThePortsWithoutTheirGateway",
         [](World& w) { w.gateway.upnp = false; w.diskIsAsleep(); w.web.answerOnce("/remote_access_status/", kWait); },

@@ -91,13 +91,6 @@ TEST_F(DnsCheckTest, ForcedCheckWaitsForAConnectionThatHasNames) {
     EXPECT_TRUE(manager().checkDNS(PORTFORWARDED));  // no longer
 }
 
-// The system may leave the terminator out.
-TEST_F(DnsCheckTest, ALongHostnameIsCut) {
-    net.hostname = std::string(600, 'x');
-    forcedCheck(PORTFORWARDED);
-    EXPECT_EQ(net.lookups.front().find('.'), 511U);
-}
-
 TEST_F(DnsCheckTest, MissingHostnameOrDeviceIdIsNoFailure) {
     std::string names[3];
     EXPECT_EQ(manager().buildDeviceDomainName(nullptr, "7", names[0], names[1], names[2]), 0);

@@ -1,5 +1,3 @@
-#include "common/stop_budget.h"
-#include "common/termination.h"
 #include "connection_fixture.h"
 
 namespace pelorus {
@@ -36,44 +34,19 @@ TEST_F(ForwardSearchTest, TestsThreeCandidatesAndRemembersThemUntilItMayWakeTheD
     EXPECT_EQ(story(search(false, false)), "map 9091, test 9091 = 9094 9091 9091");
 }
 
-TEST_F(ForwardSearchTest, EndsWithTheStopBudgetNotWithTheSignal) {
-    gateway.refuseAll = true;
-    gateway.onCall([&](const std::string& call) {
-        if (call.find("map TCP 9100 ") == 0) sigConnKilled = SIGTERM;
-        if (call.find("map TCP 9102 ") == 0) renewStopBudget({});
-    });
-    EXPECT_EQ(search(), "0");
-    EXPECT_EQ(gateway.count(" -> "), 12);
-}
-
-TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOther) {
+TEST_F(ForwardSearchTest, DefaultPortOnlyTriesNoOtherAndRemembers99BadPorts) {
     gateway.refused.insert(9091);
     EXPECT_EQ(story(search(true)), "map 9091, map 9091, map 9091 = 0");
-    for (int round = 1; round < 34; ++round) search(true);   // each adds three bad ports
+    for (int round = 1; round < 34; ++round) search(true);
     EXPECT_EQ(log.countPart("Cleared bad port vector"), 0);  // the last one found 99
-    gateway.refused.erase(9091);
-    web.answer("/test?", kNotReached);
-    EXPECT_EQ(story(search(true)),
-              "map 9091, disk, test 9091 x3, status failed, unmap 9091, next port = 0");
+    search(true);
     EXPECT_EQ(log.countPart("Cleared bad port vector"), 1);
-    EXPECT_EQ(story(search(true)), " = 0");
-}
-
-// The second cycle finds the granted start port bad: the range begins, with an empty table.
-TEST_F(ForwardSearchTest, GrantedNatpmpPortIsTestedAndTakenBackByItsInternalPort) {
-    gateway.upnp = false;
-    gateway.natpmp = true;
-    gateway.granted = {40001, {}, 600};
-    EXPECT_EQ(story(search()), "natpmp 9091 -> 8080, disk, test 40001 = 40001 40001");
-    failTest(40001);
-    EXPECT_EQ(
-        story(search()),
-        "natpmp 9091 -> 8080, disk, test 40001 x3, status failed, natpmp 0 -> 8080, next port, "
-        "natpmp 0 -> 8080, natpmp 0 -> 8080, natpmp 9092 -> 8080, disk, test 40001 = 40001 40001");
 }
 
 TEST_F(ForwardSearchTest, DoubleNatAtAPredefinedPortReturnsTheRelayValue) {
-    givenMakersRouter("OTHER,TCP,7000-7001,192.168.77.10,8080,web\n");
+    setConfig("DEVICETYPE", "5");
+    commands.answer("getip.sh wan", kWanIp);
+    commands.answer("tavik_helper.sh list", "OTHER,TCP,7000-7001,192.168.77.10,8080,web\n");
     web.answer("/test?", kOtherNat);
     EXPECT_EQ(story(search()), "disk, test 7000 = 4");
 }

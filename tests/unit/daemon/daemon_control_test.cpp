@@ -1,8 +1,5 @@
 #include "daemon/daemon_control.h"
 
-#include "common/log.h"
-#include "common/stop_budget.h"
-#include "common/termination.h"
 #include "daemon/signals.h"
 #include "daemon_fixture.h"
 
@@ -80,40 +77,6 @@ TEST_F(DaemonControlTest, ARunCleansUpFirstAndTearsDownOnASignalInThePause) {
     EXPECT_EQ(log.countPart("COMMUNICATION status:[disabled]  " + type), 1);
     EXPECT_FALSE(std::filesystem::exists(path("client.pid")));
     EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
-}
-
-TEST_F(DaemonControlTest, ASignalWhileTheCycleWorksIsNotSleptOver) {
-    givenEnabled(900);
-    gateway.onCall([](const std::string& call) {
-        if (call.find("map TCP 9091") == 0) terminate();
-        if (call.find("map TCP 9444") == 0) renewStopBudget({});  // the clean-up has its own
-    });
-    control.run();
-    EXPECT_LT(clock.elapsed(), 900);
-    EXPECT_TRUE(gateway.table.empty());
-    EXPECT_EQ(process.selfKills, std::vector<int>{SIGTERM});
-}
-
-// The capture fails the test when the handler's line comes within another one.
-TEST_F(DaemonControlTest, NoLineOfAWholeRunLetsASignalIn) {
-    givenEnabled();
-    gateway.refuseAll = true;
-    for (const int signal : {SIGINT, SIGQUIT}) {
-        std::signal(signal, [](int) { logLine(LOG_INFO, "handler\n"); });
-    }
-    int handled = 0;
-    int cycles = 0;
-    log.onLine([&](const support::LogLine& line) {
-        if (line.text == "handler\n") {
-            ++handled;
-        } else if (endsCycle(line) && ++cycles == 2) {
-            terminate();
-        } else if (!terminationRequested()) {
-            raise(handled % 2 == 0 ? SIGINT : SIGQUIT);
-        }
-    });
-    control.run();
-    EXPECT_GT(handled, 50);
 }
 
 }  // namespace

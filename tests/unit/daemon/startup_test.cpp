@@ -162,13 +162,5 @@ TEST_F(StartupTest, TunablesReachTheirOwners) {
     EXPECT_TRUE(holds("<6>DaemonControl::run - sleep 300 secs.\n"));
 }
 
-// Enabling comes after it and must not undo it.
-TEST_F(StartupTest, ASignalDuringTheStartIsKept) {
-    givenSwitch("1");
-    atStart = [] { raise(SIGTERM); };
-    EXPECT_EQ(start({}), " exit 0 signal 15");
-    EXPECT_TRUE(holds("<6>DaemonControl::run - Remote access disabled.\n"));
-}
-
 }  // namespace
 }  // namespace pelorus

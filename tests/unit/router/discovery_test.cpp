@@ -1,5 +1,3 @@
-#include "common/stop_budget.h"
-#include "common/termination.h"
 #include "unit/router/router_fixture.h"
 
 namespace pelorus {
@@ -55,20 +53,6 @@ TEST_F(DiscoveryTest, AGatewayIsUsedWhenItTellsItsAddress) {
     row(1, 501, "", false, "failed to get External IP address, ipStatus: 501, value received:  \n");
     row(1, 0, "", false, "failed to get External IP address, ipStatus: 0, value received:  \n");
     row(1, 0, "%n%s%n%s%n%s%n%s%n", true, "external IP address: %n%s%n%s%n%s%n%s \n");
-}
-
-TEST_F(DiscoveryTest, ASearchThatTheStopBudgetCutsShortKeepsTheGateway) {
-    discovered();
-    gateway.table = {{9091}};
-    sigConnKilled = SIGTERM;
-    renewStopBudget({});
-    gateway.described = false;
-    EXPECT_TRUE(router.discover() && router.unmapPort(80, 9091, "TCP"));
-    gateway.upnp = false;
-    gateway.natpmp = true;
-    EXPECT_TRUE(router.discover() && router.isInitialized() && !router.isNatPMPGateway());
-    renewStopBudget(kCleanUpBudget);
-    EXPECT_TRUE(router.discover() && router.isNatPMPGateway());
 }
 
 TEST_F(DiscoveryTest, OnlyRealGatewaysAreAsked) {

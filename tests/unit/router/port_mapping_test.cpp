@@ -1,7 +1,3 @@
-#include <csignal>
-
-#include "common/stop_budget.h"
-#include "common/termination.h"
 #include "unit/router/router_fixture.h"
 
 namespace pelorus {
@@ -118,18 +114,6 @@ TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
     EXPECT_EQ(gateway.count("unmap TCP 7000"), 2 * 4);
     gateway.lie.reset();
     EXPECT_EQ(renewedAfter(302401), Texts{});
-}
-
-TEST_F(PortMappingTest, AnEndlessTableEndsWithTheStopBudget) {
-    discovered();
-    gateway.lie = {0, "192.168.77.20", "80", "another", "7000", "TCP"};
-    gateway.onCall([&](const std::string& call) {
-        if (call == "entry #5") sigConnKilled = SIGTERM;
-        if (call == "entry #8") renewStopBudget({});
-    });
-    router.unmapAllPorts("TCP", "Kavra");
-    EXPECT_EQ(gateway.calls().back(), "entry #8");
-    EXPECT_EQ(gateway.calls().size(), 9U);
 }
 
 TEST_F(PortMappingTest, WithANatpmpGatewayAllCallsGoToNatpmp) {

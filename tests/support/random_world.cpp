@@ -131,14 +131,15 @@ void RandomWorld::takeLine(int /*priority*/, const char* text) {
     for (const char* secret : {kDeviceId, kDeviceAuth, kSubdomain}) {
         if (current->ownSecrets && std::strstr(text, secret) != nullptr) fault(text);
     }
-    if (std::strncmp(text, "sigTrap - sigConnKilled", 23) == 0) current->settle();
+    const bool isSignal = std::strncmp(text, "sigTrap - sigConnKilled", 23) == 0;
+    if (isSignal && !current->climate.fierce) current->settle();
     current->event();
 }
 
 bool RandomWorld::has(Trouble trouble) const {
     const bool isLasting = (trouble == GATEWAY && kind >= Kind::RELAYED) ||
                            (trouble == TUNNEL && kind == Kind::FAILING);
-    const bool canCome = !settled && (climate.quick || trouble != GATEWAY);
+    const bool canCome = !settled && (climate.fierce || trouble != GATEWAY);
     return isLasting || (canCome && (weather >> trouble & 1U) != 0);
 }
 
@@ -197,8 +198,9 @@ void RandomWorld::changeWeather() {
     if (stream.below(16) == 1) VirtualClock::get().advance(stream.below(2) == 0 ? kYear : -kYear);
     if (!climate.quick) return;
     if (stream.below(32) == 1) {  // to another home
-        static constexpr Kind kHomes[]{Kind::UPNP, Kind::NATPMP, Kind::BY_HAND, Kind::RELAYED};
-        kind = kHomes[stream.below(4)];
+        static constexpr Kind kHomes[]{Kind::UPNP, Kind::NATPMP, Kind::BY_HAND, Kind::RELAYED,
+                                       Kind::FAILING};
+        kind = kHomes[stream.below(5)];
         FakeGateway::get().table = kNeighbours;
     }
     static const Texts keys{
@@ -224,7 +226,7 @@ void RandomWorld::prepareGateway(const std::string& call) {
         std::tuple{0, 1, 1, false, false, 0L, std::nullopt};
     const bool searches = call == "discover 2000 ms";
     if (searches) gateway.devices = FakeGateway{}.devices;
-    if (!climate.quick || !isOdd()) return;
+    if (!climate.fierce || !isOdd()) return;
     static const Texts calls{"open", "close", "address", "map", "timeout", "read"};
     const unsigned number = stream.below(256);
     const int part = static_cast<int>(number);

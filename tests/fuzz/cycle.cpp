@@ -42,7 +42,8 @@ void tryText(const std::string& text) {
     const auto kind = static_cast<support::Kind>(stream.below(support::kKinds));
     const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
     const unsigned noise = stream.below(256);
-    support::RandomWorld world{std::move(stream), kind, {noise, 300, true, true, true}, folder.path};
+    support::RandomWorld world{
+        std::move(stream), kind, {noise, 300, true, true, true}, folder.path};
     bool isRunning = false, isSent = false;
     world.atEvent = [&] {
         const bool isTime = (signalAt != 0 && world.events >= signalAt) || world.cycles >= 20;

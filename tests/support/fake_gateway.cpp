@@ -19,14 +19,17 @@ namespace {
 constexpr const char* kControlUrl = "http://192.168.77.1:5000/ctl/IPConn";
 constexpr const char* kServiceType = "urn:schemas-upnp-org:service:WANIPConnection:1";
 
-// Stands for the socket of every NAT-PMP client; only truncated answers come out of it. Open before
-// any test begins, since clients may outlive the test that made them.
-const auto sockets = [] {
-    std::array<int, 2> ends{};
-    socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, ends.data());
-    return ends;
+// Stands for the socket of every NAT-PMP client, and is its own peer: only datagrams come out of it.
+// Open before any test begins, since clients may outlive the test that made them.
+const int clientSocket = [] {
+    sockaddr_in address{AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
+    socklen_t size = sizeof address;
+    auto* const plain = reinterpret_cast<sockaddr*>(&address);
+    const int loop = socket(AF_INET, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
+    const bool isOpen = bind(loop, plain, size) == 0 && getsockname(loop, plain, &size) == 0 &&
+                        connect(loop, plain, size) == 0;
+    return isOpen ? loop : -1;
 }();
-const int clientSocket = sockets[0], gatewaySocket = sockets[1];
 int openClients = 0;
 
 FakeGateway& gateway = FakeGateway::get();  // NOLINT(cert-err58-cpp): as above
@@ -280,9 +283,18 @@ int __wrap_getnatpmprequesttimeout(natpmp_t* client, timeval* timeout) {
     return 0;
 }
 
+int __real_readnatpmpresponseorretry(natpmp_t* client, natpmpresp_t* response);
+
 int __wrap_readnatpmpresponseorretry(natpmp_t* client, natpmpresp_t* response) {
     if (const int status = failure("read")) return status;
     if (client->has_pending_request == 0) return NATPMP_ERR_NOPENDINGREQ;
+    if (hasArrived() && gateway.datagram) {
+        natpmp_t loop = *client;
+        loop.gateway = htonl(INADDR_LOOPBACK);
+        const int status = __real_readnatpmpresponseorretry(&loop, response);
+        client->has_pending_request = loop.has_pending_request;
+        return status;
+    }
     if (hasArrived()) {
         const auto answer = gateway.onTheWay.extract(gateway.onTheWay.begin()).mapped();
         if (answer.resultcode != 0) return NATPMP_ERR_NOTAUTHORIZED;  // the request stays pending
@@ -309,11 +321,8 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
     const long end = gateway.natpmpTime + limit;
     const long next = gateway.onTheWay.empty() ? end : gateway.onTheWay.begin()->first;
     gateway.natpmpTime = std::clamp(next, gateway.natpmpTime, end);
-    if (hasArrived() && gateway.truncated) {
-        std::array<char, 16> answer{};
-        answer[3] = static_cast<char>(gateway.onTheWay.begin()->second.resultcode);
-        send(gatewaySocket, answer.data(), *gateway.truncated, 0);
-    }
+    const auto& datagram = gateway.datagram;
+    if (hasArrived() && datagram) send(clientSocket, datagram->data(), datagram->size(), 0);
     return hasArrived() ? 1 : 0;
 }
 }

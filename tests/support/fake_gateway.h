@@ -78,8 +78,8 @@ public:
     long answerDelay = 0;  ///< requests are answered so much later
     long natpmpTime = 0;   ///< spent waiting for answers
     int copies = 1;        ///< of each answer
-    /// Bytes of each answer that arrive, if not all.
-    std::optional<std::size_t> truncated;
+    /// Arrives in place of each answer, for the library itself to read.
+    std::optional<std::string> datagram;
     /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",
     /// "read".
     std::set<std::string> failing;

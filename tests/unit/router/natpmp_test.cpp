@@ -45,23 +45,26 @@ TEST_F(NatpmpTest, EachRequestHasASocketOfItsOwn) {
 }
 
 TEST_F(NatpmpTest, AnAnswerWithoutAllItsValuesIsAnError) {
+    const auto answer = [](std::size_t size, char operation, char result = 0) {
+        return std::string{'\0', operation, '\0', result}.append(12, '\1').substr(0, size);
+    };
     for (std::size_t size : {0U, 2U, 11U}) {
-        gateway.truncated = size;
+        gateway.datagram = answer(size, '\x80');
         EXPECT_FALSE(client.retrieveExternalIP(ip) || map(80, 9091)) << size;
     }
     const std::string incomplete = "errno " + std::to_string(EBADMSG) + "\n";
     EXPECT_EQ(log.countPart(incomplete), 6);
-    gateway.refused.insert(9091);
-    gateway.truncated = 8;
+    gateway.datagram = answer(8, '\x82', 2);
     errno = 0;
     EXPECT_FALSE(map(80, 9091));
     EXPECT_EQ(log.countPart(incomplete), 6) << "a refusal has no values";
-    gateway.refused.clear();
-    gateway.truncated = 12;
+    gateway.datagram = answer(12, '\x80');
     EXPECT_TRUE(client.retrieveExternalIP(ip) && !map(80, 9091));
+    EXPECT_EQ(ip, "1.1.1.1");
     EXPECT_EQ(gateway.natpmpTime, 0);
-    gateway.truncated = 16;
+    gateway.datagram = answer(16, '\x82');
     EXPECT_TRUE(map(80, 9091));
+    EXPECT_EQ(port, 257);
 }
 
 TEST_F(NatpmpTest, NothingIsAskedWithoutANewSocket) {

@@ -12,7 +12,7 @@ from pathlib import Path
 from lab import natpmp, network, packet_filter, web
 from lab.natpmp import Grant, NatPmp
 from lab.packet_filter import BY_HAND, Mapping
-from lab.scripted_gateway import Entry, Personality, ScriptedGateway
+from lab.scripted_gateway import Call, Entry, Personality, ScriptedGateway
 from lab.server import Server
 from lab.support import LabError, wait_until
 from lab.timeline import Timeline
@@ -26,6 +26,7 @@ _SEARCH = ("M-SEARCH * HTTP/1.1\r\nHOST: 239.255.255.250:1900\r\n"
            "MAN: \"ssdp:discover\"\r\nMX: 1\r\n"
            "ST: urn:schemas-upnp-org:device:InternetGatewayDevice:1\r\n\r\n").encode()
 _PUBLIC_ADDRESS_REQUEST = b"\0\0"
+_DELETED = re.compile(r"DeletePortMapping: external port: (\d+)")
 # A line of `upnpc -l`: number, protocol, mapping, description, remote host, lease.
 _LISTED = re.compile(r"^ *\d+ (TCP|UDP) +(\d+)->([\d.]+):(\d+) +'(.*)' '.*' (\d+)$",
                      re.MULTILINE)
@@ -90,6 +91,7 @@ class Gateway:
         self._natpmp: NatPmp | None = None
         self._scripted: ScriptedGateway | None = None
         self._others: list[ScriptedGateway] = []
+        self._own: list[ScriptedGateway | NatPmp] = []
         self._online = True
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
@@ -124,6 +126,7 @@ class Gateway:
             other = ScriptedGateway(personality, lambda: self.wan_address)
             other.start(address)
             self._others.append(other)
+        self._own += self._others
 
     def become(self, setup: GatewaySetup) -> None:
         """Offer something else from now on, as after a change in the router's settings.
@@ -154,6 +157,12 @@ class Gateway:
         packet_filter.change("add rule inet lab silence meta l4proto { tcp, udp } drop\n")
         self._stop()
         self._timeline.add("gateway", "no longer answers the mapping protocols")
+
+    def refuse_natpmp(self) -> None:
+        """Refuse NAT-PMP by ICMP until `become` or `reboot`, as a strict packet filter does."""
+        packet_filter.change("add rule inet lab silence udp dport 5351 "
+                             "reject with icmp type admin-prohibited\n")
+        self._timeline.add("gateway", "prohibits NAT-PMP")
 
     def go_deaf(self) -> None:
         """Receive no search any more until `become` or `reboot`; all else still works."""
@@ -282,6 +291,21 @@ class Gateway:
         return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
                 for protocol, external, address, internal, words, lease in _LISTED.findall(listing)]
 
+    def oddities(self) -> list[str]:
+        """What the lab's own servers have done in another way than a good gateway."""
+        return [oddity for server in self._own for oddity in server.oddities]
+
+    def calls(self) -> list[Call]:
+        """What clients have asked the lab's own UPnP servers."""
+        return [call for server in self._own if isinstance(server, ScriptedGateway)
+                for call in server.calls]
+
+    def deleted(self) -> set[str]:
+        """The external ports whose mappings clients have asked the gateway to delete, by UPnP."""
+        log = self.server.log.read_text() if self.server.log.exists() else ""
+        return {call.arguments["NewExternalPort"] for call in self.calls()
+                if call.action == "DeletePortMapping"} | {*_DELETED.findall(log)}
+
     def requests(self) -> int:
         """The device's requests; those of the lab and the neighbour do not count."""
         return self.upnp_requests() + self.natpmp_requests()
@@ -299,9 +323,11 @@ class Gateway:
         if self._setup.natpmp and self._setup.grant:
             self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
             self._natpmp.start(self.served_at)
+            self._own.append(self._natpmp)
         if self._setup.upnp and self._setup.personality:
             self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address)
             self._scripted.start(self.served_at)
+            self._own.append(self._scripted)
         if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())
             self.server.start(self._answers)

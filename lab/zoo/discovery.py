@@ -4,6 +4,7 @@ from __future__ import annotations
 
 import itertools
 import random
+import re
 from collections.abc import Iterable
 
 from lab.gateway import GatewaySetup
@@ -11,10 +12,12 @@ from lab.scripted_gateway import (ANY_DEVICE, DEVICE_TYPE, PPP_SERVICE, Personal
                                   Search, at)
 from lab.zoo.events import go_deaf
 from lab.zoo.hooks import late, only, telling, wait
+from lab.zoo.met import described_as_version_2
 from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_ADDRESS, NO_ANSWER, NO_GATEWAY, NOT_USED,
                          NOTHING, OTHER_ADDRESS, RELAYED, Row)
 
 _GOOD = at("{base}/rootDesc.xml")
+_LOCATION = re.compile(rb"LOCATION: .*\r\n")
 _NOWHERE = at("http://[::1]:1900/rootDesc.xml", "http://127.0.0.1:5000/rootDesc.xml",
               "http://192.168.1.1:5000/rootDesc.xml", "http://192.168.77.1:5000")
 # What a device for Wi-Fi Protected Setup says of itself.
@@ -33,7 +36,8 @@ SETUP_DEVICE = Personality(
     search=lambda search: [search.answer()], describe=lambda _: _SETUP_DESCRIPTION, forwards=False)
 
 
-def _version_2(text: str) -> str:
+def version_2(text: str) -> str:
+    """The description, with version 2 of every device and service that has one."""
     for name in ("InternetGatewayDevice", "WANDevice", "WANConnectionDevice", "WANIPConnection"):
         text = text.replace(f"{name}:1", f"{name}:2")
     return text
@@ -48,6 +52,12 @@ def _copies(search: Search) -> Iterable[bytes]:
 def _many_names(search: Search) -> Iterable[bytes]:
     return (search.answer().replace(b"uuid:2c6e", b"uuid:%04x" % number)
             for number in range(400) if search.target == DEVICE_TYPE)
+
+
+def _without_location(search: Search) -> Iterable[bytes]:
+    for answer in _GOOD(search):
+        yield _LOCATION.sub(rb"LOCATION: \r\n", answer)
+        yield _LOCATION.sub(b"", answer)
 
 
 def _garbage(search: Search) -> Iterable[bytes]:
@@ -78,10 +88,10 @@ ROWS = (
     Row("D1b", "Answers only the search target `upnp:rootdevice`",
         _scripted(Personality(search=only(ANY_DEVICE))), BY_HAND, RELAYED, NOT_USED),
     Row("D2", "Version 2, deaf to searches for version 1",
-        _scripted(Personality(search=only(ANY_DEVICE), describe=_version_2)),
+        _scripted(Personality(search=only(ANY_DEVICE), describe=version_2)),
         "switch on the compatibility with version 1, or " + BY_HAND, RELAYED, NOT_USED),
     Row("D3", "Answers the search as version 1, describes itself as version 2",
-        GatewaySetup(settings={"force_igd_desc_v1": "no"}), NOTHING),
+        GatewaySetup(settings={"force_igd_desc_v1": "no"}), NOTHING, played=described_as_version_2),
     Row("D4", "Answers the search 5 s late",
         _scripted(Personality(search=late(5, _GOOD))), NOTHING, seconds=30),
     Row("D4b", "Answers no search, only announces itself unasked",
@@ -93,10 +103,14 @@ ROWS = (
     Row("D6", "Answers the search from an odd port",
         _scripted(Personality(search_port=43702)), NOTHING),
     Row("D7", "Answers at another address than the default route's",
-        GatewaySetup(natpmp=True, served_at="192.168.77.2"), NOTHING),
+        GatewaySetup(natpmp=True, served_at="192.168.77.2"), NOTHING,
+        why="IGD found at: http://192.168.77.2:"),
     Row("D8", "Its description is said to be on the device, on another subnet, or nowhere",
         _scripted(Personality(search=_NOWHERE)), BY_HAND, RELAYED, NO_GATEWAY, seconds=100,
         longest=100),
+    Row("D8b", "Does not say where its description is: empty or missing LOCATION",
+        _scripted(Personality(search=_without_location)), BY_HAND, RELAYED,
+        "upnp_discover - gateway ignored, its description is not at another host's"),
     Row("D9", "A Wi-Fi setup device on the LAN claims every search target, before the gateway",
         _scripted(Personality(search=late(0.5, _GOOD)), SETUP_DEVICE), NOTHING),
     Row("D9b", "Silent, while a Wi-Fi setup device on the LAN claims every search target",

@@ -12,7 +12,7 @@ from pathlib import Path
 from lab import natpmp, network, packet_filter, web
 from lab.natpmp import Grant, NatPmp
 from lab.packet_filter import BY_HAND, Mapping
-from lab.scripted_gateway import Call, Entry, Personality, ScriptedGateway
+from lab.scripted_gateway import Entry, Personality, ScriptedGateway
 from lab.server import Server
 from lab.support import LabError, wait_until
 from lab.timeline import Timeline
@@ -26,7 +26,6 @@ _SEARCH = ("M-SEARCH * HTTP/1.1\r\nHOST: 239.255.255.250:1900\r\n"
            "MAN: \"ssdp:discover\"\r\nMX: 1\r\n"
            "ST: urn:schemas-upnp-org:device:InternetGatewayDevice:1\r\n\r\n").encode()
 _PUBLIC_ADDRESS_REQUEST = b"\0\0"
-_DELETED = re.compile(r"DeletePortMapping: external port: (\d+)")
 # A line of `upnpc -l`: number, protocol, mapping, description, remote host, lease.
 _LISTED = re.compile(r"^ *\d+ (TCP|UDP) +(\d+)->([\d.]+):(\d+) +'(.*)' '.*' (\d+)$",
                      re.MULTILINE)
@@ -75,7 +74,10 @@ class Listed:
 
 
 class Gateway:
-    """The router and its actual state. Its leases run in device time, `clock` times ours."""
+    """The router and its actual state. Its leases run in device time, `clock` times ours.
+
+    The lab's own servers note UPnP calls in `diary`, and as "odd" what no good gateway would do.
+    """
 
     def __init__(self, folder: Path, setup: GatewaySetup, timeline: Timeline,
                  clock: int = 1) -> None:
@@ -91,7 +93,7 @@ class Gateway:
         self._natpmp: NatPmp | None = None
         self._scripted: ScriptedGateway | None = None
         self._others: list[ScriptedGateway] = []
-        self._own: list[ScriptedGateway | NatPmp] = []
+        self.diary: list[str] = []
         self._online = True
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
@@ -123,10 +125,9 @@ class Gateway:
         self._serve()
         for number, personality in enumerate(self._setup.others, start=2):
             self._add_lan_address(address := f"192.168.77.{number}")
-            other = ScriptedGateway(personality, lambda: self.wan_address)
+            other = ScriptedGateway(personality, lambda: self.wan_address, self.diary)
             other.start(address)
             self._others.append(other)
-        self._own += self._others
 
     def become(self, setup: GatewaySetup) -> None:
         """Offer something else from now on, as after a change in the router's settings.
@@ -157,12 +158,6 @@ class Gateway:
         packet_filter.change("add rule inet lab silence meta l4proto { tcp, udp } drop\n")
         self._stop()
         self._timeline.add("gateway", "no longer answers the mapping protocols")
-
-    def refuse_natpmp(self) -> None:
-        """Refuse NAT-PMP by ICMP until `become` or `reboot`, as a strict packet filter does."""
-        packet_filter.change("add rule inet lab silence udp dport 5351 "
-                             "reject with icmp type admin-prohibited\n")
-        self._timeline.add("gateway", "prohibits NAT-PMP")
 
     def go_deaf(self) -> None:
         """Receive no search any more until `become` or `reboot`; all else still works."""
@@ -291,20 +286,10 @@ class Gateway:
         return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
                 for protocol, external, address, internal, words, lease in _LISTED.findall(listing)]
 
-    def oddities(self) -> list[str]:
-        """What the lab's own servers have done in another way than a good gateway."""
-        return [oddity for server in self._own for oddity in server.oddities]
-
-    def calls(self) -> list[Call]:
-        """What clients have asked the lab's own UPnP servers."""
-        return [call for server in self._own if isinstance(server, ScriptedGateway)
-                for call in server.calls]
-
-    def deleted(self) -> set[str]:
-        """The external ports whose mappings clients have asked the gateway to delete, by UPnP."""
-        log = self.server.log.read_text() if self.server.log.exists() else ""
-        return {call.arguments["NewExternalPort"] for call in self.calls()
-                if call.action == "DeletePortMapping"} | {*_DELETED.findall(log)}
+    def was_asked(self, call: str) -> bool:
+        """True if a UPnP client asked for this, as in "DeletePortMapping: external port: 9091"."""
+        log = self.server.log
+        return call in self.diary or log.exists() and call in log.read_text(errors="replace")
 
     def requests(self) -> int:
         """The device's requests; those of the lab and the neighbour do not count."""
@@ -321,13 +306,13 @@ class Gateway:
     def _serve(self) -> None:
         packet_filter.change("flush chain inet lab silence\n")
         if self._setup.natpmp and self._setup.grant:
-            self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
+            self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address,
+                                  self.diary)
             self._natpmp.start(self.served_at)
-            self._own.append(self._natpmp)
         if self._setup.upnp and self._setup.personality:
-            self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address)
+            self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address,
+                                             self.diary)
             self._scripted.start(self.served_at)
-            self._own.append(self._scripted)
         if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())
             self.server.start(self._answers)

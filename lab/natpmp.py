@@ -65,13 +65,13 @@ class Grant:
 class NatPmp:
     """The server on the router's LAN side; its mappings are rules in the router's packet filter."""
 
-    def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str]) -> None:
+    def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str],
+                 diary: list[str]) -> None:
         """Leases run in a time that is `clock` times as fast as ours.
 
-        `oddities` has an entry for each answer to the device that a good gateway would give in
-        another way.
+        Answers to the device that a good gateway would give in another way are noted in `diary`.
         """
-        self.oddities: list[str] = []
+        self._diary = diary
         self._grant = grant
         self._clock = clock
         self._public_address = public_address
@@ -156,7 +156,7 @@ class NatPmp:
         sent = list(self._grant.deliver(request, answer))
         if (result or sent != [answer] or self._delay or self._grant.source != PORT
                 or operation and answer[8:] != datagram[4:]):
-            self.oddities.append("NAT-PMP")
+            self._diary.append("odd NAT-PMP")
         return sent
 
     def _perform(self, request: Request, client: str) -> bytes:

@@ -189,17 +189,16 @@ class Personality:
 class ScriptedGateway:
     """The server on the router's LAN side; what it forwards are rules in the packet filter.
 
-    Its list of mappings, `table`, is its own: by protocol and external port. `calls` is what it was
-    asked, and `oddities` what of its work a good gateway would have done in another way: "search",
-    "description", or the name of an action.
+    Its list of mappings, `table`, is its own: by protocol and external port. It notes in `diary`
+    each call, and what a good gateway would have done in another way.
     """
 
-    def __init__(self, personality: Personality, public_address: Callable[[], str]) -> None:
+    def __init__(self, personality: Personality, public_address: Callable[[], str],
+                 diary: list[str]) -> None:
         """Forwardings that exist already are on the list of a gateway that forwards."""
         self.personality = personality
         self.table: dict[tuple[str, int], Entry] = {}
-        self.calls: list[Call] = []
-        self.oddities: list[str] = []
+        self.diary = diary
         self._public_address = public_address
         self._lock = threading.Lock()
         self._stopping = threading.Event()
@@ -247,19 +246,19 @@ class ScriptedGateway:
                                       control_url=escape(self.personality.control_url)))
         described = self.personality.describe(text)
         if described != text or self.personality.control_url != Personality.control_url:
-            self.oddities.append("description")
+            self.diary.append("odd description")
         return described.encode("latin-1")
 
     def answer(self, call: Call) -> Answer:
         """The answer to a call."""
-        self.calls.append(call)
+        self.diary.append(f"{call.action}: external port: {call.arguments.get('NewExternalPort')}")
         time.sleep(self.personality.delay)
         if call.action in self.personality.errors:
             answer: Answer = self.personality.errors[call.action], {}
         else:
             answer = self.personality.control(call)
         if self.personality.delay or call.performed != [answer]:
-            self.oddities.append(call.action)
+            self.diary.append(f"odd {call.action}")
         return answer
 
     def perform(self, call: Call) -> Answer:
@@ -310,9 +309,9 @@ class ScriptedGateway:
                 except OSError:
                     break
                 sent.append(datagram)
-        if (sent != list(at("{base}/rootDesc.xml")(search)) or self.personality.search_port
-                != SEARCH_PORT or time.monotonic() - began > _LATE_SECONDS):
-            self.oddities.append("search")
+        if (sent != list(Personality.search(search)) or time.monotonic() - began > _LATE_SECONDS
+                or self.personality.search_port != SEARCH_PORT):
+            self.diary.append("odd search")
 
     def _status(self, _arguments: Arguments) -> Answer:
         return 0, {"NewConnectionStatus": "Connected", "NewLastConnectionError": "ERROR_NONE",
@@ -383,7 +382,7 @@ class _Handler(BaseHTTPRequestHandler):
     def do_GET(self) -> None:
         """Deliver the description, whatever the path."""
         gateway, body = self.server.gateway, self.server.gateway.description()
-        self._send(gateway.personality.deliver, "description", _head("200 OK", len(body)), body)
+        self._send(gateway.personality.deliver, _head("200 OK", len(body)), body)
 
     def do_POST(self) -> None:
         """Perform an action of the control service."""
@@ -401,12 +400,12 @@ class _Handler(BaseHTTPRequestHandler):
         if text is None:
             self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, NO_LINGERING)
             return
-        self._send(gateway.personality.deliver_control, action, _head(status, len(text)), text)
+        self._send(gateway.personality.deliver_control, _head(status, len(text)), text)
 
-    def _send(self, deliver: Deliver, what: str, head: bytes, body: bytes) -> None:
+    def _send(self, deliver: Deliver, head: bytes, body: bytes) -> None:
         for piece in deliver(head, body):
             if piece != head + body:
-                self.server.gateway.oddities.append(what)
+                self.server.gateway.diary.append("odd delivery")
             self.wfile.write(piece)
 
     def log_message(self, *_arguments: object) -> None:

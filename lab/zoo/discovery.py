@@ -17,7 +17,6 @@ from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_ADDRESS, NO_ANSWER, NO_GATEWAY
                          NOTHING, OTHER_ADDRESS, RELAYED, Row)
 
 _GOOD = at("{base}/rootDesc.xml")
-_LOCATION = re.compile(rb"LOCATION: .*\r\n")
 _NOWHERE = at("http://[::1]:1900/rootDesc.xml", "http://127.0.0.1:5000/rootDesc.xml",
               "http://192.168.1.1:5000/rootDesc.xml", "http://192.168.77.1:5000")
 # What a device for Wi-Fi Protected Setup says of itself.
@@ -55,9 +54,8 @@ def _many_names(search: Search) -> Iterable[bytes]:
 
 
 def _without_location(search: Search) -> Iterable[bytes]:
-    for answer in _GOOD(search):
-        yield _LOCATION.sub(rb"LOCATION: \r\n", answer)
-        yield _LOCATION.sub(b"", answer)
+    return (re.sub(rb"LOCATION: .*\r\n", line, answer)
+            for answer in _GOOD(search) for line in (b"LOCATION: \r\n", b""))
 
 
 def _garbage(search: Search) -> Iterable[bytes]:
@@ -73,9 +71,10 @@ def _garbage(search: Search) -> Iterable[bytes]:
 COPIES = Personality(search=_copies)
 
 
-def _access_point(address: str) -> GatewaySetup:
-    return GatewaySetup(others=(Personality(search=late(0.3, _GOOD), forwards=False,
-                                            control=telling(NewExternalIPAddress=address)),))
+def access_point(address: str) -> Personality:
+    """Answers as a gateway, later, tells this address and forwards nothing."""
+    return Personality(search=late(0.3, _GOOD), forwards=False,
+                       control=telling(NewExternalIPAddress=address))
 
 
 def _scripted(gateway: Personality, *others: Personality) -> GatewaySetup:
@@ -117,10 +116,10 @@ ROWS = (
         _scripted(Personality(search=lambda _: []), SETUP_DEVICE),
         "switch on UPnP on the gateway, or " + BY_HAND, RELAYED, NO_ADDRESS),
     Row("D10", "An access point answers as a gateway as well, later, with a public address",
-        _access_point("44.128.0.99"), "switch off UPnP on the access point", RELAYED,
-        OTHER_ADDRESS, requests=100),
+        GatewaySetup(others=(access_point("44.128.0.99"),)),
+        "switch off UPnP on the access point", RELAYED, OTHER_ADDRESS, requests=65),
     Row("D10b", "An access point answers as a gateway as well, later, with the address 0.0.0.0",
-        _access_point("0.0.0.0"), NOTHING, requests=100),
+        GatewaySetup(others=(access_point("0.0.0.0"),)), NOTHING, requests=100),
     Row("D11", "Goes deaf to searches after a while",
         GatewaySetup(), "restart the gateway; delete mappings that are left behind",
         why="UPnP discovery failed, running port test to see if ports are still open",

@@ -9,7 +9,7 @@ from lab.scenario import Lab
 from lab.scripted_gateway import Answer, Call, Personality
 from lab.zoo.events import Event, all_of, go_offline, go_online, keep, lose, reload_firewall
 from lab.zoo.discovery import version_2
-from lab.zoo.hooks import CallHook, adding, refusing
+from lab.zoo.hooks import CallHook, adding, controlled, refusing
 from lab.zoo.met import leased, not_provoked
 from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_MAPPING, NOTHING, PERMANENT, RELAYED, TEST_FAILED,
                          Row)
@@ -17,12 +17,8 @@ from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_MAPPING, NOTHING, PERMANENT, R
 _INVALID_ARGUMENTS, _ACTION_FAILED, _NOT_AUTHORIZED = 402, 501, 606
 _CONFLICT, _SAME_PORTS, _ONLY_PERMANENT, _FULL = 718, 724, 725, 728
 _OLD = Mapping("TCP", 9095, network.DEVICE_ADDRESS, 80)
-_MAKE_ROOM = "delete mappings on the gateway, or "
+_TIDY = "delete mappings on the gateway, or "
 _OLDER = Mapping("TCP", 8080, network.DEVICE_ADDRESS, 80)
-
-
-def _scripted(control: CallHook) -> GatewaySetup:
-    return GatewaySetup(personality=Personality(control=control))
 
 
 def _refused(error: int) -> GatewaySetup:
@@ -46,7 +42,7 @@ def _internal_port_has_one(call: Call) -> bool:
 
 def _holding(entries: int, error: int) -> GatewaySetup:
     """Refuse a mapping beyond so many."""
-    return _scripted(adding(refusing(error, lambda call: len(call.gateway.table) >= entries)))
+    return controlled(adding(refusing(error, lambda call: len(call.gateway.table) >= entries)))
 
 
 def silently_full(entries: int) -> CallHook:
@@ -84,16 +80,8 @@ def _two_networks(lab: Lab) -> None:
                      f"route add default via {lab.gateway.lan_address}", host=network.DEVICE)
 
 
-def _break_firewall(_lab: Lab) -> None:
-    packet_filter.change("flush chain inet gate prerouting\n")
-
-
 def _use_9091(lab: Lab) -> None:
     web.WebServer(network.GATEWAY, lab.gateway.wan_address, 9091, lambda _: web.Reply(b"router"))
-
-
-def _refuse_from_now_on(lab: Lab) -> None:
-    lab.gateway.behave(Personality(errors={"AddPortMapping": _ACTION_FAILED}))
 
 
 def _never(name: str, title: str, gateway: GatewaySetup, advice: str = "",
@@ -105,14 +93,14 @@ def _never(name: str, title: str, gateway: GatewaySetup, advice: str = "",
 
 ROWS = (
     Row("P1", "Accepts only permanent mappings (725)",
-        _scripted(adding(refusing(_ONLY_PERMANENT, _has_lease))), PERMANENT, played=not_provoked),
+        controlled(adding(refusing(_ONLY_PERMANENT, _has_lease))), PERMANENT, played=not_provoked),
     Row("P2", "Accepts only permanent mappings (402)",
-        _scripted(adding(refusing(_INVALID_ARGUMENTS, _has_lease))), PERMANENT,
+        controlled(adding(refusing(_INVALID_ARGUMENTS, _has_lease))), PERMANENT,
         played=not_provoked),
     _never("P3", "Refuses permanent mappings (402)",
-           _scripted(adding(refusing(_INVALID_ARGUMENTS, lambda call: not _has_lease(call))))),
+           controlled(adding(refusing(_INVALID_ARGUMENTS, lambda call: not _has_lease(call))))),
     Row("P4", "Accepts mappings with a lease without doing anything",
-        _scripted(adding(lambda call: (0, {}) if _has_lease(call) else call.perform())), PERMANENT,
+        controlled(adding(lambda call: (0, {}) if _has_lease(call) else call.perform())), PERMANENT,
         played=not_provoked),
     Row("P5", "Gives every mapping a lease of a week", GatewaySetup(), NOTHING,
         played=leased(forever=False)),
@@ -121,13 +109,13 @@ ROWS = (
     _never("P6", "Refuses mappings to an address other than the sender's; the device has two (718)",
            GatewaySetup(), between={0: _two_networks}),
     Row("P7", "Allows one mapping for each internal port (718)",
-        _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING,
+        controlled(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING,
         played=not_provoked),
     Row("P7b", "Allows one mapping for each internal port (718); an old one is at 9095",
-        _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING, requests=85,
+        controlled(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING, requests=85,
         between={0: keep(_OLD)}),
     _never("P7c", "Allows one mapping for each internal port (718); an old one is at 8080",
-           _scripted(adding(refusing(_CONFLICT, _internal_port_has_one))), left=(_OLDER,),
+           controlled(adding(refusing(_CONFLICT, _internal_port_has_one))), left=(_OLDER,),
            between={0: keep(_OLDER)}),
     _never("P8", "Is not to be changed by the device (606)", GatewaySetup(permissions=NO_PORT),
            "allow the device to change settings, or "),
@@ -139,17 +127,15 @@ ROWS = (
     Row("P11", "Uses port 9091 itself (729)", GatewaySetup(), NOTHING, requests=70,
         why="external port: 9091, to internal port: 80, status: 729", between={0: _use_9091}),
     _never("P12", "Wants the same port outside and inside (724)",
-           _scripted(adding(refusing(_SAME_PORTS, _ports_differ)))),
-    _never("P13", "Has no room for another mapping (728)", _holding(1, _FULL), _MAKE_ROOM),
-    _never("P13b", "Has room for only one more mapping (728)", _holding(2, _FULL), _MAKE_ROOM),
-    _never("P13c", "Has no room for another mapping (501)", _holding(1, _ACTION_FAILED),
-           _MAKE_ROOM),
-    _never("P13d", "Has no room for another mapping (402)", _holding(1, _INVALID_ARGUMENTS),
-           _MAKE_ROOM),
+           controlled(adding(refusing(_SAME_PORTS, _ports_differ)))),
+    _never("P13", "Has no room for another mapping (728)", _holding(1, _FULL), _TIDY),
+    _never("P13b", "Has room for only one more mapping (728)", _holding(2, _FULL), _TIDY),
+    _never("P13c", "Has no room for another mapping (501)", _holding(1, _ACTION_FAILED), _TIDY),
+    _never("P13d", "Has no room for another mapping (402)", _holding(1, _INVALID_ARGUMENTS), _TIDY),
     Row("P14", "Accepts and lists mappings, but does not forward", GatewaySetup(), BY_HAND,
         RELAYED, TEST_FAILED, requests=200, longest=150, seconds=150,
-        between={0: _break_firewall}),
-    Row("P14b", "Accepts mappings without doing anything", _scripted(adding(_accepted)), BY_HAND,
+        between={0: lambda _: packet_filter.change("flush chain inet gate prerouting\n")}),
+    Row("P14b", "Accepts mappings without doing anything", controlled(adding(_accepted)), BY_HAND,
         RELAYED, TEST_FAILED, requests=200, longest=150, seconds=150),
     Row("P15", "Lists mappings that it no longer forwards",
         GatewaySetup(), NOTHING, why=TEST_FAILED, requests=70,
@@ -159,7 +145,7 @@ ROWS = (
         between={0: lambda lab: lab.gateway.forward_by_hand(9091, 80,
                                                             network.NEIGHBOUR_ADDRESS)}),
     Row("P16b", "Accepts a port that another computer has mapped, and does not tell",
-        _scripted(_unseen(9091)), NOTHING, why=TEST_FAILED, requests=75,
+        controlled(_unseen(9091)), NOTHING, why=TEST_FAILED, requests=75,
         seconds=35, between={0: keep(Mapping("TCP", 9091, network.NEIGHBOUR_ADDRESS, 7001))},
         left=(Mapping("TCP", 9091, network.NEIGHBOUR_ADDRESS, 7001),)),
     Row("P17", "Protects mappings of the device's former address from the device",
@@ -167,7 +153,8 @@ ROWS = (
         between={1: lambda lab: lab.device.move_to("192.168.77.30")}),
     _never("P18", "Refuses every mapping (501) after its internet line was down",
            GatewaySetup(personality=Personality()),
-           between={1: all_of(go_offline, go_online, lose(), _refuse_from_now_on)}),
+           between={1: all_of(go_offline, go_online, lose(), lambda lab: lab.gateway.behave(
+               Personality(errors={"AddPortMapping": _ACTION_FAILED})))}),
     Row("P19", "The port in use dies; mappings that nobody deletes would pile up", GatewaySetup(),
         NOTHING, why=TEST_FAILED, requests=80, between={1: lambda lab: lab.gateway.block(9091)}),
     Row("P20", "Version 2, with an action that picks the port itself",

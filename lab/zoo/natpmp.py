@@ -7,7 +7,7 @@ import socket
 import struct
 from collections.abc import Callable, Iterable
 
-from lab import network
+from lab import network, packet_filter
 from lab.gateway import GatewaySetup
 from lab.natpmp import Grant, Request
 from lab.packet_filter import Mapping
@@ -89,8 +89,9 @@ def _cut(length: int, when: Callable[[Request], bool]) -> Delivery:
     return lambda request, answer: [answer[:length] if when(request) else answer]
 
 
-def _neighbour_has_9091(lab: Lab) -> None:
-    lab.neighbour.hold(9091, 80)
+def _prohibit(_lab: Lab) -> None:
+    packet_filter.change(
+        "add rule inet lab silence udp dport 5351 reject with icmp type admin-prohibited\n")
 
 
 ROWS = (
@@ -108,10 +109,10 @@ ROWS = (
         seconds=100, longest=100, between={0: fall_silent}),
     Row("N4b", "Prohibits NAT-PMP (ICMP)", _MINIUPNPD, BY_HAND, RELAYED,
         "retrieveExternalIP  failed to fetched external IP address, errno 113",
-        between={0: lambda lab: lab.gateway.refuse_natpmp()}),
+        between={0: _prohibit}),
     Row("N5", "Grants the next free port instead of one that is taken", _MINIUPNPD, NOTHING,
-        why="mapped public port 9093 to localport 80 ", between={0: _neighbour_has_9091},
-        left=(_SEVENTY,)),
+        why="mapped public port 9093 to localport 80 ", left=(_SEVENTY,),
+        between={0: lambda lab: lab.neighbour.hold(9091, 80)}),
     Row("N5b", "Grants a port of its own choice", _granting(Grant(lambda _: 45678, _A_WEEK)),
         NOTHING),
     Row("N6", "Grants only a minute, less than a pause", _granting(Grant(_same, 60)), NOTHING,

@@ -47,9 +47,8 @@ class Row:
     outcome. All are seconds of the device. What is in `left` stays at the gateway after SIGTERM.
     What is in `between` happens in the pause after the cycle of that number; 0 is before the first.
 
-    `played` tells after the last cycle whether the device has met the behaviour; without it one of
-    the lab's own gateways must have done something that a good one does not. Unless `https`, only
-    HTTP still comes through the gateway then.
+    `played` tells after the last cycle if the device has met the behaviour; the lab's own servers
+    know it themselves. Unless `https`, only HTTP comes through the gateway by then.
     """
 
     name: str
@@ -65,11 +64,6 @@ class Row:
     between: Mapping[int, Callable[[Lab], None]] = field(default_factory=dict)
     played: Callable[[Lab], bool] | None = None
     https: bool = True
-
-    @property
-    def scripted(self) -> bool:
-        """True when the lab's own servers behave oddly, rather than miniupnpd."""
-        return bool(self.gateway.personality or self.gateway.grant or self.gateway.others)
 
     @property
     def within(self) -> int:

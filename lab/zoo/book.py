@@ -117,7 +117,7 @@ def _line(row: Row, seen: str) -> str:
     said += "" if row.https else " (HTTP only)"
     measured = _MEASURED.search(seen)
     reachable = f"{5 * math.ceil(int(measured[1]) / 5)} s" if measured else "never"
-    left = ", ".join(f"{mapping}{'' if mapping in LEFT_BEHIND else ' (not made by the device)'}"
+    left = ", ".join(str(mapping) + ("" if mapping in LEFT_BEHIND else " (not the daemon's)")
                      for mapping in row.left) or "nothing"
     cells = (row.name, row.title, _WORDS[row.outcome] + said, reachable, str(row.most_requests),
              left, row.advice)

@@ -88,7 +88,7 @@ ROWS = (
     Row("L4", "Its list of mappings begins at 1", controlled(_from_one), _CLEAN_UP,
         left=LEFT_BEHIND),
     Row("L5", "Its list of mappings is the same one without end", controlled(_same_for_ever),
-        _CLEAN_UP, left=LEFT_BEHIND, seconds=300, longest=300, requests=18_000),
+        _CLEAN_UP, left=LEFT_BEHIND, seconds=300, longest=300, requests=35_000),
     Row("L6", "Lists the newest mapping first", controlled(_newest_first), NOTHING),
     Row("L7", "Keeps no descriptions", controlled(_describing(0)), _CLEAN_UP, left=LEFT_BEHIND),
     Row("L7b", "Keeps three letters of a description", controlled(_describing(3)), _CLEAN_UP,

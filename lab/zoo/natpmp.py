@@ -140,5 +140,5 @@ ROWS = (
     Row("N14", "Answers with two bytes", _delivering(_cut(2, lambda _: True)), BY_HAND, RELAYED,
         NO_NATPMP),
     Row("N14b", "Answers requests for a mapping with eight bytes", _delivering(_cut(8, _maps)),
-        BY_HAND, RELAYED, NO_MAPPING, seconds=380, longest=380, requests=5000),
+        BY_HAND, RELAYED, NO_MAPPING, seconds=450, longest=450, requests=5000),
 )

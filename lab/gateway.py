@@ -74,7 +74,10 @@ class Listed:
 
 
 class Gateway:
-    """The router and its actual state. Its leases run in device time, `clock` times ours."""
+    """The router and its actual state. Its leases run in device time, `clock` times ours.
+
+    The lab's own servers note UPnP calls in `diary`, and as "odd" what no good gateway would do.
+    """
 
     def __init__(self, folder: Path, setup: GatewaySetup, timeline: Timeline,
                  clock: int = 1) -> None:
@@ -90,6 +93,7 @@ class Gateway:
         self._natpmp: NatPmp | None = None
         self._scripted: ScriptedGateway | None = None
         self._others: list[ScriptedGateway] = []
+        self.diary: list[str] = []
         self._online = True
         self.server = Server("miniupnpd", network.GATEWAY,
                              ["miniupnpd", "-d", "-f", str(folder / "miniupnpd.conf"),
@@ -121,7 +125,7 @@ class Gateway:
         self._serve()
         for number, personality in enumerate(self._setup.others, start=2):
             self._add_lan_address(address := f"192.168.77.{number}")
-            other = ScriptedGateway(personality, lambda: self.wan_address)
+            other = ScriptedGateway(personality, lambda: self.wan_address, self.diary)
             other.start(address)
             self._others.append(other)
 
@@ -282,6 +286,11 @@ class Gateway:
         return [Listed(Mapping(protocol, int(external), address, int(internal)), words, int(lease))
                 for protocol, external, address, internal, words, lease in _LISTED.findall(listing)]
 
+    def was_asked(self, call: str) -> bool:
+        """True if a UPnP client asked for this, as in "DeletePortMapping: external port: 9091"."""
+        log = self.server.log
+        return call in self.diary or log.exists() and call in log.read_text(errors="replace")
+
     def requests(self) -> int:
         """The device's requests; those of the lab and the neighbour do not count."""
         return self.upnp_requests() + self.natpmp_requests()
@@ -297,10 +306,12 @@ class Gateway:
     def _serve(self) -> None:
         packet_filter.change("flush chain inet lab silence\n")
         if self._setup.natpmp and self._setup.grant:
-            self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address)
+            self._natpmp = NatPmp(self._setup.grant, self._clock, lambda: self.wan_address,
+                                  self.diary)
             self._natpmp.start(self.served_at)
         if self._setup.upnp and self._setup.personality:
-            self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address)
+            self._scripted = ScriptedGateway(self._setup.personality, lambda: self.wan_address,
+                                             self.diary)
             self._scripted.start(self.served_at)
         if self._setup.needs_miniupnpd:
             (self._folder / "miniupnpd.conf").write_text(self._configuration())

@@ -65,8 +65,13 @@ class Grant:
 class NatPmp:
     """The server on the router's LAN side; its mappings are rules in the router's packet filter."""
 
-    def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str]) -> None:
-        """Leases run in a time that is `clock` times as fast as ours."""
+    def __init__(self, grant: Grant, clock: int, public_address: Callable[[], str],
+                 diary: list[str]) -> None:
+        """Leases run in a time that is `clock` times as fast as ours.
+
+        Answers to the device that a good gateway would give in another way are noted in `diary`.
+        """
+        self._diary = diary
         self._grant = grant
         self._clock = clock
         self._public_address = public_address
@@ -148,7 +153,11 @@ class NatPmp:
             return [self._perform(request, client)]
         result = self._grant.result(request)
         answer = self._refuse(request, result) if result else self._perform(request, client)
-        return self._grant.deliver(request, answer)
+        sent = list(self._grant.deliver(request, answer))
+        if (result or sent != [answer] or self._delay or self._grant.source != PORT
+                or operation and answer[8:] != datagram[4:]):
+            self._diary.append("odd NAT-PMP")
+        return sent
 
     def _perform(self, request: Request, client: str) -> bytes:
         if not request.operation:

@@ -29,6 +29,7 @@ ANY_DEVICE, EVERYTHING = "upnp:rootdevice", "ssdp:all"
 _SSDP_GROUP = "239.255.255.250"
 _TARGETS = (DEVICE_TYPE, IP_SERVICE, ANY_DEVICE, EVERYTHING)
 _LOOK_SECONDS = 0.05
+_LATE_SECONDS = 0.1
 
 _NO_SUCH_ACTION, _NOT_IN_ARRAY, _NOT_MAPPED, _CONFLICT = 401, 713, 714, 718
 
@@ -74,6 +75,7 @@ _FAULT = ('<s:Fault><faultcode>s:Client</faultcode><faultstring>UPnPError</fault
 _ARGUMENT = re.compile(r"<(New\w+)>(.*?)</")
 
 Arguments = dict[str, str]
+Deliver = Callable[[bytes, bytes], Iterable[bytes]]
 
 
 @dataclass(frozen=True)
@@ -120,10 +122,12 @@ class Call:
     action: str
     service: str
     arguments: Arguments
+    performed: list[Answer] = field(default_factory=list, init=False)
 
     def perform(self) -> Answer:
         """Do what a good gateway does, and return its answer."""
-        return self.gateway.perform(self)
+        self.performed.append(answer := self.gateway.perform(self))
+        return answer
 
 
 @dataclass(frozen=True)
@@ -173,10 +177,10 @@ class Personality:
     search: Callable[[Search], Iterable[bytes]] = at("{base}/rootDesc.xml")
     search_port: int = SEARCH_PORT
     describe: Callable[[str], str] = unchanged
-    deliver: Callable[[bytes, bytes], Iterable[bytes]] = whole
+    deliver: Deliver = whole
     control_url: str = "/control"
     control: Callable[[Call], Answer] = performed
-    deliver_control: Callable[[bytes, bytes], Iterable[bytes]] = whole
+    deliver_control: Deliver = whole
     delay: float = 0
     errors: Mapping[str, int] = field(default_factory=dict)
     forwards: bool = True
@@ -185,13 +189,16 @@ class Personality:
 class ScriptedGateway:
     """The server on the router's LAN side; what it forwards are rules in the packet filter.
 
-    Its list of mappings, `table`, is its own: by protocol and external port.
+    Its list of mappings, `table`, is its own: by protocol and external port. It notes in `diary`
+    each call, and what a good gateway would have done in another way.
     """
 
-    def __init__(self, personality: Personality, public_address: Callable[[], str]) -> None:
+    def __init__(self, personality: Personality, public_address: Callable[[], str],
+                 diary: list[str]) -> None:
         """Forwardings that exist already are on the list of a gateway that forwards."""
         self.personality = personality
         self.table: dict[tuple[str, int], Entry] = {}
+        self.diary = diary
         self._public_address = public_address
         self._lock = threading.Lock()
         self._stopping = threading.Event()
@@ -237,14 +244,22 @@ class ScriptedGateway:
             common=SERVICE.format(type=COMMON_SERVICE, id="WANCommonIFC1", control_url="/common"),
             connection=SERVICE.format(type=IP_SERVICE, id="WANIPConn1",
                                       control_url=escape(self.personality.control_url)))
-        return self.personality.describe(text).encode("latin-1")
+        described = self.personality.describe(text)
+        if described != text or self.personality.control_url != Personality.control_url:
+            self.diary.append("odd description")
+        return described.encode("latin-1")
 
     def answer(self, call: Call) -> Answer:
         """The answer to a call."""
+        self.diary.append(f"{call.action}: external port: {call.arguments.get('NewExternalPort')}")
         time.sleep(self.personality.delay)
         if call.action in self.personality.errors:
-            return self.personality.errors[call.action], {}
-        return self.personality.control(call)
+            answer: Answer = self.personality.errors[call.action], {}
+        else:
+            answer = self.personality.control(call)
+        if self.personality.delay or call.performed != [answer]:
+            self.diary.append(f"odd {call.action}")
+        return answer
 
     def perform(self, call: Call) -> Answer:
         """The answer of a good gateway, after it has done what it says."""
@@ -285,13 +300,18 @@ class ScriptedGateway:
 
     def _announce(self, search: Search, address: str, client: tuple[str, int]) -> None:
         """Answer one search, until there is no more to say or nobody listens any more."""
+        began, sent = time.monotonic(), []
         with _datagram_socket(address, self.personality.search_port) as sender:
             sender.connect(client)
             for datagram in self.personality.search(search):
                 try:
                     sender.send(datagram)
                 except OSError:
-                    return
+                    break
+                sent.append(datagram)
+        if (sent != list(Personality.search(search)) or time.monotonic() - began > _LATE_SECONDS
+                or self.personality.search_port != SEARCH_PORT):
+            self.diary.append("odd search")
 
     def _status(self, _arguments: Arguments) -> Answer:
         return 0, {"NewConnectionStatus": "Connected", "NewLastConnectionError": "ERROR_NONE",
@@ -362,7 +382,7 @@ class _Handler(BaseHTTPRequestHandler):
     def do_GET(self) -> None:
         """Deliver the description, whatever the path."""
         gateway, body = self.server.gateway, self.server.gateway.description()
-        self._send(gateway.personality.deliver(_head("200 OK", len(body)), body))
+        self._send(gateway.personality.deliver, _head("200 OK", len(body)), body)
 
     def do_POST(self) -> None:
         """Perform an action of the control service."""
@@ -380,10 +400,12 @@ class _Handler(BaseHTTPRequestHandler):
         if text is None:
             self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, NO_LINGERING)
             return
-        self._send(gateway.personality.deliver_control(_head(status, len(text)), text))
+        self._send(gateway.personality.deliver_control, _head(status, len(text)), text)
 
-    def _send(self, pieces: Iterable[bytes]) -> None:
-        for piece in pieces:
+    def _send(self, deliver: Deliver, head: bytes, body: bytes) -> None:
+        for piece in deliver(head, body):
+            if piece != head + body:
+                self.server.gateway.diary.append("odd delivery")
             self.wfile.write(piece)
 
     def log_message(self, *_arguments: object) -> None:

@@ -8,9 +8,10 @@ from collections.abc import Callable, Iterable
 
 from lab.gateway import GatewaySetup
 from lab.scripted_gateway import (COMMON_SERVICE, IP_SERVICE, PPP_SERVICE, SERVICE, Answer, Call,
-                                  Page, Personality, whole)
+                                  Deliver, Page, Personality, whole)
 from lab.zoo.events import restart
 from lab.zoo.hooks import MAPPING_CALLS, CallHook, replying, wait
+from lab.zoo.met import not_provoked
 from lab.zoo.row import (BY_HAND, CLOCK, NO_ADDRESS, NO_MAPPING, NOTHING, RELAYED, TEST_FAILED,
                          Row)
 
@@ -61,8 +62,14 @@ def _unmeasured(head: bytes, body: bytes) -> Iterable[bytes]:
     wait(15)
 
 
-def _cut(head: bytes, body: bytes) -> Iterable[bytes]:
-    return [head.replace(b"Length: %d" % len(body), b"Length: %d" % (len(body) - 20)) + body]
+def _saying(more: int) -> Deliver:
+    """Say that there are so many bytes more than there are, and wait if the client does."""
+
+    def delivered(head: bytes, body: bytes) -> Iterable[bytes]:
+        yield head.replace(b"Length: %d" % len(body), b"Length: %d" % (len(body) + more)) + body
+        wait(15 if more > 0 else 0)
+
+    return delivered
 
 
 def _chunked(head: bytes, body: bytes) -> Iterable[bytes]:
@@ -115,7 +122,8 @@ def _picky(wish: Callable[[Call], bool]) -> CallHook:
 
 ROWS = (
     Row("H1", "Restarts, and its description and control URL move to another port",
-        GatewaySetup(), NOTHING, between={1: restart, 2: restart, 3: restart}),
+        GatewaySetup(), NOTHING, why="IGD found at: http://192.168.77.1:5004/",
+        between={1: restart, 2: restart, 3: restart}),
     Row("H2", "The description names another port as the base of its URLs",
         _scripted(Personality(describe=lambda text: text.replace(
             "<device>", "<URLBase>http://192.168.77.1:5999/</URLBase><device>", 1))),
@@ -140,17 +148,26 @@ ROWS = (
         _scripted(Personality(deliver=_unmeasured, deliver_control=_unmeasured)), NOTHING,
         seconds=150, longest=150),
     Row("H9b", "Content-Length is too small by 20 bytes",
-        _scripted(Personality(deliver=_cut, deliver_control=_cut)), NOTHING),
+        _scripted(Personality(deliver=_saying(-20), deliver_control=_saying(-20))), NOTHING),
+    Row("H9c", "Content-Length is too large by 20 bytes, and the connection stays open for 15 s",
+        _scripted(Personality(deliver=_saying(20), deliver_control=_saying(20))), NOTHING,
+        seconds=150, longest=150),
     Row("H10", "Chunked answers", _scripted(Personality(deliver=_chunked,
                                                         deliver_control=_chunked)), NOTHING),
     Row("H11", "Empty answers with status 500 to everything about mappings",
         _scripted(Personality(control=replying(_EMPTY, *MAPPING_CALLS))), BY_HAND, RELAYED,
-        NO_MAPPING, longest=300, requests=5000),
+        NO_MAPPING, seconds=60, requests=5000),
     Row("H11b", "Resets every connection to its control service",
         _scripted(Personality(control=replying(Page(body=None)))), BY_HAND, RELAYED, NO_ADDRESS),
     Row("H12", "Web pages (404) instead of answers about mappings",
         _scripted(Personality(control=replying(Page(), *MAPPING_CALLS))), BY_HAND, RELAYED,
-        TEST_FAILED, seconds=180, longest=180, requests=120),
+        TEST_FAILED, seconds=165, longest=165, requests=120),
+    Row("H12c", "A login page (200) instead of answers about mappings",
+        _scripted(Personality(control=replying(Page("200 OK"), *MAPPING_CALLS))), BY_HAND, RELAYED,
+        TEST_FAILED, seconds=165, longest=165, requests=120),
+    Row("H12d", "Empty redirections (302) instead of answers about mappings",
+        _scripted(Personality(control=replying(Page("302 Found", b""), *MAPPING_CALLS))), BY_HAND,
+        RELAYED, NO_MAPPING, seconds=60, requests=5000),
     Row("H12b", "Web pages (404) instead of any answer of the control service",
         _scripted(Personality(control=replying(Page()))), BY_HAND, RELAYED, NO_ADDRESS),
     Row("H13", "Each answer takes 4 s", _scripted(Personality(delay=4 / CLOCK)), NOTHING,
@@ -160,11 +177,11 @@ ROWS = (
         longest=130),
     Row("H14", "Refuses to add a mapping soon after another call",
         _scripted(Personality(control=_tired("AddPortMapping"))), BY_HAND, RELAYED, NO_MAPPING,
-        longest=300, requests=5000),
+        seconds=65, longest=65, requests=5000),
     Row("H14b", "Refuses every call that comes soon after another",
         _scripted(Personality(control=_tired())), BY_HAND, RELAYED, NO_ADDRESS),
     Row("H15", "Picky about the request: quotes, upper case, a description, Host with port, ...",
-        _scripted(Personality(control=_picky(_meets_every_wish))), NOTHING),
+        _scripted(Personality(control=_picky(_meets_every_wish))), NOTHING, played=not_provoked),
     Row("H15b", 'Picky about the request: refuses it without `charset="utf-8"`',
         _scripted(Personality(control=_picky(
             lambda call: 'charset="utf-8"' in call.headers["Content-Type"].lower()))),

@@ -4,6 +4,7 @@ from __future__ import annotations
 
 import itertools
 import random
+import re
 from collections.abc import Iterable
 
 from lab.gateway import GatewaySetup
@@ -11,6 +12,7 @@ from lab.scripted_gateway import (ANY_DEVICE, DEVICE_TYPE, PPP_SERVICE, Personal
                                   Search, at)
 from lab.zoo.events import go_deaf
 from lab.zoo.hooks import late, only, telling, wait
+from lab.zoo.met import described_as_version_2
 from lab.zoo.row import (BY_HAND, LEFT_BEHIND, NO_ADDRESS, NO_ANSWER, NO_GATEWAY, NOT_USED,
                          NOTHING, OTHER_ADDRESS, RELAYED, Row)
 
@@ -33,7 +35,8 @@ SETUP_DEVICE = Personality(
     search=lambda search: [search.answer()], describe=lambda _: _SETUP_DESCRIPTION, forwards=False)
 
 
-def _version_2(text: str) -> str:
+def version_2(text: str) -> str:
+    """The description, with version 2 of every device and service that has one."""
     for name in ("InternetGatewayDevice", "WANDevice", "WANConnectionDevice", "WANIPConnection"):
         text = text.replace(f"{name}:1", f"{name}:2")
     return text
@@ -50,6 +53,11 @@ def _many_names(search: Search) -> Iterable[bytes]:
             for number in range(400) if search.target == DEVICE_TYPE)
 
 
+def _without_location(search: Search) -> Iterable[bytes]:
+    return (re.sub(rb"LOCATION: .*\r\n", line, answer)
+            for answer in _GOOD(search) for line in (b"LOCATION: \r\n", b""))
+
+
 def _garbage(search: Search) -> Iterable[bytes]:
     if search.target != DEVICE_TYPE:
         return
@@ -63,9 +71,10 @@ def _garbage(search: Search) -> Iterable[bytes]:
 COPIES = Personality(search=_copies)
 
 
-def _access_point(address: str) -> GatewaySetup:
-    return GatewaySetup(others=(Personality(search=late(0.3, _GOOD), forwards=False,
-                                            control=telling(NewExternalIPAddress=address)),))
+def access_point(address: str) -> Personality:
+    """Answers as a gateway, later, tells this address and forwards nothing."""
+    return Personality(search=late(0.3, _GOOD), forwards=False,
+                       control=telling(NewExternalIPAddress=address))
 
 
 def _scripted(gateway: Personality, *others: Personality) -> GatewaySetup:
@@ -78,10 +87,10 @@ ROWS = (
     Row("D1b", "Answers only the search target `upnp:rootdevice`",
         _scripted(Personality(search=only(ANY_DEVICE))), BY_HAND, RELAYED, NOT_USED),
     Row("D2", "Version 2, deaf to searches for version 1",
-        _scripted(Personality(search=only(ANY_DEVICE), describe=_version_2)),
+        _scripted(Personality(search=only(ANY_DEVICE), describe=version_2)),
         "switch on the compatibility with version 1, or " + BY_HAND, RELAYED, NOT_USED),
     Row("D3", "Answers the search as version 1, describes itself as version 2",
-        GatewaySetup(settings={"force_igd_desc_v1": "no"}), NOTHING),
+        GatewaySetup(settings={"force_igd_desc_v1": "no"}), NOTHING, played=described_as_version_2),
     Row("D4", "Answers the search 5 s late",
         _scripted(Personality(search=late(5, _GOOD))), NOTHING, seconds=30),
     Row("D4b", "Answers no search, only announces itself unasked",
@@ -93,20 +102,24 @@ ROWS = (
     Row("D6", "Answers the search from an odd port",
         _scripted(Personality(search_port=43702)), NOTHING),
     Row("D7", "Answers at another address than the default route's",
-        GatewaySetup(natpmp=True, served_at="192.168.77.2"), NOTHING),
+        GatewaySetup(natpmp=True, served_at="192.168.77.2"), NOTHING,
+        why="IGD found at: http://192.168.77.2:"),
     Row("D8", "Its description is said to be on the device, on another subnet, or nowhere",
         _scripted(Personality(search=_NOWHERE)), BY_HAND, RELAYED, NO_GATEWAY, seconds=100,
         longest=100),
+    Row("D8b", "Does not say where its description is: empty or missing LOCATION",
+        _scripted(Personality(search=_without_location)), BY_HAND, RELAYED,
+        "upnp_discover - gateway ignored, its description is not at another host's"),
     Row("D9", "A Wi-Fi setup device on the LAN claims every search target, before the gateway",
         _scripted(Personality(search=late(0.5, _GOOD)), SETUP_DEVICE), NOTHING),
     Row("D9b", "Silent, while a Wi-Fi setup device on the LAN claims every search target",
         _scripted(Personality(search=lambda _: []), SETUP_DEVICE),
         "switch on UPnP on the gateway, or " + BY_HAND, RELAYED, NO_ADDRESS),
     Row("D10", "An access point answers as a gateway as well, later, with a public address",
-        _access_point("44.128.0.99"), "switch off UPnP on the access point", RELAYED,
-        OTHER_ADDRESS, requests=100),
+        GatewaySetup(others=(access_point("44.128.0.99"),)),
+        "switch off UPnP on the access point", RELAYED, OTHER_ADDRESS, requests=65),
     Row("D10b", "An access point answers as a gateway as well, later, with the address 0.0.0.0",
-        _access_point("0.0.0.0"), NOTHING, requests=100),
+        GatewaySetup(others=(access_point("0.0.0.0"),)), NOTHING, requests=100),
     Row("D11", "Goes deaf to searches after a while",
         GatewaySetup(), "restart the gateway; delete mappings that are left behind",
         why="UPnP discovery failed, running port test to see if ports are still open",

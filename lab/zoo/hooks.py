@@ -6,7 +6,8 @@ import itertools
 import time
 from collections.abc import Callable, Iterable
 
-from lab.scripted_gateway import Answer, Call, Page, Search
+from lab.gateway import GatewaySetup
+from lab.scripted_gateway import Answer, Call, Page, Personality, Search
 from lab.zoo.row import CLOCK
 
 SearchHook = Callable[[Search], Iterable[bytes]]
@@ -14,6 +15,11 @@ CallHook = Callable[[Call], Answer]
 
 MAPPING_CALLS = ("AddPortMapping", "DeletePortMapping", "GetSpecificPortMappingEntry",
                  "GetGenericPortMappingEntry")
+
+
+def controlled(hook: CallHook) -> GatewaySetup:
+    """A gateway that is good but for its answers to calls."""
+    return GatewaySetup(personality=Personality(control=hook))
 
 
 def wait(seconds: float) -> None:

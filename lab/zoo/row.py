@@ -31,6 +31,7 @@ TEST_FAILED = "testPort - port map check failed"
 
 # What the owner can do.
 NOTHING = "nothing: it works"
+PERMANENT = "nothing: the device asks for permanent mappings only"
 BY_HAND = "forward two ports by hand and enter them in the settings"
 ASK_PROVIDER = "ask the provider for a public address"
 LEFT_BEHIND = tuple(BOTH_MAPPED)
@@ -45,6 +46,9 @@ class Row:
     the gateway gets at most `requests` requests before SIGTERM; 0 stands for what is usual with the
     outcome. All are seconds of the device. What is in `left` stays at the gateway after SIGTERM.
     What is in `between` happens in the pause after the cycle of that number; 0 is before the first.
+
+    `played` tells after the last cycle if the device has met the behaviour; the lab's own servers
+    know it themselves. Unless `https`, only HTTP comes through the gateway by then.
     """
 
     name: str
@@ -58,6 +62,8 @@ class Row:
     requests: int = 0
     left: tuple[Forwarding, ...] = ()
     between: Mapping[int, Callable[[Lab], None]] = field(default_factory=dict)
+    played: Callable[[Lab], bool] | None = None
+    https: bool = True
 
     @property
     def within(self) -> int:

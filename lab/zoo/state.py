@@ -3,16 +3,15 @@
 from __future__ import annotations
 
 from lab.gateway import GatewaySetup
-from lab.scripted_gateway import Personality
 from lab.zoo.events import go_offline, go_online
-from lab.zoo.hooks import telling
+from lab.zoo.hooks import controlled, telling
 from lab.zoo.row import ASK_PROVIDER, NO_ADDRESS, NOTHING, OTHER_ADDRESS, RELAYED, Row
 
 _CARRIER_GRADE = "100.64.3.4"
 
 
 def _telling(**values: str) -> GatewaySetup:
-    return GatewaySetup(personality=Personality(control=telling(**values)))
+    return controlled(telling(**values))
 
 
 ROWS = (

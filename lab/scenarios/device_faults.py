@@ -33,7 +33,7 @@ _NOT_YET_VALID = "Error: [SSL peer certificate or SSH remote key was not OK]"
 @scenario(_NO_RELAY)
 def started_oddly(lab: Lab) -> None:
     """Started without open descriptors, with SIGCHLD ignored or in a locale: as always."""
-    for through in (faults.CLOSED, faults.NO_SIGCHLD, faults.LOCALE):
+    for through in (faults.CLOSED, faults.NO_SIGCHLD, faults.foreign_locale()):
         lab.step(f"started through {through[-2:]}")
         _start(lab, through)
         assert lab.device.messages.count("unable to check drive status") == 0
@@ -210,9 +210,10 @@ def _own_file_system(folder: Path) -> None:
 def _assert_recovers_from(lab: Lab, trouble: faults.Begin) -> None:
     """The running daemon lives through two cycles of the fault, and then does its work."""
     start_direct(lab)
-    with trouble(lab):
+    with trouble(lab) as met:
         lab.device.change(NICKNAME="box")  # has the settings read again
         wait_for_next_cycle(lab, 2)
+        lab.wait_for(met, "the daemon to meet the fault", 60)
         assert len(daemon.running("pelorus")) == 1
     lab.step("the fault is over")
     wait_for_next_cycle(lab, 2)

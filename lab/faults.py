@@ -218,14 +218,15 @@ def descriptors_exhausted(lab: Lab) -> Iterator[None]:
 @_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def memory_exhausted(lab: Lab) -> Iterator[Met]:
     """The daemon gets no more memory from the kernel."""
-    with _refused(lab, "mmap,brk", "ENOMEM") as met:
+    # The system call brk tells a failure by an old address, not by an error number.
+    with _refused(lab, "mmap:error=ENOMEM", "brk:retval=0") as met:
         yield met
 
 
 @_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def processes_exhausted(lab: Lab) -> Iterator[Met]:
     """The daemon can start no process and no thread."""
-    with _refused(lab, "fork,vfork,clone,clone3", "EAGAIN") as met:
+    with _refused(lab, "fork,vfork,clone,clone3:error=EAGAIN") as met:
         yield met
 
 
@@ -314,11 +315,10 @@ def _limited(lab: Lab, resource: str, limit: int) -> Iterator[None]:
 
 
 @contextmanager
-def _refused(lab: Lab, calls: str, error: str) -> Iterator[Met]:
-    """Let the kernel refuse these calls to the daemon and the children that it starts."""
+def _refused(lab: Lab, *refusals: str) -> Iterator[Met]:
+    """Let the kernel refuse calls, named as for strace, to the daemon and what it starts."""
     record = Path("/run/lab/refused")
-    with traced(lab.daemon.pid, "-o", str(record), "-e", f"trace={calls}", "-e",
-                f"inject={calls}:error={error}"):
+    with traced(lab.daemon.pid, "-o", str(record), *(f"-einject={call}" for call in refusals)):
         yield lambda: "(INJECTED)" in record.read_text(errors="replace")
 
 

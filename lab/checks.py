@@ -28,6 +28,10 @@ TUNNEL_PID_FILE = HOME / "openvpn/openvpn.pid"
 # A gateway that only masquerades.
 SILENT = GatewaySetup(upnp=False)
 
+# Ports that the user forwards; `forward_by_hand` does it at the gateway.
+MANUAL_PORTS = {"MANUAL_PORT_FORWARD": "TRUE", "MANUAL_EXTERNAL_HTTP_PORT": "8081",
+                "MANUAL_EXTERNAL_HTTPS_PORT": "8444"}
+
 # Lines of the device's log: the end of a cycle, a skipped port test, a tunnel given up.
 PAUSE = "DaemonControl::run - retry connection after "
 NOT_DUE = "createDirectConnection() - Ignore Port Test due to Interval"
@@ -40,6 +44,12 @@ BOTH_MAPPED = [Mapping("TCP", 9091, network.DEVICE_ADDRESS, 80),
                Mapping("TCP", 9444, network.DEVICE_ADDRESS, 443)]
 PUBLISHED = Record(network.GATEWAY_WAN_ADDRESS, network.DEVICE_ADDRESS, 9091, 9444)
 PAGES = ["welcome to mynas, over http", "welcome to mynas, over https"]
+
+
+def forward_by_hand(lab: Lab) -> None:
+    """Forward the ports of `MANUAL_PORTS` to the device."""
+    lab.gateway.forward_by_hand(8081, 80)
+    lab.gateway.forward_by_hand(8444, 443)
 
 
 def wait_for_status(lab: Lab, status: str) -> None:

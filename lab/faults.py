@@ -1,6 +1,7 @@
 """Faults of the service, the name server and the device that a running daemon meets.
 
-Each is a context manager: the fault begins with its block and is over with it.
+Each is a context manager: the fault begins with its block and is over with it. Its value tells
+whether the daemon has met the fault so far.
 """
 
 from __future__ import annotations
@@ -17,10 +18,13 @@ from lab import network
 from lab.account import SERVICE_HOST
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault
 from lab.certificates import Authority
+from lab.checks import PAUSE
 from lab.scenario import Lab
 from lab.support import run_tool, wait_until
 
-Begin = Callable[[Lab], AbstractContextManager[None]]
+Met = Callable[[], bool]
+Begin = Callable[[Lab], AbstractContextManager[Met]]
+_Play = Callable[[Lab], Iterator["Met | None"]]
 
 _EVERYTHING = (COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT)
 _NOBODY = "44.128.0.99"
@@ -30,28 +34,40 @@ _CLOCK = Path("/run/lab/clock")
 _FILLER = "filler"
 _names = (f"box{number}" for number in itertools.count())
 
-# Commands that start the daemon in an unusual way: no descriptor is open, its parent ignores
-# SIGCHLD, or a locale is set.
+# Commands that start the daemon in an unusual way: no descriptor is open, or its parent ignores
+# SIGCHLD.
 CLOSED = ("sh", "-c", 'exec "$@" <&- >&- 2>&-', "sh")
 NO_SIGCHLD = ("env", "--ignore-signal=CHLD")
-LOCALE = ("env", "LC_ALL=tr_TR.UTF-8", "LANG=de_DE@euro", "LANGUAGE=de:tr", "LC_NUMERIC=C.UTF-8")
+_LOCALES = Path("/run/lab/locales")
+_LOCALE = "de_DE.ISO-8859-1"
+
+# The daemon has met a fault when its log has a line this often since: a request that failed, or the
+# end of a cycle, of which the second was wholly within the fault.
+_REQUEST_FAILED = ("TavikClient::httpGet  Error: [", 1)
+_CYCLE_ENDED = (PAUSE, 2)
 
 SERVICE_FAULTS: dict[str, Begin] = {}
 DEVICE_FAULTS: dict[str, Begin] = {}
 
 
-def _of(table: dict[str, Begin]) -> Callable[[Callable[[Lab], Iterator[None]]], Begin]:
-    """Make a fault of a function that begins it, yields and ends it, and list it by its name."""
+def _of(table: dict[str, Begin], sign: tuple[str, int]) -> Callable[[_Play], Begin]:
+    """Make a fault of a function that begins it, yields and ends it, and list it by its name.
 
-    def register(play: Callable[[Lab], Iterator[None]]) -> Begin:
+    The `sign` in the log that the daemon has met it gives way to what the function yields.
+    """
+
+    def register(play: _Play) -> Begin:
         name = play.__name__.replace("_", "-")
         assert play.__doc__
         words = play.__doc__.splitlines()[0]
+        line, often = sign
 
         @contextmanager
-        def fault(lab: Lab) -> Iterator[None]:
+        def fault(lab: Lab) -> Iterator[Met]:
             lab.timeline.add("fault", words)
-            yield from play(lab)
+            with contextmanager(play)(lab) as met:
+                before = lab.device.messages.count(line)
+                yield met or (lambda: lab.device.messages.count(line) >= before + often)
             lab.timeline.add("fault", f"is over: {words}")
 
         table[name] = fault
@@ -60,7 +76,7 @@ def _of(table: dict[str, Begin]) -> Callable[[Callable[[Lab], Iterator[None]]], 
     return register
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def certificate_expired(lab: Lab) -> Iterator[None]:
     """The service's certificate has run out."""
     lab.central.show_certificate_of(SERVICE_HOST, expired=True)
@@ -68,7 +84,7 @@ def certificate_expired(lab: Lab) -> Iterator[None]:
     lab.central.show_certificate_of(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def certificate_of_another(lab: Lab) -> Iterator[None]:
     """The service's certificate has another name."""
     lab.central.show_certificate_of("elsewhere.example")
@@ -76,7 +92,7 @@ def certificate_of_another(lab: Lab) -> Iterator[None]:
     lab.central.show_certificate_of(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def authority_unknown(lab: Lab) -> Iterator[None]:
     """The service's certificate is signed by an unknown authority."""
     lab.central.show_certificate_from(Authority(Path("/run/lab/unknown"), "Somebody"))
@@ -84,7 +100,7 @@ def authority_unknown(lab: Lab) -> Iterator[None]:
     lab.central.show_certificate_of(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def tls_outdated(lab: Lab) -> Iterator[None]:
     """The service speaks nothing newer than TLS 1.0."""
     lab.central.show_certificate_of(SERVICE_HOST, outdated=True)
@@ -92,7 +108,7 @@ def tls_outdated(lab: Lab) -> Iterator[None]:
     lab.central.show_certificate_of(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def tls_missing(lab: Lab) -> Iterator[None]:
     """The service speaks plain HTTP on port 443."""
     lab.central.drop_tls()
@@ -100,7 +116,7 @@ def tls_missing(lab: Lab) -> Iterator[None]:
     lab.central.show_certificate_of(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def service_stalls(lab: Lab) -> Iterator[None]:
     """The service accepts connections and keeps silent."""
     lab.central.keep_silent()
@@ -116,25 +132,25 @@ def _misbehaviour(lab: Lab, fault: Fault) -> Iterator[None]:
         lab.central.misbehave(operation, None)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def service_drips(lab: Lab) -> Iterator[None]:
     """The service sends a byte in half a second."""
     yield from _misbehaviour(lab, Fault(body="Success" * 100, pause=0.5))
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def service_floods(lab: Lab) -> Iterator[None]:
     """The service's answers have no end."""
     yield from _misbehaviour(lab, Fault(body="Success" * 10000, endless=True))
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def service_resets(lab: Lab) -> Iterator[None]:
     """The service resets every connection."""
     yield from _misbehaviour(lab, Fault(reset=True))
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def service_gone(lab: Lab) -> Iterator[None]:
     """The service is down."""
     lab.central.stop()
@@ -142,7 +158,7 @@ def service_gone(lab: Lab) -> Iterator[None]:
     lab.central.start()
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def names_time_out(lab: Lab) -> Iterator[None]:
     """The name server does not answer."""
     lab.device.limit_lookups(1)
@@ -152,7 +168,7 @@ def names_time_out(lab: Lab) -> Iterator[None]:
     lab.device.limit_lookups()
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def names_lead_nowhere(lab: Lab) -> Iterator[None]:
     """The name server says that the service is where nobody is."""
     lab.names.pin(SERVICE_HOST, _NOBODY)
@@ -160,7 +176,7 @@ def names_lead_nowhere(lab: Lab) -> Iterator[None]:
     lab.names.unpin(SERVICE_HOST)
 
 
-@_of(SERVICE_FAULTS)
+@_of(SERVICE_FAULTS, _REQUEST_FAILED)
 def names_lead_home(lab: Lab) -> Iterator[None]:
     """The name server says that the service is the device itself."""
     lab.names.pin(SERVICE_HOST, "127.0.0.1")
@@ -168,22 +184,23 @@ def names_lead_home(lab: Lab) -> Iterator[None]:
     lab.names.unpin(SERVICE_HOST)
 
 
-@_of(DEVICE_FAULTS)
-def log_gone(lab: Lab) -> Iterator[None]:
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
+def log_gone(lab: Lab) -> Iterator[Met]:
     """Nobody receives the log."""
     lab.device.messages.stop()
-    yield
+    before = len(lab.central.requests)
+    yield lambda: len(lab.central.requests) > before
     lab.device.messages.start()
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def tmp_full(_lab: Lab) -> Iterator[None]:
     """There is no space left in /tmp."""
     with full(Path("/tmp")):
         yield
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def tmp_read_only(_lab: Lab) -> Iterator[None]:
     """/tmp is mounted read-only."""
     run_tool("mount", "-o", "remount,ro", "/tmp")
@@ -191,51 +208,54 @@ def tmp_read_only(_lab: Lab) -> Iterator[None]:
     run_tool("mount", "-o", "remount,rw", "/tmp")
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def descriptors_exhausted(lab: Lab) -> Iterator[None]:
     """The daemon has no descriptor left."""
     with _limited(lab, "nofile", 3):
         yield
 
 
-@_of(DEVICE_FAULTS)
-def memory_exhausted(lab: Lab) -> Iterator[None]:
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
+def memory_exhausted(lab: Lab) -> Iterator[Met]:
     """The daemon gets no more memory from the kernel."""
-    with _refused(lab, "mmap,brk", "ENOMEM"):
-        yield
+    # The system call brk tells a failure by an old address, not by an error number.
+    with _refused(lab, "mmap:error=ENOMEM", "brk:retval=0") as met:
+        yield met
 
 
-@_of(DEVICE_FAULTS)
-def processes_exhausted(lab: Lab) -> Iterator[None]:
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
+def processes_exhausted(lab: Lab) -> Iterator[Met]:
     """The daemon can start no process and no thread."""
-    with _refused(lab, "fork,vfork,clone,clone3", "EAGAIN"):
-        yield
+    with _refused(lab, "fork,vfork,clone,clone3:error=EAGAIN") as met:
+        yield met
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def cable_unplugged(lab: Lab) -> Iterator[None]:
     """The network interface is down."""
-    network.ip_batch("link set eth0 down", host=network.DEVICE)
+    port, router = (("wan", network.SERVICE_ADDRESS) if lab.situation.own_router else
+                    ("eth0", lab.gateway.lan_address))
+    network.ip_batch(f"link set {port} down", host=network.DEVICE)
     yield
-    network.ip_batch("link set eth0 up", f"route replace default via {lab.gateway.lan_address}",
+    network.ip_batch(f"link set {port} up", f"route replace default via {router}",
                      host=network.DEVICE)
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def clock_ahead(lab: Lab) -> Iterator[None]:
     """The clock is a year ahead."""
     with _clock_off(lab, _YEAR):
         yield
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def clock_behind(lab: Lab) -> Iterator[None]:
     """The clock is a year behind."""
     with _clock_off(lab, -_YEAR):
         yield
 
 
-@_of(DEVICE_FAULTS)
+@_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def host_renamed(lab: Lab) -> Iterator[None]:
     """The device has another host name."""
     socket.sethostname(next(_names))
@@ -247,6 +267,16 @@ def adjustable_clock(lab: Lab) -> tuple[str, ...]:
     """A command that starts a daemon whose clock the faults of the clock can move."""
     _set_clock(lab, 0)
     return "env", "-u", "FAKETIME", f"FAKETIME_TIMESTAMP_FILE={_CLOCK}", "FAKETIME_NO_CACHE=1"
+
+
+def foreign_locale() -> tuple[str, ...]:
+    """A command that starts the daemon in a locale that writes 1,5 for one and a half."""
+    if not _LOCALES.exists():
+        _LOCALES.mkdir()
+        run_tool("localedef", "-i", "de_DE", "-f", "ISO-8859-1", str(_LOCALES / _LOCALE))
+    command = ("env", f"LOCPATH={_LOCALES}", f"LC_ALL={_LOCALE}")
+    run_tool(*command, "/usr/bin/printf", "%.1f", "1,5")
+    return command
 
 
 @contextmanager
@@ -285,10 +315,11 @@ def _limited(lab: Lab, resource: str, limit: int) -> Iterator[None]:
 
 
 @contextmanager
-def _refused(lab: Lab, calls: str, error: str) -> Iterator[None]:
-    """Let the kernel refuse these calls to the daemon and the children that it starts."""
-    with traced(lab.daemon.pid, "-o", "/dev/null", "-e", f"inject={calls}:error={error}"):
-        yield
+def _refused(lab: Lab, *refusals: str) -> Iterator[Met]:
+    """Let the kernel refuse calls, named as for strace, to the daemon and what it starts."""
+    record = Path("/run/lab/refused")
+    with traced(lab.daemon.pid, "-o", str(record), *(f"-einject={call}" for call in refusals)):
+        yield lambda: "(INJECTED)" in record.read_text(errors="replace")
 
 
 @contextmanager

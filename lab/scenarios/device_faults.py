@@ -9,11 +9,12 @@ from pathlib import Path
 
 from lab import daemon, faults
 from lab.central import PORT_TEST
-from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, NO_TUNNEL, OPTIONS, PAGES, PAUSE, RELAYED,
-                        SILENT, TUNNEL_PID_FILE, assert_log_is_proper, assert_published,
-                        assert_stops_clean, page_through_the_tunnel, pages_from_outside,
-                        start_direct, tunnel_client, wait_for_client_end, wait_for_log,
-                        wait_for_next_cycle, wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, MANUAL_PORTS, NO_TUNNEL, OPTIONS, PAGES,
+                        PAUSE, RELAYED, SILENT, TUNNEL_PID_FILE, assert_log_is_proper,
+                        assert_published, assert_stops_clean, forward_by_hand,
+                        page_through_the_tunnel, pages_from_outside, start, start_direct,
+                        tunnel_client, wait_for_client_end, wait_for_log, wait_for_next_cycle,
+                        wait_for_status)
 from lab.device import DYNAMIC_COPY
 from lab.gateway import GatewaySetup
 from lab.scenario import Lab, Situation
@@ -33,7 +34,7 @@ _NOT_YET_VALID = "Error: [SSL peer certificate or SSH remote key was not OK]"
 @scenario(_NO_RELAY)
 def started_oddly(lab: Lab) -> None:
     """Started without open descriptors, with SIGCHLD ignored or in a locale: as always."""
-    for through in (faults.CLOSED, faults.NO_SIGCHLD, faults.LOCALE):
+    for through in (faults.CLOSED, faults.NO_SIGCHLD, faults.foreign_locale()):
         lab.step(f"started through {through[-2:]}")
         _start(lab, through)
         assert lab.device.messages.count("unable to check drive status") == 0
@@ -175,14 +176,43 @@ def clock_jumps(lab: Lab) -> None:
 @scenario(_NO_RELAY)
 def quiet_cycle(lab: Lab) -> None:
     """Cycles in which nothing changes: the kernel sees no file opened for writing, none touched."""
-    start_direct(lab)
+    _assert_touches_nothing(lab, "portforwarded")
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), static=NO_TUNNEL, clock=FAST))
+def quiet_cycle_with_natpmp(lab: Lab) -> None:
+    """The same while a gateway that speaks NAT-PMP forwards the ports."""
+    _assert_touches_nothing(lab, "portforwarded")
+
+
+@scenario(Situation(gateway=SILENT, static=NO_TUNNEL, dynamic=MANUAL_PORTS, clock=FAST))
+def quiet_cycle_with_manual_ports(lab: Lab) -> None:
+    """The same while the ports are forwarded by hand."""
+    forward_by_hand(lab)
+    _assert_touches_nothing(lab, "portforwarded")
+
+
+@scenario(Situation(gateway=SILENT, relay=True, clock=IMPATIENT))
+def quiet_cycle_while_relayed(lab: Lab) -> None:
+    """The same while no gateway answers and the device is relayed."""
+    _assert_touches_nothing(lab, "relayed")
+
+
+def _assert_touches_nothing(lab: Lab, status: str) -> None:
+    """Watch three cycles that begin with this status, with a port test unless it is relayed."""
+    start(lab, status)
+    wait_for_next_cycle(lab, 2)
+    tests = len(lab.central.port_tests)
     with _traced(lab) as calls:
+        if status != "relayed":
+            lab.wait_for(lambda: len(lab.central.port_tests) > tests, "a port test", 60)
         wait_for_next_cycle(lab, 3)
     seen = calls.read_text().splitlines()
     # It does look at files, its own settings among them.
     assert any(f'"{DYNAMIC_COPY}"' in line for line in seen)
     written = [line for line in seen if _WRITES.search(line) and not _OF_THE_LAB.search(line)]
     assert written == [], written
+    assert lab.device.statuses_sent() == ["connecting", status]
     assert_stops_clean(lab)
 
 
@@ -210,9 +240,10 @@ def _own_file_system(folder: Path) -> None:
 def _assert_recovers_from(lab: Lab, trouble: faults.Begin) -> None:
     """The running daemon lives through two cycles of the fault, and then does its work."""
     start_direct(lab)
-    with trouble(lab):
+    with trouble(lab) as met:
         lab.device.change(NICKNAME="box")  # has the settings read again
         wait_for_next_cycle(lab, 2)
+        lab.wait_for(met, "the daemon to meet the fault", 60)
         assert len(daemon.running("pelorus")) == 1
     lab.step("the fault is over")
     wait_for_next_cycle(lab, 2)

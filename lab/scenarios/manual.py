@@ -4,16 +4,14 @@ from __future__ import annotations
 
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
-from lab.checks import (BOTH_MAPPED, FAST, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS, PAGES,
-                        PUBLISHED, SILENT, assert_logged_by_next_cycle, assert_published,
-                        assert_stops_clean, pages_from_outside, ports_tested, start, wait_for_log,
-                        wait_for_status)
+from lab.checks import (BOTH_MAPPED, FAST, MANUAL_PORTS, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS,
+                        PAGES, PUBLISHED, SILENT, assert_logged_by_next_cycle, assert_published,
+                        assert_stops_clean, forward_by_hand, pages_from_outside, ports_tested,
+                        start, wait_for_log, wait_for_status)
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
 
-_SETTINGS = {"MANUAL_PORT_FORWARD": "TRUE", "MANUAL_EXTERNAL_HTTP_PORT": "8081",
-             "MANUAL_EXTERNAL_HTTPS_PORT": "8444"}
 _HERE, _ELSEWHERE = network.GATEWAY_WAN_ADDRESS, "44.128.0.30"
 _BY_HAND = [Mapping("TCP", 8081, network.DEVICE_ADDRESS, 80),
             Mapping("TCP", 8444, network.DEVICE_ADDRESS, 443)]
@@ -24,10 +22,10 @@ _DOUBLE_NAT = "Enforce connection as RELAY"
 _CLOCK, _INTERVAL = 100, 500
 
 
-@scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
+@scenario(Situation(static=NO_TUNNEL, dynamic=MANUAL_PORTS, clock=FAST))
 def manual_ports(lab: Lab) -> None:
     """Ports forwarded by hand are tested and published; with a wrong port configured it fails."""
-    _forward_by_hand(lab)
+    forward_by_hand(lab)
     start(lab, "portforwarded")
     device_id, auth, _ = lab.account.secrets
     assert [request.url for request in lab.central.requests_for(PORT_TEST)] == [
@@ -109,8 +107,8 @@ def manual_and_back(lab: Lab) -> None:
 
     lab.step("the user forwards ports by hand and configures the device")
     with lab.daemon.held():
-        _forward_by_hand(lab)
-        lab.device.change(**_SETTINGS)
+        forward_by_hand(lab)
+        lab.device.change(**MANUAL_PORTS)
         changed = len(lab.device.messages.all)
     _wait_for_port(lab, 8081)
     assert_logged_by_next_cycle(lab, changed, _BEGIN)
@@ -144,10 +142,10 @@ def manual_and_back(lab: Lab) -> None:
 
 
 # Two discoveries per cycle time out, so it lasts about 280 s.
-@scenario(Situation(gateway=SILENT, dynamic=_SETTINGS, clock=_CLOCK))
+@scenario(Situation(gateway=SILENT, dynamic=MANUAL_PORTS, clock=_CLOCK))
 def manual_without_protocol(lab: Lab) -> None:
     """No mapping protocol: the service is asked for the address at times, a new one published."""
-    _forward_by_hand(lab)
+    forward_by_hand(lab)
     start(lab, "portforwarded", "-p", f"{_INTERVAL}")
     _assert_published_by_hand(lab)
     sent = list(lab.device.local_requests)
@@ -177,11 +175,11 @@ def manual_without_protocol(lab: Lab) -> None:
     assert lab.gateway.by_hand() == _BY_HAND
 
 
-@scenario(Situation(static=NO_TUNNEL, dynamic=_SETTINGS, clock=FAST))
+@scenario(Situation(static=NO_TUNNEL, dynamic=MANUAL_PORTS, clock=FAST))
 def manual_behind_second_nat(lab: Lab) -> None:
     """A second NAT blocks ports forwarded by hand: the test just fails, and passes without it."""
     lab.provider.insert()
-    _forward_by_hand(lab)
+    forward_by_hand(lab)
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, NOT_RELAYED)
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
@@ -208,8 +206,8 @@ def manual_after_second_nat(lab: Lab) -> None:
     lab.step("the second NAT goes away, and the user forwards ports by hand: they are not tested")
     with lab.daemon.held():
         lab.provider.remove()
-        _forward_by_hand(lab)
-        lab.device.change(**_SETTINGS)
+        forward_by_hand(lab)
+        lab.device.change(**MANUAL_PORTS)
     wait_for_log(lab, "relay mode is enforced, therefore don't manual forward ports.", 2)
     assert ports_tested(lab) == [9091]
     assert lab.device.status == "failed"
@@ -222,11 +220,6 @@ def manual_after_second_nat(lab: Lab) -> None:
     _wait_for_port(lab, 8081)
     _assert_published_by_hand(lab)
     assert_stops_clean(lab)
-
-
-def _forward_by_hand(lab: Lab) -> None:
-    lab.gateway.forward_by_hand(8081, 80)
-    lab.gateway.forward_by_hand(8444, 443)
 
 
 def _wait_for_port(lab: Lab, http_port: int) -> None:

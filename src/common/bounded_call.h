@@ -3,11 +3,12 @@
 #ifndef PELORUS_COMMON_BOUNDED_CALL_H
 #define PELORUS_COMMON_BOUNDED_CALL_H
 
+#include <bitset>
 #include <chrono>
 #include <condition_variable>
+#include <cstddef>
 #include <mutex>
 #include <thread>
-#include <vector>
 
 #include "common/signal_block.h"
 
@@ -18,6 +19,10 @@ enum class Peer {
     ANYBODY,
     GATEWAY,  ///< IPv4 hosts other than this device: its own servers trust local clients
 };
+
+constexpr std::size_t kMostDescriptors = 1024;
+/// One bit for each descriptor.
+using Descriptors = std::bitset<kMostDescriptors>;
 
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds
 /// they are shut down: the library then fails as if the peer had closed the connection. So it does
@@ -45,7 +50,7 @@ private:
     const Clock::time_point began = Clock::now();
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
-    std::vector<int> before;  // sockets that were open, in order
+    Descriptors before;  // sockets that were open
     std::mutex mutex;
     std::condition_variable ended;
     bool over = false;

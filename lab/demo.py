@@ -113,7 +113,7 @@ def _show(name: str | None, stay: bool) -> int:
         print("\ninterrupted, the lab has been removed")
         return _INTERRUPTED
     finally:
-        _save_picture(title, timeline)
+        _save_picture(title, timeline, _KNOWN[name].situation if name else _MAIN_JOB)
     return 0
 
 
@@ -131,11 +131,11 @@ def _play(name: str | None, timeline: Timeline) -> None:
         print("\nall checks passed")
 
 
-def _save_picture(title: str, timeline: Timeline) -> None:
+def _save_picture(title: str, timeline: Timeline, situation: Situation) -> None:
     """Write the timeline to the file that was opened outside the sandbox."""
     if _PICTURE in os.environ:
         with os.fdopen(int(os.environ[_PICTURE]), "w") as file:
-            file.write(picture.svg(title, timeline.events))
+            file.write(picture.svg(title, timeline.events, situation))
 
 
 def _reach_the_device(lab: Lab) -> None:

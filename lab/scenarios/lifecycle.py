@@ -159,6 +159,8 @@ def power_cut(lab: Lab) -> None:
         lab.step(f"the power is back; left behind: {', '.join(map(str, left)) or 'no mapping'}")
         lab.start_daemon(*OPTIONS)
         wait_for_next_cycle(lab)
+        lab.moment("power was cut twice: this start removed what was left, and mapped the ports "
+                   "again")
         with lab.daemon.held():
             assert_published(lab)
             changes = [*(f"no longer forwards {mapping}" for mapping in left),
@@ -183,6 +185,7 @@ def killed_while_relayed(lab: Lab) -> None:
     assert new != old and old in daemon.running("openvpn")
 
     # A relay has one tunnel per device: a login disconnects the other client, which reconnects.
+    lab.moment("two tunnel clients of one device: the killed daemon's and the new one's")
     lab.step("the old client is disconnected and reconnects")
     lab.wait_for(lambda: lab.relay.connections() >= 3, "the old client to be back", 60)
 

@@ -49,11 +49,7 @@ def main() -> int:
         return sandbox.FORBIDDEN
     if "PELORUS" not in os.environ and not build():
         return 1
-    kept: tuple[int, ...] = ()
-    if arguments.svg:
-        kept = (os.open(arguments.svg, os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o666),)
-        os.environ[_PICTURE] = str(kept[0])
-    status = sandbox.run("lab.demo", sys.argv[1:], keep_open=kept).returncode
+    status = run(sys.argv[1:], arguments.svg).returncode
     return status if status >= 0 else 128 - status
 
 
@@ -73,6 +69,21 @@ def _parse() -> argparse.Namespace:
     if arguments.scenario and arguments.scenario not in _KNOWN:
         parser.error(f"no scenario {arguments.scenario!r}; see --list and --zoo")
     return arguments
+
+
+def run(options: list[str], svg: str | None,
+        capture: bool = False) -> subprocess.CompletedProcess[str]:
+    """Play a demo in a sandbox of its own, and save its picture if a file is named."""
+    kept: tuple[int, ...] = ()
+    if svg:
+        kept = (os.open(svg, os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o666),)
+        os.environ[_PICTURE] = str(kept[0])
+    try:
+        return sandbox.run("lab.demo", options, capture=capture, keep_open=kept)
+    finally:
+        for descriptor in kept:
+            os.close(descriptor)
+            del os.environ[_PICTURE]
 
 
 def obstacle(name: str | None) -> str:

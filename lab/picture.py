@@ -167,8 +167,8 @@ def _columns(entries: list[_Entry], count: int) -> list[list[_Entry]]:
 
 
 def _draw_head(sheet: Sheet, title: str, events: Sequence[Event], situation: Situation) -> None:
-    sheet.write(textwrap.shorten(title, _TITLE_LETTERS, placeholder=" \u2026"), _MARGIN, 36,
-                font_size=18, font_weight="bold")
+    words = textwrap.shorten(title.replace("`", ""), _TITLE_LETTERS, placeholder=" \u2026")
+    sheet.write(words, _MARGIN, 36, font_size=18, font_weight="bold")
     sheet.write(clock(situation), _MARGIN, 58, fill=QUIET)
     sketch.draw(sheet, sketch.hosts(situation, events), _LEFT, _RIGHT, _SKETCH_TOP)
 

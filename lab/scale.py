@@ -5,6 +5,7 @@ from __future__ import annotations
 from bisect import bisect_right
 from collections.abc import Sequence
 from dataclasses import dataclass
+from math import ceil
 
 from lab.sheet import LETTER
 from lab.timeline import STORY, Event
@@ -42,12 +43,12 @@ class Mark:
 class _Places:
     """The places of events at a number of pixels a second, more where there is too little room."""
 
-    def __init__(self, unit: float, left: float) -> None:
+    def __init__(self, unit: float, left: float, start: float) -> None:
         self.places: list[float] = []
         self.marks: dict[str, list[Mark]] = {}
         self.right = left
         self._unit = unit
-        self._x, self._when = left, 0.0
+        self._x, self._when = left + _AROUND_STEP, start
         self._status, self._status_end = "", 0.0
         self._open: tuple[str, float] | None = None  # lane and place of the latest mark
 
@@ -56,6 +57,8 @@ class _Places:
         self._x += (event.when - self._when) * self._unit
         self._when = event.when
         if event.who == STORY:
+            passed = [lane[-1].right + _BETWEEN_MARKS for lane in self.marks.values()]
+            self._x = max([self._x, *passed])
             self._need(_AROUND_STEP, _LAST_STEP)
         elif number:
             self._mark(event, number)
@@ -112,22 +115,23 @@ class Scale:
                 too_much = middle
         placed = _placed(events, numbers, self._unit, left)
         self.places, self.marks = placed.places, placed.marks
-        self._times = [0.0, *(event.when for event in events)]
-        self._known = [left, *self.places]
+        self._times = [event.when for event in events] or [0.0]
+        self._known = self.places or [left]
 
     def x(self, when: float) -> float:
-        """The place of a moment up to the last event."""
-        after = min(bisect_right(self._times, when), len(self._times) - 1)
+        """The place of a moment from the first event to the last."""
+        after = min(max(bisect_right(self._times, when), 1), len(self._times) - 1)
         before = max(after - 1, 0)
         span = self._times[after] - self._times[before]
-        share = min((when - self._times[before]) / span, 1) if span else 0
+        share = (when - self._times[before]) / span if span else 0
         return self._known[before] + share * (self._known[after] - self._known[before])
 
     def ticks(self) -> list[float]:
         """Round numbers of seconds, nowhere too close for a number at each."""
         steps = (base * 10 ** power for power in range(-1, 9) for base in (1, 2, 5))
         step = next(step for step in steps if step * self._unit >= _TICKS_APART)
-        return [count * step for count in range(int(self._times[-1] / step) + 1)]
+        first, last = ceil(self._times[0] / step), int(self._times[-1] / step)
+        return [count * step for count in range(first, last + 1)]
 
 
 def word_width(word: str) -> int:
@@ -136,7 +140,7 @@ def word_width(word: str) -> int:
 
 
 def _placed(events: Sequence[Event], numbers: Sequence[int], unit: float, left: float) -> _Places:
-    places = _Places(unit, left)
+    places = _Places(unit, left, events[0].when if events else 0)
     for event, number in zip(events, numbers):
         places.add(event, number)
     return places

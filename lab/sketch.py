@@ -62,7 +62,8 @@ def hosts(situation: Situation, events: Sequence[Event]) -> list[Host]:
         gateway.networks = (_HOME, "provider's network")
         found.append(Host("provider", "provider's NAT", (*gateway.networks[1:], _INTERNET),
                           [provider.ADDRESS]))
-    found += [Host("central", "central service, names", (_INTERNET,), [network.SERVICE_ADDRESS]),
+    found += [Host("central", "central service, name server", (_INTERNET,),
+                   [network.SERVICE_ADDRESS]),
               Host("relay", "relay", (_INTERNET,), [network.RELAY_ADDRESS])]
     for who, words in _NEW_ADDRESSES:
         for host in (host for host in found if host.who == who):

@@ -8,6 +8,7 @@ from __future__ import annotations
 import argparse
 import os
 import sys
+import textwrap
 
 from lab import demo, sandbox
 from lab.scenarios import SCENARIOS
@@ -89,7 +90,7 @@ def main() -> int:
 def page() -> str:
     """The text of the page."""
     return _HEAD + "".join(
-        f"\n## {name}\n\n{sentence}\n\n![{SCENARIOS[name].title}]({FOLDER.name}/{name}.svg)\n"
+        f"\n## {name}\n\n{textwrap.fill(sentence, 100)}\n\n![{SCENARIOS[name].title}]({FOLDER.name}/{name}.svg)\n"
         for name, sentence in STORIES.items())
 
 

@@ -90,7 +90,8 @@ def main() -> int:
 def page() -> str:
     """The text of the page."""
     return _HEAD + "".join(
-        f"\n## {name}\n\n{textwrap.fill(sentence, 100)}\n\n![{SCENARIOS[name].title}]({FOLDER.name}/{name}.svg)\n"
+        f"\n## {name}\n\n{textwrap.fill(sentence, 100)}\n\n"
+        f"![{SCENARIOS[name].title}]({FOLDER.name}/{name}.svg)\n"
         for name, sentence in STORIES.items())
 
 

@@ -14,6 +14,7 @@ from lab.timeline import Event
 HEIGHT = 104
 
 _HOME, _INTERNET = "home network", "internet"
+_SHOWN = 2
 _BUS, _BOX, _LINE, _LETTER, _GAP = 24, 38, 16, 7.2, 18
 _ADDRESS = re.compile(r"\b(?:192\.168|44\.128)\.\d+\.\d+\b")
 # Who gets an address in an event, by the words before it.
@@ -36,7 +37,7 @@ class Host:
         """The addresses, those at home above those on the internet."""
         at_home = [address for address in self.addresses if address.startswith("192.168.")]
         others = [address for address in self.addresses if address not in at_home]
-        return [" or ".join(some) for some in (at_home, others) if some]
+        return [_listed(some) for some in (at_home, others) if some]
 
     @property
     def width(self) -> float:
@@ -98,6 +99,13 @@ def _with_strangers(found: list[Host], told: str) -> list[Host]:
     elsewhere = [address for address in unknown if address not in at_home]
     return [*([Host("", "others at home", (_HOME,), at_home)] if at_home else []), *found,
             *([Host("", "somebody else", (_INTERNET,), elsewhere)] if elsewhere else [])]
+
+
+def _listed(addresses: list[str]) -> str:
+    """The first addresses, and how many more there are."""
+    shown = addresses[:_SHOWN]
+    return " or ".join(shown if len(shown) == len(addresses) else [
+        *shown, f"{len(addresses) - _SHOWN} more"])
 
 
 def _draw_box(sheet: Sheet, host: Host, x: float, y: float) -> None:

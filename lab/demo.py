@@ -203,7 +203,7 @@ def _look_around(lab: Lab, special: str) -> None:
         state = f"ended with {lab.daemon.ended()}"
     else:
         os.kill(lab.daemon.pid, signal.SIGCONT)  # the story may be holding it
-        state = f"pelorus is running, status {lab.device.status}"
+        state = f"pelorus is running, status {lab.device.status or '(none)'}"
     enter = (f"nsenter --preserve-credentials -U -m -n -p -u -t {sandbox.pid_outside()} "
              "ip netns exec")
     try:

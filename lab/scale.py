@@ -12,7 +12,8 @@ from lab.timeline import STORY, Event
 
 STATUS = "status: "
 
-_AROUND_STEP, _APART, _TICK, _TOGETHER, _BETWEEN_MARKS = 16, 6, 3, 36, 3
+_AROUND_STEP, _APART, _TICK, _TOGETHER = 16, 6, 3, 36
+_BETWEEN_MARKS, _HALF_MARK = 3, 10
 _LAST_STATUS, _LAST_STEP = 170, 220
 _TICKS_APART = 44
 _MOST_UNIT = 1000
@@ -57,21 +58,26 @@ class _Places:
         self._x += (event.when - self._when) * self._unit
         self._when = event.when
         if event.who == STORY:
-            passed = [lane[-1].right + _BETWEEN_MARKS for lane in self.marks.values()]
-            self._x = max([self._x, *passed])
-            self._need(_AROUND_STEP, _LAST_STEP)
+            self._x = max([self._x, *(lane[-1].right + _BETWEEN_MARKS
+                                      for lane in self.marks.values())])
+            self._keep_apart(_AROUND_STEP)
+            self._reserve(_LAST_STEP)
+            self._open = None
         elif number:
             self._mark(event, number)
         else:
-            self._need(_TICK)
+            self._keep_apart(_TICK)
+        self._reserve(0)
         self.places.append(self._x)
 
-    def _need(self, distance: float, room: float = 0) -> None:
-        """Move at least this far from the event before, and keep room on the right."""
+    def _keep_apart(self, distance: float) -> None:
+        """Place the event at least this far from the one before."""
         if self.places:
             self._x = max(self._x, self.places[-1] + distance)
+
+    def _reserve(self, room: float) -> None:
+        """Have room to the right of the event, should it be the last of its kind."""
         self.right = max(self.right, self._x + room)
-        self._open = None if distance == _AROUND_STEP else self._open
 
     def _mark(self, event: Event, number: int) -> None:
         """Join the lane's latest mark if that is the previous event's, and near; else begin one."""
@@ -81,18 +87,19 @@ class _Places:
             self._x = max(self._x, self._status_end)
         if (self._open and self._open[0] == event.who and lane[-1].last == number - 1
                 and not changed and self._x - self._open[1] <= _TOGETHER):
-            self._need(_TICK + 1)
+            self._keep_apart(_TICK + 1)
             lane[-1].last = number
         else:
-            self._need(_APART if self._open else _AROUND_STEP)
-            free = lane[-1].right + _BETWEEN_MARKS + 10 if lane else 0
-            self._x = max(self._x, free)
-            lane.append(Mark(self._x - 10, number, number))
+            self._keep_apart(_APART if self._open else _AROUND_STEP)
+            if lane:
+                self._x = max(self._x, lane[-1].right + _BETWEEN_MARKS + _HALF_MARK)
+            lane.append(Mark(self._x - _HALF_MARK, number, number))
             self._open = event.who, self._x
         if changed:
             self._status = event.what
             self._status_end = self._x + word_width(event.what.removeprefix(STATUS))
-        self.right = max(self.right, lane[-1].right, self._x + (_LAST_STATUS if changed else 0))
+            self._reserve(_LAST_STATUS)
+        self.right = max(self.right, lane[-1].right)
 
 
 class Scale:

@@ -84,6 +84,7 @@ def ports_taken(lab: Lab) -> None:
     assert ports_tested(lab) == [9092, 9092]
     assert lab.device.messages.count(_TAKEN) == 3
     assert lab.device.messages.count(_REFUSED) == 0
+    lab.moment("the neighbour holds ports 9091 and 9444, so the device uses 9092 and 9445")
     assert_stops_clean(lab, left=others)
 
 

@@ -33,6 +33,8 @@ def unmap_all(lab: Lab) -> None:
     neighbours = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 80)
     lab.neighbour.hold(neighbours.external_port, neighbours.internal_port)
     start(lab, "portforwarded")
+    lab.moment("the ports are open: see what a daemon killed with kill -9 leaves, and what "
+               "pelorus -u removes")
 
     lab.step("kill -9 leaves everything in place")
     _kill(lab)

@@ -116,6 +116,7 @@ def manual_and_back(lab: Lab) -> None:
         changed = len(lab.device.messages.all)
     _wait_for_port(lab, 8081)
     assert_logged_by_next_cycle(lab, changed, _BEGIN)
+    lab.moment("ports forwarded by hand are in use, and the daemon has removed its own two")
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)

@@ -177,9 +177,11 @@ def clock(situation: Situation) -> str:
     """How fast the device's clock runs."""
     if situation.clock == 1:
         return "The device's clock runs at its normal speed."
-    pause = 60 / situation.clock / situation.pauses
-    return (f"The device's clock runs {situation.clock} times as fast: a pause of 1 minute takes "
-            f"{pause:.2g} second{'' if pause == 1 else 's'}.")
+    in_pauses = situation.clock * situation.pauses
+    faster = f", in pauses {in_pauses} times" if situation.pauses != 1 else ""
+    pause = 60 / in_pauses
+    return (f"The device's clock runs {situation.clock} times as fast{faster}: a pause of 1 minute "
+            f"takes {pause:.2g} second{'' if pause == 1 else 's'}.")
 
 
 def _draw_axis(sheet: Sheet, scale: Scale, top: float, end: float, remark: str) -> None:

@@ -72,7 +72,7 @@ class Fault:
         pause = f" after {self.delay:g} s" if self.delay else ""
         pause += f", a byte in {self.pause:g} s" if self.pause else ""
         pause += " without end" if self.endless else ""
-        often = f", {self.times} times" if self.times else ""
+        often = {0: "", 1: ", once"}.get(self.times, f", {self.times} times")
         return f"{self._ending()}{pause}{often}"
 
     def _ending(self) -> str:

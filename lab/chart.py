@@ -5,7 +5,7 @@ from __future__ import annotations
 from collections.abc import Sequence
 from dataclasses import dataclass
 
-from lab.picture import Sheet
+from lab.sheet import Sheet
 
 _LEFT, _RIGHT, _TOP, _PANEL, _GAP = 110, 1140, 70, 90, 44
 _LINE, _PALE, _SHADE = "#2b6cb0", "#e2e8f0", "#fbe9d7"

@@ -8,15 +8,15 @@ from __future__ import annotations
 
 import argparse
 import os
+import select
 import signal
 import subprocess
 import sys
-import time
 import traceback
 from collections.abc import Callable
 
 from lab import network, picture, sandbox, web
-from lab.device import HOME
+from lab.device import DYNAMIC_FILE, HOME
 from lab.gateway import GatewaySetup
 from lab.relay import TUNNEL_DEVICE
 from lab.scenario import Lab, Situation
@@ -36,6 +36,7 @@ def main() -> int:
     """Outside a sandbox: build the daemon and open one. Inside: play the demo."""
     arguments = _parse()
     if arguments.list or arguments.zoo:
+        signal.signal(signal.SIGPIPE, signal.SIG_DFL)  # a reader may want the first lines only
         shown = ZOO if arguments.zoo else SCENARIOS
         width = max(map(len, shown))
         for scenario in shown.values():
@@ -48,11 +49,7 @@ def main() -> int:
         return sandbox.FORBIDDEN
     if "PELORUS" not in os.environ and not build():
         return 1
-    kept: tuple[int, ...] = ()
-    if arguments.svg:
-        kept = (os.open(arguments.svg, os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o666),)
-        os.environ[_PICTURE] = str(kept[0])
-    status = sandbox.run("lab.demo", sys.argv[1:], keep_open=kept).returncode
+    status = run(sys.argv[1:], arguments.svg).returncode
     return status if status >= 0 else 128 - status
 
 
@@ -66,11 +63,27 @@ def _parse() -> argparse.Namespace:
                         help="list the behaviours of home gateways, one per line")
     parser.add_argument("--svg", metavar="FILE", help="save the timeline as an SVG picture")
     parser.add_argument("--stay", action="store_true",
-                        help="keep the lab up until Ctrl-C, to look around")
+                        help="keep the lab as it is in the story's telling moment, with the daemon "
+                        "running, until Enter or Ctrl-C")
     arguments = parser.parse_args()
     if arguments.scenario and arguments.scenario not in _KNOWN:
         parser.error(f"no scenario {arguments.scenario!r}; see --list and --zoo")
     return arguments
+
+
+def run(options: list[str], svg: str | None,
+        capture: bool = False) -> subprocess.CompletedProcess[str]:
+    """Play a demo in a sandbox of its own, and save its picture if a file is named."""
+    kept: tuple[int, ...] = ()
+    if svg:
+        kept = (os.open(svg, os.O_WRONLY | os.O_CREAT | os.O_TRUNC, 0o666),)
+        os.environ[_PICTURE] = str(kept[0])
+    try:
+        return sandbox.run("lab.demo", options, capture=capture, keep_open=kept)
+    finally:
+        for descriptor in kept:
+            os.close(descriptor)
+            del os.environ[_PICTURE]
 
 
 def obstacle(name: str | None) -> str:
@@ -95,6 +108,10 @@ def build() -> bool:
     return True
 
 
+class _Left(Exception):
+    """The visitor of a story's telling moment has left the lab."""
+
+
 def _show(name: str | None, stay: bool) -> int:
     """Play in the sandbox, printing events as they happen."""
     signal.signal(signal.SIGINT, signal.default_int_handler)
@@ -103,9 +120,9 @@ def _show(name: str | None, stay: bool) -> int:
     title = _KNOWN[name].title if name else "A device behind a home router becomes reachable"
     print(f"{title}\n")
     try:
-        _play(name, timeline)
-        if stay:
-            _look_around()
+        _play(name, timeline, title if stay else "")
+    except _Left:
+        print("\nthe lab has been removed")
     except (LabError, AssertionError) as failure:
         print(f"\nFAILED: {failure or 'a check did not hold'}")
         return 1
@@ -113,29 +130,43 @@ def _show(name: str | None, stay: bool) -> int:
         print("\ninterrupted, the lab has been removed")
         return _INTERRUPTED
     finally:
-        _save_picture(title, timeline)
+        _save_picture(title, timeline, _KNOWN[name].situation if name else _MAIN_JOB)
     return 0
 
 
-def _play(name: str | None, timeline: Timeline) -> None:
+def _play(name: str | None, timeline: Timeline, visited: str) -> None:
+    """Play a story; with `visited`, its title, only up to its telling moment. _Left after that."""
     story: Callable[[Lab], None] = _KNOWN[name].play if name else _reach_the_device
     lab = Lab(_KNOWN[name].situation if name else _MAIN_JOB, timeline)
+    left: list[_Left] = []
+
+    def visit(what: str) -> None:
+        _look_around(lab, what or visited)
+        left.append(_Left())
+        raise left[0]
+
+    if visited:
+        lab.visit_by(visit, first_stop=not (name and _KNOWN[name].tells_moment))
     timeline.add("lab", "device, gateway, central service and name server are up")
     try:
         story(lab)
     except (LabError, AssertionError):
+        if left:  # what the story does on its way out does not matter any more
+            raise left[0] from None
         print(lab.report())
         print(f"\n{traceback.format_exc(limit=-2)}")
         raise
     if name:
         print("\nall checks passed")
+    if visited:
+        visit("")
 
 
-def _save_picture(title: str, timeline: Timeline) -> None:
+def _save_picture(title: str, timeline: Timeline, situation: Situation) -> None:
     """Write the timeline to the file that was opened outside the sandbox."""
     if _PICTURE in os.environ:
         with os.fdopen(int(os.environ[_PICTURE]), "w") as file:
-            file.write(picture.svg(title, timeline.events))
+            file.write(picture.svg(title, timeline.events, situation))
 
 
 def _reach_the_device(lab: Lab) -> None:
@@ -166,21 +197,38 @@ def _close(lab: Lab) -> None:
         print(f"public name     {name} -> {lab.names.resolve(name)}")
 
 
-def _look_around() -> None:
-    """Print how to enter the lab, and keep it up until Ctrl-C."""
+def _look_around(lab: Lab, special: str) -> None:
+    """Tell what is special now and how to enter the lab, and wait for Enter or Ctrl-C."""
+    if lab.daemon.ended():
+        state = f"ended with {lab.daemon.ended()}"
+    else:
+        os.kill(lab.daemon.pid, signal.SIGCONT)  # the story may be holding it
+        state = f"pelorus is running, status {lab.device.status or '(none)'}"
     enter = (f"nsenter --preserve-credentials -U -m -n -p -u -t {sandbox.pid_outside()} "
              "ip netns exec")
     try:
         print(f"""
-The lab stays up until Ctrl-C. From another terminal, as the same user:
+The lab stays like this until Enter or Ctrl-C, and events go on to be printed.
+  what is special         {special}
+  the daemon              {state}
+  the clock               {picture.clock(lab.situation)}
+
+From another terminal, as the same user:
   a shell on the device   {enter} {network.DEVICE} sh
-  the device's log        {enter} {network.DEVICE} tail -f {HOME}/messages
+  the device's log        {enter} {network.DEVICE} tail -n 50 -f {HOME}/messages
+  the device's settings   {enter} {network.DEVICE} cat {DYNAMIC_FILE}
   the gateway's rules     {enter} {network.GATEWAY} nft list ruleset
-  the view from outside   {enter} {network.INTERNET} sh""", flush=True)
+  the view from outside   {enter} {network.INTERNET} sh
+""", flush=True)
+        sources = [sys.stdin] if sys.stdin else []
         while True:
-            time.sleep(1)  # short: a signal just before the sleep does not end it
+            # Short waits: a signal just before one does not end it.
+            if select.select(sources, [], [], 1)[0]:
+                if sys.stdin.readline():
+                    return
+                sources = []  # at its end, as without a terminal
     except KeyboardInterrupt:
-        print("\nthe lab has been removed")
+        pass
 
 
 if __name__ == "__main__":

@@ -137,7 +137,8 @@ class Device:
     def minutes_since_disk_access(self, count: int) -> None:
         """Set how long the disk has been unused, as the device's own watcher counts it."""
         SLEEP_COUNT.write_text(f"{count}\n")
-        self._timeline.add("device", f"the disk has been unused for {count} minutes")
+        unit = "minute" if count == 1 else "minutes"
+        self._timeline.add("device", f"the disk has been unused for {count} {unit}")
 
     def answer_slowly(self, pause: float) -> None:
         """Let each byte of the local back end's answers take `pause` seconds from now on."""

@@ -1,30 +1,28 @@
-"""A timeline as a picture that a web page can show: SVG without script, style or link."""
+"""The timeline of a story as a picture: its network, a lane for each actor, and every event."""
 
 from __future__ import annotations
 
-import re
 import textwrap
-import xml.etree.ElementTree as ElementTree
 from collections.abc import Sequence
 from dataclasses import dataclass
 
+from lab import sketch
+from lab.scale import STATUS, Mark, Scale, word_width
+from lab.scenario import Situation
+from lab.sheet import ACTOR_COLOURS, LETTER, OTHER, PALE, QUIET, WIDTH, Sheet
 from lab.timeline import STORY, Event
 
 STATUS_COLOURS = {"connecting": "#c05f10", "portforwarded": "#2b8a4b", "relayed": "#2b6cb0",
                   "failed": "#c53030", "disabled": "#718096"}
-_ACTOR_COLOURS = {"device": "#34495e", "gateway": "#8a5a12", "neighbour": "#9b2c2c",
-                  "central": "#1f6f78", "names": "#3f6b1f", "relay": "#2b6cb0", "lab": "#718096"}
-_OTHER, _STORY, _INK, _PALE = "#4a5568", "#7b2d8b", "#1a202c", "#e2e8f0"
-_STATUS = "status: "
+_STORY_COLOUR = "#7b2d8b"
 
-_WIDTH, _LEFT, _RIGHT = 1200, 110, 1140
-_HEADINGS_TOP, _HEADING, _LANE, _LINE, _AXIS = 56, 20, 38, 20, 64
-_COLUMNS, _TIME_AT, _WHO_AT, _TEXT_AT = (30, 625), 96, 103, 183
-_TITLE_LETTERS, _HEADING_LETTERS, _LIST_LETTERS = 105, 60, 48
-_MOST_NUDGE = 20
-_LEAST_LETTERS = 20
-_LETTER = 8  # mean width of a letter in the widest of the usual fonts
-_UNPRINTABLE = re.compile("[^\t\n\r\x20-\ud7ff\ue000-\ufffd\U00010000-\U0010ffff]")
+_MARGIN, _LEFT, _RIGHT = 30, 122, 1140
+_SKETCH_TOP, _HEADINGS_TOP, _HEADING, _LANE, _LINE, _AXIS = 70, 186, 18, 38, 20, 64
+_COLUMN, _TIME_AT, _WHO_AT, _TEXT_AT = 585, 88, 95, 178
+_TITLE_LETTERS, _STEP_LETTERS, _LIST_LETTERS = 105, 58, 52
+_LEAST_LETTERS, _MOST_LETTERS = 26, 60
+_END = "pelorus receives SIGTERM"
+_START_OR_END = ("pelorus starts", _END)
 
 
 @dataclass
@@ -38,15 +36,16 @@ class _Entry:
     @property
     def colour(self) -> str:
         """A status has its own colour, any other event its actor's."""
-        status = self.event.what.removeprefix(_STATUS)
-        return STATUS_COLOURS.get(status, _ACTOR_COLOURS.get(self.event.who, _OTHER))
+        status = self.event.what.removeprefix(STATUS)
+        return STATUS_COLOURS.get(status, ACTOR_COLOURS.get(self.event.who, OTHER))
 
     def lines(self) -> list[str]:
-        """The text, cut to fit a column."""
+        """The text, wrapped to fit a column."""
         text = self.event.what
         if len(self.times) > 1:
             text += f" ({len(self.times)} times, until {self.times[-1]:.2f} s)"
-        return textwrap.wrap(text, _LIST_LETTERS) or [""]
+        letters = _STEP_LETTERS if self.event.who == STORY else _LIST_LETTERS
+        return textwrap.wrap(text, letters) or [""]
 
     def height(self) -> int:
         """Height in the list; a heading has some space above it."""
@@ -54,213 +53,186 @@ class _Entry:
 
 
 @dataclass
-class _Mark:
-    """The number of an entry in its lane, or a range where entries are too close."""
+class _Step:
+    """The heading of a step, and the place of its line."""
 
-    left: float
-    first: int
-    last: int
-
-    def __str__(self) -> str:
-        return str(self.first) if self.first == self.last else f"{self.first}\u2013{self.last}"
+    x: float
+    lines: list[str]
+    top: float = 0
 
     @property
-    def width(self) -> int:
-        """Width of the box around the numbers."""
-        return len(str(self)) * _LETTER + 10
+    def bottom(self) -> float:
+        """The lower end of the heading."""
+        return self.top + _HEADING * len(self.lines)
+
+    @property
+    def right(self) -> float:
+        """The right end of the heading."""
+        return self.x + max(map(len, self.lines)) * LETTER + 8
 
 
-class _Scale:
-    """Seconds to pixels, with space left for the last status and the start of late headings."""
-
-    def __init__(self, events: Sequence[Event]) -> None:
-        words = [(event.when, _LEAST_LETTERS) for event in events if event.who == STORY]
-        words += [(when, len(word)) for when, word in _statuses(events)[-1:]]
-        end = max([event.when for event in events] + [1])
-        self._unit = min([(_RIGHT - _LEFT) / end] + [
-            (_RIGHT - _LEFT - letters * _LETTER - 12) / when for when, letters in words
-            if when > 0])
-
-    def x(self, when: float) -> float:
-        """The horizontal position of a moment."""
-        return _LEFT + when * self._unit
-
-    def ticks(self) -> list[float]:
-        """Round numbers of seconds, at least 60 pixels apart."""
-        steps = (base * 10 ** power for power in range(-1, 9) for base in (1, 2, 5))
-        step = next(step for step in steps if step * self._unit >= 60)
-        return [count * step for count in range(int((_RIGHT - _LEFT) / self._unit / step) + 1)]
-
-
-class Sheet:
-    """The drawing."""
-
-    def __init__(self, height: float) -> None:
-        self._root = ElementTree.Element("svg", {
-            "xmlns": "http://www.w3.org/2000/svg", "width": f"{_WIDTH}", "height": f"{height:g}",
-            "viewBox": f"0 0 {_WIDTH} {height:g}", "font-family": "sans-serif", "fill": _INK})
-        self.draw("rect", width=_WIDTH, height=height, rx=8, fill="#ffffff")
-
-    def draw(self, shape: str, text: str = "", **attributes: str | float) -> None:
-        """Add a shape; an underscore in an attribute's name stands for a hyphen."""
-        element = ElementTree.SubElement(self._root, shape, {
-            name.replace("_", "-"): value if isinstance(value, str) else f"{value:g}"
-            for name, value in attributes.items()})
-        element.text = _UNPRINTABLE.sub("\ufffd", text)
-
-    def write(self, text: str, x: float, y: float, **attributes: str | float) -> None:
-        """Add a line of text."""
-        placed: dict[str, str | float] = {"x": x, "y": y, "font_size": 14}
-        self.draw("text", text, **placed | attributes)
-
-    def mark(self, mark: _Mark, y: float, colour: str) -> None:
-        """Add numbers in a box with round corners."""
-        self.draw("rect", x=mark.left, y=y, width=mark.width, height=18, rx=9, fill=colour)
-        self.write(str(mark), mark.left + mark.width / 2, y + 13, text_anchor="middle",
-                   font_size=12, font_weight="bold", fill="#ffffff")
-
-    def __str__(self) -> str:
-        ElementTree.indent(self._root)
-        return ElementTree.tostring(self._root, encoding="unicode") + "\n"
-
-
-def svg(title: str, events: Sequence[Event]) -> str:
-    """Status over time, a lane for every actor, and below them the numbered list of events."""
-    scale, entries = _Scale(events), _entries(events)
-    steps = _step_rows(events, scale)
-    seen = [entry.event.who for entry in entries if entry.number]
-    actors = [who for who in dict.fromkeys([*_ACTOR_COLOURS, *seen]) if who in seen]
-    lanes_top = _HEADINGS_TOP + 8 + _HEADING * max([row + 1 for _, row in steps] + [0])
+def svg(title: str, events: Sequence[Event], situation: Situation = Situation()) -> str:
+    """The network, status over time, a lane for each actor, and the numbered list of events."""
+    shown, end = _story(title, events)
+    entries, numbers = _entries(shown)
+    scale = Scale(shown, numbers, _LEFT, _RIGHT)
+    width = scale.right + WIDTH - _RIGHT
+    steps = _steps(shown, scale)
+    actors = sorted(scale.marks, key=[*ACTOR_COLOURS, *scale.marks].index)
+    lanes_top = max([step.bottom for step in steps], default=_HEADINGS_TOP) + 6
     lanes_end = lanes_top + _LANE * (1 + len(actors))
-    columns = _columns(entries)
+    columns = _columns(entries, int(width / _COLUMN))
     list_height = max(sum(entry.height() for entry in column) for column in columns)
-    sheet = Sheet(lanes_end + _AXIS + list_height + 12)
-    sheet.write(textwrap.shorten(title, _TITLE_LETTERS, placeholder=" \u2026"), _COLUMNS[0], 36,
-                font_size=18, font_weight="bold")
-    _draw_axis(sheet, scale, lanes_top, lanes_end)
-    _draw_steps(sheet, scale, steps, lanes_end)
-    _draw_status(sheet, scale, _statuses(events), lanes_top)
+    sheet = Sheet(lanes_end + _AXIS + list_height + 12, width)
+    _draw_head(sheet, title, events, situation)
+    _draw_axis(sheet, scale, lanes_top, lanes_end, end)
+    _draw_steps(sheet, steps, lanes_end)
+    _draw_status(sheet, scale, shown, lanes_top)
     for number, who in enumerate(actors, 1):
-        own = [entry for entry in entries if entry.event.who == who]
-        _draw_lane(sheet, scale, own, lanes_top + number * _LANE)
-    for x, column in zip(_COLUMNS, columns):
-        _draw_list(sheet, column, x, lanes_end + _AXIS)
+        _draw_lane(sheet, scale, shown, who, lanes_top + number * _LANE)
+    for number, column in enumerate(columns):
+        _draw_list(sheet, column, _MARGIN + number * _COLUMN, lanes_end + _AXIS)
     return str(sheet)
 
 
-def _entries(events: Sequence[Event]) -> list[_Entry]:
-    """Merge what an actor repeats within a step into one entry."""
+def _story(title: str, events: Sequence[Event]) -> tuple[list[Event], str]:
+    """The events without the lab's own and without a shutdown that only ends the story.
+
+    The second value tells of that shutdown. A shutdown is part of the story if the title names the
+    signal, or if it is all that the device does in the last step.
+    """
+    told = [event for event in events if event.who != "lab"]
+    runs = [number for number, event in enumerate(told) if event.what.startswith(_START_OR_END)]
+    if not runs or told[runs[-1]].what != _END:
+        return told, ""
+    before, after = told[:runs[-1]], told[runs[-1]:]
+    own = [event.who for event in before if event.who in ("device", STORY)]
+    if "SIGTERM" in title or own[-1] == STORY or any(event.who == STORY for event in after):
+        return told, ""
+    return before, f" \u00b7 the shutdown at {after[0].when:.1f} s is left out"
+
+
+def _entries(events: Sequence[Event]) -> tuple[list[_Entry], list[int]]:
+    """Merge what an actor repeats within a step into one entry.
+
+    The second value has the number of each event's entry, 0 for a repetition or a step.
+    """
     entries: list[_Entry] = []
+    numbers: list[int] = []
     latest: dict[str, _Entry] = {}
-    number = 0
     for event in events:
         before = latest.get(event.who)
+        number = 0
         if event.who == STORY:
             latest.clear()
             entries.append(_Entry(0, event, [event.when]))
         elif before and before.event.what == event.what:
             before.times.append(event.when)
         else:
-            number += 1
+            number = max(numbers, default=0) + 1
             latest[event.who] = _Entry(number, event, [event.when])
             entries.append(latest[event.who])
-    return entries
+        numbers.append(number)
+    return entries, numbers
 
 
-def _statuses(events: Sequence[Event]) -> list[tuple[float, str]]:
-    """The device's status changes, with their times."""
-    told = [(event.when, event.what.removeprefix(_STATUS)) for event in events
-            if event.who == "device" and event.what.startswith(_STATUS)]
-    return [change for before, change in zip([(0.0, ""), *told], told) if change[1] != before[1]]
+def _steps(events: Sequence[Event], scale: Scale) -> list[_Step]:
+    """Each step, its heading beside those before it, or below those that its line would cross."""
+    told = [(event.what, x) for event, x in zip(events, scale.places) if event.who == STORY]
+    steps: list[_Step] = []
+    for number, (text, x) in enumerate(told):
+        beside = [told[number + 1][1] - x - 14] if number + 1 < len(told) else []
+        letters = [int(room / LETTER) for room in (*beside, scale.right - x - 8)]
+        wide = next(count for count in (*letters, _LEAST_LETTERS) if count >= _LEAST_LETTERS)
+        step = _Step(x, textwrap.wrap(text, min(wide, _MOST_LETTERS)))
+        step.top = max([before.bottom for before in steps if before.right > x],
+                       default=_HEADINGS_TOP)
+        steps.append(step)
+    return steps
 
 
-def _heading(step: Event, scale: _Scale) -> str:
-    """The text of a step, cut to the available width; the list has it in full."""
-    letters = int((_RIGHT - scale.x(step.when)) / _LETTER)
-    return textwrap.shorten(step.what, min(_HEADING_LETTERS, letters), placeholder=" \u2026")
-
-
-def _step_rows(events: Sequence[Event], scale: _Scale) -> list[tuple[Event, int]]:
-    """Each step with the row of its heading, below every heading that its line would cross."""
-    rows: list[tuple[Event, int]] = []
-    ends: list[float] = []
-    for step in (event for event in events if event.who == STORY):
-        x = scale.x(step.when)
-        crossed = [row for (_, row), end in zip(rows, ends) if end > x]
-        rows.append((step, max(crossed, default=-1) + 1))
-        ends.append(x + len(_heading(step, scale)) * _LETTER + 8)
-    return rows
-
-
-def _marks(entries: Sequence[_Entry], scale: _Scale) -> list[_Mark]:
-    """Marks that do not overlap: moved to the right a little, else merged into the previous one."""
-    marks: list[_Mark] = []
+def _columns(entries: list[_Entry], count: int) -> list[list[_Entry]]:
+    """Columns of about the same height; none ends with a heading."""
+    share = sum(entry.height() for entry in entries) / count
+    columns: list[list[_Entry]] = [[]]
+    height = 0
     for entry in entries:
-        mark = _Mark(0, entry.number, entry.number)
-        wanted = scale.x(entry.event.when) - mark.width / 2
-        free = marks[-1].left + marks[-1].width + 3 if marks else wanted
-        if free - wanted > _MOST_NUDGE:
-            marks[-1].last = entry.number
-        else:
-            mark.left = max(wanted, free)
-            marks.append(mark)
-    return marks
+        if height >= share * len(columns) and len(columns) < count:
+            columns.append([])
+            if columns[-2][-1].event.who == STORY:
+                columns[-1].append(columns[-2].pop())
+        columns[-1].append(entry)
+        height += entry.height()
+    return columns
 
 
-def _columns(entries: list[_Entry]) -> tuple[list[_Entry], list[_Entry]]:
-    """Two columns of about the same height; the first does not end with a heading."""
-    half, height, first = sum(entry.height() for entry in entries) / 2, 0, 0
-    while first < len(entries) and height < half:
-        height += entries[first].height()
-        first += 1
-    while first and entries[first - 1].event.who == STORY:
-        first -= 1
-    return entries[:first], entries[first:]
+def _draw_head(sheet: Sheet, title: str, events: Sequence[Event], situation: Situation) -> None:
+    words = textwrap.shorten(title.replace("`", ""), _TITLE_LETTERS, placeholder=" \u2026")
+    sheet.write(words, _MARGIN, 36, font_size=18, font_weight="bold")
+    sheet.write(clock(situation), _MARGIN, 58, fill=QUIET)
+    sketch.draw(sheet, sketch.hosts(situation, events), _LEFT, _RIGHT, _SKETCH_TOP)
 
 
-def _draw_axis(sheet: Sheet, scale: _Scale, top: float, end: float) -> None:
+def clock(situation: Situation) -> str:
+    """How fast the device's clock runs."""
+    if situation.clock == 1:
+        return "The device's clock runs at its normal speed."
+    in_pauses = situation.clock * situation.pauses
+    faster = f", in pauses {in_pauses} times" if situation.pauses != 1 else ""
+    pause = 60 / in_pauses
+    return (f"The device's clock runs {situation.clock} times as fast{faster}: a pause of 1 minute "
+            f"takes {pause:.2g} second{'' if pause == 1 else 's'}.")
+
+
+def _draw_axis(sheet: Sheet, scale: Scale, top: float, end: float, remark: str) -> None:
     for tick in scale.ticks():
         x = scale.x(tick)
-        sheet.draw("line", x1=x, x2=x, y1=top, y2=end + 6, stroke=_PALE)
+        sheet.draw("line", x1=x, x2=x, y1=top, y2=end + 6, stroke=PALE)
         sheet.write(f"{tick:g}", x, end + 20, text_anchor="middle", font_size=12)
-    sheet.write("seconds in the lab", (_LEFT + _RIGHT) / 2, end + 37, text_anchor="middle",
-                font_size=12)
+    sheet.write(f"seconds in the lab, wider where more happens{remark}",
+                (_LEFT + scale.right) / 2, end + 38, text_anchor="middle", font_size=12, fill=QUIET)
 
 
-def _draw_steps(sheet: Sheet, scale: _Scale, steps: Sequence[tuple[Event, int]],
-                end: float) -> None:
+def _draw_steps(sheet: Sheet, steps: Sequence[_Step], end: float) -> None:
     if steps:
-        sheet.write(STORY, _COLUMNS[0], _HEADINGS_TOP + 14, fill=_STORY, font_weight="bold")
-    for step, row in steps:
-        x, y = scale.x(step.when), _HEADINGS_TOP + row * _HEADING
-        sheet.draw("line", x1=x, x2=x, y1=y + 2, y2=end + 6, stroke=_STORY, stroke_dasharray="4 3")
-        sheet.write(_heading(step, scale), x + 5, y + 14, fill=_STORY, font_size=13,
-                    font_weight="bold")
+        sheet.write(STORY, _MARGIN, _HEADINGS_TOP + 14, fill=_STORY_COLOUR, font_weight="bold")
+    for step in steps:
+        sheet.draw("line", x1=step.x, x2=step.x, y1=step.top + 2, y2=end + 6,
+                   stroke=_STORY_COLOUR, stroke_dasharray="4 3")
+        for number, line in enumerate(step.lines):
+            sheet.write(line, step.x + 5, step.top + 14 + number * _HEADING, fill=_STORY_COLOUR,
+                        font_size=13, font_weight="bold")
 
 
-def _draw_status(sheet: Sheet, scale: _Scale, changes: Sequence[tuple[float, str]],
-                 y: float) -> None:
+def _draw_status(sheet: Sheet, scale: Scale, events: Sequence[Event], y: float) -> None:
     """A bar from each change to the next, the last one up to the right edge."""
-    sheet.write("status", _COLUMNS[0], y + 24, font_weight="bold")
-    places = [scale.x(when) for when, _ in changes] + [_RIGHT]
-    for (_, word), x, end in zip(changes, places, places[1:]):
+    sheet.write("status", _MARGIN, y + 24, font_weight="bold")
+    told = [(event.what.removeprefix(STATUS), x) for event, x in zip(events, scale.places)
+            if event.who == "device" and event.what.startswith(STATUS)]
+    changes = [now for before, now in zip([("", 0.0), *told], told) if now[0] != before[0]]
+    for (word, x), (_, end) in zip(changes, [*changes[1:], ("", scale.right)]):
         sheet.draw("rect", x=x, y=y + 7, width=end - x, height=_LANE - 14,
-                   fill=STATUS_COLOURS.get(word, _OTHER))
-        if end - x >= len(word) * _LETTER + 12:
+                   fill=STATUS_COLOURS.get(word, OTHER))
+        if end - x >= word_width(word) - 1:
             sheet.write(word, x + 6, y + 24, fill="#ffffff", font_weight="bold")
 
 
-def _draw_lane(sheet: Sheet, scale: _Scale, entries: Sequence[_Entry], y: float) -> None:
+def _draw_lane(sheet: Sheet, scale: Scale, events: Sequence[Event], who: str, y: float) -> None:
     """A tick at every event, and the marks above the ticks."""
-    who, base = entries[0].event.who, y + _LANE - 3
-    colour = _ACTOR_COLOURS.get(who, _OTHER)
-    sheet.write(who, _COLUMNS[0], y + 24, fill=colour, font_weight="bold")
-    sheet.draw("line", x1=_LEFT, x2=_RIGHT, y1=base, y2=base, stroke=colour)
-    for when in (when for entry in entries for when in entry.times):
-        sheet.draw("line", x1=scale.x(when), x2=scale.x(when), y1=base - 8, y2=base,
-                   stroke=colour, stroke_width=2)
-    for mark in _marks(entries, scale):
-        sheet.mark(mark, y + 7, colour)
+    colour, base = ACTOR_COLOURS.get(who, OTHER), y + _LANE - 3
+    sheet.write(who, _MARGIN, y + 24, fill=colour, font_weight="bold")
+    sheet.draw("line", x1=_LEFT, x2=scale.right, y1=base, y2=base, stroke=colour)
+    for x in (x for event, x in zip(events, scale.places) if event.who == who):
+        sheet.draw("line", x1=x, x2=x, y1=base - 8, y2=base, stroke=colour, stroke_width=2)
+    for mark in scale.marks[who]:
+        _draw_mark(sheet, mark, y + 7, colour)
+
+
+def _draw_mark(sheet: Sheet, mark: Mark, y: float, colour: str) -> None:
+    """Numbers in a box with round corners."""
+    sheet.draw("rect", x=mark.left, y=y, width=mark.width, height=18, rx=9, fill=colour)
+    sheet.write(str(mark), mark.left + mark.width / 2, y + 13, text_anchor="middle",
+                font_size=12, font_weight="bold", fill="#ffffff")
 
 
 def _draw_list(sheet: Sheet, entries: Sequence[_Entry], x: float, y: float) -> None:
@@ -269,11 +241,13 @@ def _draw_list(sheet: Sheet, entries: Sequence[_Entry], x: float, y: float) -> N
         y += entry.height()
         first = y - _LINE * len(lines) + 12
         if event.who == STORY:
-            colour, text_at, style = _STORY, _WHO_AT, {"fill": _STORY, "font_weight": "bold"}
+            colour, text_at, style = _STORY_COLOUR, _WHO_AT, {
+                "fill": _STORY_COLOUR, "font_weight": "bold"}
         else:
             colour, text_at, style = entry.colour, _TEXT_AT, {}
-            sheet.mark(_Mark(x, entry.number, entry.number), first - 14, colour)
-            sheet.write(event.who, x + _WHO_AT, first, fill=colour)
-        sheet.write(f"{event.when:.2f} s", x + _TIME_AT, first, text_anchor="end", fill=colour)
+            _draw_mark(sheet, Mark(x, entry.number, entry.number), first - 14, colour)
+            sheet.write(event.who, x + _WHO_AT, first, font_size=13, fill=colour)
+        sheet.write(f"{event.when:.2f} s", x + _TIME_AT, first, font_size=13, text_anchor="end",
+                    fill=colour)
         for number, line in enumerate(lines):
-            sheet.write(line, x + text_at, first + number * _LINE, **style)
+            sheet.write(line, x + text_at, first + number * _LINE, font_size=13, **style)

@@ -55,6 +55,8 @@ class Lab:
         self.timeline = timeline
         self.account = Account()
         self._daemon: Daemon | None = None
+        self._visitor: Callable[[str], None] | None = None
+        self._visits_first_stop = False
         socket.sethostname(self.account.host_name)
         network.raise_home_network(situation.own_router)
         authority = Authority(_FOLDER / "authority")
@@ -100,8 +102,22 @@ class Lab:
         """Begin the next step; a failure report shows the device's log from here on."""
         self.timeline.step(heading)
 
+    def visit_by(self, visitor: Callable[[str], None], first_stop: bool) -> None:
+        """Call `visitor` in each telling moment, with what is special in it.
+
+        With `first_stop` the moment before the daemon is first stopped is one, with no text.
+        """
+        self._visitor, self._visits_first_stop = visitor, first_stop
+
+    def moment(self, what: str) -> None:
+        """Tell what is special now, in the moment of the story that is most worth a visit."""
+        if self._visitor:
+            self._visitor(what)
+
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""
+        if self._visits_first_stop:
+            self.moment("")
         self.timeline.add("device", f"pelorus receives {signal.Signals(number).name}")
         how = self.daemon.stop(number)
         self.timeline.add("device", f"pelorus ended with {how}")

@@ -84,6 +84,7 @@ def ports_taken(lab: Lab) -> None:
     assert ports_tested(lab) == [9092, 9092]
     assert lab.device.messages.count(_TAKEN) == 3
     assert lab.device.messages.count(_REFUSED) == 0
+    lab.moment("the neighbour holds ports 9091 and 9444, so the device uses 9092 and 9445")
     assert_stops_clean(lab, left=others)
 
 
@@ -265,6 +266,8 @@ def privileged_ports_refused(lab: Lab) -> None:
         assert lab.gateway.upnp_requests() == start + attempt
         assert lab.device.status == "relayed"
         assert page_through_the_tunnel(lab) == PAGES[0]
+    lab.moment("the gateway refuses ports below 1024, so every cycle searches, and the device is "
+               "relayed")
 
     lab.step("every cycle searches again")
     wait_for_cycle(lab, 2)

@@ -50,6 +50,7 @@ def upnp_leases(lab: Lab) -> None:
     """UPnP mappings are renewed over ten leases; the device is reachable all the time."""
     _start_leasing(lab, _LEASE)
     changes = mapping_changes(lab)
+    lab.moment("the lease is short, so the mappings are renewed every few seconds")
 
     lab.step("a visitor fetches pages all the time, over ten leases")
     with _visitor():
@@ -75,6 +76,7 @@ def natpmp_leases(lab: Lab) -> None:
     """NAT-PMP mappings are renewed over ten leases, and expire after the daemon is killed."""
     _start_leasing(lab, _LEASE)
     changes = len(mapping_changes(lab))
+    lab.moment("the lease is short, so the mappings are renewed every few seconds")
 
     lab.step("a visitor fetches pages all the time, over ten leases")
     with _visitor():

@@ -33,6 +33,8 @@ def unmap_all(lab: Lab) -> None:
     neighbours = Mapping("TCP", 7000, network.NEIGHBOUR_ADDRESS, 80)
     lab.neighbour.hold(neighbours.external_port, neighbours.internal_port)
     start(lab, "portforwarded")
+    lab.moment("the ports are open: see what a daemon killed with kill -9 leaves, and what "
+               "pelorus -u removes")
 
     lab.step("kill -9 leaves everything in place")
     _kill(lab)
@@ -159,6 +161,8 @@ def power_cut(lab: Lab) -> None:
         lab.step(f"the power is back; left behind: {', '.join(map(str, left)) or 'no mapping'}")
         lab.start_daemon(*OPTIONS)
         wait_for_next_cycle(lab)
+        lab.moment("power was cut twice: this start removed what was left, and mapped the ports "
+                   "again")
         with lab.daemon.held():
             assert_published(lab)
             changes = [*(f"no longer forwards {mapping}" for mapping in left),
@@ -183,6 +187,7 @@ def killed_while_relayed(lab: Lab) -> None:
     assert new != old and old in daemon.running("openvpn")
 
     # A relay has one tunnel per device: a login disconnects the other client, which reconnects.
+    lab.moment("two tunnel clients of one device: the killed daemon's and the new one's")
     lab.step("the old client is disconnected and reconnects")
     lab.wait_for(lambda: lab.relay.connections() >= 3, "the old client to be back", 60)
 

@@ -47,6 +47,7 @@ def manual_ports(lab: Lab) -> None:
     wait_for_log(lab, NOT_RELAYED, 2)
     assert ports_tested(lab)[1:] == [8082] * 6
     lab.device.disk_wakes()
+    lab.moment("the settings name a port that nobody forwards: every cycle tests it, and fails")
 
     lab.step("the settings are correct again")
     lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
@@ -82,6 +83,7 @@ def manual_ports_that_are_none(lab: Lab) -> None:
     assert lab.central.record is None
     # Switching to the relay withdraws the record but leaves the gateway alone.
     assert lab.gateway.mappings() == BOTH_MAPPED
+    lab.moment("a manual port is no port number: nothing is tested, and the old mappings stay open")
 
     lab.step("both ports are valid, and the automatic ones are removed")
     lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
@@ -112,6 +114,7 @@ def manual_and_back(lab: Lab) -> None:
         changed = len(lab.device.messages.all)
     _wait_for_port(lab, 8081)
     assert_logged_by_next_cycle(lab, changed, _BEGIN)
+    lab.moment("ports forwarded by hand are in use, and the daemon has removed its own two")
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
@@ -185,6 +188,7 @@ def manual_behind_second_nat(lab: Lab) -> None:
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
     assert lab.device.statuses_sent() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
+    lab.moment("a second NAT blocks the ports that the user forwarded, so their test fails")
 
     lab.step("the provider's NAT is gone")
     with lab.daemon.held():
@@ -211,6 +215,8 @@ def manual_after_second_nat(lab: Lab) -> None:
     wait_for_log(lab, "relay mode is enforced, therefore don't manual forward ports.", 2)
     assert ports_tested(lab) == [9091]
     assert lab.device.status == "failed"
+    lab.moment("ports are forwarded by hand, but a second NAT was found earlier: they are not "
+               "tested")
 
     lab.step("only an automatic attempt lifts that")
     lab.device.change(MANUAL_PORT_FORWARD="FALSE")

@@ -4,6 +4,7 @@ from __future__ import annotations
 
 from collections.abc import Callable
 from dataclasses import dataclass
+from types import FunctionType
 
 from lab.scenario import Lab, Situation
 
@@ -18,6 +19,11 @@ class Scenario:
     title: str
     situation: Situation
     play: Play
+
+    @property
+    def tells_moment(self) -> bool:
+        """True when the story itself calls `Lab.moment`."""
+        return isinstance(self.play, FunctionType) and "moment" in self.play.__code__.co_names
 
 
 SCENARIOS: dict[str, Scenario] = {}

@@ -30,6 +30,7 @@ def disk_asleep(lab: Lab) -> None:
     lab.step("the next port test is due, but the disk is in standby")
     lab.device.disk_sleeps()
     wait_for_log(lab, "drive is in standby, port test is suspended")
+    lab.moment("the disk sleeps, so no port is tested, and the device stays port forwarded")
 
     lab.step("the disk spins up, but has not been used for two minutes")
     lab.device.minutes_since_disk_access(2)
@@ -103,6 +104,8 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     assert lab.central.port_tests == []
     assert lab.device.statuses_sent() == ["connecting", "relayed"]
     assert tunnel_client() == client
+    lab.moment("the gateway maps ports, but the disk sleeps: no port is tested, the device stays "
+               "relayed")
 
     lab.step("another program requests a new connection")
     lab.device.change(COMMUNICATION_STATUS="connecting")
@@ -119,6 +122,7 @@ def credentials_missing(lab: Lab) -> None:
     """Without credentials the daemon idles silently; it starts working as soon as they appear."""
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, _IDLE, 2)
+    lab.moment("there are no credentials: the daemon asks nobody anything")
 
     lab.step("an identifier without its authorisation is not enough")
     lab.device.change(DEVICEID=lab.account.device_id)
@@ -210,6 +214,7 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
     wait_for_log(lab, _IDLE, 2)
     assert lab.central.requests == []
     assert lab.gateway.mappings() == []
+    lab.moment("the dynamic configuration is rubbish: the daemon idles")
 
     lab.step("the configuration is repaired")
     for path in (DYNAMIC_FILE, DYNAMIC_COPY):

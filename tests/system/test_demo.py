@@ -22,13 +22,13 @@ def start_demo(*options: str, binary: str = str(sandbox.binary())) -> subprocess
     """Start the demo as a terminal does, in its own process group, with a built daemon."""
     return subprocess.Popen([sandbox.PYTHON, "-m", "lab.demo", *options], text=True,
                             env=dict(os.environ, PELORUS=binary), cwd=sandbox.PROJECT,
-                            stdout=subprocess.PIPE, stderr=subprocess.STDOUT,
-                            start_new_session=True)
+                            stdin=subprocess.PIPE, stdout=subprocess.PIPE,
+                            stderr=subprocess.STDOUT, start_new_session=True)
 
 
 def output_of(*options: str, status: int = 0, **binary: str) -> str:
     demo = start_demo(*options, **binary)
-    text, _ = demo.communicate(timeout=90)
+    text, _ = demo.communicate("\n", timeout=90)
     assert demo.returncode == status, text
     return text
 
@@ -57,13 +57,16 @@ def test_demo_prints_each_step_and_succeeds() -> None:
     assert traces() == before
 
 
-def test_demo_plays_a_listed_scenario_and_saves_its_picture(tmp_path: Path) -> None:
+def test_demo_lists_plays_and_draws_scenarios_and_stays_in_one(tmp_path: Path) -> None:
     assert [line.split()[0] for line in output_of("--list").splitlines()] == list(SCENARIOS)
+    assert not subprocess.getoutput(f"cd '{sandbox.PROJECT}'; python3 -m lab.demo --list | true")
     text = output_of("ports-taken", "--svg", f"{tmp_path}/taken.svg")
     assert "== it holds 9444 as well" in text and "all checks passed" in text
     words = " ".join(ElementTree.parse(tmp_path / "taken.svg").getroot().itertext())
     assert SCENARIOS["ports-taken"].title in words
     assert "forwards TCP 9445 -> 192.168.77.10:443" in words
+    text = output_of("credentials-missing", "--stay")
+    assert re.search("there are no credentials.*pelorus is running.*been removed", text, re.DOTALL)
 
 
 def test_demo_fails_with_a_daemon_that_does_nothing() -> None:

@@ -8,6 +8,8 @@ from xml.etree import ElementTree
 import pytest
 
 from lab.picture import STATUS_COLOURS, svg
+from lab.scenario import Situation
+from lab.sketch import hosts
 from lab.timeline import Event, Timeline
 
 pytestmark = pytest.mark.outside
@@ -39,35 +41,45 @@ def test_repeated_lines_become_one_entry_without_control_characters() -> None:
     assert sum(word.startswith("gateway refuses a port (2 times") for word in words) == 1
 
 
-def test_status_bars_follow_each_other_to_scale() -> None:
-    told = {10: "connecting", 40: "relayed", 55: "relayed", 70: "failed", 80: "disabled"}
+def test_status_bars_follow_each_other_to_scale_and_the_last_is_wide() -> None:
+    told = {10: "connecting", 40: "relayed", 55: "relayed", 70: "failed", 80: "portforwarded"}
     events = [Event(when, "device", f"status: {word}") for when, word in told.items()]
-    events.append(Event(81, "lab", "is gone"))
+    events += [Event(80.02, "device", "pelorus receives SIGTERM")]
     bars = drawn(events, "rect", height="24")
-    assert [bar["fill"] for bar in bars] == [
-        STATUS_COLOURS[word] for word in ("connecting", "relayed", "failed", "disabled")]
+    del told[55]
+    assert [bar["fill"] for bar in bars] == [STATUS_COLOURS[word] for word in told.values()]
     starts = [ends(bar)[0] for bar in bars]
-    scale = (starts[3] - starts[0]) / 70
-    assert starts == pytest.approx([110 + scale * when for when in (10, 40, 70, 80)], 0.01)
+    unit = (starts[3] - starts[0]) / 70
+    assert starts == pytest.approx([starts[0] + unit * (when - 10) for when in told], 0.01)
     assert [ends(bar)[1] for bar in bars] == pytest.approx([*starts[1:], 1140], abs=0.1)
-    assert {"connecting", "disabled"} <= {text["text"] for text in drawn(events, "text")}
+    words = "|".join(text["text"] for text in drawn(events, "text"))
+    assert "shutdown at 80.0 s" in words and "|failed|" in words and starts[3] <= 970
 
 
-def test_crowded_marks_and_headings_do_not_overlap() -> None:
+def test_crowded_marks_and_headings_are_complete_and_do_not_overlap() -> None:
     events = [Event(60 + number ** 2 / 50, who, f"event {number} of {who}")
               for number in range(40) for who in ("device", "gateway", "somebody")]
     events += [Event(60 + number / 5, "story", f"and then, as step {number}, it goes on and on")
                for number in range(6)]
     events.sort(key=lambda event: event.when)
     texts = drawn(events, "text")
-    assert {event.what for event in events} <= {text["text"] for text in texts}
-    assert float(drawn(events, "rect")[0]["height"]) > max(float(text["y"]) for text in texts)
-    rows: dict[tuple[str, str], list[tuple[float, float]]] = {}
-    for shape in drawn(events, "rect", rx="9") + drawn(events, "text", **{"font-size": "13"}):
-        rows.setdefault((shape.get("rx", ""), shape["y"]), []).append(ends(shape))
-    assert [len(row) for (kind, _), row in rows.items() if not kind] == [1] * 6
-    assert max(map(len, rows.values())) > 1
-    for row in rows.values():
-        row.sort()
-        assert all(before[1] < after[0] for before, after in pairwise(row))
-        assert 0 < row[0][0] and row[-1][1] < 1200
+    lanes = {float(text["y"]) - 4: text["text"] for text in texts if text["x"] == "30"}
+    headings = [text for text in drawn(events, "text", fill="#7b2d8b")
+                if text["text"] != "story" and float(text["y"]) < max(lanes)]
+    assert " ".join(heading["text"] for heading in headings) == " ".join(
+        event.what for event in events if event.who == "story")
+    numbers = {int(text["text"]): lanes[float(text["y"])]
+               for text in texts if float(text["y"]) in lanes}
+    assert numbers == dict(enumerate(("device", "gateway", "somebody") * 40, 1))
+    boxes = sorted((shape.get("rx", ""), shape["y"], *ends(shape))
+                   for shape in drawn(events, "rect", rx="9") + headings)
+    assert all(end < start for (*row, _, end), (*next_row, start, _) in pairwise(boxes)
+               if row == next_row)
+    assert max(right for *_, right in boxes) < float(drawn(events, "rect")[0]["width"])
+
+
+def test_sketch_names_the_owner_of_each_address() -> None:
+    words = "puts the gateway, now 44.128.1.20, behind 44.128.0.21, far from 44.128.0.99"
+    found = [host.lines()[-1] for host in hosts(Situation(), [Event(1, "provider", words)])]
+    assert found == ["192.168.77.10", "44.128.0.20 or 44.128.1.20", "44.128.0.21", "44.128.0.1",
+                     "44.128.0.2", "44.128.0.99"]

@@ -38,11 +38,10 @@ _MODES = {
     "etc/pelorus": (0o755, "root"), "etc/pelorus/globalconfig.ini": (0o644, "root"),
     "etc/default/pelorus": (0o644, "root"), "run/pelorus-relay": (0o700, "root"),
     "var/lib/pelorus": (0o770, "www-data"), "run/pelorus": (0o770, "www-data")}
-# What differs between two runs of the same system whatever is installed.
+# What changes by itself, whatever is installed.
 _VOLATILE = ("var/log", "var/cache", "var/lib/dpkg", "var/lib/apt", "var/lib/systemd", "proc",
              "sys", "dev", "run/systemd", "run/log", "run/lab", "run/lock", "tmp/systemd-private",
              "etc/ld.so.cache", "run/initctl", "run/utmp")
-_DROP_IN = "[Service]\nRestartSec=1\n"
 
 
 class Installed:
@@ -55,7 +54,7 @@ class Installed:
         self._before: set[str] = set()
 
     def play(self, stay: bool) -> None:
-        """Go through the package's life; with `stay` wait for Ctrl-C where it works first."""
+        """Go through the package's life; with `stay` wait for Ctrl-C after the installation."""
         self._prepare()
         self._installs_and_idles()
         self._gives_local_users_nothing()
@@ -71,7 +70,7 @@ class Installed:
         self._purges()
 
     def _prepare(self) -> None:
-        """Boot the device and let it trust the lab's service; connect the lab's back end to it."""
+        """Boot a device that trusts the lab's service; the lab's back end writes its settings."""
         authority = ROOT / "usr/local/share/ca-certificates/lab.crt"
         authority.write_text(Path("/etc/netns/device/ssl/certs/ca-certificates.crt").read_text())
         shutil.copy(HOME / "bin/hdparm", ROOT / "usr/local/sbin")
@@ -89,7 +88,7 @@ class Installed:
         self._system.follow(UNIT, self._lab.timeline)
 
     def _speed_up(self) -> None:
-        """Let the unit's time run as fast as the situation says, and restart it at once."""
+        """Let the unit's time run as fast as the situation says; restart it soon after a crash."""
         settings = fast_pauses(self._lab.situation.clock, False)
         libraries = [word for text in settings if text.startswith("LD_PRELOAD=")
                      for word in text.split("=", 1)[1].split()]
@@ -99,8 +98,8 @@ class Installed:
             shutil.copy(library, place)
         folder = ROOT / f"etc/systemd/system/{UNIT}.d"
         folder.mkdir()
-        (folder / "lab.conf").write_text(
-            _DROP_IN + "".join(f'Environment="{text}"\n' for text in settings))
+        (folder / "lab.conf").write_text("[Service]\nRestartSec=1\n" + "".join(
+            f'Environment="{text}"\n' for text in settings))
 
     def _installs_and_idles(self) -> None:
         self._lab.step("the package is installed and left as it is")
@@ -297,13 +296,15 @@ def _outside() -> int:
     parent = _cgroup_folder()
     assert parent
     group = parent / f"pelorus-lab-{os.getpid()}"
+    for number in (signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, lambda received, _: sys.exit(128 + received))
     group.mkdir()
     try:
         status = sandbox.run("lab.installed", [*sys.argv[1:], "--cgroup", str(group)],
                              own_users=False).returncode
         return status if status >= 0 else 128 - status
     finally:
-        wait_until(lambda: not (group / "cgroup.procs").read_text(), "the lab's end", 10)
+        wait_until(lambda: "populated 0" in (group / "cgroup.events").read_text(), "its end", 10)
         for folder, _, _ in os.walk(group, topdown=False):
             os.rmdir(folder)
 

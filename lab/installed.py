@@ -148,7 +148,7 @@ class Installed:
         assert self._system.attempt("systemctl", "restart", UNIT).returncode != 0
         assert not self._lab.gateway.mappings()
         self._wait_for_log("Invalid argument: -h")
-        self._wait_for_log("EXIT STATUS in pelorus(8)")
+        self._wait_for_log("NOTES in pelorus(8)")
         _OPTIONS.write_text(good)
         self._system.run("systemctl", "restart", UNIT)
         self._wait_for_status("portforwarded")
@@ -170,6 +170,10 @@ class Installed:
         [client] = self._system.running("openvpn")
         assert Path(f"/proc/{client}").stat().st_uid == 65534
         assert not self._may("nobody", "-r", "etc/openvpn/pelorus/auth.txt")
+        self._system.run("systemctl", "restart", UNIT)
+        self._wait_for_status("relayed")
+        assert client not in self._system.running("openvpn")
+        assert not any("failed to stop openVPN" in line for line in self._system.log)
 
     def _restarts_after_a_crash(self) -> None:
         self._lab.step("the daemon is killed: its tunnel goes, and it starts again")

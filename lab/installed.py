@@ -38,6 +38,8 @@ _MODES = {
     "etc/pelorus": (0o755, "root"), "etc/pelorus/globalconfig.ini": (0o644, "root"),
     "etc/default/pelorus": (0o644, "root"), "run/pelorus-relay": (0o700, "root"),
     "var/lib/pelorus": (0o770, "www-data"), "run/pelorus": (0o770, "www-data")}
+_AS = {name: ("setpriv", "--reuid", number, "--regid", number, "--clear-groups")
+       for name, number in (("nobody", "65534"), ("www-data", "33"))}
 # What changes by itself, whatever is installed.
 _VOLATILE = ("var/log", "var/cache", "var/lib/dpkg", "var/lib/apt", "var/lib/systemd", "proc",
              "sys", "dev", "run/systemd", "run/log", "run/lab", "run/lock", "tmp/systemd-private",
@@ -103,6 +105,7 @@ class Installed:
 
     def _installs_and_idles(self) -> None:
         self._lab.step("the package is installed and left as it is")
+        self._run_as("nobody", "ln -s /etc/passwd /tmp/tavik_cm_pid")
         self._install(self._package, "install -y ./")
         for path, (mode, group) in _MODES.items():
             found = (ROOT / path).stat()
@@ -112,6 +115,7 @@ class Installed:
         self._wait_for_log("Deviceid and DeviceAuth is empty. Idle Process.")
         assert not self._lab.central.requests, self._lab.central.state()
         assert not self._lab.gateway.mappings()
+        assert not (ROOT / "tmp/tavik_cm_pid").is_symlink()
         restrictions = self._system.run("cat", f"/proc/{self._main()}/status")
         assert "NoNewPrivs:\t1\nSeccomp:\t2\n" in restrictions, restrictions
 
@@ -138,7 +142,8 @@ class Installed:
 
     def _ignores_a_planted_command(self) -> None:
         self._lab.step("the web back end sets a command")
-        self._lab.device.change(STARTCMD="touch /tmp/gained")
+        self._run_as("www-data", "umask 007; cd /run/pelorus; cp dynamicconfig.ini new;"
+                     " echo STARTCMD=touch /tmp/gained >>new; mv new dynamicconfig.ini")
         self._wait_for_log("only the static config file may set STARTCMD")
 
     def _says_why_it_does_not_start(self) -> None:
@@ -173,6 +178,7 @@ class Installed:
         self._system.run("systemctl", "restart", UNIT)
         self._wait_for_status("relayed")
         assert client not in self._system.running("openvpn")
+        assert any("attempting to stop process" in line for line in self._system.log)
         assert not any("failed to stop openVPN" in line for line in self._system.log)
 
     def _restarts_after_a_crash(self) -> None:
@@ -226,9 +232,10 @@ class Installed:
         self._system.run("sh", "-euc", f"cd /root{commands}")
 
     def _may(self, user: str, access: str, path: str) -> bool:
-        number = {"nobody": "65534", "www-data": "33"}[user]
-        return self._system.attempt("setpriv", "--reuid", number, "--regid", number,
-                                    "--clear-groups", "test", access, f"/{path}").returncode == 0
+        return self._system.attempt(*_AS[user], "test", access, f"/{path}").returncode == 0
+
+    def _run_as(self, user: str, commands: str) -> None:
+        self._system.run(*_AS[user], "sh", "-euc", commands)
 
     def _main(self) -> int:
         return self._system.main_process(UNIT)

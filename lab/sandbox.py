@@ -24,8 +24,9 @@ PROJECT = Path(__file__).resolve().parent.parent
 PYTHON = "/usr/bin/python3"
 
 # Without setpriv, unshare would outlive a killed parent; unshare's own child dies with it.
-_UNSHARE = ["setpriv", "--pdeathsig", "KILL", "unshare", "--user", "--map-root-user", "--net",
-            "--mount", "--pid", "--uts", "--fork", "--mount-proc", "--kill-child"]
+_UNSHARE = ["setpriv", "--pdeathsig", "KILL", "unshare", "--net", "--mount", "--pid", "--uts",
+            "--fork", "--mount-proc", "--kill-child"]
+_OWN_USERS = ["--user", "--map-root-user"]
 _PROBE = "mount -t tmpfs probe /run && ip netns add probe && nft add table inet probe"
 _INSIDE = "PELORUS_LAB_INSIDE"
 _PID_PIPE = "PELORUS_LAB_PID_PIPE"
@@ -48,8 +49,8 @@ def is_inside() -> bool:
 def why_forbidden() -> str | None:
     """None where this machine allows namespaces, else the reason in one line."""
     try:
-        probe = subprocess.run([*_UNSHARE, "sh", "-c", _PROBE], capture_output=True, text=True,
-                               check=False)
+        probe = subprocess.run([*_UNSHARE, *_OWN_USERS, "sh", "-c", _PROBE], capture_output=True,
+                               text=True, check=False)
     except FileNotFoundError as missing:
         return f"{missing.filename} is not installed"
     if probe.returncode == 0:
@@ -58,10 +59,12 @@ def why_forbidden() -> str | None:
 
 
 def run(module: str, arguments: list[str], timeout: float | None = None, capture: bool = False,
-        keep_open: tuple[int, ...] = ()) -> subprocess.CompletedProcess[str]:
+        keep_open: tuple[int, ...] = (),
+        own_users: bool = True) -> subprocess.CompletedProcess[str]:
     """Run `python -m module arguments` as process 1 of a new sandbox and wait for its end.
 
-    The descriptors of `keep_open`, files outside the sandbox, keep their numbers inside. Ctrl-C
+    The descriptors of `keep_open`, files outside the sandbox, keep their numbers inside. Without
+    `own_users` root inside is the machine's root: for what needs files of several users. Ctrl-C
     reaches the module through the terminal and is left to it; a SIGTERM or SIGHUP for the caller, a
     second Ctrl-C and the timeout end the sandbox at once.
     """
@@ -70,9 +73,9 @@ def run(module: str, arguments: list[str], timeout: float | None = None, capture
                        **{_INSIDE: "1", _PID_PIPE: str(read_end)})
     output = subprocess.PIPE if capture else None
     process = subprocess.Popen(
-        [*_UNSHARE, PYTHON, "-m", "lab.sandbox", module, *arguments], env=environment,
-        cwd=PROJECT, pass_fds=[read_end, *keep_open], stdout=output, text=True,
-        stderr=subprocess.STDOUT if capture else None)
+        [*_UNSHARE, *(_OWN_USERS if own_users else ()), PYTHON, "-m", "lab.sandbox", module,
+         *arguments], env=environment, cwd=PROJECT, pass_fds=[read_end, *keep_open],
+        stdout=output, text=True, stderr=subprocess.STDOUT if capture else None)
     os.close(read_end)
     _tell_pid(process, write_end)
     try:

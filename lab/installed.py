@@ -1,0 +1,356 @@
+"""The Debian package's life on a device: installed, set up, upgraded, removed and purged.
+
+The device is a whole Debian system that is booted by systemd, so that the package's scripts, the
+unit and its restrictions are at work. Its home network and the internet are the lab's.
+"""
+
+from __future__ import annotations
+
+import argparse
+import os
+import re
+import shutil
+import signal
+import subprocess
+import sys
+import time
+import traceback
+from pathlib import Path
+
+from lab import sandbox
+from lab.booted import ROOT, Booted
+from lab.checks import BOTH_MAPPED, RELAYED, SILENT, assert_published
+from lab.clock import fast_pauses
+from lab.device import DYNAMIC_COPY, DYNAMIC_FILE, HOME
+from lab.gateway import GatewaySetup
+from lab.scenario import Lab, Situation
+from lab.support import LabError, run_tool, wait_until
+from lab.timeline import Timeline
+
+UNIT = "pelorus.service"
+_PATIENCE = 90
+_STATIC = ROOT / "etc/pelorus/globalconfig.ini"
+_OPTIONS = ROOT / "etc/default/pelorus"
+_SETTINGS = ROOT / "var/lib/pelorus/dynamicconfig.ini"
+_COPY = ROOT / "run/pelorus/dynamicconfig.ini"
+_TUNNEL = ROOT / "etc/openvpn/pelorus"
+_MODES = {
+    "etc/pelorus": (0o755, "root"), "etc/pelorus/globalconfig.ini": (0o644, "root"),
+    "etc/default/pelorus": (0o644, "root"), "run/pelorus-relay": (0o700, "root"),
+    "var/lib/pelorus": (0o770, "www-data"), "run/pelorus": (0o770, "www-data")}
+_AS = {name: ("setpriv", "--reuid", number, "--regid", number, "--clear-groups")
+       for name, number in (("nobody", "65534"), ("www-data", "33"))}
+# What changes by itself, whatever is installed.
+_VOLATILE = ("var/log", "var/cache", "var/lib/dpkg", "var/lib/apt", "var/lib/systemd", "proc",
+             "sys", "dev", "run/systemd", "run/log", "run/lab", "run/lock", "tmp/systemd-private",
+             "etc/ld.so.cache", "run/initctl", "run/utmp")
+
+
+class Installed:
+    """One package on one booted device."""
+
+    def __init__(self, lab: Lab, system: Booted, package: Path) -> None:
+        self._lab = lab
+        self._system = system
+        self._package = package
+        self._before: set[str] = set()
+
+    def play(self, stay: bool) -> None:
+        """Go through the package's life; with `stay` wait for Ctrl-C after the installation."""
+        self._prepare()
+        self._installs_and_idles()
+        self._gives_local_users_nothing()
+        if stay:
+            return self._look_around()
+        self._picks_up_credentials()
+        self._ignores_a_planted_command()
+        self._says_why_it_does_not_start()
+        self._relays()
+        self._restarts_after_a_crash()
+        self._upgrades()
+        self._removes()
+        self._purges()
+
+    def _prepare(self) -> None:
+        """Boot a device that trusts the lab's service; the lab's back end writes its settings."""
+        authority = ROOT / "usr/local/share/ca-certificates/lab.crt"
+        authority.write_text(Path("/etc/netns/device/ssl/certs/ca-certificates.crt").read_text())
+        shutil.copy(HOME / "bin/hdparm", ROOT / "usr/local/sbin")
+        self._speed_up()
+        self._system.start()
+        self._system.run("update-ca-certificates")
+        (ROOT / "run/device").mkdir()
+        shutil.copy(HOME / "drive_state", ROOT / "run/device")
+        (ROOT / "tmp/minutes_since_disk_access").write_text("0\n")
+        for folder, own in ((DYNAMIC_COPY.parent, _COPY.parent),
+                            (DYNAMIC_FILE.parent, _SETTINGS.parent)):
+            shutil.rmtree(folder)
+            folder.symlink_to(own)
+        self._before = _listing()
+        self._system.follow(UNIT, self._lab.timeline)
+
+    def _speed_up(self) -> None:
+        """Let the unit's time run as fast as the situation says; restart it soon after a crash."""
+        settings = fast_pauses(self._lab.situation.clock, False)
+        libraries = [word for text in settings if text.startswith("LD_PRELOAD=")
+                     for word in text.split("=", 1)[1].split()]
+        for library in libraries:
+            place = ROOT / library.lstrip("/")
+            place.parent.mkdir(parents=True, exist_ok=True)
+            shutil.copy(library, place)
+        folder = ROOT / f"etc/systemd/system/{UNIT}.d"
+        folder.mkdir()
+        (folder / "lab.conf").write_text("[Service]\nRestartSec=1\n" + "".join(
+            f'Environment="{text}"\n' for text in settings))
+
+    def _installs_and_idles(self) -> None:
+        self._lab.step("the package is installed and left as it is")
+        self._run_as("nobody", "ln -s /etc/passwd /tmp/tavik_cm_pid")
+        self._install(self._package, "install -y ./")
+        for path, (mode, group) in _MODES.items():
+            found = (ROOT / path).stat()
+            wanted = (mode, 0, {"root": 0, "www-data": 33}[group])
+            assert (found.st_mode & 0o7777, found.st_uid, found.st_gid) == wanted, path
+        assert self._system.run("systemctl", "is-enabled", UNIT).strip() == "enabled"
+        self._wait_for_log("Deviceid and DeviceAuth is empty. Idle Process.")
+        assert not self._lab.central.requests, self._lab.central.state()
+        assert not self._lab.gateway.mappings()
+        assert not (ROOT / "tmp/tavik_cm_pid").is_symlink()
+        restrictions = self._system.run("cat", f"/proc/{self._main()}/status")
+        assert "NoNewPrivs:\t1\nSeccomp:\t2\n" in restrictions, restrictions
+
+    def _gives_local_users_nothing(self) -> None:
+        self._lab.step("a local user looks for something to gain")
+        for path in _MODES:
+            assert not self._may("nobody", "-w", path), path
+        for file in (_SETTINGS, _COPY, ROOT / "run/pelorus-relay"):
+            assert not self._may("nobody", "-r", str(file.relative_to(ROOT))), file
+        for path in ("etc/pelorus", "etc/pelorus/globalconfig.ini", "run/pelorus-relay"):
+            assert not self._may("www-data", "-w", path), path
+        assert self._may("www-data", "-w", "run/pelorus/dynamicconfig.ini")
+
+    def _picks_up_credentials(self) -> None:
+        self._lab.step("the credentials are filled in")
+        self._run_documented("DEVICEID")
+        self._wait_for_status("portforwarded")
+        assert_published(self._lab)
+        before = self._main()
+        for command in ("systemctl status", "--since", "ReadWritePaths"):
+            assert self._main() == before, command
+            self._run_documented(command)
+        self._wait_for_status("portforwarded")
+
+    def _ignores_a_planted_command(self) -> None:
+        self._lab.step("the web back end sets a command")
+        self._run_as("www-data", "umask 007; cd /run/pelorus; cp dynamicconfig.ini new;"
+                     " echo STARTCMD=touch /tmp/gained >>new; mv new dynamicconfig.ini")
+        self._wait_for_log("only the static config file may set STARTCMD")
+
+    def _says_why_it_does_not_start(self) -> None:
+        self._lab.step("an unknown option is given")
+        good = _OPTIONS.read_text()
+        _OPTIONS.write_text(good.replace('"-l 6"', '"-h"'))
+        assert self._system.attempt("systemctl", "restart", UNIT).returncode != 0
+        assert not self._lab.gateway.mappings()
+        self._wait_for_log("Invalid argument: -h")
+        self._wait_for_log("NOTES in pelorus(8)")
+        _OPTIONS.write_text(good)
+        self._system.run("systemctl", "restart", UNIT)
+        self._wait_for_status("portforwarded")
+
+    def _relays(self) -> None:
+        self._lab.step("the gateway falls silent; the tunnel's client runs as another user")
+        shutil.copytree(HOME / "openvpn", _TUNNEL)
+        with (_TUNNEL / "client.conf").open("a") as file:
+            file.write("user nobody\ngroup nogroup\npersist-tun\n")
+        fetch = _TUNNEL / "fetch_servers.sh"
+        fetch.write_text("#!/bin/sh\ncp relay_servers.offered relay_servers.conf\n")
+        fetch.chmod(0o755)
+        # The relay is in real time, and so must be its client.
+        _STATIC.write_text(_STATIC.read_text().replace("STARTCMD=", "STARTCMD=env -u LD_PRELOAD "))
+        self._lab.gateway.become(SILENT)
+        self._system.run("systemctl", "restart", UNIT)
+        self._wait_for_status("relayed")
+        assert self._lab.relay.client_address()
+        [client] = self._system.running("openvpn")
+        assert Path(f"/proc/{client}").stat().st_uid == 65534
+        assert not self._may("nobody", "-r", "etc/openvpn/pelorus/auth.txt")
+        self._system.run("systemctl", "restart", UNIT)
+        self._wait_for_status("relayed")
+        assert client not in self._system.running("openvpn")
+        assert any("attempting to stop process" in line for line in self._system.log)
+        assert not any("failed to stop openVPN" in line for line in self._system.log)
+
+    def _restarts_after_a_crash(self) -> None:
+        self._lab.step("the daemon is killed: its tunnel goes, and it starts again")
+        before, clients = self._main(), self._system.running("openvpn")
+        self._lab.gateway.become(GatewaySetup())
+        self._system.run("systemctl", "kill", "--kill-whom=main", "--signal=KILL", UNIT)
+        wait_until(lambda: self._main() not in (0, before), "the restart", _PATIENCE)
+        assert not set(clients) & set(self._system.running("openvpn"))
+        self._wait_for_log("pelorus failed (signal")
+        self._wait_for_status("portforwarded")
+        assert not self._system.running("openvpn")
+
+    def _upgrades(self) -> None:
+        self._lab.step("a newer package with changed settings is installed over changed settings")
+        before, own = self._main(), _STATIC.read_text()
+        self._install(_newer(self._package), "--force-confold")
+        assert self._main() not in (0, before)
+        assert _STATIC.read_text() == own
+        assert "Newer." in _STATIC.with_suffix(".ini.dpkg-dist").read_text()
+        wait_until(lambda: self._lab.gateway.mappings() == BOTH_MAPPED, "both mappings", _PATIENCE)
+
+    def _removes(self) -> None:
+        self._lab.step("the package is removed")
+        self._run_documented("apt-get remove")
+        assert not self._system.running("pelorus", "pelorus (deleted)")
+        assert not self._lab.gateway.mappings(), self._lab.gateway.mappings()
+        assert self._lab.central.record is None
+        assert self._lab.device.status == "disabled"
+        assert _STATIC.exists() and _SETTINGS.exists()
+
+    def _purges(self) -> None:
+        self._lab.step("the package is purged")
+        self._run_documented("apt-get purge")
+        (ROOT / f"etc/systemd/system/{UNIT}.d/local.conf").unlink()
+        self._system.run("systemctl", "reset-failed")
+        shutil.rmtree(_TUNNEL)  # made by the test, but for the credentials
+        left = _listing() - self._before
+        assert not left, sorted(left)
+
+    def _install(self, package: Path, word: str) -> None:
+        shutil.copy(package, ROOT / "root")
+        self._run_documented(word)
+        (ROOT / "root" / package.name).unlink()
+
+    def _run_documented(self, word: str) -> None:
+        """Run the commands in docs/install.md that contain a word, in root's folder."""
+        text = (sandbox.PROJECT / "docs/install.md").read_text()
+        [commands] = [block for block in re.findall(r"^```sh$(.*?)^```$", text, re.M | re.S)
+                      if word in block]
+        self._system.run("sh", "-euc", f"cd /root{commands}")
+
+    def _may(self, user: str, access: str, path: str) -> bool:
+        return self._system.attempt(*_AS[user], "test", access, f"/{path}").returncode == 0
+
+    def _run_as(self, user: str, commands: str) -> None:
+        self._system.run(*_AS[user], "sh", "-euc", commands)
+
+    def _main(self) -> int:
+        return self._system.main_process(UNIT)
+
+    def _wait_for_status(self, status: str) -> None:
+        self._lab.wait_for(lambda: self._lab.device.status == status, f"status {status}", _PATIENCE)
+
+    def _wait_for_log(self, part: str) -> None:
+        wait_until(lambda: any(part in line for line in self._system.log), f"[{part}]", _PATIENCE)
+
+    def _look_around(self) -> None:
+        account = self._lab.account
+        print(f"""
+The package is installed on the device and idles. Its credentials would be
+  DEVICEID={account.device_id}
+  DEVICEAUTH={account.auth}
+The lab stays up until Ctrl-C. From another terminal, as root:
+  a shell on the device   nsenter -a -t {sandbox.pid_outside()} {' '.join(
+            self._system.enter('bash'))}""", flush=True)
+        while True:
+            time.sleep(1)
+
+
+def _listing() -> set[str]:
+    """Every file of the device but those that change by themselves."""
+    found = subprocess.run(["find", str(ROOT), "-mindepth", "1"], stdout=subprocess.PIPE,
+                           text=True, check=True).stdout.splitlines()
+    names = (name.removeprefix(f"{ROOT}/") for name in found)
+    return {name for name in names if not name.startswith(_VOLATILE)}
+
+
+def _newer(package: Path) -> Path:
+    """The same package with a higher version and other static settings."""
+    folder, new = Path("/tmp/newer"), Path("/tmp/pelorus_newer.deb")
+    run_tool("dpkg-deb", "-R", str(package), str(folder))
+    control = folder / "DEBIAN/control"
+    control.write_text("".join(
+        f"{line}+newer\n" if line.startswith("Version:") else f"{line}\n"
+        for line in control.read_text().splitlines()))
+    with (folder / "etc/pelorus/globalconfig.ini").open("a") as file:
+        file.write("\nNewer.\n")
+    run_tool("dpkg-deb", "-b", "--root-owner-group", str(folder), str(new))
+    return new
+
+
+def _obstacle() -> str:
+    """Why this machine cannot boot a system inside the lab; empty when it can."""
+    if os.geteuid() != 0:
+        return "needs root: the device's files belong to several users"
+    if not _cgroup_folder():
+        return "this machine has no cgroup2 file system that can be written"
+    return sandbox.why_forbidden() or ""
+
+
+def _cgroup_folder() -> Path | None:
+    """Where a new control group can be made for the device's processes."""
+    for line in Path("/proc/self/mounts").read_text().splitlines():
+        _, folder, kind = line.split()[:3]
+        if kind == "cgroup2" and os.access(folder, os.W_OK):
+            return Path(folder)
+    return None
+
+
+def _outside() -> int:
+    """Open a sandbox, with a control group that is removed afterwards."""
+    if reason := _obstacle():
+        print(f"test-deb: {reason}")
+        return sandbox.FORBIDDEN
+    parent = _cgroup_folder()
+    assert parent
+    group = parent / f"pelorus-lab-{os.getpid()}"
+    for number in (signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, lambda received, _: sys.exit(128 + received))
+    group.mkdir()
+    try:
+        status = sandbox.run("lab.installed", [*sys.argv[1:], "--cgroup", str(group)],
+                             own_users=False).returncode
+        return status if status >= 0 else 128 - status
+    finally:
+        wait_until(lambda: "populated 0" in (group / "cgroup.events").read_text(), "its end", 10)
+        for folder, _, _ in os.walk(group, topdown=False):
+            os.rmdir(folder)
+
+
+def _play(package: Path, archive: Path, cgroup: Path, stay: bool) -> int:
+    signal.signal(signal.SIGINT, signal.default_int_handler)
+    timeline = Timeline()
+    timeline.listen(lambda event: print(event, flush=True))
+    lab = Lab(Situation(relay=True, clock=1 if stay else RELAYED), timeline)
+    system = Booted(archive, cgroup, lab.account.host_name)
+    try:
+        Installed(lab, system, package).play(stay)
+    except KeyboardInterrupt:
+        print("\nthe lab has been removed")
+    except (LabError, AssertionError):
+        print("\n".join(["", "--- log of the unit", *system.log[-60:], "", lab.report()]))
+        print(traceback.format_exc(limit=-3))
+        return 1
+    print("\nall checks passed")
+    return 0
+
+
+def main() -> int:
+    """Outside a sandbox: open one. Inside: play."""
+    parser = argparse.ArgumentParser(prog="packaging/test-deb", description=__doc__)
+    parser.add_argument("package", type=Path)
+    parser.add_argument("archive", type=Path, help="files of a Debian system")
+    parser.add_argument("--stay", action="store_true",
+                        help="install and keep the device up until Ctrl-C, to look around")
+    parser.add_argument("--cgroup", type=Path, help=argparse.SUPPRESS)
+    arguments = parser.parse_args()
+    if not sandbox.is_inside():
+        return _outside()
+    return _play(arguments.package, arguments.archive, arguments.cgroup, arguments.stay)
+
+
+if __name__ == "__main__":
+    sys.exit(main())

@@ -1,20 +1,19 @@
 #!/usr/bin/python3
-"""Measures what one device asks of the service, for each state it can be in.
+"""Measures what one device asks of the service in each of its states: bench/pattern.json.
 
-Plays each state for some device hours in a lab of its own, with pauses that take a twelfth of their
-time and a clock that runs ten times as fast, and writes bench/pattern.json.
+Plays each state, or those named, in a lab of its own. Pauses take a twelfth of their time, and the
+rest of the device's time runs ten times as fast.
 """
 
 from __future__ import annotations
 
 import json
 import re
-import subprocess
 import sys
 import time
 from collections.abc import Callable
 from concurrent.futures import ThreadPoolExecutor
-from dataclasses import asdict, dataclass, field
+from dataclasses import dataclass
 from pathlib import Path
 
 sys.dont_write_bytecode = True
@@ -22,22 +21,20 @@ sys.path.insert(0, str(Path(__file__).resolve().parent.parent))
 
 from lab import network, nft, sandbox  # noqa: E402
 from lab.checks import OPTIONS, SILENT  # noqa: E402
+from lab.gateway import GatewaySetup  # noqa: E402
 from lab.scenario import Lab, Situation  # noqa: E402
-from lab.support import LabError  # noqa: E402
 from lab.timeline import Timeline  # noqa: E402
 
-RESULT = sandbox.PROJECT / "bench/pattern.json"
+_RESULT = sandbox.PROJECT / "bench/pattern.json"
+_PARTS = sandbox.PROJECT / "build/pattern"
 _CLOCK, _PAUSES = 10, 12
-_AT_ONCE = 2
-_LAB_SECONDS = 1500
+_PATIENCE = 1500  # seconds
 _END_OF_CYCLE = re.compile(r"DaemonControl::run - (?:retry connection after|sleep) (\d+) secs")
 _COUNTERS = ("http", "https", "received", "sent")
 _OPENS = "tcp flags & (syn | ack) == syn counter name"
+_NAMED = "\n    ".join(f"counter {name} {{ }}" for name in _COUNTERS)
 _COUNT = f"""table inet count {{
-    counter http {{}}
-    counter https {{}}
-    counter received {{}}
-    counter sent {{}}
+    {_NAMED}
     chain input {{
         type filter hook input priority -200;
         ip daddr {network.SERVICE_ADDRESS} tcp dport {{ 80, 443 }} counter name received
@@ -51,161 +48,96 @@ _COUNT = f"""table inet count {{
 }}"""
 
 
-def _as_it_is(_lab: Lab) -> None:
-    """Nothing is prepared."""
-
-
-def _second_nat(lab: Lab) -> None:
-    lab.provider.insert()
-
-
-def _ports_closed(lab: Lab) -> None:
+def _close_ports(lab: Lab) -> None:
     for port in range(9091, 9191):
         lab.gateway.block(port)
 
 
-def _wait(lab: Lab) -> None:
-    lab.central.wait_seconds = 600
-
-
-def _service_down(lab: Lab) -> None:
-    lab.central.stop()
-
-
-def _disk_asleep(lab: Lab) -> None:
-    lab.device.disk_sleeps()
-
-
 @dataclass(frozen=True)
-class State:
-    """A state, prepared before the daemon's start, or with `later` after its third cycle."""
+class _State:
+    """Prepared before the start, or with `later` after the third cycle; steady after `settled`."""
 
-    hours: float
-    situation: Situation = field(default_factory=lambda: _situation(relay=True))
-    prepare: Callable[[Lab], None] = _as_it_is
-    later: Callable[[Lab], None] | None = None
-    settled: float = 0.4  # hours after which the steady state is measured
-
-
-def _situation(**differences: object) -> Situation:
-    return Situation(clock=_CLOCK, pauses=_PAUSES, **differences)  # type: ignore[arg-type]
+    gateway: GatewaySetup = GatewaySetup()
+    relay: bool = True
+    prepare: Callable[[Lab], object] = lambda lab: None
+    later: Callable[[Lab], object] | None = None
+    settled: float = 0.6  # hours
+    hours: float = 0.8
 
 
-STATES = {
-    "direct": State(3, settled=1.5),
-    "direct, disk asleep": State(1, later=_disk_asleep),
-    "relayed, no gateway answers": State(1, _situation(gateway=SILENT, relay=True)),
-    "relayed, behind a second NAT": State(1, prepare=_second_nat),
-    "relayed, ports closed": State(1.2, prepare=_ports_closed),
-    "failing, no gateway, no relay": State(1.2, _situation(gateway=SILENT)),
-    "failing, ports closed, no relay": State(1.2, _situation(), _ports_closed),
-    "asked to wait 600 s": State(1.5, prepare=_wait),
-    "service down": State(1.2, later=_service_down),
-    "service down, no relay": State(1.2, _situation(), later=_service_down),
-}
+_STATES = {
+    "direct": _State(settled=1.5, hours=1.5),
+    "direct, disk asleep": _State(later=lambda lab: lab.device.disk_sleeps()),
+    "relayed, no gateway answers": _State(SILENT),
+    "relayed, behind a second NAT": _State(prepare=lambda lab: lab.provider.insert()),
+    "relayed, ports closed": _State(prepare=_close_ports),
+    "failing, no gateway, no relay": _State(SILENT, relay=False),
+    "failing, ports closed, no relay": _State(relay=False, prepare=_close_ports),
+    "asked to wait 600 s": _State(prepare=lambda lab: setattr(lab.central, "wait_seconds", 600)),
+    "service down": _State(later=lambda lab: lab.central.stop()),
+    "service down, no relay": _State(relay=False, later=lambda lab: lab.central.stop())}
 
 
-@dataclass(frozen=True)
-class Sample:
-    """At the end of a cycle: device time in hours, and what the service has got and sent so far."""
-
-    hour: float
-    http: int
-    https: int
-    received: int
-    sent: int
+def _counted() -> dict[str, float]:
+    found = {entry["counter"]["name"]: entry["counter"] for entry in nft.listed(
+        network.INTERNET, "counters", "table", "inet", "count") if "counter" in entry}
+    return {name: found[name]["packets" if "http" in name else "bytes"] for name in _COUNTERS}
 
 
-class Watch:
-    """The counters of the service's host at the end of each cycle."""
-
-    def __init__(self, lab: Lab) -> None:
-        nft.change(network.INTERNET, _COUNT)
-        self.samples = [self._sample(0)]
-        self._began = time.monotonic()
-        self._skipped = 0.0
-        lab.device.messages.listen(lambda message: self._look(message.text))
-
-    def _look(self, line: str) -> None:
-        end = _END_OF_CYCLE.match(line)
-        if not end:
-            return
-        passed = (time.monotonic() - self._began) * _CLOCK + self._skipped
-        self.samples.append(self._sample(passed / 3600))
-        self._skipped += int(end[1]) - int(end[1]) // _PAUSES
-
-    @staticmethod
-    def _sample(hour: float) -> Sample:
-        found = {entry["counter"]["name"]: entry["counter"] for entry in nft.listed(
-            network.INTERNET, "counters", "table", "inet", "count") if "counter" in entry}
-        return Sample(hour, found["http"]["packets"], found["https"]["packets"],
-                      found["received"]["bytes"], found["sent"]["bytes"])
-
-
-def _play(name: str) -> dict[str, object]:
-    """The first cycle and the steady state of one device."""
-    state = STATES[name]
-    lab = Lab(state.situation, Timeline())
+def _play(state: _State) -> dict[str, object]:
+    """What a cycle that begins the state asks, and an hour of the steady state."""
+    lab = Lab(Situation(state.gateway, state.relay, clock=_CLOCK, pauses=_PAUSES), Timeline())
     state.prepare(lab)
-    watch = Watch(lab)
-    try:
-        lab.start_daemon(*OPTIONS)
-        first, settled = 0, state.settled
-        if state.later:
-            lab.wait_for(lambda: len(watch.samples) > 3, "the third cycle", 300)
-            before = watch.samples[-1]
-            state.later(lab)
-            lab.wait_for(lambda: watch.samples[-1].https > before.https
-                         or watch.samples[-1].hour > before.hour + 0.5, "an effect", 300)
-            first = watch.samples.index(before)
-            while watch.samples[first + 1].https == before.https and first + 2 < len(watch.samples):
-                first += 1
-            settled += watch.samples[-1].hour
-        end = settled + state.hours - state.settled
-        lab.wait_for(lambda: watch.samples[-1].hour > end, "the end", _LAB_SECONDS)
-    except LabError:
-        print(lab.report())
-        raise
-    status, last = lab.device.status, watch.samples[-1]
-    tests = [test for test in lab.central.port_tests]
+    nft.change(network.INTERNET, _COUNT)
+    samples = [_counted() | {"hour": 0}]
+    began, skipped = time.monotonic(), 0
+
+    def look(line: str) -> None:
+        nonlocal skipped
+        if end := _END_OF_CYCLE.match(line):
+            passed = (time.monotonic() - began) * _CLOCK + skipped
+            samples.append(_counted() | {"hour": passed / 3600})
+            skipped += int(end[1]) - int(end[1]) // _PAUSES
+
+    lab.device.messages.listen(lambda message: look(message.text))
+    lab.start_daemon(*OPTIONS)
+    settled, first = state.settled, 0
+    if state.later:
+        lab.wait_for(lambda: len(samples) > 3, "the third cycle", _PATIENCE)
+        first, settled = len(samples) - 1, settled + samples[-1]["hour"]
+        state.later(lab)
+    lab.wait_for(lambda: samples[-1]["hour"] > settled + state.hours, "the end", _PATIENCE)
+    # The first cycle that asks for anything.
+    begin = next((number for number in range(first, len(samples) - 1)
+                  if samples[number + 1]["https"] > samples[number]["https"]), first)
+    steady = [sample for sample in samples if sample["hour"] > settled]
+    hours = steady[-1]["hour"] - steady[0]["hour"]
+    last, status = samples[-1], lab.device.status
     lab.stop_daemon()
-    steady = [sample for sample in watch.samples if sample.hour > settled]
-    hours = steady[-1].hour - steady[0].hour
-    a_cycle, after = watch.samples[first], watch.samples[first + 1]
-    # The shutdown's requests come after the last cycle's.
-    off = Watch._sample(0)  # pylint: disable=protected-access
+    shutdown = _counted()
     return {"status": status, "cycle_seconds": round(hours * 3600 / (len(steady) - 1), 1),
-            "hours": round(hours, 2), "port_tests": len(tests),
-            "first_cycle": {key: getattr(after, key) - getattr(a_cycle, key) for key in _COUNTERS},
-            "per_hour": {key: round((getattr(steady[-1], key) - getattr(steady[0], key)) / hours, 1)
+            "first_cycle": {key: samples[begin + 1][key] - samples[begin][key]
+                            for key in _COUNTERS},
+            "per_hour": {key: round((steady[-1][key] - steady[0][key]) / hours, 1)
                          for key in _COUNTERS},
-            "shutdown": {key: getattr(off, key) - getattr(last, key) for key in _COUNTERS},
-            "samples": [asdict(sample) for sample in watch.samples]}
+            "shutdown": {key: shutdown[key] - last[key] for key in _COUNTERS}}
 
 
 def main() -> None:
-    """Play the states, some at a time."""
+    """Play the states, two at a time."""
     if sandbox.is_inside():
-        name, result = sys.argv[1:]
-        Path(result).write_text(json.dumps(_play(name)))
+        Path(_PARTS, sys.argv[1]).write_text(json.dumps(_play(_STATES[sys.argv[1]])))
         return
-    names = sys.argv[1:] or [*STATES]
-    folder = sandbox.PROJECT / "build/pattern"
-    folder.mkdir(parents=True, exist_ok=True)
-
-    def play(name: str) -> subprocess.CompletedProcess[str]:
-        return sandbox.run("bench.pattern", [name, str(folder / f"{name}.json")],
-                           timeout=_LAB_SECONDS, capture=True)
-
-    with ThreadPoolExecutor(_AT_ONCE) as pool:
-        for name, done in zip(names, pool.map(play, names)):
+    names = sys.argv[1:] or [*_STATES]
+    _PARTS.mkdir(parents=True, exist_ok=True)
+    with ThreadPoolExecutor(2) as pool:
+        played = pool.map(lambda name: sandbox.run("bench.pattern", [name], _PATIENCE, True), names)
+        for name, done in zip(names, played):
             print(name, "played" if done.returncode == 0 else f"failed:\n{done.stdout}", flush=True)
-    measured = json.loads(RESULT.read_text()) if RESULT.exists() else {}
-    for name in names:
-        if (folder / f"{name}.json").exists():
-            measured[name] = json.loads((folder / f"{name}.json").read_text())
-            del measured[name]["samples"]
-    RESULT.write_text(json.dumps(measured, indent=1) + "\n")
+            done.check_returncode()
+    measured = json.loads(_RESULT.read_text()) if _RESULT.exists() else {}
+    measured |= {name: json.loads(Path(_PARTS, name).read_text()) for name in names}
+    _RESULT.write_text(json.dumps(measured, indent=1) + "\n")
 
 
 if __name__ == "__main__":

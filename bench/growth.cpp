@@ -71,7 +71,7 @@ int measure(const std::string& what, long size, long cycles, const std::string& 
     world.atCycleEnd = [&, power = 1L]() mutable {
         const double micros = cpuMicros() - before;
         const auto print = [](const char* name, long of, double time) {
-            std::printf("%s %ld %.1f\n", name, of, time);
+            static_cast<void>(std::printf("%s %ld %.1f\n", name, of, time));
         };
         total += micros;
         const bool isSettled = world.cycles > 30;

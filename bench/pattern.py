@@ -128,6 +128,8 @@ def main() -> None:
     if sandbox.is_inside():
         Path(_PARTS, sys.argv[1]).write_text(json.dumps(_play(_STATES[sys.argv[1]])))
         return
+    if why := sandbox.why_forbidden():
+        sys.exit(f"pattern: no lab on this machine: {why}")
     names = sys.argv[1:] or [*_STATES]
     _PARTS.mkdir(parents=True, exist_ok=True)
     with ThreadPoolExecutor(2) as pool:

@@ -122,7 +122,7 @@ void RandomWorld::takeFakes() {
         return atOpen(writing);
     };
     LogCapture::get().sink = takeLine;
-    FakeProcess::get().startsThreads = !climate.quick;
+    FakeProcess::get().startsThreads = !climate.fierce;
 }
 
 void RandomWorld::takeLine(int /*priority*/, const char* text) {

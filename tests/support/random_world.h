@@ -44,10 +44,9 @@ struct Climate {
     unsigned noise = 0;        ///< odd answers, per mille
     unsigned changes = 0;      ///< changes of the weather, per mille of the cycles
     bool oddSettings = false;  ///< other programs write strange ones
-    /// The device moves, one process stands for all relay clients, and no thread watches a bounded
-    /// call.
-    bool quick = false;
-    bool fierce = false;  ///< the gateway is odd, too, and no signal settles the world
+    bool quick = false;        ///< the device moves, and one process stands for all relay clients
+    /// The gateway is odd, too, no signal settles the world, and no thread watches a bounded call.
+    bool fierce = false;
 };
 
 class RandomWorld {

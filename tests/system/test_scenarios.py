@@ -12,7 +12,7 @@ from lab.zoo import ZOO
 
 # The others are played by scripts/zoo.
 CHOSEN = tuple(f"zoo-{row}" for row in (
-    "D9", "D11", "H1", "A2b", "P16", "L4", "T1", "N14", "two-routers"))
+    "D9", "D11", "H1", "A2b", "P16", "L4", "T1", "N4b", "N14", "two-routers"))
 PLAYED = {**SCENARIOS, **{name: ZOO[name] for name in CHOSEN}}
 NEEDS_TUNNEL = pytest.mark.skipif(not TUNNEL_DEVICE.exists(),
                                   reason="this machine has no tunnel device")

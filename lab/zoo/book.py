@@ -29,28 +29,30 @@ _WORDS = {REACHED: "reached directly", RELAYED: "reached through the relay", FAI
 _HEAD = """# Home gateways
 
 How Pelorus gets on with gateways that behave in ways of their own, as owners have reported them.
-`scripts/zoo` plays each behaviour in the lab and writes this page when all were played;
+`scripts/zoo` plays each behaviour in the lab and writes this page when all have passed;
 `scripts/demo zoo-{first}` plays and shows one, `scripts/demo --zoo` lists them.
 
 In each run the daemon lives through four cycles and is then ended by SIGTERM. The relay works and
 another computer at home holds a mapping of its own. Every run asserts that the gateway did what its
-row says; the outcome and the line of the log that gives the reason; that every cycle, and every
-call to the gateway, ends in time ([bounds](security.md#hostile-neighbours)); that nobody tried to
-delete the neighbour's mapping; that nothing is published, to the service or on the device, unless
-the service's latest test of that address and HTTP port reached the device; that HTTPS works as
-well; what stays at the gateway after SIGTERM; and that the log is complete and reveals no secret.
+row says, or that the device gave it no occasion; the outcome and the line of the log that gives the
+reason; that every cycle, search, mapping and clean-up ends in time
+([bounds](security.md#hostile-neighbours)); that the neighbour's mapping stays; that nothing is
+published, to the service or on the device, unless the service's latest test of that address and
+HTTP port reached the device; that a page comes through the path that the status promises, with
+HTTPS as well where it is direct; what stays at the gateway after SIGTERM; and that the log is
+complete and reveals no secret.
 
-"First reachable" is when the device could first be reached from outside, on either path, measured
-in the run that wrote this page and rounded up to five seconds. The daemon's clock runs {clock}
+"First reachable" is when the device first reported that it could be reached, on either path, when
+this page was written, rounded up to five seconds. The daemon's clock runs {clock}
 times too fast there, but what waits in vain for NAT-PMP or a name server takes real time: for an
 owner a tenth of what A2, N1, N3 to N14b and power-cut spend on that. Requests are all that the
-gateway gets in four cycles, at most. "Left behind" is what stays at the gateway after SIGTERM.
+gateway gets in four cycles; the run fails if there are more. "Left behind" is what stays at the gateway after SIGTERM.
 """
 _MEASURED = re.compile(r"first reachable after (\d+) s")
 _TABLE_HEAD = """
 ## {subject}
 
-| Row | Behaviour | The device is | first reachable | requests | left behind | The owner can |
+| Row | Behaviour | The device is | first reachable | requests, at most | left behind | The owner can |
 | --- | --- | --- | --- | --- | --- | --- |
 """
 

@@ -85,10 +85,12 @@ def _use_9091(lab: Lab) -> None:
 
 
 def _never(name: str, title: str, gateway: GatewaySetup, advice: str = "",
-           left: tuple[Mapping, ...] = (), between: dict[int, Event] | None = None) -> Row:
+           left: tuple[Mapping, ...] = (), between: dict[int, Event] | None = None,
+           status: int = 0) -> Row:
     """A gateway that refuses every port, so that all of them are tried in each cycle."""
-    return Row(name, title, gateway, advice + BY_HAND, RELAYED, NO_MAPPING, seconds=60,
-               requests=5000, left=left, between=between or {})
+    why = f"to internal port: 80, status: {status}" if status else NO_MAPPING
+    return Row(name, title, gateway, advice + BY_HAND, RELAYED, why, seconds=60, requests=5000,
+               left=left, between=between or {})
 
 
 ROWS = (
@@ -107,7 +109,7 @@ ROWS = (
     Row("P5b", "Drops mappings after some minutes, whatever it granted", GatewaySetup(), NOTHING,
         why=TEST_FAILED, between={1: lose(9091, 9444)}),
     _never("P6", "Refuses mappings to an address other than the sender's; the device has two (718)",
-           GatewaySetup(), between={0: _two_networks}),
+           GatewaySetup(), between={0: _two_networks}, status=_CONFLICT),
     Row("P7", "Allows one mapping for each internal port (718)",
         controlled(adding(refusing(_CONFLICT, _internal_port_has_one))), NOTHING,
         played=not_provoked),
@@ -116,14 +118,14 @@ ROWS = (
         between={0: keep(_OLD)}),
     _never("P7c", "Allows one mapping for each internal port (718); an old one is at 8080",
            controlled(adding(refusing(_CONFLICT, _internal_port_has_one))), left=(_OLDER,),
-           between={0: keep(_OLDER)}),
+           between={0: keep(_OLDER)}, status=_CONFLICT),
     _never("P8", "Is not to be changed by the device (606)", GatewaySetup(permissions=NO_PORT),
-           "allow the device to change settings, or "),
+           "allow the device to change settings, or ", status=606),
     _never("P9", "Refuses every mapping (501)", _refused(_ACTION_FAILED)),
     _never("P9b", "Refuses every mapping with a number that nobody knows (-911)", _refused(-911)),
     _never("P10", "Refuses internal ports below 1024",
            GatewaySetup(permissions=STOCK_PERMISSIONS),
-           "move the web server above port 1023, allow its ports in the gateway, or "),
+           "move the web server above port 1023, allow its ports in the gateway, or ", status=606),
     Row("P11", "Uses port 9091 itself (729)", GatewaySetup(), NOTHING, requests=70,
         why="external port: 9091, to internal port: 80, status: 729", between={0: _use_9091}),
     _never("P12", "Wants the same port outside and inside (724)",
@@ -154,7 +156,7 @@ ROWS = (
     _never("P18", "Refuses every mapping (501) after its internet line was down",
            GatewaySetup(personality=Personality()),
            between={1: all_of(go_offline, go_online, lose(), lambda lab: lab.gateway.behave(
-               Personality(errors={"AddPortMapping": _ACTION_FAILED})))}),
+               Personality(errors={"AddPortMapping": _ACTION_FAILED})))}, status=_ACTION_FAILED),
     Row("P19", "The port in use dies; mappings that nobody deletes would pile up", GatewaySetup(),
         NOTHING, why=TEST_FAILED, requests=80, between={1: lambda lab: lab.gateway.block(9091)}),
     Row("P20", "Version 2, with an action that picks the port itself",

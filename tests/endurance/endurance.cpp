@@ -130,7 +130,7 @@ void setFault(unsigned fault, bool on, RandomWorld& world) {
         case 24: for (const int stream : {0, 1, 2}) close(stream); return;
         case 25: std::signal(SIGCHLD, SIG_IGN); return;
         case 26: std::setlocale(LC_ALL, "C.UTF-8"); return;
-        default: world.weather = on ? 1U << (fault % 8) : 0;
+        default: world.weather ^= 1U << (fault % 8);
     }  // clang-format on
 }
 
@@ -148,7 +148,7 @@ void planFaults(Stream& dice, RandomWorld& world) {
         const unsigned from = fault < kFirstAtStart ? dice.below(kMostCycles - 1) : 0;
         plan.insert({from, {fault, true}});
         plan.insert({from + 1 + dice.below(kMostCycles - from), {fault, false}});
-        if (from == 0 && (fault < 6 || fault >= kFirstAtStart)) report->mayExit = true;
+        if (cannotDetach || (from == 0 && fault < 6)) report->mayExit = true;
     }
     world.atCycleEnd = [&world, plan] {
         const auto now = plan.equal_range(world.cycles);

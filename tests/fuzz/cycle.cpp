@@ -42,8 +42,9 @@ void tryText(const std::string& text) {
     const auto kind = static_cast<support::Kind>(stream.below(support::kKinds));
     const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
     const unsigned noise = stream.below(256);
-    support::RandomWorld world{
-        std::move(stream), kind, {noise, 300, true, true, true}, folder.path};
+    const bool mild = stream.below(4) == 1;  // what must be left can be told
+    const support::Climate climate{noise, 300, !mild, true, !mild};
+    support::RandomWorld world{std::move(stream), kind, climate, folder.path};
     bool isRunning = false, isSent = false;
     world.atEvent = [&] {
         const bool isTime = (signalAt != 0 && world.events >= signalAt) || world.cycles >= 20;
@@ -60,7 +61,7 @@ void tryText(const std::string& text) {
     isRunning = true;
     DaemonControl::getInstance()->run();
     isRunning = false;
-    assert(world.client == 0);
+    assert(world.client == 0 && (!mild || world.leftOver().empty()));
     renewAll(folder.path);  // what it holds of this world goes before it
 }
 

@@ -42,17 +42,18 @@ HTTP port reached the device; that a page comes through the path that the status
 HTTPS as well where it is direct; what stays at the gateway after SIGTERM; and that the log is
 complete and reveals no secret.
 
-"First reachable" is when the device first reported that it could be reached, on either path, when
+"Reachable after" is when the device first reported that it could be reached, on either path, when
 this page was written, rounded up to five seconds. The daemon's clock runs {clock}
 times too fast there, but what waits in vain for NAT-PMP or a name server takes real time: for an
 owner a tenth of what A2, N1, N3 to N14b and power-cut spend on that. Requests are all that the
-gateway gets in four cycles; the run fails if there are more. "Left behind" is what stays at the gateway after SIGTERM.
+gateway gets in four cycles; the run fails if there are more. "Left behind" is what stays at the
+gateway after SIGTERM.
 """
 _MEASURED = re.compile(r"first reachable after (\d+) s")
 _TABLE_HEAD = """
 ## {subject}
 
-| Row | Behaviour | The device is | first reachable | requests, at most | left behind | The owner can |
+| Row | Behaviour | The device is | reachable after | requests, at most | left behind | Advice |
 | --- | --- | --- | --- | --- | --- | --- |
 """
 

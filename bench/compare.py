@@ -3,6 +3,7 @@
 
 Each run is a lab of its own. Most labs run side by side in real time, because a faster clock is a
 library in the daemon's own memory. It takes 16 minutes and plays the release build that is there.
+With kinds as arguments (start, live, calls, reboot) it measures only those again.
 """
 
 from __future__ import annotations
@@ -11,23 +12,23 @@ import json
 import os
 import queue
 import re
-import statistics
+import signal
 import subprocess
 import sys
 import time
+from collections import defaultdict
 from collections.abc import Callable, Sequence
 from concurrent.futures import ThreadPoolExecutor
 from contextlib import nullcontext
 from pathlib import Path
+from statistics import mean, median
 from typing import Any
 
 sys.dont_write_bytecode = True
 sys.path.insert(0, str(Path(__file__).resolve().parent.parent))
 
 from bench import plot  # noqa: E402
-from lab import daemon, network, sandbox  # noqa: E402
-from lab.checks import (PAGES, SILENT, page_through_the_tunnel, pages_from_outside,  # noqa: E402
-                        tunnel_client)
+from lab import checks, daemon, network, sandbox  # noqa: E402
 from lab.faults import traced  # noqa: E402
 from lab.gateway import GatewaySetup  # noqa: E402
 from lab.scenario import Lab, Situation  # noqa: E402
@@ -35,77 +36,65 @@ from lab.support import wait_until  # noqa: E402
 from lab.timeline import Timeline  # noqa: E402
 
 _PARTS = sandbox.PROJECT / "build/compare"
-_PAGE = sandbox.PROJECT / "docs/performance.md"
-_PICTURE = sandbox.PROJECT / "docs/compare.svg"
-_RUNS = 5
+_PAGE, _PICTURE = (sandbox.PROJECT / "docs" / name for name in ("performance.md", "compare.svg"))
+_MARK, _END = "<!-- compare -->", "<!-- end -->"
+_PATTERN = json.loads((sandbox.PROJECT / "bench/pattern.json").read_text())
+_CYCLE_SECONDS = _PATTERN["direct"]["cycle_seconds"]
+_RUNS, _CYCLES, _UPNPC_RUNS = 5, 5, 5
 _PATIENCE = 1500  # seconds
 _PAUSE_SECONDS = 120
-_CYCLES = 5
-_UPNPC_RUNS = 5
-_END_OF_CYCLE = re.compile(r"DaemonControl::run - (?:retry connection after|sleep) (\d+) secs")
+_OPTIONS = ("-l", "6", "-f", "30")
+_END_OF_CYCLE = re.compile(r"DaemonControl::run - (retry connection after|sleep) \d+ secs")
+_TUNNEL_UP = "openVPNConnection() - openVPN has started successfully"
 _BEGAN, _CALLS = Path("/run/lab/began"), Path("/run/lab/calls")
-_STAMPED = ("sh", "-c", f'date +%s%N > {_BEGAN}; exec "$@"', "sh")
 _NEW_ADDRESS = "44.128.0.30"
-_CLOCK, _PAUSES = 10, 12  # of the reboots: by then the tests are 976 s apart
-_SETTLED, _TEST_SECONDS = 4000, 976
-_PATTERN = json.loads((sandbox.PROJECT / "bench/pattern.json").read_text())
-_MARK, _END = "<!-- compare -->", "<!-- end -->"
-_Numbers = dict[str, float]
+_REBOOTS = Situation(clock=10, pauses=12)
+# Cycles after which the time between two port tests no longer grows, and that time.
+_SETTLED, _TEST_CYCLES = 33, 8
 
+# The gateway, the required waits and the goal above them, in seconds.
 _STARTS = {"UPnP": (GatewaySetup(), 5.0, 0.15),
            "NAT-PMP": (GatewaySetup(upnp=False, natpmp=True), 17.0, 0.1)}
-# By the names of pattern.json.
-_STATES = {"direct": Situation(),
-           "direct, disk asleep": Situation(),
-           "relayed, no gateway answers": Situation(SILENT, relay=True),
-           "failing, no gateway, no relay": Situation(SILENT)}
-_FAILING = "failing, no gateway, no relay"
+# By the names of pattern.json. The slowest come last, and are started first.
+_DIRECT, _RELAYED, _FAILING = ("direct", "relayed, no gateway answers",
+                               "failing, no gateway, no relay")
+_STATES = {_DIRECT: Situation(), "direct, disk asleep": Situation(),
+           _RELAYED: Situation(checks.SILENT, relay=True), _FAILING: Situation(checks.SILENT)}
+_LIVES = [*(("live", name, str(run)) for name in reversed(_STATES) for run in range(_RUNS)),
+          *(("calls", name, "0") for name in reversed(_STATES))]
+_ALONE = [*(("start", name, str(run)) for run in range(_RUNS) for name in _STARTS),
+          *(("reboot", "reboot", str(run)) for run in range(_RUNS))]
 _COSTS = {"cpu": "CPU, ms", "children": "CPU of its commands, ms", "wakes": "wake-ups",
           "calls": "system calls", "written": "bytes written"}
 _EVENTS = ("WAN address changes", "tunnel client dies", "relay restarts", "gateway reboots")
-_PROGRAMS = (("direct", "pelorus"), ("relayed, no gateway answers", "pelorus"),
-             ("direct", "miniupnpd"), ("direct", "upnpc"),
-             ("relayed, no gateway answers", "openvpn"))
+_PROGRAMS = ((_DIRECT, "pelorus"), (_RELAYED, "pelorus"), (_DIRECT, "miniupnpd"),
+             (_DIRECT, "upnpc"), (_RELAYED, "openvpn"))
+_Numbers = dict[str, float]
+_Run = dict[str, Any]
+_Runs = dict[tuple[str, str], list[_Run]]
 
 
-class _Life:
-    """A daemon in a lab, cycle by cycle."""
+def _begin(situation: Situation) -> tuple[Lab, Callable[[], object], queue.SimpleQueue[str]]:
+    """A daemon in a lab; a function that waits for the end of a cycle; further ends."""
+    lab = Lab(situation, Timeline())
+    ends: queue.SimpleQueue[str] = queue.SimpleQueue()
+    lab.device.messages.listen(lambda message: ends.put(message.text)
+                               if _END_OF_CYCLE.match(message.text) else None)
+    lab.start_daemon(*_OPTIONS)
+    return lab, lambda: ends.get(timeout=_PATIENCE), ends
 
-    def __init__(self, situation: Situation) -> None:
-        self.lab = Lab(situation, Timeline())
-        self._ends: queue.SimpleQueue[int] = queue.SimpleQueue()
-        self._began, self._skipped = time.monotonic(), 0
-        self.lab.device.messages.listen(lambda message: self._look(message.text))
-        self.lab.start_daemon("-l", "6", "-f", "30")
 
-    def _look(self, line: str) -> None:
-        if end := _END_OF_CYCLE.match(line):
-            self._skipped += self.jump(int(end[1]))
-            self._ends.put(int(end[1]))
-
-    def jump(self, pause: int) -> int:
-        """By how much the device's clock jumps in a pause."""
-        return pause - pause // self.lab.situation.pauses
-
-    def now(self) -> float:
-        """Device seconds; those of a pause that has begun are over."""
-        return (time.monotonic() - self._began) * self.lab.situation.clock + self._skipped
-
-    def cycle(self) -> int:
-        """Wait for the end of a cycle; the seconds of the pause that begins."""
-        return self._ends.get(timeout=_PATIENCE)
-
-    def usage(self) -> _Numbers:
-        """What the kernel has counted so far; the commands' CPU time only to 10 ms."""
-        time.sleep(1)  # from the line that ends a cycle to the sleep
-        process = Path(f"/proc/{self.lab.daemon.pid}")
-        stat = (process / "stat").read_text().rpartition(")")[2].split()
-        # The CPU clock of a process, which no header of Python's names: see clock_getcpuclockid(3).
-        return {"cpu": time.clock_gettime(~self.lab.daemon.pid << 3 | 2) * 1000,
-                "children": (int(stat[13]) + int(stat[14])) * 1000 / os.sysconf("SC_CLK_TCK"),
-                "wakes": _counted(process / "status", "voluntary_ctxt_switches"),
-                "written": _counted(process / "io", "wchar"),
-                "requests": len(self.lab.central.requests)}
+def _usage(lab: Lab) -> _Numbers:
+    """What the kernel has counted so far; the CPU time of commands in steps of 10 ms."""
+    time.sleep(1)  # from the line that ends a cycle to the pause
+    pid = lab.daemon.pid
+    stat = Path(f"/proc/{pid}/stat").read_text().rpartition(")")[2].split()
+    # The CPU clock of another process, as clock_getcpuclockid(3) would return it.
+    return {"cpu": time.clock_gettime(~pid << 3 | 2) * 1000,
+            "children": (int(stat[13]) + int(stat[14])) * 1000 / os.sysconf("SC_CLK_TCK"),
+            "wakes": _counted(Path(f"/proc/{pid}/status"), "voluntary_ctxt_switches"),
+            "written": _counted(Path(f"/proc/{pid}/io"), "wchar"),
+            "requests": len(lab.central.requests)}
 
 
 def _counted(file: Path, name: str) -> int:
@@ -119,47 +108,43 @@ def _memory(pid: int) -> _Numbers:
     return {name: _counted(rollup, name) for name in ("Rss", "Private_Dirty")}
 
 
-def _start(protocol: str) -> dict[str, object]:
-    """Seconds from the process's start to "portforwarded", and where the log stood still."""
+def _start(protocol: str, _number: int) -> _Run:
+    """Seconds from the process's start to "portforwarded"."""
     lab = Lab(Situation(_STARTS[protocol][0]), Timeline())
     done: queue.SimpleQueue[float] = queue.SimpleQueue()
-    lab.timeline.listen(lambda event: done.put(time.time()) if event.what ==
-                        "status: portforwarded" else None)
-    lab.start_daemon("-l", "7", "-f", "30", through=_STAMPED)
+    lab.timeline.listen(lambda event: done.put(time.time())
+                        if event.what == "status: portforwarded" else None)
+    lab.start_daemon(*_OPTIONS, through=(
+        "sh", "-c", f'date +%s%N > {_BEGAN}; exec "$@"', "sh"))
     seconds = done.get(timeout=60) - int(_BEGAN.read_text()) / 1e9
-    lines = [message for message in lab.device.messages.all]
-    gaps = sorted(((later.when - line.when, line.text, later.text)
-                   for line, later in zip(lines, lines[1:])), reverse=True)
     lab.stop_daemon()
-    return {"seconds": seconds, "gaps": gaps[:20]}
+    return {"seconds": seconds}
 
 
-def _live(name: str, number: int, with_calls: bool) -> dict[str, object]:
-    """What each cycle of a state costs; with the system calls, nothing else is true."""
-    life = _Life(_STATES[name])
-    lab = life.lab
+def _live(name: str, number: int, with_calls: bool = False) -> _Run:
+    """What each cycle of a state costs; with the system calls, all else is distorted."""
+    lab, cycle, _ = _begin(_STATES[name])
     # The first cycle sets up, the second looks up the names.
     for _ in range(1 if name == _FAILING else 2):
-        life.cycle()
+        cycle()
         if "asleep" in name:
             lab.device.disk_sleeps()
     cycles = []
-    before = life.usage()
+    before = _usage(lab)
     for _ in range(1 if name == _FAILING else _CYCLES):
         with (traced(lab.daemon.pid, "-c", "-o", str(_CALLS)) if with_calls else nullcontext()):
-            life.cycle()
-            after = life.usage()
+            cycle()
+            after = _usage(lab)
         cycles.append({cost: after[cost] - before[cost] for cost in after})
         if with_calls:
-            wait_until(_CALLS.read_text, "the system calls", 5)
-            cycles[-1]["calls"] = sum(int(line.split()[3]) for line in
-                                      _CALLS.read_text().splitlines()[2:-2])
+            summary = wait_until(_CALLS.read_text, "the system calls", 5).splitlines()
+            cycles[-1]["calls"] = sum(int(line.split()[3]) for line in summary[2:-2])
             _CALLS.unlink()
-        before = life.usage()
-    memory = {"pelorus": _memory(lab.daemon.pid)}
-    found: dict[str, object] = {"status": lab.device.status, "cycles": cycles, "memory": memory}
+        before = _usage(lab)
+    found: _Run = {"cycles": cycles, "memory": {"pelorus": _memory(lab.daemon.pid)}}
     if name in _AFTERWARDS and not with_calls:
-        found |= _AFTERWARDS[name](lab, (number + 0.5) / _RUNS * _PAUSE_SECONDS, memory)
+        found |= _AFTERWARDS[name](lab, (number + 0.5) / _RUNS * _PAUSE_SECONDS,
+                                   found["memory"])
     return found
 
 
@@ -169,16 +154,15 @@ def _seconds(lab: Lab, done: Callable[[], bool]) -> float:
     return time.monotonic() - began
 
 
-def _direct_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> dict[str, object]:
+def _direct_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> _Run:
     """Another address, `phase` seconds into the pause; before it, upnpc beside the daemon."""
     began = time.monotonic()
     memory["miniupnpd"] = _memory(daemon.running("miniupnpd")[0])
     upnpc = [_upnpc(memory) for _ in range(_UPNPC_RUNS)]
     time.sleep(max(0, began + phase - time.monotonic()))
     lab.gateway.move_to(_NEW_ADDRESS)
-    moved = _seconds(lab, lambda: lab.central.record is not None and
-                     lab.central.record.external_ip == _NEW_ADDRESS)
-    assert pages_from_outside(address=_NEW_ADDRESS) == PAGES
+    moved = _seconds(lab, lambda: _NEW_ADDRESS in str(lab.central.record))
+    assert checks.pages_from_outside(address=_NEW_ADDRESS) == checks.PAGES
     return {"upnpc": upnpc, "WAN address changes": [phase, moved]}
 
 
@@ -189,175 +173,138 @@ def _upnpc(memory: dict[str, _Numbers]) -> float:
                                   stdout=subprocess.DEVNULL)
     time.sleep(1)  # half of its search
     memory["upnpc"] = _memory(client.pid)
-    _, status, used = os.wait4(client.pid, 0)
-    client.returncode = status
-    assert status == 0
+    _, client.returncode, used = os.wait4(client.pid, 0)
+    assert client.returncode == 0
     return float(used.ru_utime + used.ru_stime) * 1000
 
 
-def _relayed_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> dict[str, object]:
+def _relayed_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> _Run:
     """The tunnel client dies `phase` seconds into the pause; later the relay restarts."""
-    client = tunnel_client()
+    client, count = checks.tunnel_client(), lab.device.messages.count
     memory["openvpn"] = _memory(client)
     time.sleep(phase)
-    started = lab.device.messages.count(_TUNNEL_UP)
-    os.kill(client, 9)
-    died = _seconds(lab, lambda: lab.device.messages.count(_TUNNEL_UP) > started and
-                    page_through_the_tunnel(lab) == PAGES[0])
-    time.sleep(5)
-    connections = lab.relay.connections()
+    started = count(_TUNNEL_UP)
+    os.kill(client, signal.SIGKILL)
+    died = _seconds(lab, lambda: count(_TUNNEL_UP) > started
+                    and checks.page_through_the_tunnel(lab) == checks.PAGES[0])
     lab.relay.server.stop()
     lab.relay.start()
-    returned = _seconds(lab, lambda: lab.relay.connections() > connections and
-                        page_through_the_tunnel(lab) == PAGES[0])
+    returned = _seconds(lab, lambda: checks.page_through_the_tunnel(lab) == checks.PAGES[0])
     return {"tunnel client dies": [phase, died], "relay restarts": [phase, returned]}
 
 
-_TUNNEL_UP = "openVPNConnection() - openVPN has started successfully"
-_AFTERWARDS = {"direct": _direct_afterwards, "relayed, no gateway answers": _relayed_afterwards}
+_AFTERWARDS = {_DIRECT: _direct_afterwards, _RELAYED: _relayed_afterwards}
 
 
-def _reboot(number: int) -> dict[str, object]:
+def _reboot(_name: str, number: int) -> _Run:
     """Device seconds until the mappings are back; the moments are spread between two tests."""
-    life = _Life(Situation(clock=_CLOCK, pauses=_PAUSES))
-    phase = (number + 0.5) / _RUNS * _TEST_SECONDS
-    pause = 0
-    while life.now() < _SETTLED + phase:
-        pause = life.cycle()
-    rebooted = life.now() - life.jump(pause)  # the pause has just begun
-    life.lab.gateway.reboot()
-    life.lab.wait_for(lambda: len(life.lab.gateway.mappings()) == 2, "the mappings", _PATIENCE)
-    seconds = life.now() - rebooted
-    assert pages_from_outside() == PAGES
-    return {"gateway reboots": [phase, seconds]}
+    lab, cycle, ends = _begin(_REBOOTS)
+    phase = (number + 0.5) / _RUNS * _TEST_CYCLES
+    for _ in range(_SETTLED + round(phase)):
+        cycle()
+    began = time.monotonic()
+    lab.gateway.reboot()
+    _seconds(lab, lambda: len(lab.gateway.mappings()) == 2)
+    seconds = (time.monotonic() - began) * _REBOOTS.clock
+    # The clock has jumped in the pause that had begun, and in each since.
+    jumped = (1 + ends.qsize()) * _PAUSE_SECONDS * (1 - 1 / _REBOOTS.pauses)
+    assert checks.pages_from_outside() == checks.PAGES
+    return {"gateway reboots": [phase * _CYCLE_SECONDS, seconds + jumped]}
 
 
-def _play(arguments: Sequence[str]) -> dict[str, object]:
-    kind, name, number = arguments
-    if kind == "start":
-        return _start(name)
-    if kind == "reboot":
-        return _reboot(int(number))
-    return _live(name, int(number), kind == "calls")
+_PLAYS: dict[str, Callable[[str, int], _Run]] = {
+    "start": _start, "live": _live, "reboot": _reboot,
+    "calls": lambda name, number: _live(name, number, with_calls=True)}
 
 
-_LIVES = [*(("live", name, str(run)) for name in reversed(_STATES) for run in range(_RUNS)),
-          *(("calls", name, "0") for name in reversed(_STATES))]
-_ALONE = [*(("start", name, str(run)) for run in range(_RUNS) for name in _STARTS),
-          *(("reboot", "reboot", str(run)) for run in range(_RUNS))]
+def _measure(kinds: Sequence[str]) -> None:
+    """Play the starts and the reboots one by one, while the other labs wait."""
+    def play(delay: float, *job: str) -> None:
+        time.sleep(delay)
+        done = sandbox.run("bench.compare", [*job], _PATIENCE, True)
+        print(*job, "played" if done.returncode == 0 else f"failed:\n{done.stdout}", flush=True)
+        done.check_returncode()
 
-
-def _measure(delay: float, *arguments: str) -> None:
-    time.sleep(delay)
-    done = sandbox.run("bench.compare", [*arguments], _PATIENCE, True)
-    print(*arguments, "played" if done.returncode == 0 else f"failed:\n{done.stdout}", flush=True)
-    done.check_returncode()
-
-
-def _measure_all() -> None:
-    """Play everything: the starts and the reboots one by one, while the other labs wait."""
+    lives, alone = ([job for job in jobs if job[0] in kinds] for jobs in (_LIVES, _ALONE))
     _PARTS.mkdir(parents=True, exist_ok=True)
     with ThreadPoolExecutor(len(_LIVES)) as pool, ThreadPoolExecutor(1) as one:
-        jobs = [pool.submit(_measure, 2.5 * number, *job) for number, job in enumerate(_LIVES)]
-        jobs += [one.submit(_measure, 2.5 * len(_LIVES) * (number == 0), *job)
-                 for number, job in enumerate(_ALONE)]
-    for job in jobs:
-        job.result()
+        begun = [pool.submit(play, 2.5 * number, *job) for number, job in enumerate(lives)]
+        begun += [one.submit(time.sleep, 2.5 * len(lives)),
+                  *(one.submit(play, 0, *job) for job in alone)]
+    for each in begun:
+        each.result()
 
 
 def _spread(values: Sequence[float], places: int = 0) -> str:
     middle, least, most = (f"{value:,.{places}f}" for value in (
-        statistics.median(values), min(values), max(values)))
-    return f"{middle} ({least}..{most})"
+        median(values), min(values), max(values)))
+    return middle if least == most else f"{middle} ({least} to {most})"
 
 
-def _hour(name: str, run: dict[str, Any], cost: str) -> float:
+def _hour(name: str, run: _Run, cost: str) -> float:
     """The cost of an hour in the steady state, of cycles with and without a port test."""
     pattern = _PATTERN[name]
     cycles, tests = 3600 / pattern["cycle_seconds"], pattern["per_hour"]["http"]
     quiet, busy = ([cycle[cost] for cycle in run["cycles"] if bool(cycle["requests"]) == asked]
                    for asked in (False, True))
-    if not quiet:
-        return float(cycles * statistics.mean(busy))
-    more = statistics.mean(busy) - statistics.mean(quiet) if busy else 0
-    return float(cycles * statistics.mean(quiet) + tests * more)
+    if not quiet or not busy:
+        return float(cycles * mean(quiet or busy))
+    return float(cycles * mean(quiet) + tests * (mean(busy) - mean(quiet)))
 
 
-def _tables(runs: dict[str, list[dict[str, Any]]]) -> list[str]:
-    lines = ["| Start to \"portforwarded\" | required waits, s | whole time, s | over the waits, s "
-             "| goal |", "| --- | --- | --- | --- | --- |"]
-    for protocol, (_, waits, goal) in _STARTS.items():
-        times = [run["seconds"] for run in runs[protocol]]
-        lines.append(f"| {protocol} | {waits:.1f} | {_spread(times, 2)} | "
-                     f"{_spread([time - waits for time in times], 2)} | {goal} |")
-    live = {name: [run for run in runs[name] if "calls" not in run["cycles"][0]]
-            for name in _STATES}
-    own = [_hour("direct", run, "cpu") for run in live["direct"]]
-    cycles = 3600 / _PATTERN["direct"]["cycle_seconds"]
-    upnpc = [statistics.median(run["upnpc"]) * cycles for run in live["direct"]]
-    lines += ["", "| CPU of an hour | ms | of `upnpc` |", "| --- | --- | --- |",
-              f"| the daemon, direct | {_spread(own)} | "
-              f"{statistics.median(own) / statistics.median(upnpc):.2f} (goal: 0.5) |",
-              f"| one `upnpc -a` in each cycle | {_spread(upnpc)} | 1 |",
-              "", "| Event | seconds until reachable |", "| --- | --- |"]
-    lines += [f"| {event} | {_spread([seconds for _, seconds in _moments(runs, event)])} |"
-              for event in _EVENTS]
-    lines += ["", f"| An hour of | requests | bytes | {' | '.join(_COSTS.values())} |",
-              "| --- " * (3 + len(_COSTS)) + "|"]
-    for name in _STATES:
+def _table(head: Sequence[str], *rows: Sequence[str]) -> list[str]:
+    return ["", *(f"| {' | '.join(row)} |" for row in (head, ["---"] * len(head), *rows))]
+
+
+def _tables(runs: _Runs) -> list[str]:
+    def costs(name: str) -> list[str]:
         asked = _PATTERN[name]["per_hour"]
-        cells = [f"{asked['http'] + asked['https']:.0f}",
-                 f"{asked['received'] + asked['sent']:,.0f}"]
-        for cost in _COSTS:
-            chosen = live[name] if cost != "calls" else [
-                run for run in runs[name] if run not in live[name]]
-            hours = [_hour(name, run, cost) for run in chosen]
-            cells.append(_spread(hours) if len(hours) > 1 else f"{hours[0]:,.0f}")
-        lines.append(f"| {name} | {' | '.join(cells)} |")
-    lines += ["", "| Memory, KiB | resident | private dirty |", "| --- | --- | --- |"]
-    for state, program in _PROGRAMS:
-        cells = [_spread([run["memory"][program][kind] for run in live[state]])
-                 for kind in ("Rss", "Private_Dirty")]
-        lines.append(f"| {program}, {state} | {' | '.join(cells)} |")
-    return lines
+        hours = [[_hour(name, run, cost) for run in runs["calls" if cost == "calls" else "live",
+                                                         name]] for cost in _COSTS]
+        requests, size = asked["http"] + asked["https"], asked["received"] + asked["sent"]
+        return [f"{requests:.0f}", f"{size:,.0f}", *map(_spread, hours)]
+
+    upnpc = [median(run["upnpc"]) * 3600 / _CYCLE_SECONDS for run in runs["live", _DIRECT]]
+    starts = [[name, f"{waits:g}", *(_spread([run["seconds"] - less for run in runs["start", name]],
+                                             2) for less in (0, waits)), f"{goal:g}"]
+              for name, (_, waits, goal) in _STARTS.items()]
+    memory = [[f"{program}, {name}", *(_spread([run["memory"][program][kind]
+                                                for run in runs["live", name]])
+                                       for kind in ("Rss", "Private_Dirty"))]
+              for name, program in _PROGRAMS]
+    return [*_table(["Start", "required waits, s", "portforwarded after, s", "over the waits, s",
+                     "goal"], *starts),
+            *_table(["Event", "reachable after, s"], *(
+                [event, _spread([y for _, y in _moments(runs, event)])] for event in _EVENTS)),
+            *_table(["An hour of", "requests", "bytes", *_COSTS.values()], *(
+                [name, *costs(name)] for name in _STATES),
+                ["one `upnpc -a` in each cycle", "", "", _spread(upnpc), *[""] * 4]),
+            *_table(["Memory, KiB", "resident", "private dirty"], *memory), ""]
 
 
-def _moments(runs: dict[str, list[dict[str, Any]]], event: str) -> plot.Points:
+def _moments(runs: _Runs, event: str) -> plot.Points:
     return sorted(run[event] for found in runs.values() for run in found if event in run)
-
-
-def _picture(runs: dict[str, list[dict[str, Any]]]) -> str:
-    def over(protocol: str) -> plot.Points:
-        return [(number, (run["seconds"] - _STARTS[protocol][1]) * 1000)
-                for number, run in enumerate(runs[protocol], start=1)]
-
-    panels = [plot.Panel('Start to "portforwarded" over the required waits, ms', "run",
-                         {protocol: over(protocol) for protocol in _STARTS})]
-    panels += [plot.Panel("Seconds until reachable", x_name, {
-        event: _moments(runs, event) for event in events}) for x_name, events in (
-            ("seconds into the pause at the event", _EVENTS[:3]),
-            ("seconds into the time between two tests", _EVENTS[3:]))]
-    return plot.svg("From the start, and from an event, to a device that is reached", panels,
-                    columns=1, height=150)
 
 
 def main() -> None:
     """Measure, then write the tables and the picture."""
     if sandbox.is_inside():
-        Path(_PARTS, "-".join(sys.argv[1:])).write_text(json.dumps(_play(sys.argv[1:])))
+        kind, name, number = sys.argv[1:]
+        Path(_PARTS, "-".join(sys.argv[1:])).write_text(json.dumps(_PLAYS[kind](name, int(number))))
         return
-    if why := sandbox.why_forbidden():
-        sys.exit(f"compare: no lab on this machine: {why}")
-    if sys.argv[1:] != ["--again"]:
-        _measure_all()
-    runs: dict[str, list[dict[str, Any]]] = {}
-    for job in (*_LIVES, *_ALONE):
-        runs.setdefault(job[1], []).append(json.loads(Path(_PARTS, "-".join(job)).read_text()))
-    lines = _tables(runs)
-    print("\n".join(lines))
+    _measure(sys.argv[1:] or [*_PLAYS])
+    runs: _Runs = defaultdict(list)
+    for kind, name, number in (*_LIVES, *_ALONE):
+        runs[kind, name].append(json.loads(Path(_PARTS, f"{kind}-{name}-{number}").read_text()))
+    text = "\n".join(_tables(runs))
+    print(text)
     before, _, rest = _PAGE.read_text().partition(_MARK)
-    _PAGE.write_text("\n".join([before + _MARK, *lines, "", _END + rest.partition(_END)[2]]))
-    _PICTURE.write_text(_picture(runs))
+    _PAGE.write_text(f"{before}{_MARK}{text}\n{_END}{rest.partition(_END)[2]}")
+    _PICTURE.write_text(plot.svg("From an event to a device that is reached again, seconds", [
+        plot.Panel("", x_name, {event: _moments(runs, event) for event in events})
+        for x_name, events in (("seconds into the pause", _EVENTS[:3]),
+                               ("seconds since a port test was due", _EVENTS[3:]))],
+        columns=1, height=160))
 
 
 if __name__ == "__main__":

@@ -12,7 +12,6 @@ import json
 import os
 import queue
 import re
-import signal
 import subprocess
 import sys
 import time
@@ -32,7 +31,6 @@ from lab import checks, daemon, network, sandbox  # noqa: E402
 from lab.faults import traced  # noqa: E402
 from lab.gateway import GatewaySetup  # noqa: E402
 from lab.scenario import Lab, Situation  # noqa: E402
-from lab.support import wait_until  # noqa: E402
 from lab.timeline import Timeline  # noqa: E402
 
 _PARTS = sandbox.PROJECT / "build/compare"
@@ -41,13 +39,11 @@ _MARK, _END = "<!-- compare -->", "<!-- end -->"
 _PATTERN = json.loads((sandbox.PROJECT / "bench/pattern.json").read_text())
 _CYCLE_SECONDS = _PATTERN["direct"]["cycle_seconds"]
 _RUNS, _CYCLES, _UPNPC_RUNS = 5, 5, 5
-_PATIENCE = 1500  # seconds
-_PAUSE_SECONDS = 120
-_OPTIONS = ("-l", "6", "-f", "30")
+_PATIENCE, _PAUSE_SECONDS = 1500, 120
+_OPTIONS, _NEW_ADDRESS = ("-l", "6", "-f", "30"), "44.128.0.30"
 _END_OF_CYCLE = re.compile(r"DaemonControl::run - (retry connection after|sleep) \d+ secs")
 _TUNNEL_UP = "openVPNConnection() - openVPN has started successfully"
 _BEGAN, _CALLS = Path("/run/lab/began"), Path("/run/lab/calls")
-_NEW_ADDRESS = "44.128.0.30"
 _REBOOTS = Situation(clock=10, pauses=12)
 # Cycles after which the time between two port tests no longer grows, and that time.
 _SETTLED, _TEST_CYCLES = 33, 8
@@ -69,7 +65,6 @@ _COSTS = {"cpu": "CPU, ms", "children": "CPU of its commands, ms", "wakes": "wak
 _EVENTS = ("WAN address changes", "tunnel client dies", "relay restarts", "gateway reboots")
 _PROGRAMS = ((_DIRECT, "pelorus"), (_RELAYED, "pelorus"), (_DIRECT, "miniupnpd"),
              (_DIRECT, "upnpc"), (_RELAYED, "openvpn"))
-_Numbers = dict[str, float]
 _Run = dict[str, Any]
 _Runs = dict[tuple[str, str], list[_Run]]
 
@@ -84,7 +79,7 @@ def _begin(situation: Situation) -> tuple[Lab, Callable[[], object], queue.Simpl
     return lab, lambda: ends.get(timeout=_PATIENCE), ends
 
 
-def _usage(lab: Lab) -> _Numbers:
+def _usage(lab: Lab) -> dict[str, float]:
     """What the kernel has counted so far; the CPU time of commands in steps of 10 ms."""
     time.sleep(1)  # from the line that ends a cycle to the pause
     pid = lab.daemon.pid
@@ -102,7 +97,7 @@ def _counted(file: Path, name: str) -> int:
                 if line.startswith(f"{name}:"))
 
 
-def _memory(pid: int) -> _Numbers:
+def _memory(pid: int) -> dict[str, float]:
     """KiB."""
     rollup = Path(f"/proc/{pid}/smaps_rollup")
     return {name: _counted(rollup, name) for name in ("Rss", "Private_Dirty")}
@@ -116,9 +111,7 @@ def _start(protocol: str, _number: int) -> _Run:
                         if event.what == "status: portforwarded" else None)
     lab.start_daemon(*_OPTIONS, through=(
         "sh", "-c", f'date +%s%N > {_BEGAN}; exec "$@"', "sh"))
-    seconds = done.get(timeout=60) - int(_BEGAN.read_text()) / 1e9
-    lab.stop_daemon()
-    return {"seconds": seconds}
+    return {"seconds": done.get(timeout=60) - int(_BEGAN.read_text()) / 1e9}
 
 
 def _live(name: str, number: int, with_calls: bool = False) -> _Run:
@@ -137,15 +130,13 @@ def _live(name: str, number: int, with_calls: bool = False) -> _Run:
             after = _usage(lab)
         cycles.append({cost: after[cost] - before[cost] for cost in after})
         if with_calls:
-            summary = wait_until(_CALLS.read_text, "the system calls", 5).splitlines()
-            cycles[-1]["calls"] = sum(int(line.split()[3]) for line in summary[2:-2])
-            _CALLS.unlink()
+            summary = _CALLS.read_text().splitlines()[2:-2]
+            cycles[-1]["calls"] = sum(int(line.split()[3]) for line in summary)
         before = _usage(lab)
-    found: _Run = {"cycles": cycles, "memory": {"pelorus": _memory(lab.daemon.pid)}}
-    if name in _AFTERWARDS and not with_calls:
-        found |= _AFTERWARDS[name](lab, (number + 0.5) / _RUNS * _PAUSE_SECONDS,
-                                   found["memory"])
-    return found
+    memory = {"pelorus": _memory(lab.daemon.pid)}
+    phase = (number + 0.5) / _RUNS * _PAUSE_SECONDS
+    more = _AFTERWARDS[name](lab, phase, memory) if name in _AFTERWARDS and not with_calls else {}
+    return {"cycles": cycles, "memory": memory, **more}
 
 
 def _seconds(lab: Lab, done: Callable[[], bool]) -> float:
@@ -154,7 +145,7 @@ def _seconds(lab: Lab, done: Callable[[], bool]) -> float:
     return time.monotonic() - began
 
 
-def _direct_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> _Run:
+def _direct_afterwards(lab: Lab, phase: float, memory: _Run) -> _Run:
     """Another address, `phase` seconds into the pause; before it, upnpc beside the daemon."""
     began = time.monotonic()
     memory["miniupnpd"] = _memory(daemon.running("miniupnpd")[0])
@@ -166,7 +157,7 @@ def _direct_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> _
     return {"upnpc": upnpc, "WAN address changes": [phase, moved]}
 
 
-def _upnpc(memory: dict[str, _Numbers]) -> float:
+def _upnpc(memory: _Run) -> float:
     """The CPU time of mapping one port, ms."""
     with network.inside(network.DEVICE):
         client = subprocess.Popen(["upnpc", "-a", network.DEVICE_ADDRESS, "80", "9191", "TCP"],
@@ -178,13 +169,13 @@ def _upnpc(memory: dict[str, _Numbers]) -> float:
     return float(used.ru_utime + used.ru_stime) * 1000
 
 
-def _relayed_afterwards(lab: Lab, phase: float, memory: dict[str, _Numbers]) -> _Run:
+def _relayed_afterwards(lab: Lab, phase: float, memory: _Run) -> _Run:
     """The tunnel client dies `phase` seconds into the pause; later the relay restarts."""
     client, count = checks.tunnel_client(), lab.device.messages.count
     memory["openvpn"] = _memory(client)
     time.sleep(phase)
     started = count(_TUNNEL_UP)
-    os.kill(client, signal.SIGKILL)
+    os.kill(client, 9)
     died = _seconds(lab, lambda: count(_TUNNEL_UP) > started
                     and checks.page_through_the_tunnel(lab) == checks.PAGES[0])
     lab.relay.server.stop()
@@ -247,9 +238,8 @@ def _hour(name: str, run: _Run, cost: str) -> float:
     cycles, tests = 3600 / pattern["cycle_seconds"], pattern["per_hour"]["http"]
     quiet, busy = ([cycle[cost] for cycle in run["cycles"] if bool(cycle["requests"]) == asked]
                    for asked in (False, True))
-    if not quiet or not busy:
-        return float(cycles * mean(quiet or busy))
-    return float(cycles * mean(quiet) + tests * (mean(busy) - mean(quiet)))
+    more = tests * (mean(busy) - mean(quiet)) if quiet and busy else 0
+    return float(cycles * mean(quiet or busy) + more)
 
 
 def _table(head: Sequence[str], *rows: Sequence[str]) -> list[str]:
@@ -259,10 +249,10 @@ def _table(head: Sequence[str], *rows: Sequence[str]) -> list[str]:
 def _tables(runs: _Runs) -> list[str]:
     def costs(name: str) -> list[str]:
         asked = _PATTERN[name]["per_hour"]
-        hours = [[_hour(name, run, cost) for run in runs["calls" if cost == "calls" else "live",
-                                                         name]] for cost in _COSTS]
-        requests, size = asked["http"] + asked["https"], asked["received"] + asked["sent"]
-        return [f"{requests:.0f}", f"{size:,.0f}", *map(_spread, hours)]
+        hours = [[_hour(name, run, cost) for run in runs[
+            "calls" if cost == "calls" else "live", name]] for cost in _COSTS]
+        return [f"{asked['http'] + asked['https']:.0f}",
+                f"{asked['received'] + asked['sent']:,.0f}", *map(_spread, hours)]
 
     upnpc = [median(run["upnpc"]) * 3600 / _CYCLE_SECONDS for run in runs["live", _DIRECT]]
     starts = [[name, f"{waits:g}", *(_spread([run["seconds"] - less for run in runs["start", name]],
@@ -296,10 +286,9 @@ def main() -> None:
     runs: _Runs = defaultdict(list)
     for kind, name, number in (*_LIVES, *_ALONE):
         runs[kind, name].append(json.loads(Path(_PARTS, f"{kind}-{name}-{number}").read_text()))
-    text = "\n".join(_tables(runs))
-    print(text)
-    before, _, rest = _PAGE.read_text().partition(_MARK)
-    _PAGE.write_text(f"{before}{_MARK}{text}\n{_END}{rest.partition(_END)[2]}")
+    print(text := "\n".join(_tables(runs)))
+    _PAGE.write_text(re.sub(f"(?<={_MARK}).*?(?={_END})", lambda _: f"{text}\n", _PAGE.read_text(),
+                            flags=re.S))
     _PICTURE.write_text(plot.svg("From an event to a device that is reached again, seconds", [
         plot.Panel("", x_name, {event: _moments(runs, event) for event in events})
         for x_name, events in (("seconds into the pause", _EVENTS[:3]),

@@ -60,7 +60,7 @@ _LIVES = [*(("live", name, str(run)) for name in reversed(_STATES) for run in ra
           *(("calls", name, "0") for name in reversed(_STATES))]
 _ALONE = [*(("start", name, str(run)) for run in range(_RUNS) for name in _STARTS),
           *(("reboot", "reboot", str(run)) for run in range(_RUNS))]
-_COSTS = {"cpu": "CPU, ms", "children": "CPU of its commands, ms", "wakes": "wake-ups",
+_COSTS = {"cpu": "CPU, ms", "children": "its commands, ms", "wakes": "wake-ups, main thread",
           "calls": "system calls", "written": "bytes written"}
 _EVENTS = ("WAN address changes", "tunnel client dies", "relay restarts", "gateway reboots")
 _PROGRAMS = ((_DIRECT, "pelorus"), (_RELAYED, "pelorus"), (_DIRECT, "miniupnpd"),
@@ -291,8 +291,8 @@ def main() -> None:
                             flags=re.S))
     _PICTURE.write_text(plot.svg("From an event to a device that is reached again, seconds", [
         plot.Panel("", x_name, {event: _moments(runs, event) for event in events})
-        for x_name, events in (("seconds into the pause", _EVENTS[:3]),
-                               ("seconds since a port test was due", _EVENTS[3:]))],
+        for x_name, events in (("seconds into the pause, at the event", _EVENTS[:3]),
+                               ("seconds after cycle 33, at the event", _EVENTS[3:]))],
         columns=1, height=160))
 
 

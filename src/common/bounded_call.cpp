@@ -26,7 +26,8 @@ namespace pelorus {
 
 namespace {
 
-constexpr std::chrono::milliseconds kLook{20};
+// Between two looks for a termination signal, and between two attempts to end the transfers.
+constexpr std::chrono::milliseconds kLook{200}, kRepeat{20};
 
 constexpr long kEverything = std::numeric_limits<long>::max();
 
@@ -113,8 +114,12 @@ void BoundedCall::watch(Clock::duration limit) {
     bool exceeded = false;
     bool hurried = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short
+    const auto next = [&] {
+        if (exceeded) return Clock::now() + kRepeat;
+        return terminating ? end : std::min(Clock::now() + kLook, end);
+    };
     std::unique_lock lock(mutex);
-    while (!ended.wait_for(lock, kLook, [this] { return over; })) {
+    while (!ended.wait_until(lock, next(), [this] { return over; })) {
         if (!terminating && terminationPending()) {
             terminating = true;
             hurried = end > Clock::now() + kCycleBudget;

@@ -16,6 +16,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <cstring>
 #include <exception>
 #include <limits>
 
@@ -78,7 +79,9 @@ int libcConnect(int socket, const sockaddr* address, socklen_t size) {
 bool isGatewayAddress(const sockaddr* address, socklen_t size) {
     if (address->sa_family == AF_UNIX) return true;
     if (address->sa_family != AF_INET || size < sizeof(sockaddr_in)) return false;
-    return !isOwnAddress(reinterpret_cast<const sockaddr_in*>(address)->sin_addr);
+    sockaddr_in gateway{};
+    std::memcpy(&gateway, address, sizeof gateway);
+    return !isOwnAddress(gateway.sin_addr);
 }
 
 }  // namespace

@@ -37,6 +37,7 @@ HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|
 ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc .*|natpmpc|hdparm .* .*|pgrep .*|touch .*|pelorus -u.*")
 ELSEWHERE = {
     r"scripts/(deps|lint|test)\b.*|(cmake|ctest) .*-preset .*|.*python3.* pytest.*": "scripts/test",
+    r"scripts/(cross|matrix|test-cross)\b.*": "nobody: ten minutes and more",
     r"scripts/demo\b.*": "test_demo and test_scenarios",
     r"scripts/(endure|fuzz)\b.*": "scripts/test in short; each takes minutes to hours",
     r"scripts/(gallery|zoo)\b.*|bench/.*": "takes up to an hour; --help is run here",

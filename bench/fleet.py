@@ -8,6 +8,7 @@ not influence each other, so the load is in proportion to their number.
 
 from __future__ import annotations
 
+import argparse
 import json
 import random
 import sys
@@ -191,6 +192,7 @@ def _peaks(name: str, title: str, minutes: int, services: dict[str, Service]) ->
 
 def main() -> None:
     """Simulate, draw, fill in the tables."""
+    argparse.ArgumentParser(prog="bench/fleet.py", description=__doc__).parse_args()
     rates, back = simulate(Service()).rates(), _INCIDENT + _OUTAGE
     measured = sum(share / 100 * (_PATTERN[kind]["per_hour"]["http"] + _PATTERN[kind]["per_hour"]
                                   ["https"]) for kind, share in _MIX.items()) / 3600 * 1e6

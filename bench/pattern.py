@@ -7,6 +7,7 @@ rest of the device's time runs ten times as fast.
 
 from __future__ import annotations
 
+import argparse
 import json
 import re
 import sys
@@ -55,7 +56,10 @@ def _close_ports(lab: Lab) -> None:
 
 @dataclass(frozen=True)
 class _State:
-    """Prepared before the start, or with `later` after the third cycle; steady after `settled`."""
+    """Prepared before the start, or with `later` after the third cycle; steady after `settled`.
+
+    Measured for `hours`, as far as they are whole periods.
+    """
 
     gateway: GatewaySetup = GatewaySetup()
     relay: bool = True
@@ -84,12 +88,20 @@ def _counted() -> dict[str, float]:
     return {name: found[name]["packets" if "http" in name else "bytes"] for name in _COUNTERS}
 
 
+def _whole_periods(samples: list[dict[str, float]]) -> list[dict[str, float]]:
+    """From the first cycle that asks for anything to the last; all if there are not two."""
+    asked = [number for number in range(1, len(samples))
+             if samples[number]["http"] + samples[number]["https"]
+             > samples[number - 1]["http"] + samples[number - 1]["https"]]
+    return samples[asked[0]:asked[-1] + 1] if len(asked) > 1 else samples
+
+
 def _play(state: _State) -> dict[str, object]:
     """What a cycle that begins the state asks, and an hour of the steady state."""
     lab = Lab(Situation(state.gateway, state.relay, clock=_CLOCK, pauses=_PAUSES), Timeline())
     state.prepare(lab)
     nft.change(network.INTERNET, _COUNT)
-    samples = [_counted() | {"hour": 0}]
+    samples: list[dict[str, float]] = [_counted() | {"hour": 0}]
     began, skipped = time.monotonic(), 0
 
     def look(line: str) -> None:
@@ -110,7 +122,7 @@ def _play(state: _State) -> dict[str, object]:
     # The first cycle that asks for anything.
     begin = next((number for number in range(first, len(samples) - 1)
                   if samples[number + 1]["https"] > samples[number]["https"]), first)
-    steady = [sample for sample in samples if sample["hour"] > settled]
+    steady = _whole_periods([sample for sample in samples if sample["hour"] > settled])
     hours = steady[-1]["hour"] - steady[0]["hour"]
     last, status = samples[-1], lab.device.status
     lab.stop_daemon()
@@ -125,12 +137,17 @@ def _play(state: _State) -> dict[str, object]:
 
 def main() -> None:
     """Play the states, two at a time."""
+    parser = argparse.ArgumentParser(
+        prog="bench/pattern.py", description=__doc__, epilog=f"The states: {'; '.join(_STATES)}.")
+    parser.add_argument("names", nargs="*", metavar="NAME", help="a state; without one, all")
+    names = parser.parse_args().names or [*_STATES]
+    if unknown := set(names) - set(_STATES):
+        parser.error(f"no state {', '.join(sorted(unknown))}")
     if sandbox.is_inside():
-        Path(_PARTS, sys.argv[1]).write_text(json.dumps(_play(_STATES[sys.argv[1]])))
+        Path(_PARTS, names[0]).write_text(json.dumps(_play(_STATES[names[0]])))
         return
     if why := sandbox.why_forbidden():
         sys.exit(f"pattern: no lab on this machine: {why}")
-    names = sys.argv[1:] or [*_STATES]
     _PARTS.mkdir(parents=True, exist_ok=True)
     with ThreadPoolExecutor(2) as pool:
         played = pool.map(lambda name: sandbox.run("bench.pattern", [name], _PATIENCE, True), names)

@@ -6,7 +6,7 @@ import math
 from collections.abc import Callable, Sequence
 from dataclasses import dataclass
 
-from lab.picture import Sheet
+from lab.sheet import Sheet
 
 _LEFT, _WIDTH, _TOP, _GAP = 80, 1090, 82, 86
 _COLOURS = ("#2b6cb0", "#c05f10", "#2b8a4b", "#7b2d8b")

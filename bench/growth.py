@@ -6,6 +6,7 @@ Prints a table and draws docs/growth.svg. Exit status 1 when something grows fas
 
 from __future__ import annotations
 
+import argparse
 import math
 import statistics
 import subprocess
@@ -42,6 +43,7 @@ def slope(points: plot.Points) -> float:
 
 def main() -> int:
     """Build, measure, judge, draw."""
+    argparse.ArgumentParser(prog="bench/growth.py", description=__doc__).parse_args()
     for command in (["cmake", "--preset", "bench"],
                     ["cmake", "--build", "--preset", "bench", "--target", "growth"]):
         subprocess.run(command, cwd=sandbox.PROJECT, stdout=subprocess.DEVNULL, check=True)

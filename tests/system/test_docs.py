@@ -44,7 +44,8 @@ ELSEWHERE = {
     r"cmake --build --preset dev --target \w+|/usr/bin/python3 .*-m pytest .*":
         "scripts/test, which leaves nothing out",
     r"scripts/demo\b.*": "test_demo, with and without --stay, and test_scenarios",
-    r"scripts/(endure|fuzz)\b.*": "scripts/test in short; each takes minutes to hours",
+    r"scripts/(endure( (?!hours).*)?|fuzz\b.*)":
+        "scripts/test in short; each takes minutes to hours",
     r"packaging/build-deb": "packaging/test-deb",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
@@ -59,6 +60,7 @@ NOT_RUN = {
     "packaging/test-deb": "needs root and control groups: run by hand",
     "packaging/test-deb --stay": "needs somebody to look around",
     "packaging/test-deb [--stay]": "as above",
+    "scripts/endure hours 30 1": "takes 20 minutes at least",
     "scripts/gallery": "takes up to an hour; --help is run here",
     "scripts/gallery [NAME...]": "takes up to an hour; --help is run here",
     "scripts/lint --fix": "changes sources",

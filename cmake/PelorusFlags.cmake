@@ -1,5 +1,5 @@
 # Flags of every target in the project.
-#   pelorus_flags: warnings, sanitizers and, in a release, hardening.
+#   pelorus_flags: warnings, sanitizers and, in every build type but Debug, hardening.
 
 include(CheckCXXCompilerFlag)
 
@@ -24,9 +24,8 @@ if(PELORUS_SANITIZE)
     -fsanitize=${PELORUS_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
   string(REPLACE "fuzzer-no-link," "" PELORUS_SANITIZE_LINK "${PELORUS_SANITIZE}")
   target_link_options(pelorus_flags INTERFACE -fsanitize=${PELORUS_SANITIZE_LINK})
-elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
+elseif(NOT CMAKE_BUILD_TYPE STREQUAL "Debug")
   # Fortify does not work with the sanitizers. Distributions set another level for their packages.
-  set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
   target_compile_options(pelorus_flags INTERFACE
     -U_FORTIFY_SOURCE -D_FORTIFY_SOURCE=3 -D_GLIBCXX_ASSERTIONS
     -fstack-protector-strong -fstack-clash-protection -fPIE -ffunction-sections -fdata-sections)

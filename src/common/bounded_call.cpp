@@ -16,6 +16,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <cstring>
 #include <exception>
 #include <limits>
 
@@ -26,7 +27,8 @@ namespace pelorus {
 
 namespace {
 
-constexpr std::chrono::milliseconds kLook{20};
+// Between two looks for a termination signal, and between two attempts to end the transfers.
+constexpr std::chrono::milliseconds kLook{200}, kRepeat{20};
 
 constexpr long kEverything = std::numeric_limits<long>::max();
 
@@ -77,7 +79,9 @@ int libcConnect(int socket, const sockaddr* address, socklen_t size) {
 bool isGatewayAddress(const sockaddr* address, socklen_t size) {
     if (address->sa_family == AF_UNIX) return true;
     if (address->sa_family != AF_INET || size < sizeof(sockaddr_in)) return false;
-    return !isOwnAddress(reinterpret_cast<const sockaddr_in*>(address)->sin_addr);
+    sockaddr_in gateway{};
+    std::memcpy(&gateway, address, sizeof gateway);
+    return !isOwnAddress(gateway.sin_addr);
 }
 
 }  // namespace
@@ -113,8 +117,12 @@ void BoundedCall::watch(Clock::duration limit) {
     bool exceeded = false;
     bool hurried = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short
+    const auto next = [&] {
+        if (exceeded) return Clock::now() + kRepeat;
+        return terminating ? end : std::min(Clock::now() + kLook, end);
+    };
     std::unique_lock lock(mutex);
-    while (!ended.wait_for(lock, kLook, [this] { return over; })) {
+    while (!ended.wait_until(lock, next(), [this] { return over; })) {
         if (!terminating && terminationPending()) {
             terminating = true;
             hurried = end > Clock::now() + kCycleBudget;

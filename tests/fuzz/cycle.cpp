@@ -42,9 +42,8 @@ void tryText(const std::string& text) {
     const auto kind = static_cast<support::Kind>(stream.below(support::kKinds));
     const unsigned signalAt = stream.below(2) == 0 ? 0 : 1 + stream.below(4000);
     const unsigned noise = stream.below(256);
-    const bool mild = stream.below(4) == 1;  // what must be left can be told
-    const support::Climate climate{noise, 300, !mild, true, !mild};
-    support::RandomWorld world{std::move(stream), kind, climate, folder.path};
+    support::RandomWorld world{
+        std::move(stream), kind, {noise, 300, true, true, true}, folder.path};
     bool isRunning = false, isSent = false;
     world.atEvent = [&] {
         const bool isTime = (signalAt != 0 && world.events >= signalAt) || world.cycles >= 20;
@@ -61,7 +60,7 @@ void tryText(const std::string& text) {
     isRunning = true;
     DaemonControl::getInstance()->run();
     isRunning = false;
-    assert(world.client == 0 && (!mild || world.leftOver().empty()));
+    assert(world.client == 0);
     renewAll(folder.path);  // what it holds of this world goes before it
 }
 

@@ -34,8 +34,8 @@ STORIES = {
         "A gateway that no longer answers is no reason to give up ports that work; once a test "
         "finds them closed, the same cycle starts the tunnel.",
     "second-nat":
-        "A test that fails while the service sees another address than the gateway reports tells "
-        "of a second NAT: the device is relayed at once instead of trying a hundred ports.",
+        "A test that fails while the service sees another address than the gateway reports "
+        "reveals a second NAT: the device is relayed at once instead of trying a hundred ports.",
     "manual-and-back":
         "Ports that the user forwards by hand are tested and published like any others, but "
         "opening and closing them is left to the user.",

@@ -110,7 +110,7 @@ class Lab:
         self._visitor, self._visits_first_stop = visitor, first_stop
 
     def moment(self, what: str) -> None:
-        """Tell what is special now, in the moment of the story that is most worth a visit."""
+        """Tell what is special now, at the moment of the story that is most worth a visit."""
         if self._visitor:
             self._visitor(what)
 

@@ -248,7 +248,7 @@ class Installed:
         self._run_documented("earlier-settings")
         self._wait_for_status("portforwarded")
         for name in ("pid", "out"):
-            (ROOT / f"run/pelorus-openvpn.{name}").unlink()
+            (ROOT / f"run/pelorus-openvpn.{name}").unlink(missing_ok=True)
 
     def _set_up_older_settings(self) -> None:
         """Settings where the first release had them; the lab's back end writes there."""

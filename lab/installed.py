@@ -221,7 +221,7 @@ class Installed:
         (ROOT / f"etc/systemd/system/{UNIT}.d/local.conf").unlink(missing_ok=True)
         self._system.run("systemctl", "reset-failed")
         # Made by the test, but for the credentials.
-        for folder in (_TUNNEL, _OLD_SETTINGS.parent):
+        for folder in (_TUNNEL, ROOT / "var/www"):
             shutil.rmtree(folder, ignore_errors=True)
         left = _listing() - self._before
         assert not left, sorted(left)

@@ -34,6 +34,14 @@ _OPTIONS = ROOT / "etc/default/pelorus"
 _SETTINGS = ROOT / "var/lib/pelorus/dynamicconfig.ini"
 _COPY = ROOT / "run/pelorus/dynamicconfig.ini"
 _TUNNEL = ROOT / "etc/openvpn/pelorus"
+_OLD_SETTINGS = ROOT / "var/www/rest-api/config"
+_RELEASED_OPTIONS = """\
+# Options of the pelorus service, see pelorus(8).
+PELORUS_OPTIONS="-l 5"
+
+# Static configuration file, if it is not /var/www/rest-api/config/globalconfig.ini.
+#TAVIK_STATIC_CONFIG=/etc/pelorus/globalconfig.ini
+"""
 _MODES = {
     "etc/pelorus": (0o755, "root"), "etc/pelorus/globalconfig.ini": (0o644, "root"),
     "etc/default/pelorus": (0o644, "root"), "run/pelorus-relay": (0o700, "root"),
@@ -69,6 +77,8 @@ class Installed:
         self._restarts_after_a_crash()
         self._upgrades()
         self._removes()
+        self._purges()
+        self._upgrades_an_older_device()
         self._purges()
 
     def _prepare(self) -> None:
@@ -160,12 +170,7 @@ class Installed:
 
     def _relays(self) -> None:
         self._lab.step("the gateway falls silent; the tunnel's client runs as another user")
-        shutil.copytree(HOME / "openvpn", _TUNNEL)
-        with (_TUNNEL / "client.conf").open("a") as file:
-            file.write("user nobody\ngroup nogroup\npersist-tun\n")
-        fetch = _TUNNEL / "fetch_servers.sh"
-        fetch.write_text("#!/bin/sh\ncp relay_servers.offered relay_servers.conf\n")
-        fetch.chmod(0o755)
+        _set_up_tunnel()
         # The relay is in real time, and so must be its client.
         _STATIC.write_text(_STATIC.read_text().replace("STARTCMD=", "STARTCMD=env -u LD_PRELOAD "))
         self._lab.gateway.become(SILENT)
@@ -213,11 +218,56 @@ class Installed:
     def _purges(self) -> None:
         self._lab.step("the package is purged")
         self._run_documented("apt-get purge")
-        (ROOT / f"etc/systemd/system/{UNIT}.d/local.conf").unlink()
+        (ROOT / f"etc/systemd/system/{UNIT}.d/local.conf").unlink(missing_ok=True)
         self._system.run("systemctl", "reset-failed")
-        shutil.rmtree(_TUNNEL)  # made by the test, but for the credentials
+        # Made by the test, but for the credentials.
+        for folder in (_TUNNEL, ROOT / "var/www"):
+            shutil.rmtree(folder, ignore_errors=True)
         left = _listing() - self._before
         assert not left, sorted(left)
+
+    def _upgrades_an_older_device(self) -> None:
+        self._lab.step("a device set up with the first release is upgraded: it keeps its settings")
+        self._install(_released(self._package), "install -y ./")
+        self._set_up_older_settings()
+        self._system.run("systemd-tmpfiles", "--create", "pelorus.conf")
+        self._system.run("systemctl", "daemon-reload")
+        self._system.run("systemctl", "enable", "--now", UNIT)
+        self._wait_for_status("portforwarded")
+        before = self._main()
+        self._install(self._package, "install -y ./")
+        assert self._main() not in (0, before)
+        assert "-l 6" in _OPTIONS.read_text() and not _SETTINGS.samefile(DYNAMIC_FILE)
+        self._lab.gateway.become(SILENT)
+        self._system.run("systemctl", "restart", UNIT)
+        self._wait_for_status("relayed")
+        self._lab.gateway.become(GatewaySetup())
+        DYNAMIC_FILE.parent.unlink()
+        DYNAMIC_FILE.parent.symlink_to(_SETTINGS.parent)
+        self._run_documented("DEVICEID")
+        self._run_documented("earlier-settings")
+        self._wait_for_status("portforwarded")
+        for name in ("pid", "out"):
+            (ROOT / f"run/pelorus-openvpn.{name}").unlink(missing_ok=True)
+
+    def _set_up_older_settings(self) -> None:
+        """Settings where the first release had them; the lab's back end writes there."""
+        _OLD_SETTINGS.mkdir(parents=True)
+        samples = ROOT / "usr/share/pelorus"
+        text = (samples / "globalconfig.ini").read_text()
+        for new, old in (("/var/lib/pelorus", "/var/www/rest-api/config"),
+                         ("/run/pelorus-relay/openvpn", "/run/pelorus-openvpn"),
+                         ("STARTCMD=", "STARTCMD=env -u LD_PRELOAD ")):
+            text = text.replace(new, old)
+        (_OLD_SETTINGS / "globalconfig.ini").write_text(text)
+        account = self._lab.account
+        dynamic = (samples / "dynamicconfig.ini").read_text().replace(
+            "DEVICEID=", f"DEVICEID={account.device_id}").replace(
+            "DEVICEAUTH=", f"DEVICEAUTH={account.auth}")
+        (_OLD_SETTINGS / "dynamicconfig.ini").write_text(dynamic)
+        DYNAMIC_FILE.parent.unlink()
+        DYNAMIC_FILE.parent.symlink_to(_OLD_SETTINGS)
+        _set_up_tunnel()
 
     def _install(self, package: Path, word: str) -> None:
         shutil.copy(package, ROOT / "root")
@@ -267,6 +317,15 @@ def _listing() -> set[str]:
     return {name for name in names if not name.startswith(_VOLATILE)}
 
 
+def _set_up_tunnel() -> None:
+    shutil.copytree(HOME / "openvpn", _TUNNEL)
+    with (_TUNNEL / "client.conf").open("a") as file:
+        file.write("user nobody\ngroup nogroup\npersist-tun\n")
+    fetch = _TUNNEL / "fetch_servers.sh"
+    fetch.write_text("#!/bin/sh\ncp relay_servers.offered relay_servers.conf\n")
+    fetch.chmod(0o755)
+
+
 def _newer(package: Path) -> Path:
     """The same package with a higher version and other static settings."""
     folder, new = Path("/tmp/newer"), Path("/tmp/pelorus_newer.deb")
@@ -279,6 +338,29 @@ def _newer(package: Path) -> Path:
         file.write("\nNewer.\n")
     run_tool("dpkg-deb", "-b", "--root-owner-group", str(folder), str(new))
     return new
+
+
+def _released(package: Path) -> Path:
+    """The same daemon as 1.7.0-54 packed it: no scripts, no settings, another place of the unit."""
+    folder, old = Path("/tmp/released"), Path("/tmp/pelorus_released.deb")
+    run_tool("dpkg-deb", "-R", str(package), str(folder))
+    control = folder / "DEBIAN/control"
+    control.write_text(re.sub("^Version: .*", "Version: 1.7.0-54", control.read_text(),
+                              flags=re.M))
+    (folder / "DEBIAN/conffiles").write_text("/etc/default/pelorus\n")
+    for name in ("preinst", "postinst", "prerm", "postrm", "md5sums"):
+        (folder / "DEBIAN" / name).unlink()
+    shutil.rmtree(folder / "etc/pelorus")
+    (folder / "etc/default/pelorus").write_text(_RELEASED_OPTIONS)
+    (folder / "usr/lib/tmpfiles.d/pelorus.conf").write_text("d /run/pelorus 0770 root www-data -\n")
+    unit = folder / "lib/systemd/system/pelorus.service"
+    earlier = unit.read_text().replace("ProtectSystem=strict", "ProtectSystem=full")
+    place = folder / "usr" / unit.relative_to(folder)
+    place.parent.mkdir(parents=True)
+    place.write_text(earlier)
+    shutil.rmtree(folder / "lib")
+    run_tool("dpkg-deb", "-b", "--root-owner-group", str(folder), str(old))
+    return old
 
 
 def _obstacle() -> str:

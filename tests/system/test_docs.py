@@ -49,7 +49,7 @@ ELSEWHERE = {
     r"packaging/build-deb": "packaging/test-deb",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
-    "bench/compare.py": "takes a quarter of an hour",
+    "bench/compare.py": "takes a quarter of an hour; --help is run here",
     "bench/growth.py": "takes minutes; --help is run here",
     "bench/run [--quick]": "takes minutes; --help is run here",
     "bench/run": "takes minutes; --help is run here",

@@ -70,6 +70,7 @@ NOT_RUN = {
     "scripts/lint --fix": "changes sources",
     "scripts/lint [--fix]": "changes sources",
     "scripts/matrix": "takes ten minutes and more",
+    "scripts/test-cross": "takes ten minutes and more",
     "scripts/test-cross arm64": "takes ten minutes and more",
     "scripts/zoo": "takes up to an hour; --help is run here",
     "scripts/zoo NAME": "test_scenarios plays the rows without it",

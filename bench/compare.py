@@ -8,6 +8,7 @@ With kinds as arguments (start, live, calls, reboot) it measures only those agai
 
 from __future__ import annotations
 
+import argparse
 import json
 import os
 import queue
@@ -282,7 +283,13 @@ def main() -> None:
         kind, name, number = sys.argv[1:]
         Path(_PARTS, "-".join(sys.argv[1:])).write_text(json.dumps(_PLAYS[kind](name, int(number))))
         return
-    _measure(sys.argv[1:] or [*_PLAYS])
+    parser = argparse.ArgumentParser(prog="bench/compare.py", description=__doc__,
+                                     formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("kind", nargs="*", help=f"what to measure: {', '.join(_PLAYS)}")
+    kinds = parser.parse_args().kind
+    if unknown := [kind for kind in kinds if kind not in _PLAYS]:
+        parser.error(f"no such kind: {unknown[0]}")
+    _measure(kinds or [*_PLAYS])
     runs: _Runs = defaultdict(list)
     for kind, name, number in (*_LIVES, *_ALONE):
         runs[kind, name].append(json.loads(Path(_PARTS, f"{kind}-{name}-{number}").read_text()))

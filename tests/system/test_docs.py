@@ -49,7 +49,7 @@ ELSEWHERE = {
     r"packaging/build-deb": "packaging/test-deb",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
-    "bench/compare.py": "takes a quarter of an hour",
+    "bench/compare.py": "takes a quarter of an hour; --help is run here",
     "bench/growth.py": "takes minutes; --help is run here",
     "bench/run [--quick]": "takes minutes; --help is run here",
     "bench/run": "takes minutes; --help is run here",
@@ -70,6 +70,7 @@ NOT_RUN = {
     "scripts/lint --fix": "changes sources",
     "scripts/lint [--fix]": "changes sources",
     "scripts/matrix": "takes ten minutes and more",
+    "scripts/test-cross": "takes ten minutes and more",
     "scripts/test-cross arm64": "takes ten minutes and more",
     "scripts/zoo": "takes up to an hour; --help is run here",
     "scripts/zoo NAME": "test_scenarios plays the rows without it",

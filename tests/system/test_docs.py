@@ -33,11 +33,11 @@ BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
     r"((scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+|/usr/bin/python3|apt|apt-get|cat"
     r"|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
-    r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pelorus-doctor|pgrep|pkill|printf|python3|rm|sed|sudo"
+    r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"
                   r"|ctest --preset dev -[RN].*|build/dev/tests/unit/.*")
-ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc .*|natpmpc|hdparm .* .*|pgrep .*|touch .*|pelorus -u.*")
+ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc (?!-a$).*|natpmpc|hdparm .* .*|pgrep .*|touch .*|pelorus -u.*")
 ELSEWHERE = {
     r"scripts/(deps|lint|test|test-32bit)|cmake (--build )?--preset \w+|ctest --preset asan":
         "scripts/test",
@@ -47,6 +47,7 @@ ELSEWHERE = {
     r"scripts/(endure( (?!hours).*)?|fuzz\b.*)":
         "scripts/test in short; each takes minutes to hours",
     r"packaging/build-deb": "packaging/test-deb",
+    r"upnpc -a": "bench/compare.py, with its arguments",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
     "bench/compare.py": "takes a quarter of an hour; --help is run here",

@@ -37,7 +37,8 @@ COMMAND = re.compile(
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"
                   r"|ctest --preset dev -[RN].*|build/dev/tests/unit/.*")
-ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc (?!-a$).*|natpmpc|hdparm .* .*|pgrep .*|touch .*|pelorus -u.*")
+ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc (?!-a$).*|natpmpc|hdparm .* .*|pgrep .*|touch .*"
+                       r"|pelorus -u.*")
 ELSEWHERE = {
     r"scripts/(deps|lint|test|test-32bit)|cmake (--build )?--preset \w+|ctest --preset asan":
         "scripts/test",

@@ -1,3 +1,4 @@
+#include "support/fake_files.h"
 #include "unit/router/router_fixture.h"
 
 namespace pelorus {
@@ -100,6 +101,7 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
 }
 
 TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
+    support::FakeProcess::get().startsThreads = false;  // a watcher for each entry takes its time
     discovered();
     ASSERT_TRUE(map(443, 9444));
     const std::string big(99, '9');

@@ -20,6 +20,7 @@ enum class Peer {
     GATEWAY,  ///< IPv4 hosts other than this device: its own servers trust local clients
 };
 
+/// Sockets with numbers below this are shut down when a call takes too long.
 constexpr std::size_t kMostDescriptors = 1024;
 /// One bit for each descriptor.
 using Descriptors = std::bitset<kMostDescriptors>;

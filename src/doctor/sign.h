@@ -1,0 +1,97 @@
+// The signs from which causes are concluded.
+#ifndef PELORUS_DOCTOR_SIGN_H
+#define PELORUS_DOCTOR_SIGN_H
+
+namespace pelorus::doctor {
+
+/// Something that was seen. A sign that is absent was not seen, for whatever reason; where its
+/// contrary matters, that is a sign too.
+enum class Sign {
+    // From files and the process table.
+    STATIC_FILE_UNREADABLE,
+    DYNAMIC_FILE_UNREADABLE,
+    CREDENTIALS_MISSING,
+    REMOTE_ACCESS_OFF,
+    MANUAL_MODE,
+    MANUAL_PORT_INVALID,
+    DEFAULT_PORTS_ONLY,
+    OWN_ROUTER,  ///< the device is itself the home router
+    DAEMON_RUNS,
+    DAEMON_GONE,  ///< there is no such process
+    TUNNEL_RUNS,  ///< the process that the pid file names
+    TUNNEL_GONE,
+    TUNNEL_SAYS_UP,     ///< the client's output has the text of success
+    TUNNEL_REFUSED,     ///< the client's output says that the relay refuses the credentials
+    TUNNEL_UNANSWERED,  ///< the client's output says that the relay does not answer
+    TUNNEL_FILES_UNWRITABLE,
+    DISK_UNUSED,  ///< for longer than the daemon lets a port test wake it
+
+    // From probes.
+    NO_INTERFACE_UP,
+    NO_ADDRESS,
+    NO_DEFAULT_ROUTE,
+    GATEWAY_FOUND,  ///< through UPnP or NAT-PMP
+    NO_GATEWAY_ANSWERS,
+    GATEWAY_WITHOUT_ADDRESS,
+    GATEWAY_ADDRESS_PRIVATE,
+    GATEWAY_ADDRESS_SHARED,
+    GATEWAY_ADDRESS_PUBLIC,
+    OUR_MAPPINGS_THERE,
+    OUR_MAPPINGS_MISSING,  ///< the table was read to its end, and the published ports are not ours
+    PORT_HELD_BY_OTHER,
+    WEB_SERVER_LISTENS,
+    WEB_SERVER_SILENT,
+    BACK_END_ANSWERS,
+    BACK_END_SILENT,
+    SERVICE_REACHED,  ///< name, connection and certificate are right
+    SERVICE_UNRESOLVED,
+    SERVICE_UNREACHABLE,
+    SERVICE_CERTIFICATE_BAD,
+    CLOCK_WRONG,
+    NAMES_RIGHT,
+    NAMES_LEAD_ELSEWHERE,
+    NAMES_UNRESOLVED,
+    DISK_STANDBY,
+    DISK_ACTIVE,
+    RELAY_CLIENT_MISSING,  ///< no openvpn program
+    TUNNEL_DEVICE_MISSING,
+    TUNNEL_INTERFACE_UP,
+    SERVICE_SEES_OTHER_ADDRESS,
+    PORT_TEST_PASSES,
+    PORT_TEST_FAILS,
+
+    // From the log: the last time that the daemon dealt with the matter it was so.
+    LOGGED_START_FAILED,  ///< settings unreadable at the start, or an unknown option
+    LOGGED_END,           ///< it ended in an orderly way
+    LOGGED_REMOTE_ACCESS_OFF,
+    LOGGED_CREDENTIALS_MISSING,
+    LOGGED_ATTEMPT,     ///< a start or a change, with no result yet
+    LOGGED_SECOND_NAT,  ///< the service sees another address than the gateway's
+    LOGGED_NO_GATEWAY,
+    LOGGED_GATEWAY_WITHOUT_ADDRESS,
+    LOGGED_GATEWAY_REFUSES,  ///< every port that was asked for
+    LOGGED_PORT_HELD_BY_OTHER,
+    LOGGED_TEST_FAILED,
+    LOGGED_TEST_SKIPPED_DISK,
+    LOGGED_SERVICE_WAIT,
+    LOGGED_SERVICE_UNRESOLVED,
+    LOGGED_SERVICE_SILENT,  ///< no answer to requests
+    LOGGED_SERVICE_CERTIFICATE,
+    LOGGED_SERVICE_NONSENSE,
+    LOGGED_OTHER_DEVICE,
+    LOGGED_PUBLISHING_FAILED,
+    LOGGED_BACK_END_SILENT,
+    LOGGED_BACK_END_REFUSES,
+    LOGGED_NAMES_LEAD_ELSEWHERE,
+    LOGGED_NAMES_UNRESOLVED,
+    LOGGED_MANUAL_PORT_INVALID,
+    LOGGED_MANUAL_RULED_OUT,  ///< manual ports are not tested after a second NAT was found
+    LOGGED_RELAY_DOES_NOT_COME_UP,
+    LOGGED_TUNNEL_NO_OUTPUT,  ///< the start command did not run, or could not write
+    LOGGED_TUNNEL_DIED,
+    LOGGED_TWO_TUNNELS,
+};
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -75,7 +75,8 @@ enum class Sign {
     LOGGED_TEST_SKIPPED_DISK,
     LOGGED_SERVICE_WAIT,
     LOGGED_SERVICE_UNRESOLVED,
-    LOGGED_SERVICE_SILENT,  ///< no answer to requests
+    LOGGED_SERVICE_UNREACHABLE,  ///< no connection
+    LOGGED_SERVICE_SILENT,       ///< a connection, but no answer to requests
     LOGGED_SERVICE_CERTIFICATE,
     LOGGED_SERVICE_NONSENSE,
     LOGGED_OTHER_DEVICE,

@@ -73,8 +73,7 @@ private:
     time_t tmpModTime = 0;
     std::string configPath;
     SettingsMap properties;
-    std::set<std::string>
-        reportedKeys;  // those set elsewhere although the static file reserves them
+    std::set<std::string> reportedKeys;  // set elsewhere although they are reserved
     bool isFullReported = false;
 };
 

@@ -20,8 +20,9 @@ LogRule& LogRule::clears(std::vector<Sign> signs) {
     return *this;
 }
 
-LogRule& LogRule::keeps(Kept what) {
+LogRule& LogRule::keeps(Kept what, std::size_t value) {
     kept = what;
+    keptValue = value;
     return *this;
 }
 
@@ -110,7 +111,8 @@ Rules lifeRules() {
 
 Rules cycleRules() {
     return {
-    info("ConnectionManager::createConnection() - checking status & attempting direct connection.").happens(LogEvent::CYCLE),
+    info("ConnectionManager::createConnection() - checking status & attempting direct connection.").happens(LogEvent::CYCLE)
+        .clears({Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS}),
     info("DaemonControl::run - retry connection after %d secs.").happens(LogEvent::CYCLE_ENDS).clears({Sign::LOGGED_ATTEMPT}),
     info("DaemonControl::run - sleep %d secs.").happens(LogEvent::CYCLE_ENDS).clears({Sign::LOGGED_ATTEMPT}),
     info("ConnectionManager::createConnection() - Deviceid and DeviceAuth is empty. Idle Process.").happens(LogEvent::IDLE)
@@ -133,14 +135,14 @@ Rules gatewayRules() {
     info("Router::initLocalIP() - IPv4: [%s]").clears({Sign::LOGGED_NO_ADDRESS}),
     info("Router::upnp_discover - failed to get External IP address, ipStatus: %d")
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the gateway has no internet address, or does not tell it (UPnP status {1})"),
-    error("Router::upnp_discover - UPnP Discover failed to return any response.").clears({Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS})
-        .sets(Sign::LOGGED_NO_GATEWAY, "no gateway answers UPnP"),
-    info("Router::natpmp_discover - failed to get External IP address").unless(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS)
+    error("Router::upnp_discover - UPnP Discover failed to return any response.").happens(LogEvent::UPNP_SILENT),
+    info("Router::natpmp_discover - failed to get External IP address").happens(LogEvent::NATPMP_SILENT).unless(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS)
         .sets(Sign::LOGGED_NO_GATEWAY, "no gateway answers UPnP or NAT-PMP"),
     info("Router::upnp_discover - Router's external IP address: %s ").keeps(Kept::GATEWAY).clears(kGateway),
-    info("Router::natpmp_discover - Router's external IP address: %s ").keeps(Kept::GATEWAY).clears(kGateway),
+    info("Router::natpmp_discover - Router's external IP address: %s ").keeps(Kept::GATEWAY).clears(kGateway)
+        .happens(LogEvent::NATPMP_FOUND),
     notice("Router::upnp_discover - Router's external IP address has changed!").clears(kGateway),
-    notice("Router::natpmp_discover - Router's external IP address has changed!").clears(kGateway),
+    notice("Router::natpmp_discover - Router's external IP address has changed!").clears(kGateway).happens(LogEvent::NATPMP_FOUND),
     error("Router::initIpAddrBrenvik - Not connected to internet.").happens(LogEvent::ADDRESS_LOST)
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the router has no internet address"),
     info("ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.")
@@ -176,7 +178,7 @@ Rules testRules() {
         .clears({Sign::LOGGED_TEST_FAILED}).happens(LogEvent::PORTS_LOST),
     info("TavikClient::testPort - Requested external IP: [%s] / Respond remote external IP: [%s].").keeps(Kept::GATEWAY),
     info("TavikClient::testPort - Response remote external IP: [%s].").keeps(Kept::SERVICE),
-    error("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s]"),
+    error("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s]").keeps(Kept::PORT, 3),
     error("TavikClient::testPort - port map check failed.").happens(LogEvent::TEST_FAILED),
     info("TavikClient::testPort - port map check success.").clears({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE}),
     info("TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [%s]").keeps(Kept::TESTED),

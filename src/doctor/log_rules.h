@@ -33,6 +33,9 @@ enum class LogEvent {
     SERVICE_FAILED,  ///< a request to the service got no answer
     PUBLISHED,       ///< the service has the record; the back end is told next
     PUBLISHING_FAILED,
+    UPNP_SILENT,
+    NATPMP_FOUND,
+    NATPMP_SILENT,
     PORTS_LOST,    ///< the direct path is given up
     ADDRESS_LOST,  ///< no way in is left: the names, or the router's address
     COPY_MISSING,  ///< the machine was restarted, if this comes first in a start
@@ -48,25 +51,26 @@ enum class Kept { NOTHING, GATEWAY, SERVICE, TESTED, PORT, ERROR, WAIT, FILE, CO
 /// The one that is called @p name in a rule's words: "gateway" for GATEWAY. NOTHING if none is.
 Kept keptNamed(std::string_view name);
 
-/// A line of interest. Made by `error`, `warning`, `notice` and `info`, named as the calls that log it.
+/// A line of interest, and what it tells.
 struct LogRule {
     int severity{};  ///< as syslog counts
-    std::string_view
-        text;  ///< as in the source, conversions included; the line's end may be missing
+    /// As in the source, conversions included; the end of the line may be missing.
+    std::string_view text;
     LogEvent event = LogEvent::NOTHING;
     std::vector<Sign> set{};
     std::vector<Sign> cleared{};
-    std::string_view
-        words{};  ///< the fact's text: "{2}" is the second value, "{gateway}" a kept one
-    Kept kept = Kept::NOTHING;        ///< which value the first one is
+    /// The fact's text: "{2}" stands for the second value, "{gateway}" for a kept one.
+    std::string_view words{};
+    Kept kept = Kept::NOTHING;
+    std::size_t keptValue = 1;        ///< which one is kept, counted from 1
     std::optional<Sign> exception{};  ///< nothing is set while this sign is there
-    std::pair<std::size_t, std::string_view>
-        condition{};  ///< a value (1 is the first) and its text
+    /// The rule fits only if this value, counted from 1, is this text. 0: always.
+    std::pair<std::size_t, std::string_view> condition{};
 
     LogRule& happens(LogEvent what);
     LogRule& sets(Sign sign, std::string_view fact);
     LogRule& clears(std::vector<Sign> signs);
-    LogRule& keeps(Kept what);
+    LogRule& keeps(Kept what, std::size_t value = 1);
     LogRule& unless(Sign sign);
     LogRule& onlyIf(std::size_t value, std::string_view is);
 };

@@ -25,6 +25,9 @@ const std::vector<Sign> kDirectSigns{
     Sign::LOGGED_GATEWAY_REFUSES,  Sign::LOGGED_PORT_HELD_BY_OTHER,
     Sign::LOGGED_SERVICE_WAIT,     Sign::LOGGED_CREDENTIALS_MISSING,
     Sign::LOGGED_MANUAL_RULED_OUT, Sign::LOGGED_MANUAL_PORT_INVALID};
+const std::vector<Sign> kRelaySolves{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
+                                     Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
+                                     Sign::LOGGED_SECOND_NAT};
 const std::vector<Sign> kRelayedSigns{Sign::LOGGED_ATTEMPT, Sign::LOGGED_RELAY_DOES_NOT_COME_UP,
                                       Sign::LOGGED_TUNNEL_NO_OUTPUT, Sign::LOGGED_TUNNEL_DIED};
 
@@ -123,7 +126,7 @@ void LogStory::becomePending() {
 
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
     if (rule.severity >= 6) progress = true;
-    if (rule.kept != Kept::NOTHING) keep(rule, values[0]);
+    if (rule.kept != Kept::NOTHING) keep(rule, values[rule.keptValue - 1]);
     clear(rule.cleared);
     if (!rule.exception || signs.count(*rule.exception) == 0) setSigns(rule, when, values);
     happen(rule.event, when, values);
@@ -165,13 +168,8 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             takeStatus(values[0], when);
             break;
         case LogEvent::STATUS_THERE:
-            if (values[0] == "portforwarded") assume(Reach::DIRECT);
-            if (values[0] == "relayed") assume(Reach::RELAYED);
-            if (values[0] == "failed") assume(Reach::NOT_REACHED);
-            break;
         case LogEvent::TYPE:
-            if (values[0] == "1") assume(Reach::DIRECT);
-            if (values[0] == "2") assume(Reach::RELAYED);
+            assumeFrom(values[0]);
             break;
         case LogEvent::TEST_ANSWER:
             takeTestAnswer(values[1], when);
@@ -186,8 +184,28 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             pending = {Reach::DIRECT, when};
             break;
         default:
+            happenAtGateway(event, when);
             happenInLife(event, when);
             happenInRelay(event, when);
+    }
+}
+
+void LogStory::happenAtGateway(LogEvent event, Time when) {
+    switch (event) {
+        case LogEvent::UPNP_SILENT:
+            // NAT-PMP, which is tried next, reports success as progress only.
+            if (!natpmp && signs.count(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS) == 0) {
+                set(Sign::LOGGED_NO_GATEWAY, when, "no gateway answers UPnP");
+            }
+            break;
+        case LogEvent::NATPMP_FOUND:
+            natpmp = true;
+            break;
+        case LogEvent::NATPMP_SILENT:
+            natpmp = false;
+            break;
+        default:
+            break;
     }
 }
 
@@ -258,7 +276,7 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
         case LogEvent::RELAY_FAILED:
             pending.reset();
             tornDown = true;
-            lose(when);
+            failRelay(when);
             break;
         default:
             break;
@@ -274,7 +292,7 @@ void LogStory::start(Time when) {
     signs.clear();
     reason.reset();
     nextCycle.reset();
-    signalled = ended = progress = tornDown = false;
+    signalled = ended = progress = natpmp = tornDown = false;
     ++startCount;
     since = when;
     become(Reach::NOT_REACHED, when, std::string{kStarted});
@@ -308,9 +326,7 @@ void LogStory::endCycle(Time when, std::string_view seconds) {
     int pause = 0;
     std::from_chars(seconds.data(), seconds.data() + seconds.size(), pause);
     nextCycle = when + std::chrono::seconds{pause};
-    if (!history.empty() && passing && history.back().cause == kStarted) {
-        history.back().cause = reasonText();
-    }
+    explainStart();
     passing = false;
     tornDown = false;
     reason.reset();
@@ -376,18 +392,49 @@ void LogStory::failService(Time when) {
 // The direct path does not work. A tunnel that stands is not touched by that.
 void LogStory::lose(Time when) {
     if (reach() == Reach::RELAYED && !tornDown) return;
+    if (reach() == Reach::NOT_REACHED && passing && history.back().cause.empty()) {
+        history.back().cause = reasonText();
+    }
     become(Reach::NOT_REACHED, when, reasonText());
 }
 
+void LogStory::failRelay(Time when) {
+    // For what a relay is there for it is the relay that counts.
+    if (reason && std::count(kRelaySolves.begin(), kRelaySolves.end(), *reason) != 0) {
+        for (const Sign sign :
+             {Sign::LOGGED_RELAY_DOES_NOT_COME_UP, Sign::LOGGED_TUNNEL_NO_OUTPUT}) {
+            if (signs.count(sign) != 0) reason = sign;
+        }
+    }
+    lose(when);
+    explainStart();
+    passing = false;
+}
+
+// The first cycle of a run ends without a way in.
+void LogStory::explainStart() {
+    if (passing && reach() == Reach::NOT_REACHED && history.back().cause == kStarted && reason) {
+        history.back().cause = reasonText();
+    }
+}
+
+// A status word, or the number of a connection type.
+void LogStory::assumeFrom(std::string_view status) {
+    if (status == "portforwarded" || status == "1") assume(Reach::DIRECT);
+    if (status == "relayed" || status == "2") assume(Reach::RELAYED);
+    if (status == "failed") assume(Reach::NOT_REACHED);
+}
+
 // How it was when the log began.
-void LogStory::assume(Reach reach) {
+void LogStory::assume(Reach status) {
     if (!history.empty()) return;
-    become(reach, *firstLine, "");
+    become(status, *firstLine, "");
     passing = false;
 }
 
 void LogStory::become(Reach next, Time when, const std::string& cause) {
-    if (ended && (next == Reach::DIRECT || next == Reach::RELAYED)) return;
+    // On its way out it finishes what it had begun.
+    if (ended && next != Reach::NOT_RUNNING && next != Reach::SWITCHED_OFF) return;
     const std::string address =
         next != Reach::DIRECT ? ""
                               : value(value(Kept::TESTED).empty() ? Kept::GATEWAY : Kept::TESTED);

@@ -43,6 +43,7 @@ private:
     void setSigns(const LogRule& rule, Time when, const LogValues& values);
     void set(Sign sign, Time when, const std::string& text);
     void happen(LogEvent event, Time when, const LogValues& values);
+    void happenAtGateway(LogEvent event, Time when);
     void happenInLife(LogEvent event, Time when);
     void happenInRelay(LogEvent event, Time when);
     void clear(const std::vector<Sign>& cleared);
@@ -55,7 +56,10 @@ private:
     void failTest(Time when);
     void failService(Time when);
     void lose(Time when);
-    void assume(Reach reach);
+    void failRelay(Time when);
+    void explainStart();
+    void assumeFrom(std::string_view status);
+    void assume(Reach status);
     void become(Reach reach, Time when, const std::string& cause);
     [[nodiscard]] bool isInBetween(Reach next, Time when) const;
     [[nodiscard]] Reach reach() const;
@@ -75,6 +79,7 @@ private:
     bool signalled = false;      // told to end
     bool ended = true;           // no daemon is there, or it is on its way out
     bool progress = false;       // since the last start there was a line of severity 6
+    bool natpmp = false;         // the gateway speaks it, as far as the log tells
     bool orphan = false;         // an earlier daemon ended suddenly and left its tunnel
     bool tornDown = false;       // no connection of this cycle's beginning is left
     int startCount = 0;

@@ -24,6 +24,9 @@ endfunction()
 pelorus_import(miniupnpc miniupnpc/miniupnpc.h miniupnpc)
 pelorus_import(natpmp natpmp.h natpmp)
 
+# Rotated logs are compressed.
+find_package(ZLIB REQUIRED)
+
 # The device's structured event log; a build host rarely has it.
 add_library(pelorus_qvlog INTERFACE)
 if(NOT PELORUS_QVLOG STREQUAL "BUNDLED")

@@ -65,6 +65,7 @@ enum class Sign {
     LOGGED_END,           ///< it ended in an orderly way
     LOGGED_REMOTE_ACCESS_OFF,
     LOGGED_CREDENTIALS_MISSING,
+    LOGGED_NO_ADDRESS,  ///< no interface of the device has an address
     LOGGED_ATTEMPT,     ///< a start or a change, with no result yet
     LOGGED_SECOND_NAT,  ///< the service sees another address than the gateway's
     LOGGED_NO_GATEWAY,

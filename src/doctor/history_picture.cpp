@@ -20,11 +20,12 @@ constexpr double kWidth = 1200, kMargin = 30;
 constexpr double kLeft = kMargin, kRight = kWidth - kMargin;
 constexpr double kLetter = 8;       // mean width of 14 pixels in the widest of the usual fonts
 constexpr double kSmallLetter = 7;  // of 12 pixels
-constexpr double kLegendTop = 82, kMarksTop = 118, kBandTop = 146, kBandHeight = 46;
-constexpr double kAxisTop = kBandTop + kBandHeight, kListTop = kAxisTop + 64;
+constexpr double kLegendTop = 82, kLegendLine = 24, kBandHeight = 46;
+constexpr double kMarkHeight = 18, kMarkAbove = 28;  // the top of a mark above the band
+constexpr double kAxisHeight = 64;
 constexpr double kLeastSliver = 1.5;  // a period of seconds can be seen
 constexpr double kLine = 20, kEntryGap = 8, kColumn = 585, kTextAt = 40;
-constexpr std::size_t kListLetters = 64;
+constexpr std::size_t kListLetters = 64, kSmallListLetters = 76;
 constexpr std::size_t kMostTicks = 12;
 
 const char* colourOf(Reach reach) {
@@ -141,6 +142,7 @@ private:
     Time begin{}, end{};
     std::vector<Stretch> stretches;
     std::vector<Entry> entries;
+    double bandTop = 0, axisTop = 0;
     PictureSheet sheet;
 };
 
@@ -179,13 +181,15 @@ void HistoryPicture::drawHead() {
     if (!stretches.empty()) {
         span = timeBetween(begin, end) + ", from " + dayInWords(begin, end) + " " +
                timeOfDay(begin) + " to " + dayInWords(end, end) + " " + timeOfDay(end) +
-               ", in the device's local time. A number marks where a cause set in.";
+               ", in the device's local time.";
+        if (!entries.empty()) span += " A number marks where a cause set in.";
     }
     sheet.write(span, {kLeft, 58, 14, kQuiet});
 }
 
+// Says how much of the time each status had, and where the band has its place.
 void HistoryPicture::drawLegend() {
-    double at = kLeft;
+    double at = kLeft, top = kLegendTop;
     for (const ReachWords& words : kReachWords) {
         seconds total{0};
         bool isThere = false;
@@ -197,21 +201,26 @@ void HistoryPicture::drawLegend() {
         if (!isThere) continue;
         const std::string text = std::string{words.shortly} + " " + share(total, end - begin) +
                                  ", " + timeBetween(begin, begin + total);
-        sheet.draw({at, kLegendTop, 14, 14, colourOf(words.reach), 3});
-        sheet.write(text, {at + 21, kLegendTop + 12});
-        at += 21 + static_cast<double>(letters(text)) * kLetter + 14;
+        const double width = 21 + static_cast<double>(letters(text)) * kLetter;
+        if (at + width > kRight) {
+            at = kLeft;
+            top += kLegendLine;
+        }
+        sheet.draw({at, top, 14, 14, colourOf(words.reach), 3});
+        sheet.write(text, {at + 21, top + 12});
+        at += width + 14;
     }
+    bandTop = top + kLegendLine + 12 + (entries.empty() ? 0 : kMarkAbove);
+    axisTop = bandTop + kBandHeight;
 }
 
 void HistoryPicture::drawAxis() {
-    const auto span = static_cast<double>((end - begin).count());
-    static_cast<void>(span);
     for (const Tick& tick : timeTicks(begin, end, kMostTicks)) {
         const double at = x(tick.when);
-        sheet.drawVertical(at, kBandTop - 4, kAxisTop + 8, "#a0aec0");
+        sheet.drawVertical(at, bandTop - 4, axisTop + 8, "#a0aec0");
         const double half = static_cast<double>(tick.label.size()) * kSmallLetter / 2;
         const double middle = std::clamp(at, kLeft + half, kRight - half);
-        sheet.write(tick.label, {middle, kAxisTop + 23, 12, kInk, "middle"});
+        sheet.write(tick.label, {middle, axisTop + 23, 12, kInk, "middle"});
     }
 }
 
@@ -226,13 +235,13 @@ void HistoryPicture::drawBand() {
     for (const Stretch& stretch : stretches) {
         if (!isSliver(stretch)) continue;
         const double left = std::min(x(stretch.since), kRight - kLeastSliver);
-        sheet.draw({left, kBandTop, kLeastSliver, kBandHeight, colourOf(stretch.reach)});
+        sheet.draw({left, bandTop, kLeastSliver, kBandHeight, colourOf(stretch.reach)});
     }
 }
 
 void HistoryPicture::drawStretch(const Stretch& stretch) {
     const double left = x(stretch.since), width = x(stretch.until) - left;
-    sheet.draw({left, kBandTop, width, kBandHeight, colourOf(stretch.reach)});
+    sheet.draw({left, bandTop, width, kBandHeight, colourOf(stretch.reach)});
     const std::string word = wordsFor(stretch.reach).shortly;
     const std::string age = timeBetween(stretch.since, stretch.until);
     const char* colour = stretch.reach == Reach::UNKNOWN ? kInk : kWhite;
@@ -241,8 +250,8 @@ void HistoryPicture::drawStretch(const Stretch& stretch) {
     };
     if (!fits(word, kLetter + 1)) return;
     const bool hasAge = fits(age, kSmallLetter);
-    sheet.write(word, {left + 7, kBandTop + (hasAge ? 20 : 28), 14, colour, "start", true});
-    if (hasAge) sheet.write(age, {left + 7, kBandTop + 37, 12, colour});
+    sheet.write(word, {left + 7, bandTop + (hasAge ? 20 : 28), 14, colour, "start", true});
+    if (hasAge) sheet.write(age, {left + 7, bandTop + 37, 12, colour});
 }
 
 std::vector<Mark> HistoryPicture::marks() const {
@@ -267,17 +276,18 @@ std::vector<Mark> HistoryPicture::marks() const {
 void HistoryPicture::drawMarks() {
     for (const Stretch& stretch : stretches) {
         if (stretch.cause == 0) continue;
-        sheet.drawVertical(x(stretch.since), kMarksTop + 18, kBandTop, colourOf(stretch.reach));
+        sheet.drawVertical(x(stretch.since), bandTop - kMarkAbove + kMarkHeight, bandTop,
+                           colourOf(stretch.reach));
     }
     for (const Mark& mark : marks()) {
-        drawMark(mark.left, mark.right, kMarksTop, mark.label(), mark.reach);
+        drawMark(mark.left, mark.right, bandTop - kMarkAbove, mark.label(), mark.reach);
     }
 }
 
 void HistoryPicture::drawMark(
     double left, double right, double top, const std::string& label, Reach reach) {
     const char* colour = reach == Reach::UNKNOWN ? kQuiet : colourOf(reach);
-    sheet.draw({left, top, right - left, 18, colour, 9});
+    sheet.draw({left, top, right - left, kMarkHeight, colour, kMarkHeight / 2});
     sheet.write(label, {(left + right) / 2, top + 13, 12, kWhite, "middle", true});
 }
 
@@ -313,7 +323,7 @@ double HistoryPicture::drawEntry(std::size_t number, double x, double y) {
         sheet.write(line, {x + kTextAt, y});
         y += kLine;
     }
-    for (const std::string& line : wrap(times(entry), kListLetters + 8)) {
+    for (const std::string& line : wrap(times(entry), kSmallListLetters)) {
         sheet.write(line, {x + kTextAt, y, 12, kQuiet});
         y += kLine;
     }
@@ -322,16 +332,16 @@ double HistoryPicture::drawEntry(std::size_t number, double x, double y) {
 
 // In two columns of about the same height.
 double HistoryPicture::drawList() {
-    if (entries.empty()) return kAxisTop + 30;
+    if (entries.empty()) return axisTop + 30;
     std::size_t lines = 0;
     for (const Entry& entry : entries) lines += linesOf(entry).size() + 1;
-    double bottom = kListTop, y = kListTop;
+    double bottom = axisTop + kAxisHeight, y = axisTop + kAxisHeight;
     std::size_t drawn = 0;
     double column = kLeft;
     for (std::size_t number = 1; number <= entries.size(); ++number) {
         if (column == kLeft && 2 * drawn >= lines) {
             column += kColumn;
-            y = kListTop;
+            y = axisTop + kAxisHeight;
         }
         y = drawEntry(number, column, y);
         drawn += linesOf(entries[number - 1]).size() + 1;

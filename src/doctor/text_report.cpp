@@ -143,10 +143,11 @@ std::string TextReport::sinceWhen() const {
         text += " as of " + momentInWords(diagnosis.now, today) + ", where the log ends";
     }
     if (diagnosis.since) {
-        text += text.empty() ? " since " : ", since ";
+        if (!text.empty()) text += diagnosis.fromElsewhere ? ";" : ",";
+        text += " since ";
         text += momentInWords(*diagnosis.since, today) + " (" +
                 timeBetween(*diagnosis.since, diagnosis.now) + ")";
-    } else if (diagnosis.reach != Reach::UNKNOWN) {
+    } else if (diagnosis.reach != Reach::UNKNOWN && !diagnosis.fromElsewhere) {
         text += ", since when could not be told";
     }
     return text + ".";
@@ -234,7 +235,7 @@ std::string TextReport::daemonLine() const {
     if (daemon.pid > 0) details = "pid " + std::to_string(daemon.pid);
     if (!daemon.options.empty()) details += (details.empty() ? "" : ", ") + daemon.options;
     if (!text.empty() && !details.empty()) text += " (" + details + ")";
-    if (daemon.nextCycle) {
+    if (daemon.nextCycle && !diagnosis.fromElsewhere) {
         text += text.empty() ? "next cycle " : ", next cycle ";
         const bool isDue = *daemon.nextCycle <= diagnosis.now;
         text += isDue ? "due now" : "in " + timeBetween(diagnosis.now, *daemon.nextCycle);

@@ -27,6 +27,12 @@ pelorus_import(natpmp natpmp.h natpmp)
 # Rotated logs are compressed.
 find_package(ZLIB REQUIRED)
 
+# Header only; what is printed by pelorus-doctor --json.
+find_path(nlohmann_json_INCLUDE_DIR nlohmann/json.hpp REQUIRED)
+mark_as_advanced(nlohmann_json_INCLUDE_DIR)
+add_library(pelorus_json INTERFACE)
+target_include_directories(pelorus_json SYSTEM INTERFACE ${nlohmann_json_INCLUDE_DIR})
+
 # The device's structured event log; a build host rarely has it.
 add_library(pelorus_qvlog INTERFACE)
 if(NOT PELORUS_QVLOG STREQUAL "BUNDLED")

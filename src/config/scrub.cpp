@@ -16,10 +16,12 @@ bool sameLetter(unsigned char left, unsigned char right) {
     return std::tolower(left) == std::tolower(right);
 }
 
+}  // namespace
+
 // Case-insensitive: secrets are part of host names, and DNS changes their case. A
 // configuration file with CRLF line ends leaves a carriage return behind a secret, which no answer
 // repeats.
-void hide(std::string& text, std::string secret, const std::string& mask) {
+void hideSecret(std::string& text, std::string secret, const std::string& mask) {
     while (!secret.empty() && secret.back() == '\r') secret.pop_back();
     if (secret.empty()) return;
     auto from = text.begin();
@@ -32,8 +34,6 @@ void hide(std::string& text, std::string secret, const std::string& mask) {
     }
 }
 
-}  // namespace
-
 std::string scrubSecrets(std::string text) {
     const auto* config = GlobalConfig::getInstance();
     std::array<std::pair<std::string, const char*>, 3> secrets{{
@@ -45,7 +45,7 @@ std::string scrubSecrets(std::string text) {
     std::stable_sort(secrets.begin(), secrets.end(), [](const auto& left, const auto& right) {
         return left.first.size() > right.first.size();
     });
-    for (const auto& [secret, mask] : secrets) hide(text, secret, mask);
+    for (const auto& [secret, mask] : secrets) hideSecret(text, secret, mask);
     std::replace(text.begin(), text.end(), '\n', ' ');
     return text;
 }

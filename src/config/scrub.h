@@ -12,6 +12,10 @@ namespace pelorus {
 /// its way to the log, which blanks the other control characters.
 [[nodiscard]] std::string scrubSecrets(std::string text);
 
+/// Replaces @p secret by @p mask everywhere in @p text, whatever the case of its letters. Carriage
+/// returns at the end of the secret are ignored; an empty one is nowhere.
+void hideSecret(std::string& text, std::string secret, const std::string& mask);
+
 }  // namespace pelorus
 
 #endif

@@ -5,7 +5,7 @@
 #include <cstring>
 
 #include "common/text.h"
-#include "daemon/version.h"
+#include "common/version.h"
 
 namespace pelorus {
 

@@ -14,13 +14,13 @@
 #include "common/log.h"
 #include "common/signal_block.h"
 #include "common/termination.h"
+#include "common/version.h"
 #include "config/global_config.h"
 #include "connection/connection_manager.h"
 #include "connection/network_addrs.h"
 #include "daemon/command_line.h"
 #include "daemon/daemon_control.h"
 #include "daemon/signals.h"
-#include "daemon/version.h"
 
 namespace pelorus {
 

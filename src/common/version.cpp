@@ -1,4 +1,4 @@
-#include "daemon/version.h"
+#include "common/version.h"
 
 namespace pelorus {
 

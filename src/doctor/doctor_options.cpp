@@ -1,0 +1,124 @@
+#include "doctor/doctor_options.h"
+
+#include <getopt.h>
+
+#include <cstdio>
+
+#include "common/version.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr const char* kHelp =
+    R"(Usage: pelorus-doctor [OPTION]...
+Says why this device is not reached directly, since when, and what would help.
+Changes nothing: not on the device, not on the gateway, not at the service.
+
+      --log FILE     read this log, - for standard input, also compressed (.gz);
+                     repeatable; without it the journal or the files of syslog
+      --no-probes    look at files and the log only, not at the network
+      --ask-service  also ask the service for the public address, and for one
+                     test of a published port, with the device's credentials
+      --settings     check the settings files only, before anything is started
+      --json         print everything for programs
+      --svg FILE     also draw the history into this file
+      --share        mask addresses and host names, for a place others can read
+  -h, --help         print this and exit
+      --version      print the version and exit
+
+Exit status: 0 reached directly, 1 relayed, 2 not reached, 3 could not be told,
+64 wrong usage, 73 output could not be written. With --settings: 0 or 2.
+)";
+
+// Values beyond those of characters.
+enum Option : int { LOG = 256, NO_PROBES, ASK_SERVICE, SETTINGS, JSON, SVG, SHARE, VERSION };
+
+constexpr option kOptions[]{{"help", no_argument, nullptr, 'h'},
+                            {"version", no_argument, nullptr, VERSION},
+                            {"log", required_argument, nullptr, LOG},
+                            {"no-probes", no_argument, nullptr, NO_PROBES},
+                            {"ask-service", no_argument, nullptr, ASK_SERVICE},
+                            {"settings", no_argument, nullptr, SETTINGS},
+                            {"json", no_argument, nullptr, JSON},
+                            {"svg", required_argument, nullptr, SVG},
+                            {"share", no_argument, nullptr, SHARE},
+                            {nullptr, 0, nullptr, 0}};
+
+int complain(const std::string& what) {
+    std::fprintf(stderr, "pelorus-doctor: %s, see pelorus-doctor --help\n", what.c_str());
+    return kWrongUsage;
+}
+
+// What getopt_long() stopped at: a short option, or the whole argument.
+std::string badArgument(char** argv) {
+    if (optopt > 0 && optopt < LOG) return std::string{"-"} + static_cast<char>(optopt);
+    return argv[optind - 1];
+}
+
+std::optional<int> readOption(int found, char** argv, DoctorOptions& options) {
+    switch (found) {
+        case 'h':
+            static_cast<void>(std::fputs(kHelp, stdout));
+            return 0;
+        case VERSION:
+            std::printf("pelorus-doctor %s\n", GetPelorusVersion());
+            return 0;
+        case LOG:
+            options.logs.emplace_back(optarg);
+            return std::nullopt;
+        case SVG:
+            options.picture = optarg;
+            return std::nullopt;
+        case NO_PROBES:
+            options.probes = false;
+            return std::nullopt;
+        case ASK_SERVICE:
+            options.askService = true;
+            return std::nullopt;
+        case SETTINGS:
+            options.settingsOnly = true;
+            return std::nullopt;
+        case JSON:
+            options.json = true;
+            return std::nullopt;
+        case SHARE:
+            options.share = true;
+            return std::nullopt;
+        case ':':
+            return complain(std::string{argv[optind - 1]} + " needs a file");
+        default:
+            return complain("no such option: " + badArgument(argv));
+    }
+}
+
+std::optional<int> contradiction(const DoctorOptions& options) {
+    const bool hasOthers = !options.logs.empty() || !options.probes || options.askService ||
+                           options.json || !options.picture.empty();
+    if (options.settingsOnly && hasOthers) return complain("--settings goes only with --share");
+    if (options.askService && !options.probes) {
+        return complain("--ask-service is a probe, it does not go with --no-probes");
+    }
+    return std::nullopt;
+}
+
+}  // namespace
+
+DoctorOptions parseDoctorOptions(int argc, char** argv) {
+    DoctorOptions options;
+    optind = 0;  // from the start, whatever was parsed before
+    while (!options.exitStatus) {
+        const int found = getopt_long(argc, argv, "+:h", kOptions, nullptr);
+        if (found == -1) break;
+        options.exitStatus = readOption(found, argv, options);
+        const bool isFile = found == LOG || found == SVG;
+        if (isFile && *optarg == '\0') options.exitStatus = complain("the name of a file is empty");
+    }
+    if (!options.exitStatus && optind < argc) {
+        options.exitStatus = complain(std::string{"unexpected argument: "} + argv[optind]);
+    }
+    if (!options.exitStatus) options.exitStatus = contradiction(options);
+    return options;
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,183 @@
+#include <fcntl.h>
+#include <sys/ioctl.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <string>
+#include <string_view>
+
+#include "common/handles.h"
+#include "doctor/device_files.h"
+#include "doctor/device_log.h"
+#include "doctor/diagnosis.h"
+#include "doctor/doctor_options.h"
+#include "doctor/history_picture.h"
+#include "doctor/json_report.h"
+#include "doctor/lines.h"
+#include "doctor/probes.h"
+#include "doctor/settings_report.h"
+#include "doctor/sharing.h"
+#include "doctor/text_report.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr int kNotWritten = 73;
+constexpr int kUnusableSettings = 2;
+constexpr const char* kStaticConfigVariable = "TAVIK_STATIC_CONFIG";
+constexpr const char* kDefaultStaticConfig = "/var/www/rest-api/config/globalconfig.ini";
+constexpr const char* kPackagedStaticConfig = "/etc/pelorus/globalconfig.ini";
+
+bool exists(const std::string& path) {
+    return access(path.c_str(), F_OK) == 0;
+}
+
+// The package names its file to the daemon only.
+std::string staticFile() {
+    const char* named = std::getenv(kStaticConfigVariable);
+    std::string path = named != nullptr ? named : kDefaultStaticConfig;
+    return !exists(path) && exists(kPackagedStaticConfig) ? kPackagedStaticConfig : path;
+}
+
+Time now() {
+    return std::chrono::time_point_cast<std::chrono::seconds>(std::chrono::system_clock::now());
+}
+
+std::string hostName() {
+    std::array<char, 256> name{};
+    return gethostname(name.data(), name.size() - 1) == 0 ? name.data() : "";
+}
+
+Layout layout() {
+    Layout result;
+    result.today = now();
+    const bool isTerminal = isatty(STDOUT_FILENO) == 1;
+    winsize size{};
+    if (isTerminal && ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) {
+        result.width = size.ws_col;
+    }
+    const char* noColour = std::getenv("NO_COLOR");
+    const char* terminal = std::getenv("TERM");
+    result.colours = isTerminal && (noColour == nullptr || *noColour == '\0') &&
+                     terminal != nullptr && terminal != std::string_view{"dumb"};
+    return result;
+}
+
+void probeWithProgress(const ProbeChoice& choice, Evidence& evidence) {
+    constexpr std::string_view kProgress = "looking at the network...";
+    const bool isShown = isatty(STDERR_FILENO) == 1;
+    if (isShown) std::fprintf(stderr, "%s", kProgress.data());
+    probe(choice, evidence);
+    if (isShown) std::fprintf(stderr, "\r%*s\r", static_cast<int>(kProgress.size()), "");
+}
+
+Evidence look(const DoctorOptions& options) {
+    Evidence evidence;
+    evidence.now = now();
+    const std::string file = staticFile();
+    evidence.fromElsewhere = !options.logs.empty() && !options.probes && !exists(file);
+    if (!evidence.fromElsewhere) {
+        DevicePaths paths;
+        paths.staticFile = file;
+        lookAtFiles(paths, evidence);
+    }
+    LogChoice choice;
+    choice.files = options.logs;
+    lookAtLog(choice, evidence);
+    if (options.probes) {
+        ProbeChoice probes;
+        probes.askService = options.askService;
+        probeWithProgress(probes, evidence);
+    }
+    return evidence;
+}
+
+int complain(const char* what) {
+    const int cause = errno;
+    std::fprintf(stderr, "pelorus-doctor: cannot write %s: %s\n", what, std::strerror(cause));
+    return kNotWritten;
+}
+
+// Of the file that is open: 0, or the exit status.
+int writeAll(std::FILE* file, const std::string& text, const char* name) {
+    const bool isWritten = std::fwrite(text.data(), 1, text.size(), file) == text.size();
+    return isWritten && std::fflush(file) == 0 ? 0 : complain(name);
+}
+
+int writePicture(const std::string& path, const std::string& picture) {
+    constexpr mode_t kMode = 0644;
+    const int descriptor = open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, kMode);
+    if (descriptor < 0) return complain(path.c_str());
+    const FileHandle file{fdopen(descriptor, "w")};
+    return file ? writeAll(file.get(), picture, path.c_str()) : complain(path.c_str());
+}
+
+void addLines(std::string& text, const char* label, const std::string& line, const Layout& how) {
+    for (const std::string& part : hang(label, line, static_cast<std::size_t>(how.width))) {
+        text += part + '\n';
+    }
+}
+
+int reportSettings(const DoctorOptions& options) {
+    const std::string file = staticFile();
+    DevicePaths paths;
+    paths.staticFile = file;
+    Evidence evidence;
+    lookAtFiles(paths, evidence);
+    const SettingsReport report = checkSettings(file);
+    const Layout how = layout();
+    std::string text;
+    addLines(text, "",
+             "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."),
+             how);
+    for (const std::string& problem : report.problems) addLines(text, "PROBLEM  ", problem, how);
+    for (const std::string& remark : report.remarks) addLines(text, "remark   ", remark, how);
+    if (report.problems.empty() && report.remarks.empty()) text += "Nothing to remark.\n";
+    Masks masks{evidence.settings, options.share, hostName()};
+    const int failure = writeAll(stdout, masks.hide(std::move(text)), "to standard output");
+    if (failure != 0) return failure;
+    return report.usable ? 0 : kUnusableSettings;
+}
+
+int reportDiagnosis(const DoctorOptions& options) {
+    const Evidence evidence = look(options);
+    Diagnosis diagnosis = diagnose(evidence);
+    // In every text of it: masked in the finished output, a number that is a secret would spoil the
+    // format where it is a coordinate or a time.
+    Masks masks{evidence.settings, options.share, evidence.fromElsewhere ? "" : hostName()};
+    masks.hideIn(diagnosis);
+    int failure = 0;
+    if (!options.picture.empty()) {
+        failure = writePicture(options.picture, historyPicture(diagnosis));
+    }
+    const std::string report =
+        options.json ? jsonReport(diagnosis) : masks.hide(textReport(diagnosis, layout()));
+    const int printing = writeAll(stdout, report, "to standard output");
+    if (failure == 0) failure = printing;
+    return failure != 0 ? failure : exitStatus(diagnosis);
+}
+
+int runDoctor(int argc, char** argv) {
+    tzset();
+    // What the shared code logs is the daemon's to say.
+    static_cast<void>(setlogmask(LOG_MASK(LOG_EMERG)));
+    const DoctorOptions options = parseDoctorOptions(argc, argv);
+    if (options.exitStatus) return *options.exitStatus;
+    return options.settingsOnly ? reportSettings(options) : reportDiagnosis(options);
+}
+
+}  // namespace
+
+}  // namespace pelorus::doctor
+
+int main(int argc, char** argv) {
+    return pelorus::doctor::runDoctor(argc, argv);
+}

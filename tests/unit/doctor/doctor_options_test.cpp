@@ -1,0 +1,74 @@
+#include "doctor/doctor_options.h"
+
+#include <gtest/gtest.h>
+
+#include <sstream>
+
+namespace pelorus::doctor {
+namespace {
+
+std::string describe(const DoctorOptions& options) {
+    std::string text;
+    for (const std::string& log : options.logs) text += "log=" + log + " ";
+    if (!options.probes) text += "files ";
+    if (options.askService) text += "ask ";
+    if (options.settingsOnly) text += "settings ";
+    if (options.json) text += "json ";
+    if (options.share) text += "share ";
+    if (!options.picture.empty()) text += "svg=" + options.picture + " ";
+    return text + (options.exitStatus ? "exit" : "");
+}
+
+TEST(DoctorOptions, AreReadOrRefusedInOneLine) {
+    struct Row {
+        const char *arguments, *wanted, *complaint;
+    };
+    const Row rows[]{{"", "", ""},
+                     {"--log a --log - --no-probes --json --svg b --share",
+                      "log=a log=- files json share svg=b ", ""},
+                     {"--ask-service --log=c", "log=c ask ", ""},
+                     {"--settings --share", "settings share ", ""},
+                     {"-x", "", "no such option: -x"},
+                     {"--bad", "", "no such option: --bad"},
+                     {"--json=1", "", "no such option: --json=1"},
+                     {"--log", "", "--log needs a file"},
+                     {"--svg=", "", "the name of a file is empty"},
+                     {"file --json", "", "unexpected argument: file"},
+                     {"--no-probes --ask-service", "",
+                      "--ask-service is a probe, it does not go with --no-probes"},
+                     {"--settings --json", "", "--settings goes only with --share"}};
+    for (const Row& row : rows) {
+        std::vector<std::string> words{"pelorus-doctor"};
+        std::istringstream stream{row.arguments};
+        for (std::string word; stream >> word;) words.push_back(word);
+        std::vector<char*> arguments;
+        for (std::string& word : words) arguments.push_back(word.data());
+        arguments.push_back(nullptr);
+        testing::internal::CaptureStderr();
+        const auto options = parseDoctorOptions(static_cast<int>(words.size()), arguments.data());
+        const std::string complaint = testing::internal::GetCapturedStderr();
+        if (*row.complaint == '\0') {
+            EXPECT_EQ(describe(options), row.wanted);
+            EXPECT_EQ(complaint, "");
+        } else {
+            EXPECT_EQ(options.exitStatus, kWrongUsage) << row.arguments;
+            EXPECT_EQ(complaint, "pelorus-doctor: " + std::string{row.complaint} +
+                                     ", see pelorus-doctor --help\n");
+        }
+    }
+}
+
+TEST(DoctorOptions, HelpNamesEveryOption) {
+    std::string name = "pelorus-doctor", option = "--help";
+    char* arguments[]{name.data(), option.data(), nullptr};
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(parseDoctorOptions(2, arguments).exitStatus, 0);
+    const std::string help = testing::internal::GetCapturedStdout();
+    for (const char* wanted : {"--log FILE", "--no-probes", "--ask-service", "--settings", "--json",
+                               "--svg FILE", "--share", "-h, --help", "--version"}) {
+        EXPECT_NE(help.find(wanted), std::string::npos) << wanted;
+    }
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

@@ -26,6 +26,8 @@ constexpr std::size_t kOutputTail = 64UL * 1024;  // bytes
 constexpr std::size_t kMostOfLine = 100;          // characters
 constexpr std::size_t kTimeStamp = std::string_view{"2026-01-31 23:59:59 "}.size();
 
+constexpr const char* kAsks = "link remote: ";
+constexpr const char* kAnswer = "Initial packet from";
 constexpr const char* kRefused = "control message: AUTH_FAILED";
 constexpr const char* kEnds[] = {"process restarting", "process exiting", "due to fatal error"};
 constexpr const char* kFailures[] = {
@@ -207,6 +209,7 @@ private:
 
 TunnelOutput readTunnelOutput(const std::string& output, const std::string& successText) {
     TunnelOutput said;
+    bool isWaiting = false;  // for the relay's first packet
     std::istringstream lines{output};
     for (std::string line; std::getline(lines, line);) {
         if (contains(line, successText)) {
@@ -219,7 +222,11 @@ TunnelOutput readTunnelOutput(const std::string& output, const std::string& succ
             said.failure = shownText(withoutTimeStamp(line), kMostOfLine);
             said.isRefused = false;
         }
-        if (containsAny(line, kEnds)) said.isUp = false;
+        if (contains(line, kAsks)) isWaiting = true;
+        if (contains(line, kAnswer)) isWaiting = false;
+        if (!containsAny(line, kEnds)) continue;
+        said.isUp = false;
+        if (isWaiting && said.failure.empty()) said.failure = "no answer at all";
     }
     return said;
 }

@@ -1,0 +1,300 @@
+#include "doctor/settings_report.h"
+
+#include <algorithm>
+#include <cctype>
+#include <map>
+#include <string_view>
+#include <utility>
+
+#include "common/masks.h"
+#include "common/text.h"
+#include "doctor/device_settings.h"
+#include "doctor/file_safety.h"
+#include "doctor/known_settings.h"
+#include "doctor/setting_value.h"
+#include "doctor/shown_text.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+using LastLines = std::map<std::string, const SettingsLine*>;
+
+constexpr std::size_t kMostReported = 100;
+constexpr std::size_t kMostOfValue = 60;    // characters
+constexpr std::size_t kShortestSecret = 4;  // shorter ones would mask half of every line
+
+// Each key's last line that counts.
+LastLines lastLines(const std::vector<SettingsLine>& lines) {
+    LastLines last;
+    for (const SettingsLine& line : lines) {
+        if (line.fate == MergedLine::Fate::TAKEN) last[line.key] = &line;
+    }
+    return last;
+}
+
+std::string withoutReturn(std::string value) {
+    while (!value.empty() && value.back() == '\r') value.pop_back();
+    return value;
+}
+
+std::string trimmed(std::string key) {
+    key.erase(key.find_last_not_of(" \t") + 1);  // npos + 1 is 0
+    return key;
+}
+
+std::string inCapitals(std::string key) {
+    std::transform(key.begin(), key.end(), key.begin(),
+                   [](unsigned char letter) { return static_cast<char>(std::toupper(letter)); });
+    return key;
+}
+
+class SettingsCheck {
+public:
+    explicit SettingsCheck(const std::string& staticFile)
+        : settings{readDeviceSettings(staticFile)} {}
+
+    SettingsReport run() {
+        checkFiles();
+        if (settings.staticFile.content.text) {
+            checkText(FileKind::STATIC);
+            checkText(settings.dynamicSource());
+            checkLines();
+            checkMissing();
+            checkDifferences();
+            checkSafety();
+        }
+        for (auto* list : {&report.problems, &report.remarks}) {
+            for (std::string& line : *list) hideSecrets(line);
+            const std::size_t more = list->size() - std::min(list->size(), kMostReported);
+            list->resize(list->size() - more);
+            if (more > 0) list->push_back("and " + std::to_string(more) + " more");
+        }
+        return report;
+    }
+
+private:
+    void problem(const std::string& place, const std::string& text) {
+        report.problems.push_back(place + ": " + text);
+    }
+    void remark(const std::string& place, const std::string& text) {
+        report.remarks.push_back(place + ": " + text);
+    }
+    [[nodiscard]] std::string place(FileKind file) const {
+        return shownText(settings.file(file).path);
+    }
+    [[nodiscard]] std::string place(FileKind file, std::size_t line) const {
+        return place(file) + ":" + std::to_string(line);
+    }
+    [[nodiscard]] std::string place(const SettingsLine& line) const {
+        return place(line.file, line.number);
+    }
+
+    void checkFiles() {
+        report.usable = settings.obstacle == DeviceSettings::Obstacle::NONE && !settings.needsRoot;
+        if (settings.needsRoot) {
+            report.problems.emplace_back("the files cannot be read by this user: run it as root");
+        } else if (!report.usable) {
+            report.problems.push_back("the daemon would not start: " + settings.reason);
+        }
+        for (const FileKind file : {FileKind::STATIC, settings.dynamicSource()}) {
+            if (settings.file(file).content.isCut) {
+                problem(place(file), "is longer than 1 MiB; only its beginning is read");
+            }
+        }
+    }
+
+    // What a setting's key and value do not show.
+    void checkText(FileKind file) {
+        const std::string text = settings.file(file).content.text.value_or("");
+        std::size_t number = 0;
+        bool isDosReported = false;
+        for (std::size_t at = 0; at < text.size();) {
+            const std::size_t end = std::min(text.find('\n', at), text.size());
+            const std::string_view line = std::string_view{text}.substr(at, end - at);
+            ++number;
+            at = end + 1;
+            if (line.find('=') == std::string_view::npos) continue;
+            if (line.size() >= kSettingLineSize) {
+                problem(place(file, number),
+                        "has " + std::to_string(line.size()) +
+                            " characters: what follows the 299th is read as another line");
+            }
+            if (line.find('\0') != std::string_view::npos) {
+                problem(place(file, number), "has zero bytes: the rest is not read");
+            }
+            if (line.back() == '\r' && !std::exchange(isDosReported, true)) {
+                problem(place(file, number),
+                        "DOS line end: the carriage return becomes part of the value");
+            }
+        }
+    }
+
+    void checkLines() {
+        LastLines last;
+        for (const SettingsLine& line : settings.lines) {
+            if (line.fate == MergedLine::Fate::RESERVED) {
+                remark(place(line),
+                       shownText(line.key) + " is ignored: only the static file sets it");
+            } else if (line.fate == MergedLine::Fate::FULL) {
+                problem(place(line), "is ignored: there are " + std::to_string(kMostSettings) +
+                                         " settings already");
+            } else {
+                checkKey(line);
+                checkEarlier(line, std::exchange(last[line.key], &line));
+            }
+        }
+        for (const auto& [key, line] : last) {
+            const KnownSetting* known = findKnownSetting(key);
+            if (known != nullptr) checkValue(*known, *line);
+        }
+    }
+
+    void checkKey(const SettingsLine& line) {
+        if (findKnownSetting(line.key) != nullptr) return;
+        const std::string shown = shownText(line.key);
+        const std::string plain = trimmed(line.key);
+        if (plain != line.key && findKnownSetting(plain) != nullptr) {
+            problem(place(line), "the blank in front of = makes another key than " + plain);
+        } else if (line.key.front() == '#') {
+            remark(place(line), "# begins no comment: this sets the key " + shown);
+        } else if (findKnownSetting(inCapitals(plain)) != nullptr) {
+            problem(place(line), shown + " is another key than " + inCapitals(plain));
+        } else {
+            remark(place(line), "the daemon does not know " + shown);
+        }
+    }
+
+    void checkEarlier(const SettingsLine& line, const SettingsLine* earlier) {
+        const bool addsUp = line.key == "STATIC_ONLY_KEYS";
+        if (earlier == nullptr || addsUp || earlier->value == line.value) return;
+        const bool isSameFile = earlier->file == line.file;
+        std::string text = shownText(line.key);
+        const KnownSetting* known = findKnownSetting(line.key);
+        if (known != nullptr && isShowable(*known)) {
+            text += "=" + shownText(line.value, kMostOfValue) + " replaces " +
+                    shownText(earlier->value, kMostOfValue) + " of ";
+        } else {
+            text += " replaces the value of ";
+        }
+        remark(place(line),
+               text + (isSameFile ? "line " + std::to_string(earlier->number) : place(*earlier)));
+    }
+
+    void checkValue(const KnownSetting& known, const SettingsLine& line) {
+        const std::string value = withoutReturn(line.value);
+        const std::string fault = valueFault(known, value);
+        if (fault.empty()) {
+            if (known.kind == SettingKind::SWITCH && value == "0") {
+                remark(place(line), line.key + "=0: remote access is off");
+            }
+            return;
+        }
+        const std::string shown =
+            isShowable(known) ? "=" + shownText(value, kMostOfValue) : std::string{};
+        problem(place(line), line.key + shown + " " + fault);
+    }
+
+    void checkMissing() {
+        const LastLines last = lastLines(settings.lines);
+        for (const KnownSetting& known : knownSettings()) {
+            const std::string key{known.key};
+            if (known.without.empty() || !settings.value(key).empty()) continue;
+            const auto line = last.find(key);
+            const bool isThere = line != last.end();
+            problem(isThere ? place(*line->second) : place(FileKind::STATIC),
+                    key + (isThere ? " is empty: " : " is missing: ") + std::string{known.without});
+        }
+        if (settings.value("MANUAL_PORT_FORWARD") != "TRUE") return;
+        for (const char* key : {"MANUAL_EXTERNAL_HTTP_PORT", "MANUAL_EXTERNAL_HTTPS_PORT"}) {
+            if (!settings.value(key).empty()) continue;
+            problem(place(settings.dynamicSource()),
+                    std::string{key} + " is missing: no port forwarded by hand is used");
+        }
+    }
+
+    // While there is a copy, the dynamic file has no effect.
+    void checkDifferences() {
+        if (settings.dynamicSource() != FileKind::COPY) return;
+        if (!settings.dynamicFile.content.text) {
+            remark(place(FileKind::DYNAMIC), "cannot be read; the copy is used");
+            return;
+        }
+        const auto copyLines = linesOf(settings.copy, FileKind::COPY);
+        const auto fileLines = linesOf(settings.dynamicFile, FileKind::DYNAMIC);
+        const LastLines inCopy = lastLines(copyLines);
+        const LastLines inFile = lastLines(fileLines);
+        for (const auto& [key, line] : inFile) {
+            const auto other = inCopy.find(key);
+            if (other == inCopy.end()) {
+                remark(place(*line), shownText(key) + " is not in the copy, which counts");
+            } else if (other->second->value != line->value) {
+                remark(place(*line), shownText(key) + " differs from " + place(*other->second) +
+                                         ", which counts");
+            }
+        }
+        for (const auto& [key, line] : inCopy) {
+            if (inFile.count(key) == 0) {
+                remark(place(*line), shownText(key) + " is only in the copy");
+            }
+        }
+    }
+
+    void checkSafety() {
+        const Writers staticWriters = writersOf(settings.staticFile.path);
+        if (staticWriters == Writers::SOME || staticWriters == Writers::EVERYBODY) {
+            problem(place(FileKind::STATIC),
+                    "others than root can change it or its folder, and its commands run as root");
+        }
+        const FileKind source = settings.dynamicSource();
+        Writers writers = writersOf(settings.file(source).path);
+        if (writers == Writers::EVERYBODY) problem(place(source), "everybody can write it");
+        if (!settings.copy.path.empty() && creatorsOf(settings.copy.path) == Writers::EVERYBODY) {
+            problem(
+                place(FileKind::COPY),
+                "everybody can take its name before the daemon starts; it belongs into a folder that only root and the web back end can enter");
+            writers = Writers::EVERYBODY;
+        }
+        checkReserved(writers);
+    }
+
+    void checkReserved(Writers writers) {
+        std::string open;
+        bool isCommandOpen = false;
+        for (const KnownSetting& known : knownSettings()) {
+            if (!isDangerous(known) || settings.merged.isReserved(std::string{known.key})) continue;
+            open += " " + std::string{known.key};
+            isCommandOpen |= known.kind == SettingKind::COMMAND;
+        }
+        if (open.empty()) return;
+        const std::string text = "STATIC_ONLY_KEYS lacks" + open;
+        if (writers == Writers::EVERYBODY || (writers == Writers::SOME && isCommandOpen)) {
+            problem(place(FileKind::STATIC),
+                    text + ": whoever writes " + place(settings.dynamicSource()) + " sets them");
+        } else {
+            remark(place(FileKind::STATIC), text);
+        }
+    }
+
+    // A line shows keys and paths, and somebody may have written a secret there.
+    void hideSecrets(std::string& line) const {
+        const std::pair<const char*, const char*> secrets[]{{"DEVICEID", STRIPPED_DEVID_VAL},
+                                                            {"DEVICEAUTH", STRIPPED_DEVAUTH_VAL},
+                                                            {"SUBDOMAIN", STRIPPED_SUBDOMAIN_VAL}};
+        for (const auto& [key, mask] : secrets) {
+            const std::string secret = withoutReturn(settings.value(key));
+            if (secret.size() >= kShortestSecret) replaceAll(line, secret, mask);
+        }
+    }
+
+    const DeviceSettings settings;
+    SettingsReport report;
+};
+
+}  // namespace
+
+SettingsReport checkSettings(const std::string& staticFile) {
+    return SettingsCheck{staticFile}.run();
+}
+
+}  // namespace pelorus::doctor

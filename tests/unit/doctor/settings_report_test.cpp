@@ -1,0 +1,193 @@
+#include "doctor/settings_report.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <regex>
+
+#include "doctor/known_settings.h"
+#include "doctor/setting_value.h"
+#include "support/fixture.h"
+
+namespace pelorus::support {
+namespace {
+
+namespace fs = std::filesystem;
+using doctor::checkSettings;
+using doctor::SettingsReport;
+
+// The samples of the package, with a copy in a closed folder.
+class SettingsReportTest : public PelorusTest {
+protected:
+    SettingsReportTest() {
+        fs::permissions(folder, fs::perms{0755});
+        fs::create_directory(path("run"));
+        fs::permissions(path("run"), fs::perms{0700});
+        dynamic =
+            std::regex_replace(sample("dynamicconfig.ini"), std::regex{"(DEVICEID|DEVICEAUTH)=\n"},
+                               std::string{"$1="} + kDeviceAuth + "\n");
+        fixed =
+            std::regex_replace(sample("globalconfig.ini"), std::regex{"/var/lib/pelorus"}, folder);
+        fixed = std::regex_replace(fixed, std::regex{"/run/pelorus/"}, path("run/"));
+    }
+
+    static std::string sample(const std::string& name) {
+        const fs::path tree = fs::path{__FILE__}.parent_path() / "../../..";
+        return readFile(tree / "packaging/config" / name);
+    }
+    [[nodiscard]] SettingsReport check(const std::string& more = {},
+                                       const std::string& moreDynamic = {}) const {
+        writeFile("dynamicconfig.ini", dynamic + moreDynamic);
+        const auto report = checkSettings(writeFile("static.ini", fixed + more));
+        for (const auto& list : {report.problems, report.remarks}) {
+            for (const auto& line : list) EXPECT_FALSE(holds(line, kDeviceAuth)) << line;
+        }
+        return report;
+    }
+    // In tests of a user other than root, the files are not root's.
+    static Texts withoutOwners(const Texts& lines) {
+        Texts left;
+        for (const auto& line : lines) {
+            if (!holds(line, "others than root")) left.push_back(line);
+        }
+        return left;
+    }
+    // The text of the one problem, behind the name of its file.
+    [[nodiscard]] std::string problem(const std::string& more,
+                                      const std::string& moreDynamic = {}) {
+        const Texts problems = withoutOwners(check(more, moreDynamic).problems);
+        EXPECT_LE(problems.size(), 1U) << ::testing::PrintToString(problems);
+        return problems.empty() ? "" : problems.front().substr(folder.size() + 1);
+    }
+
+    std::string fixed, dynamic;
+};
+
+TEST_F(SettingsReportTest, TheSamplesHaveEveryKeyAndNoFault) {
+    const auto report = check();
+    EXPECT_TRUE(report.usable);
+    EXPECT_EQ(withoutOwners(report.problems), Texts{});
+    EXPECT_EQ(report.remarks, Texts{});
+    EXPECT_FALSE(fs::exists(path("run/dynamicconfig.ini"))) << "nothing is created";
+    const std::string both = "\n" + fixed + dynamic;
+    for (const auto& known : doctor::knownSettings()) {
+        EXPECT_TRUE(holds(both, "\n" + std::string{known.key} + "=")) << known.key;
+    }
+    const std::regex setting{"\n([A-Z0-9_]+)="};
+    for (std::sregex_iterator found{both.begin(), both.end(), setting}, end; found != end;
+         ++found) {
+        EXPECT_NE(doctor::findKnownSetting((*found)[1].str()), nullptr) << (*found)[1];
+    }
+}
+
+TEST_F(SettingsReportTest, AFaultIsNamedWithFileAndLine) {
+    const auto count = [](const std::string& text) {
+        return std::to_string(std::count(text.begin(), text.end(), '\n') + 1);
+    };
+    const std::string inStatic = "static.ini:" + count(fixed) + ": ";
+    const std::string inDynamic = "dynamicconfig.ini:" + count(dynamic) + ": ";
+    const char* const rows[][2]{
+        {"INTERNAL_HTTP_PORT=http", "INTERNAL_HTTP_PORT=http is no number"},
+        {"INTERNAL_HTTP_PORT=70000", "INTERNAL_HTTP_PORT=70000 is no port, 1 to 65535"},
+        {"MANUAL_PORT_FORWARD=true", "MANUAL_PORT_FORWARD=true is not TRUE, so it is off"},
+        {"DEVICEID=", "DEVICEID is empty: the daemon idles"},
+        {"DEVICEID = x", "the blank in front of = makes another key than DEVICEID"},
+        {"Deviceid=x", "Deviceid is another key than DEVICEID"},
+        {"DEFAULT_PORTS_ONLY=TRUE\r",
+         "DOS line end: the carriage return becomes part of the value"},
+    };
+    for (const auto& [line, fault] : rows) {
+        EXPECT_EQ(problem("", std::string{line} + "\n"), inDynamic + fault);
+    }
+    EXPECT_EQ(problem("ENABLEREMOTEACCESS=yes\n"),
+              inStatic + "ENABLEREMOTEACCESS=yes is not 1, so remote access is off");
+    EXPECT_EQ(problem("SERVER_BASE_URL=cloud.kavra.example\n"),
+              inStatic + "SERVER_BASE_URL has no // in front of the host");
+    EXPECT_EQ(problem("LOCAL_DELFORWARDURL=http://127.0.0.1:%d/%s\n"),
+              inStatic +
+                  "LOCAL_DELFORWARDURL has the wrong kind of placeholder as number 2: no "
+                  "URL is built");
+    EXPECT_EQ(problem("X=" + std::string(300, 'x') + "\n"),
+              inStatic + "has 302 characters: what follows the 299th is read as another line");
+}
+
+TEST(SettingValue, ATemplateMustTakeWhatItIsGiven) {
+    const char* const rows[][2]{
+        {"/%s?port=%d", ""},
+        {"/%s?port=%u&part=100%%", ""},
+        {"/", ""},
+        {"/%s/%d/%s", "has more than 2 placeholders: no URL is built"},
+        {"/%d", "has the wrong kind of placeholder as number 1: no URL is built"},
+        {"/%5s", "has a percent sign that is neither %s, %d, %i, %u nor %%: no URL is built"},
+        {"/%", "has a percent sign that is neither %s, %d, %i, %u nor %%: no URL is built"},
+    };
+    for (const auto& [text, fault] : rows) EXPECT_EQ(doctor::templateFault(text, "sd"), fault);
+}
+
+TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
+    const std::string copy = path("run/dynamicconfig.ini");
+    writeFile("run/dynamicconfig.ini", dynamic +
+                                           "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
+                                           "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=here\n");
+    const auto report = check("#DEVICETYPE=1\n");
+    const std::string all = ::testing::PrintToString(report.remarks);
+    for (const char* part :
+         {"# begins no comment: this sets the key #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
+          "STARTCMD is ignored: only the static", "the daemon does not know EXTRA",
+          "EXTRA is only in the copy", "DEFAULT_PORTS_ONLY=TRUE replaces FALSE of line ",
+          "SUBDOMAIN replaces the value of line ", "DEFAULT_PORTS_ONLY differs from "}) {
+        EXPECT_TRUE(holds(all, part)) << part << " in " << all;
+    }
+    EXPECT_EQ(withoutOwners(report.problems), Texts{});
+    EXPECT_TRUE(report.usable);
+}
+
+TEST_F(SettingsReportTest, AStartThatWouldFailIsForetold) {
+    EXPECT_FALSE(checkSettings(path("gone.ini")).usable);
+    EXPECT_FALSE(checkSettings(writeFile("empty.ini", "nothing here\n")).usable);
+    fixed += "DYNAMIC_CONFIG=/gone\n";
+    const auto noDynamic = check();
+    EXPECT_FALSE(noDynamic.usable);
+    EXPECT_EQ(noDynamic.problems.front(),
+              "the daemon would not start: /gone/dynamicconfig.ini cannot be read: No such file or "
+              "directory");
+    fixed += "DYNAMIC_CONFIG=" + folder + "\nDYNAMIC_CONFIG_TMP=/gone/copy.ini\n";
+    const auto noCopy = check();
+    EXPECT_FALSE(noCopy.usable);
+    EXPECT_EQ(noCopy.problems.front(),
+              "the daemon would not start: the copy /gone/copy.ini cannot be made: /gone does not "
+              "exist");
+}
+
+TEST_F(SettingsReportTest, WhatOthersCanChangeIsUnsafe) {
+    const std::string file = path("run/dynamicconfig.ini");
+    writeFile("run/dynamicconfig.ini", dynamic);
+    chmod(file.c_str(), 0666);
+    EXPECT_EQ(problem(""), "") << "nobody else can enter the folder";
+    fs::permissions(path("run"), fs::perms{0755});
+    EXPECT_EQ(problem(""), "run/dynamicconfig.ini: everybody can write it");
+    chmod(file.c_str(), 0600);
+    fs::permissions(path("run"), fs::perms{01777});
+    EXPECT_TRUE(holds(problem(""), ": everybody can take its name before the daemon starts"));
+    fixed = std::regex_replace(fixed, std::regex{"STATIC_ONLY_KEYS=.*STARTCMD.*\n"}, "");
+    const auto report = check();
+    EXPECT_TRUE(holds(::testing::PrintToString(report.problems),
+                      "STATIC_ONLY_KEYS lacks UPDATE_CONF_WITH_SERVER_CMD STARTCMD"))
+        << ::testing::PrintToString(report.problems);
+}
+
+TEST_F(SettingsReportTest, RubbishGivesABoundedReport) {
+    std::string rubbish;
+    for (int line = 0; line < 30'000; ++line) {
+        rubbish += std::string{static_cast<char>(line % 256), static_cast<char>(line % 61)} +
+                   std::to_string(line) + "=\x01\xFF\n";
+    }
+    const auto report = check("", rubbish);
+    EXPECT_EQ(report.problems.size(), 101U);
+    EXPECT_EQ(report.remarks.size(), 101U);
+    EXPECT_TRUE(std::regex_match(report.remarks.back(), std::regex{"and \\d+ more"}));
+}
+
+}  // namespace
+}  // namespace pelorus::support

@@ -3,6 +3,7 @@
 #include <poll.h>
 #include <sys/socket.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <chrono>
@@ -38,12 +39,15 @@ int askForAddress(natpmp_t& client, natpmpresp_t& response) {
         timeval pause{};
         status = getnatpmprequesttimeout(&client, &pause);
         if (status < 0) return status;
+        const auto left =
+            std::chrono::duration_cast<std::chrono::milliseconds>(end - Clock::now()).count();
+        if (left <= 0) return NATPMP_TRYAGAIN;
+        const long wanted = pause.tv_sec * 1000 + pause.tv_usec / 1000 + 1;
         pollfd waited{client.s, POLLIN, 0};
-        static_cast<void>(
-            poll(&waited, 1, static_cast<int>(pause.tv_sec * 1000 + pause.tv_usec / 1000 + 1)));
+        static_cast<void>(poll(&waited, 1, static_cast<int>(std::min<long>(wanted, left))));
         if (!hasWholeAnswer(client.s)) return NATPMP_ERR_UNDEFINEDERROR;
         status = readnatpmpresponseorretry(&client, &response);
-    } while (status == NATPMP_TRYAGAIN && Clock::now() < end);
+    } while (status == NATPMP_TRYAGAIN);
     return status;
 }
 

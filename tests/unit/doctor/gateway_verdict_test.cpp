@@ -1,0 +1,172 @@
+#include "doctor/gateway_verdict.h"
+
+#include <gtest/gtest.h>
+
+#include <set>
+#include <string>
+
+#include "doctor/address_class.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+using State = GatewayAnswer::State;
+
+std::set<Sign> signsOf(const Findings& findings) {
+    std::set<Sign> signs;
+    for (const auto& seen : findings.signs()) signs.insert(seen.sign);
+    return signs;
+}
+
+TEST(AddressClass, FollowsTheRegistry) {
+    const std::pair<const char*, AddressClass> rows[] = {
+        {"", AddressClass::NONE},
+        {"0.0.0.0", AddressClass::NONE},
+        {"256.1.1.1", AddressClass::NONE},
+        {"1.2.3", AddressClass::NONE},
+        {"fe80::1", AddressClass::NONE},
+        {"10.255.255.255", AddressClass::HOME},
+        {"11.0.0.0", AddressClass::PUBLIC},
+        {"172.15.0.1", AddressClass::PUBLIC},
+        {"172.16.0.1", AddressClass::HOME},
+        {"172.32.0.1", AddressClass::PUBLIC},
+        {"192.168.77.1", AddressClass::HOME},
+        {"100.63.255.255", AddressClass::PUBLIC},
+        {"100.64.3.9", AddressClass::SHARED},
+        {"100.127.255.255", AddressClass::SHARED},
+        {"100.128.0.0", AddressClass::PUBLIC},
+        {"127.0.0.1", AddressClass::RESERVED},
+        {"169.254.7.1", AddressClass::RESERVED},
+        {"255.255.255.255", AddressClass::RESERVED},
+        {"44.128.0.20", AddressClass::PUBLIC},
+    };
+    for (const auto& [address, kind] : rows) EXPECT_EQ(classOf(address), kind) << address;
+}
+
+struct Answers {
+    std::string name;
+    GatewayAnswer upnp, natpmp;
+    std::set<Sign> signs;
+    std::string check;
+};
+
+GatewayAnswer found(const std::string& address, bool connected = true) {
+    return {State::FOUND, "192.168.1.1", address, connected, ""};
+}
+
+const GatewayAnswer kSilent{State::SILENT, "", "", true, ""};
+const GatewayAnswer kUnknown{};
+
+class Gateway : public ::testing::TestWithParam<Answers> {};
+
+TEST_P(Gateway, IsJudged) {
+    Findings findings;
+    judgeGateway(GetParam().upnp, GetParam().natpmp, findings);
+    EXPECT_EQ(signsOf(findings), GetParam().signs);
+    ASSERT_EQ(findings.checks().size(), 1U);
+    EXPECT_EQ(findings.checks()[0].text, GetParam().check);
+}
+
+const Answers kAnswers[] = {
+    {"SharedAddress",
+     found("100.64.3.9"),
+     kSilent,
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_ADDRESS_SHARED},
+     "gateway 192.168.1.1 (UPnP): address 100.64.3.9 is shared address space"},
+    {"PublicThroughBoth",
+     found("44.128.0.20"),
+     found("44.128.0.20"),
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_ADDRESS_PUBLIC},
+     "gateway 192.168.1.1 (UPnP and NAT-PMP): address 44.128.0.20 is public"},
+    {"PrivateThroughNatpmp",
+     kUnknown,
+     found("10.0.0.2"),
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_ADDRESS_PRIVATE},
+     "gateway 192.168.1.1 (NAT-PMP): address 10.0.0.2 is private"},
+    {"UpnpWithoutAddressNatpmpWith",
+     found(""),
+     found("44.128.0.20"),
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_ADDRESS_PUBLIC},
+     "gateway 192.168.1.1 (UPnP and NAT-PMP): address 44.128.0.20 is public"},
+    {"ZeroAddress",
+     found("0.0.0.0"),
+     kSilent,
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_WITHOUT_ADDRESS},
+     "gateway 192.168.1.1 (UPnP): says its address is 0.0.0.0"},
+    {"Unconnected",
+     found("44.128.0.20", false),
+     kSilent,
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+     "gateway 192.168.1.1 (UPnP): says that it is not connected, address 44.128.0.20 is public"},
+    {"BothSilent",
+     kSilent,
+     kSilent,
+     {Sign::NO_GATEWAY_ANSWERS},
+     "gateway: no gateway answers to UPnP or NAT-PMP"},
+    {"OneSilentOneCutShort", kUnknown, kSilent, {}, "gateway: it did not answer in time"},
+};
+
+INSTANTIATE_TEST_SUITE_P(Answers, Gateway, ::testing::ValuesIn(kAnswers), [](const auto& row) {
+    return row.param.name;
+});
+
+struct Table {
+    std::string name;
+    std::vector<TableEntry> entries;
+    bool complete;
+    int published;
+    bool byHand;
+    std::set<Sign> signs;
+};
+
+const TableEntry kOurs{9091, "TCP", "192.168.1.5", 80, "Kavra"};
+const TableEntry kNeighbour{9091, "TCP", "192.168.1.9", 80, "Kavra"};
+const TableEntry kElsewhere{9092, "TCP", "192.168.1.5", 80, ""};
+
+class Mappings : public ::testing::TestWithParam<Table> {};
+
+TEST_P(Mappings, AreJudged) {
+    const Table& row = GetParam();
+    Findings findings;
+    judgeTable({row.entries, row.complete, {"192.168.1.5"}, 80, 443, row.published, 0, row.byHand},
+               findings);
+    EXPECT_EQ(signsOf(findings), row.signs);
+}
+
+const Table kTables[] = {
+    {"NothingMappedNothingPublished", {}, true, 0, false, {}},
+    {"Ours", {kOurs}, true, 9091, false, {Sign::OUR_MAPPINGS_THERE}},
+    {"OursUnderAnotherPort",
+     {kElsewhere},
+     true,
+     9091,
+     false,
+     {Sign::OUR_MAPPINGS_THERE, Sign::OUR_MAPPINGS_MISSING}},
+    {"Lost", {}, true, 9091, false, {Sign::OUR_MAPPINGS_MISSING}},
+    {"NotReadToItsEnd", {}, false, 9091, false, {}},
+    {"ForwardedByHand", {}, true, 9091, true, {}},
+    {"HeldByAnother", {kNeighbour}, true, 0, false, {Sign::PORT_HELD_BY_OTHER}},
+    {"TakenAway",
+     {kNeighbour},
+     true,
+     9091,
+     false,
+     {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
+    {"OfAnotherProtocol", {{9091, "UDP", "192.168.1.9", 80, ""}}, true, 0, false, {}},
+    {"OfAnotherProgramHere", {{9091, "TCP", "192.168.1.5", 80, "web"}}, true, 9091, false, {}},
+};
+
+INSTANTIATE_TEST_SUITE_P(Tables, Mappings, ::testing::ValuesIn(kTables), [](const auto& row) {
+    return row.param.name;
+});
+
+TEST(Mappings, NameWhoHoldsThePort) {
+    Findings findings;
+    judgeTable({{kNeighbour}, true, {"192.168.1.5"}, 80, 443, 0, 0, false}, findings);
+    EXPECT_EQ(findings.signs().at(0).text, "the gateway maps port 9091 to 192.168.1.9 (Kavra)");
+}
+
+}  // namespace
+
+}  // namespace pelorus::doctor

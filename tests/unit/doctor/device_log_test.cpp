@@ -1,0 +1,144 @@
+#include "doctor/device_log.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <zlib.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+
+#include "doctor/log_source.h"
+
+namespace pelorus::doctor {
+namespace {
+
+namespace fs = std::filesystem;
+
+const std::string kFirst =
+    "2026-11-20T10:00:00Z nas cron[1]: Pelorus: no line of the daemon\n"
+    "2026-11-20T10:00:01Z nas Pelorus: main - pelorus daemon starting up, Version: [1], PID: [1]\n"
+    "2026-11-20T10:00:09Z nas Pelorus: TavikClient::updateLocalCommStatus - Update COMMUNICATION "
+    "status : [relayed].\n";
+const std::string kSecond =
+    "2026-11-21T10:00:00Z nas Pelorus: TavikClient::updateLocalCommStatus - Update COMMUNICATION "
+    "status : [portforwarded].\n"
+    "2026-11-21T10:02:00Z nas Pelorus: DaemonControl::run - sleep 300 secs.";
+
+class DeviceLogTest : public testing::Test {
+protected:
+    DeviceLogTest() {
+        folder = fs::temp_directory_path() / "pelorus-log-XXXXXX";
+        if (mkdtemp(folder.data()) == nullptr) throw std::runtime_error{"no temporary folder"};
+        // No journal of this machine.
+        setenv("PATH", folder.c_str(), 1);
+    }
+    ~DeviceLogTest() override { fs::remove_all(folder); }
+
+    [[nodiscard]] std::string path(const std::string& name) const { return folder + "/" + name; }
+
+    std::string plain(const std::string& name, const std::string& text) {
+        std::ofstream{path(name)} << text;
+        return path(name);
+    }
+
+    std::string zipped(const std::string& name, const std::string& text) {
+        gzFile file = gzopen(path(name).c_str(), "wb");
+        gzwrite(file, text.data(), static_cast<unsigned>(text.size()));
+        gzclose(file);
+        return path(name);
+    }
+
+    Evidence look(const std::vector<std::string>& files) {
+        Evidence evidence;
+        evidence.now = Time{std::chrono::seconds{1795316400}};
+        evidence.fromElsewhere = true;
+        LogChoice choice;
+        choice.files = files;
+        choice.folder = folder;
+        lookAtLog(choice, evidence);
+        return evidence;
+    }
+
+    void expectWhole(const Evidence& evidence) {
+        ASSERT_EQ(evidence.history.size(), 2U);
+        EXPECT_EQ(evidence.history[0].reach, Reach::RELAYED);
+        EXPECT_EQ(evidence.history[1].reach, Reach::DIRECT);
+        ASSERT_FALSE(evidence.checks.empty());
+        EXPECT_NE(evidence.checks.back().text.find(", 1 start of the daemon"), std::string::npos);
+        EXPECT_EQ(evidence.now, evidence.logEnd);
+    }
+
+    std::string folder;
+};
+
+TEST_F(DeviceLogTest, FilesInAnyOrderPlainOrZippedAndRepeated) {
+    const std::string first = plain("a", kFirst);
+    const std::string second = zipped("b", kSecond);
+    const std::string both = plain("c", kFirst + kSecond);
+    for (const auto& files : std::vector<std::vector<std::string>>{
+             {first, second}, {second, first}, {second, first, second, first}, {both, second}}) {
+        expectWhole(look(files));
+    }
+}
+
+TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
+    plain("messages", kFirst + kSecond);  // the same lines once more
+    plain("syslog", kSecond);
+    const std::string rotated = zipped("syslog.2.gz", kFirst);
+    plain("syslog.1.old", kFirst);
+    fs::last_write_time(rotated, fs::file_time_type::clock::now() - std::chrono::hours{24});
+    expectWhole(look({}));
+}
+
+TEST_F(DeviceLogTest, TheJournalComesFirst) {
+    plain("syslog", kFirst);
+    plain("lines", kFirst + kSecond);
+    plain("journalctl", "#!/bin/sh\nexec /bin/cat " + path("lines") + "\n");
+    chmod(path("journalctl").c_str(), 0700);
+    expectWhole(look({}));
+}
+
+TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
+    const std::string whole = zipped("whole.gz", kFirst + std::string(100000, 'x') + kSecond);
+    std::string bytes(fs::file_size(whole) - 20, '\0');
+    std::ifstream{whole}.read(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+    const struct {
+        std::string file;
+        std::string problem;
+    } rows[]{{plain("cut.gz", bytes), "its end is missing"},
+             {path("absent"), "No such file or directory"},
+             {folder, "it is no regular file"},
+             {plain("bad.gz", bytes.substr(0, 40) + std::string(400, '?')), "it is damaged"}};
+    for (const auto& row : rows) {
+        const Evidence evidence = look({row.file});
+        ASSERT_FALSE(evidence.checks.empty());
+        EXPECT_EQ(evidence.checks[0].verdict, Check::Verdict::NOT_SEEN);
+        EXPECT_NE(evidence.checks[0].text.find(row.problem), std::string::npos)
+            << evidence.checks[0].text;
+    }
+    EXPECT_TRUE(look({path("cut.gz")}).hasLog);
+    EXPECT_FALSE(look({plain("empty", "")}).hasLog);
+    EXPECT_EQ(look({path("empty")}).untold.size(), 1U);
+}
+
+TEST(LineFilter, CutsWhereverThePiecesEnd) {
+    const std::string text = "other\nelorus 1\nx elorus 2\n" + std::string(9000, 'y') +
+                             "elorus\nelorus " + std::string(9000, 'z') + "\nelorus 3";
+    const std::vector<std::string> wanted{"elorus 1", "x elorus 2",
+                                          "elorus " + std::string(8185, 'z'), "elorus 3"};
+    for (const std::size_t size : {1U, 2U, 7U, 8192U, 100000U}) {
+        std::vector<std::string> lines;
+        LineFilter filter{[&lines](std::string_view line) {
+            if (line[0] != 'y') lines.emplace_back(line);
+        }};
+        for (std::size_t i = 0; i < text.size(); i += size) {
+            filter.take(std::string_view{text}.substr(i, size));
+        }
+        filter.finish();
+        EXPECT_EQ(lines, wanted) << size;
+    }
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

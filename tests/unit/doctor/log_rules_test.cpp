@@ -1,0 +1,85 @@
+#include "doctor/log_rules.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <set>
+#include <sstream>
+
+namespace pelorus::doctor {
+namespace {
+
+namespace fs = std::filesystem;
+
+// What calls the daemon logs by, with the severity of each.
+const std::map<std::string, int> kCalls{
+    {"logError(", 3},          {"logWarning(", 4},     {"logNotice(", 5},    {"logInfo(", 6},
+    {"logLine(LOG_ALERT,", 1}, {"logConfigError(", 3}, {"logConfigInfo(", 6}};
+
+std::string sources() {
+    std::string all;
+    for (const auto& entry : fs::recursive_directory_iterator{PELORUS_SOURCES}) {
+        const std::string path = entry.path();
+        if (entry.path().extension() != ".cpp" || path.find("/doctor/") != std::string::npos) {
+            continue;
+        }
+        std::ostringstream text;
+        text << std::ifstream{path}.rdbuf();
+        all += text.str();
+    }
+    return all;
+}
+
+TEST(LogRules, EachIsALineThatTheDaemonLogsAtThatSeverity) {
+    const std::string all = sources();
+    for (const LogRule& rule : logRules()) {
+        const std::size_t found = all.find('"' + std::string{rule.text});
+        ASSERT_NE(found, std::string::npos) << rule.text;
+        const std::size_t call = all.find_last_not_of(" \n", found - 1);
+        bool named = false;
+        for (const auto& [name, severity] : kCalls) {
+            if (call + 1 < name.size()) continue;
+            if (all.compare(call + 1 - name.size(), name.size(), name) != 0) continue;
+            named = true;
+            EXPECT_EQ(rule.severity, severity) << rule.text;
+        }
+        EXPECT_TRUE(named) << rule.text;
+    }
+}
+
+TEST(LogRules, EachWordKnowsItsValue) {
+    for (const LogRule& rule : logRules()) {
+        for (std::size_t open = rule.words.find('{'); open != std::string_view::npos;
+             open = rule.words.find('{', open + 1)) {
+            const std::string_view name =
+                rule.words.substr(open + 1, rule.words.find('}', open) - open - 1);
+            const bool number = name.size() == 1 && name[0] >= '1' && name[0] <= '8';
+            EXPECT_TRUE(number || keptNamed(name) != Kept::NOTHING) << rule.words;
+        }
+        EXPECT_EQ(rule.set.empty(), rule.words.empty()) << rule.text;
+    }
+}
+
+TEST(LogRules, FindsValues) {
+    LogValues values;
+    const LogRule* rule = findLogRule(
+        "Router::mapPort() - fail - failed to map external port: 9091, to internal port: 80, "
+        "status: -718",
+        values);
+    ASSERT_NE(rule, nullptr);
+    EXPECT_EQ(values[2], "-718");
+    rule = findLogRule(
+        "ConnectionManager::checkDNS - DNS check failed for 4-level device domain name, DNS IP "
+        "address is 203.0.113.9, local value of IP address is 203.0.113.7",
+        values);
+    ASSERT_NE(rule, nullptr);
+    EXPECT_EQ(values[0], "203.0.113.9");
+    EXPECT_EQ(values[1], "203.0.113.7");
+    EXPECT_EQ(findLogRule("DaemonControl::run - sleep x secs.", values), nullptr);
+    EXPECT_EQ(findLogRule("", values), nullptr);
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

@@ -1,0 +1,221 @@
+#include "doctor/log_story.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <vector>
+
+namespace pelorus::doctor {
+namespace {
+
+constexpr const char* kStart =
+    "main - pelorus daemon starting up, Version: [1.7.0], PID: [64], SID: [64]";
+constexpr const char* kNoUpnp =
+    "Router::upnp_discover - UPnP Discover failed to return any response.";
+constexpr const char* kNoNatpmp = "Router::natpmp_discover - failed to get External IP address";
+constexpr const char* kTunnelStarts =
+    "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.";
+constexpr const char* kTunnelUp =
+    "VPNManager::openVPNConnection() - openVPN has started successfully";
+constexpr const char* kPause = "DaemonControl::run - retry connection after 120 secs.";
+constexpr const char* kPassed =
+    "TavikClient::testPort[1] - httpGet got <port_test><status>Success</status>"
+    "<external_ip>203.0.113.7</external_ip></port_test>, 90 bytes from central server.";
+constexpr const char* kSecondNatAnswer =
+    "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status><remote_external_ip>"
+    "203.0.113.7</remote_external_ip><external_ip>100.64.3.9</external_ip></port_test>, 90 bytes "
+    "from central server.";
+constexpr const char* kSecondNat =
+    "TavikClient::testPort - Enforce connection as RELAY (double-NAT detected: Server-returned "
+    "external IP != router's external IP).";
+constexpr const char* kPublished =
+    "TavikClient::updateServerMapping - httpGet got <status>Success</status>, 24 bytes.";
+constexpr const char* kStatusDirect =
+    "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [portforwarded].";
+constexpr const char* kStatusFailed =
+    "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [failed].";
+constexpr const char* kTestFailed = "TavikClient::testPort - port map check failed.";
+constexpr const char* kRelayFailed =
+    "ConnectionManager::createRelayConnection() - failed to create VPN connection.";
+constexpr const char* kStaleTunnel =
+    "VPNManager::isVPNRunning() - unlink stale openVPN pid file /run/openvpn.pid";
+constexpr const char* kSigterm = "sigTrap - Received SIGTERM signal.";
+constexpr const char* kOff = "DaemonControl::disableRemoteAccess - remote access is disabled.";
+constexpr const char* kSecondNatFact = "the gateway says 100.64.3.9, the service sees 203.0.113.7";
+
+using Lines = std::vector<std::pair<int, const char*>>;  // seconds, and what is logged then
+
+Time at(int seconds) {
+    return Time{std::chrono::seconds{seconds}};
+}
+
+Evidence told(const Lines& lines, int now) {
+    LogStory story;
+    for (const auto& [second, text] : lines) story.take({at(second), text});
+    Evidence evidence;
+    evidence.now = at(now);
+    story.finish(evidence);
+    return evidence;
+}
+
+// "0 RELAYED: cause|...".
+std::string historyOf(const Evidence& evidence) {
+    constexpr const char* kNames[]{"direct", "relayed", "not reached", "off", "not running", "?"};
+    std::string text;
+    for (const Period& period : evidence.history) {
+        text += std::to_string(period.since.time_since_epoch().count()) + " " +
+                kNames[static_cast<int>(period.reach)] +
+                (period.address.empty() ? "" : " " + period.address) + ": " + period.cause + "|";
+    }
+    return text;
+}
+
+TEST(LogStory, HistoryAndSigns) {
+    const std::string direct =
+        "direct 203.0.113.7: the ports passed their test and were published|";
+    const struct {
+        const char* name;
+        Lines lines;
+        std::string history;
+        std::vector<Sign> signs;
+    } rows[]{
+        {"second NAT, then none",
+         {{0, kStart},
+          {5, kSecondNatAnswer},
+          {5, kSecondNat},
+          {6, kTunnelStarts},
+          {16, kTunnelUp},
+          {16, kPause},
+          {140, kPassed},
+          {141, kPublished},
+          {142, kStatusDirect}},
+         "16 relayed: " + std::string{kSecondNatFact} + "|142 " + direct,
+         {}},
+        {"errors and notices only",
+         {{0, kStart},
+          {5, kSecondNatAnswer},
+          {5, kSecondNat},
+          {6, kTunnelStarts},
+          {140, kPassed},
+          {141, kPublished},
+          {400, kPassed}},
+         "6 relayed: " + std::string{kSecondNatFact} + "|141 " + direct,
+         {}},
+        {"no result yet",
+         {{0, kStart}, {5, kNoUpnp}, {6, kTunnelStarts}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_NO_GATEWAY}},
+        {"a relay that does not come up",
+         {{0, kStart},
+          {5, kNoUpnp},
+          {6, kNoNatpmp},
+          {6, kTunnelStarts},
+          {290,
+           "VPNManager::openVPNConnection() - Failed to establish VPN connection, retries exceeded"},
+          {290, kStatusFailed},
+          {290, kRelayFailed},
+          {290, kPause}},
+         "0 not reached: the tunnel did not come up in four starts of its client|",
+         {Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_RELAY_DOES_NOT_COME_UP}},
+        {"a test that fails while relayed leaves the tunnel alone",
+         {{0, kStart},
+          {6, kTunnelStarts},
+          {16, kTunnelUp},
+          {16, kPause},
+          {150, kStatusFailed},
+          {150, kTestFailed},
+          {151, kPause}},
+         "16 relayed: the tunnel came up|",
+         {Sign::LOGGED_TEST_FAILED}},
+        {"a service that is gone",
+         {{0, kStart},
+          {9, kPassed},
+          {9, kPublished},
+          {10, kPause},
+          {250, "TavikClient::httpGet  Error: [Couldn't resolve host name]"},
+          {250,
+           "TavikClient::testPort[1] - httpGet for https://x, no response from central server."},
+          {250, kTestFailed}},
+         "9 " + direct + "250 not reached: the service's name does not resolve|",
+         {Sign::LOGGED_SERVICE_UNRESOLVED}},
+        {"a tunnel that died",
+         {{0, kStart}, {6, kTunnelStarts}, {16, kTunnelUp}, {16, kPause}, {140, kStaleTunnel}},
+         "16 relayed: the tunnel came up|140 not reached: the tunnel's client was found dead|",
+         {Sign::LOGGED_TUNNEL_DIED}},
+        {"a sudden end, and the tunnel it left",
+         {{0, kStart},
+          {6, kTunnelStarts},
+          {16, kTunnelUp},
+          {16, kPause},
+          {100, kStart},
+          {106, kTunnelStarts},
+          {116, kTunnelUp}},
+         "16 relayed: the tunnel came up|16 not running: the daemon ended suddenly|"
+         "116 relayed: an earlier daemon ended suddenly and left its tunnel running|",
+         {Sign::LOGGED_TWO_TUNNELS}},
+        {"an orderly end",
+         {{0, kStart}, {9, kPublished}, {20, kSigterm}, {20, kOff}},
+         "9 direct: the ports passed their test and were published|"
+         "20 not running: the daemon was told to end by a signal|",
+         {Sign::LOGGED_END}},
+        {"switched off",
+         {{0, kStart}, {0, kOff}},
+         "0 off: remote access is off in the settings, or this was a run with -u|",
+         {Sign::LOGGED_END, Sign::LOGGED_REMOTE_ACCESS_OFF}},
+        {"begins in the middle",
+         {{0, kPassed},
+          {3, "ConnectionManager::createConnection() - connection type 1 un-changed. x"}},
+         "0 direct 203.0.113.7: |",
+         {}},
+        {"NAT-PMP only, without progress",
+         {{0, kStart},
+          {2, kNoUpnp},
+          {3, "Router::natpmp_discover - Router's external IP address has changed!"},
+          {4, kPublished},
+          {130, kNoUpnp}},
+         "4 direct: the ports passed their test and were published|",
+         {}},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        const Evidence evidence = told(row.lines, row.lines.back().first + 60);
+        EXPECT_EQ(historyOf(evidence), row.history);
+        std::vector<Sign> signs;
+        for (const auto& [sign, fact] : evidence.signs) signs.push_back(sign);
+        std::vector<Sign> wanted = row.signs;
+        std::sort(wanted.begin(), wanted.end());
+        EXPECT_EQ(signs, wanted);
+    }
+}
+
+TEST(LogStory, TellsValuesAndTimes) {
+    const Evidence evidence = told({{0, kStart},
+                                    {5,
+                                     "Router::upnp_discover - Router's external IP address: "
+                                     "100.64.3.9 "},
+                                    {6, kSecondNatAnswer},
+                                    {7, kSecondNat},
+                                    {20, kPause}},
+                                   30);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_SECOND_NAT).text, kSecondNatFact);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_SECOND_NAT).when, at(7));
+    EXPECT_EQ(evidence.daemon.since, at(0));
+    EXPECT_EQ(evidence.daemon.nextCycle, at(140));
+    EXPECT_TRUE(evidence.hasProgressLines);
+}
+
+TEST(LogStory, KeepsTheLast2000Periods) {
+    LogStory story;
+    for (int cycle = 0; cycle < 3000; ++cycle) {
+        story.take({at(cycle * 100), kStart});
+        story.take({at(cycle * 100 + 9), kSigterm});
+        story.take({at(cycle * 100 + 9), kOff});
+    }
+    Evidence evidence;
+    story.finish(evidence);
+    EXPECT_EQ(evidence.history.size(), 2000U);
+    EXPECT_EQ(evidence.history.back().since, at(299909));
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

@@ -30,6 +30,9 @@ mark_as_advanced(nlohmann_json_INCLUDE_DIR)
 add_library(pelorus_json INTERFACE)
 target_include_directories(pelorus_json SYSTEM INTERFACE ${nlohmann_json_INCLUDE_DIR})
 
+# Rotated logs are compressed.
+find_package(ZLIB REQUIRED)
+
 # The device's structured event log; a build host rarely has it.
 add_library(pelorus_qvlog INTERFACE)
 if(NOT PELORUS_QVLOG STREQUAL "BUNDLED")

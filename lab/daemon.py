@@ -40,6 +40,7 @@ class Daemon:
                            f"{OUTPUT.read_text()}")
         self.pid = wait_until(_detached, "the detached daemon", 10)
         self._status: int | None = None
+        self._holders = 0
 
     def ended(self) -> str:
         """How the daemon ended ("SIGTERM", "exit 0"); empty while it runs."""
@@ -64,10 +65,13 @@ class Daemon:
         Its clock runs on: a pause that is over by then ends at once.
         """
         os.kill(self.pid, signal.SIGSTOP)
+        self._holders += 1
         try:
             yield
         finally:
-            os.kill(self.pid, signal.SIGCONT)
+            self._holders -= 1
+            if self._holders == 0:
+                os.kill(self.pid, signal.SIGCONT)
 
     def stop(self, number: int = signal.SIGTERM) -> str:
         """Send a signal and return how the daemon ended."""

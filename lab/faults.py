@@ -28,7 +28,7 @@ _Play = Callable[[Lab], Iterator["Met | None"]]
 
 _EVERYTHING = (COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT)
 _NOBODY = "44.128.0.99"
-_YEAR = 365 * 24 * 3600
+YEAR = 365 * 24 * 3600
 # The clock of a daemon that `adjustable_clock` started; libfaketime reads it at every look.
 _CLOCK = Path("/run/lab/clock")
 _FILLER = "filler"
@@ -244,14 +244,14 @@ def cable_unplugged(lab: Lab) -> Iterator[None]:
 @_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def clock_ahead(lab: Lab) -> Iterator[None]:
     """The clock is a year ahead."""
-    with _clock_off(lab, _YEAR):
+    with _clock_off(lab, YEAR):
         yield
 
 
 @_of(DEVICE_FAULTS, _CYCLE_ENDED)
 def clock_behind(lab: Lab) -> Iterator[None]:
     """The clock is a year behind."""
-    with _clock_off(lab, -_YEAR):
+    with _clock_off(lab, -YEAR):
         yield
 
 

@@ -10,6 +10,7 @@ import threading
 import time
 from collections.abc import Callable
 from dataclasses import dataclass
+from datetime import datetime
 from pathlib import Path
 
 # A folder of its own, which servers on other hosts do not see.
@@ -38,11 +39,14 @@ class Message:
 class Messages:
     """Receives and keeps the log; `file` holds the same lines for a human reader.
 
+    `syslog` holds them as a log daemon writes them, with the machine's time.
+
     A reader gets every line sent before its call, however busy the receiving thread is.
     """
 
     def __init__(self, file: Path) -> None:
         self.file = file
+        self.syslog = file.with_name("syslog")
         self._kept: list[Message] = []
         self._listeners: list[Callable[[Message], None]] = []
         self._lock = threading.Lock()
@@ -58,12 +62,13 @@ class Messages:
             _LINK.symlink_to(_LOG_SOCKET)
         self.file.parent.mkdir(parents=True, exist_ok=True)
         self.file.touch()
+        self.syslog.touch()
         self._receiver = receiver
         threading.Thread(target=self._receive, args=(receiver,), daemon=True).start()
 
     def stop(self) -> None:
         """Remove the log socket: what is sent until the next start is lost."""
-        self._take_waiting()
+        self.take_waiting()
         with self._lock:
             assert self._receiver is not None
             self._receiver.close()
@@ -73,7 +78,7 @@ class Messages:
     @property
     def all(self) -> list[Message]:
         """The lines so far, in order."""
-        self._take_waiting()
+        self.take_waiting()
         return list(self._kept)
 
     def listen(self, listener: Callable[[Message], None]) -> None:
@@ -92,11 +97,12 @@ class Messages:
         while self._receiver is receiver:
             with contextlib.suppress(OSError, ValueError):  # closed meanwhile
                 select.select([receiver], [], [], _LOOK_SECONDS)
-            self._take_waiting()
+            self.take_waiting()
 
-    def _take_waiting(self) -> None:
+    def take_waiting(self) -> None:
         """Store the lines waiting in the socket."""
-        with self._lock, self.file.open("a", errors="replace") as file:
+        with self._lock, self.file.open("a", errors="replace") as file, \
+                self.syslog.open("a", errors="replace") as syslog:
             while self._receiver:
                 try:
                     datagram = self._receiver.recv(65536, socket.MSG_DONTWAIT)
@@ -105,6 +111,9 @@ class Messages:
                 message = _read(datagram.rstrip(b"\n\0").decode(errors="replace"))
                 self._kept.append(message)
                 file.write(f"{message}\n")
+                stamp = datetime.now().astimezone().isoformat(timespec="milliseconds")
+                text = message.text.replace("\n", "#012")
+                syslog.write(f"{stamp} {socket.gethostname()} {message.ident}: {text}\n")
                 for listener in self._listeners:
                     listener(message)
 

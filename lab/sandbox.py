@@ -40,6 +40,12 @@ def binary() -> Path:
     return Path(os.environ.get("PELORUS", default)).absolute()
 
 
+def doctor() -> Path:
+    """The program that explains a device's state: $PELORUS_DOCTOR, or that of the release build."""
+    default = PROJECT / "build/release/src/doctor/pelorus-doctor"
+    return Path(os.environ.get("PELORUS_DOCTOR", default)).absolute()
+
+
 def is_inside() -> bool:
     """True in a process that `run` started."""
     return _INSIDE in os.environ
@@ -179,7 +185,7 @@ def _private_etc() -> None:
 
 def _set_up() -> None:
     """Mount a private folder over each one that a server or the daemon writes to."""
-    held = _open_hidden([PROJECT, binary()])
+    held = _open_hidden([PROJECT, binary(), doctor()])
     _mount("-t", "tmpfs", "lab", "/mnt")
     _private_devices()
     _private_etc()

@@ -5,10 +5,11 @@ from __future__ import annotations
 import signal
 import socket
 from collections.abc import Callable, Mapping, Sequence
+from contextlib import nullcontext
 from dataclasses import dataclass, field
 from pathlib import Path
 
-from lab import daemon, network
+from lab import daemon, doctor, network
 from lab.account import Account
 from lab.central import CentralService
 from lab.certificates import Authority
@@ -57,6 +58,8 @@ class Lab:
         self._daemon: Daemon | None = None
         self._visitor: Callable[[str], None] | None = None
         self._visits_first_stop = False
+        self.asks_doctor = False  # in each telling moment
+        self._told = False
         socket.sethostname(self.account.host_name)
         network.raise_home_network(situation.own_router)
         authority = Authority(_FOLDER / "authority")
@@ -109,14 +112,34 @@ class Lab:
         """
         self._visitor, self._visits_first_stop = visitor, first_stop
 
-    def moment(self, what: str) -> None:
-        """Tell what is special now, at the moment of the story that is most worth a visit."""
+    def moment(self, what: str, cause: str = "", ahead: float = 0) -> None:
+        """Tell what is special now, at the moment of the story that is most worth a visit.
+
+        The doctor must then name this cause first, or none if it is empty. The device's clock is
+        `ahead` seconds ahead.
+        """
+        self._told = True
         if self._visitor:
             self._visitor(what)
+        if self.asks_doctor:
+            diagnosis = self.diagnosis(ahead=ahead)
+            assert diagnosis.cause == cause, f"the doctor says\n{diagnosis}"
+
+    def diagnosis(self, *options: str, ahead: float = 0) -> doctor.Diagnosis:
+        """What the doctor concludes now. The daemon is held meanwhile.
+
+        No secret of the device may be in it.
+        """
+        runs = self._daemon is not None and not self._daemon.ended()
+        with self.daemon.held() if runs else nullcontext():
+            diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead)
+        for secret in self.account.secrets:
+            assert secret not in str(diagnosis), diagnosis
+        return diagnosis
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""
-        if self._visits_first_stop:
+        if not self._told and (self._visits_first_stop or self.asks_doctor):
             self.moment("")
         self.timeline.add("device", f"pelorus receives {signal.Signals(number).name}")
         how = self.daemon.stop(number)

@@ -159,7 +159,8 @@ def gateway_falls_silent(lab: Lab) -> None:
     _assert_in_one_cycle(lab, "Port test returned FAIL_TEST", "openVPN has started successfully")
     assert lab.central.record is None
     assert page_through_the_tunnel(lab) == PAGES[0]
-    lab.moment("the gateway is silent and has closed the ports, so the device is relayed")
+    lab.moment("the gateway is silent and has closed the ports, so the device is relayed",
+               "no-gateway-protocol")
 
     lab.step("the gateway answers again: direct in the next cycle")
     before = len(lab.central.requests)

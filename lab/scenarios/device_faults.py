@@ -98,7 +98,8 @@ def tunnel_files_cannot_be_written(lab: Lab) -> None:
         lab.start_daemon(*OPTIONS)
         wait_for_status(lab, "failed")
         wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay's own process", 20)
-    lab.moment("there is no space for the tunnel's files: the status is failed")
+    lab.moment("there is no space for the tunnel's files: the status is failed",
+               "tunnel-files-unwritable")
     lab.step("there is space again")
     wait_for_status(lab, "relayed")
     client = tunnel_client()
@@ -160,7 +161,7 @@ def clock_jumps(lab: Lab) -> None:
         assert lab.device.messages.count(_NOT_YET_VALID) > 0
         assert lab.central.record is None
         lab.moment("the clock is a year behind: certificates are not valid yet, the status is "
-                   "failed")
+                   "failed", "clock-wrong", -faults.YEAR)
     lab.step("the clock is set")
     wait_for_status(lab, "portforwarded")
     wait_for_next_cycle(lab)

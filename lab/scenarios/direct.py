@@ -267,7 +267,8 @@ def privileged_ports_refused(lab: Lab) -> None:
         assert lab.device.status == "relayed"
         assert page_through_the_tunnel(lab) == PAGES[0]
     lab.moment("the gateway refuses ports below 1024, so every cycle searches, and the device is "
-               "relayed")
+               "relayed",
+               "gateway-refuses")
 
     lab.step("every cycle searches again")
     wait_for_cycle(lab, 2)

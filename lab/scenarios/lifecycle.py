@@ -187,7 +187,8 @@ def killed_while_relayed(lab: Lab) -> None:
     assert new != old and old in daemon.running("openvpn")
 
     # A relay has one tunnel per device: a login disconnects the other client, which reconnects.
-    lab.moment("two tunnel clients of one device: the killed daemon's and the new one's")
+    lab.moment("two tunnel clients of one device: the killed daemon's and the new one's",
+               "two-tunnels")
     lab.step("the old client is disconnected and reconnects")
     lab.wait_for(lambda: lab.relay.connections() >= 3, "the old client to be back", 60)
 

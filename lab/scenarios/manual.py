@@ -47,7 +47,8 @@ def manual_ports(lab: Lab) -> None:
     wait_for_log(lab, NOT_RELAYED, 2)
     assert ports_tested(lab)[1:] == [8082] * 6
     lab.device.disk_wakes()
-    lab.moment("the settings name a port that nobody forwards: every cycle tests it, and fails")
+    lab.moment("the settings name a port that nobody forwards: every cycle tests it, and fails",
+               "manual-ports-closed")
 
     lab.step("the settings are correct again")
     lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
@@ -83,7 +84,8 @@ def manual_ports_that_are_none(lab: Lab) -> None:
     assert lab.central.record is None
     # Switching to the relay withdraws the record but leaves the gateway alone.
     assert lab.gateway.mappings() == BOTH_MAPPED
-    lab.moment("a manual port is no port number: nothing is tested, and the old mappings stay open")
+    lab.moment("a manual port is no port number: nothing is tested, and the old mappings stay open",
+               "manual-ports-invalid")
 
     lab.step("both ports are valid, and the automatic ones are removed")
     lab.device.change(MANUAL_EXTERNAL_HTTPS_PORT="1")
@@ -188,7 +190,8 @@ def manual_behind_second_nat(lab: Lab) -> None:
     assert lab.central.port_tests == [PortTest(provider.ADDRESS, 8081, "HTTP", "")] * 3
     assert lab.device.statuses_sent() == ["connecting", "failed"]
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
-    lab.moment("a second NAT blocks the ports that the user forwarded, so their test fails")
+    lab.moment("a second NAT blocks the ports that the user forwarded, so their test fails",
+               "manual-ports-closed")
 
     lab.step("the provider's NAT is gone")
     with lab.daemon.held():
@@ -216,7 +219,8 @@ def manual_after_second_nat(lab: Lab) -> None:
     assert ports_tested(lab) == [9091]
     assert lab.device.status == "failed"
     lab.moment("ports are forwarded by hand, but a second NAT was found earlier: they are not "
-               "tested")
+               "tested",
+               "manual-ruled-out")
 
     lab.step("only an automatic attempt lifts that")
     lab.device.change(MANUAL_PORT_FORWARD="FALSE")

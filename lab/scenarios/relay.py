@@ -71,7 +71,8 @@ def gateway_gives_in(lab: Lab) -> None:
     assert lab.gateway.mappings() == []
     assert lab.central.requests_for(PORT_TEST) == []
     before = len(lab.central.requests)
-    lab.moment("the gateway refuses every port, so the device is reached through the relay")
+    lab.moment("the gateway refuses every port, so the device is reached through the relay",
+               "gateway-refuses")
 
     lab.step("the gateway allows ports; the service is slow to publish")
     lab.central.misbehave(PORT_FORWARD, Fault(delay=3, times=1))
@@ -98,7 +99,8 @@ def relay_down_at_first(lab: Lab) -> None:
     assert lab.device.messages.count(_NOT_UP) == 28
     assert lab.device.messages.count(_STOPS) == 4
     wait_until(lambda: daemon.running("openvpn") == [], "the last client to end", 20)
-    lab.moment("the relay does not answer: four tunnel clients came and went, the status is failed")
+    lab.moment("the relay does not answer: four tunnel clients came and went, the status is failed",
+               "relay-does-not-come-up")
 
     lab.step("the relay is back")
     lab.relay.start()
@@ -173,7 +175,8 @@ def second_nat(lab: Lab) -> None:
     assert asked(lab) == [COMM_STATUS, PORT_FORWARD, WAIT, PORT_TEST, PORT_FORWARD]
     assert lab.device.messages.count(_DOUBLE_NAT) == 1
     assert lab.gateway.mappings() == []
-    lab.moment("the gateway's address belongs to a second NAT, so the device is relayed")
+    lab.moment("the gateway's address belongs to a second NAT, so the device is relayed",
+               "second-nat")
 
     lab.step("the second NAT goes away")
     with lab.daemon.held():
@@ -197,7 +200,8 @@ def second_nat_appears(lab: Lab) -> None:
     assert lab.central.port_tests[-1] == PortTest(provider.CUSTOMER_ADDRESS, 9091, "HTTP", "")
     assert lab.central.record is None
     assert lab.gateway.mappings() == []
-    lab.moment("a second NAT has appeared, so the device that was reached directly is relayed")
+    lab.moment("a second NAT has appeared, so the device that was reached directly is relayed",
+               "second-nat")
 
     lab.step("the second NAT goes away")
     with lab.daemon.held():
@@ -233,7 +237,8 @@ def address_behind_the_gateways_back(lab: Lab) -> None:
     assert lab.gateway.mappings() == BOTH_MAPPED[1:]
     assert tunnel_client() == client
     lab.moment("the service sees another address than the gateway reports, so the device is "
-               "relayed")
+               "relayed",
+               "second-nat")
 
     lab.step("the gateway's own address is back in use")
     lab.gateway.unblock(9091)

@@ -45,7 +45,8 @@ def service_says_wait(lab: Lab) -> None:
     lab.central.wait_seconds = 300
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, f"{PAUSE}300 secs.")
-    lab.moment("the service says wait: nothing is mapped or tested, and no tunnel is started")
+    lab.moment("the service says wait: nothing is mapped or tested, and no tunnel is started",
+               "service-asks-to-wait")
     lab.central.wait_seconds = 0
     assert asked(lab) == [COMM_STATUS, PORT_FORWARD, WAIT]
     assert lab.gateway.mappings() == []
@@ -87,7 +88,8 @@ def service_is_gone(lab: Lab) -> None:
     """The service is down: failed, nothing published; forwarded once it is back."""
     lab.central.stop()
     _assert_fails(lab, "Error: [Couldn't connect to server]", _TRIES + 4)
-    lab.moment("the service is down: nothing is published, the status is failed")
+    lab.moment("the service is down: nothing is published, the status is failed",
+               "service-unreachable")
     lab.step("the service is back")
     lab.central.start()
     _assert_recovers(lab)
@@ -122,7 +124,8 @@ def service_is_an_impostor(lab: Lab) -> None:
     _assert_fails(lab, "Error: [SSL peer certificate or SSH remote key was not OK]", _TRIES + 3)
     assert _questions(lab) == len(lab.central.requests)
     lab.moment("the service shows a wrong certificate: the device tells it no secret, the status "
-               "is failed")
+               "is failed",
+               "service-certificate")
     lab.step("the certificate is correct")
     lab.central.show_certificate_of(SERVICE_HOST)
     _assert_recovers(lab)
@@ -134,7 +137,8 @@ def service_says_too_much(lab: Lab) -> None:
     lab.central.misbehave(PORT_TEST, Fault(body=_passed(lab, _LONGEST_ANSWER + 1)))
     _assert_fails(lab, "TavikClient curlRcvData - Buffer overrun detected, read buffer too small, "
                        "transfer aborted", _TRIES)
-    lab.moment("the answer to a port test is a byte too long: it is ignored, the status is failed")
+    lab.moment("the answer to a port test is a byte too long: it is ignored, the status is failed",
+               "service-answers-nonsense")
     lab.step("the answer is a byte shorter")
     lab.central.misbehave(PORT_TEST, Fault(body=_passed(lab, _LONGEST_ANSWER)))
     _assert_recovers(lab)
@@ -167,7 +171,8 @@ def service_goes_away_later(lab: Lab) -> None:
     # The withdrawal did not get through: the service sends clients to closed ports for a while.
     assert lab.device.messages.count("failed to delete port mapping info.") == 1
     assert lab.central.record == PUBLISHED
-    lab.moment("the service went down while the device was reached: the ports are closed again")
+    lab.moment("the service went down while the device was reached: the ports are closed again",
+               "service-unreachable")
 
     lab.step("the service is back")
     lab.central.start()
@@ -355,7 +360,8 @@ def _play_fault(lab: Lab, fault: Fault, error: str, count: int, *operations: str
     for operation in operations:
         lab.central.misbehave(operation, fault)
     _assert_fails(lab, error, count)
-    lab.moment("the service misbehaves in each port test: the status is failed")
+    lab.moment("the service misbehaves in each port test: the status is failed",
+               "service-answers-nonsense" if fault.body else "service-silent")
     lab.step("the service answers properly")
     for operation in operations:
         lab.central.misbehave(operation, None)

@@ -105,7 +105,8 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "relayed"]
     assert tunnel_client() == client
     lab.moment("the gateway maps ports, but the disk sleeps: no port is tested, the device stays "
-               "relayed")
+               "relayed",
+               "disk-asleep")
 
     lab.step("another program requests a new connection")
     lab.device.change(COMMUNICATION_STATUS="connecting")
@@ -122,7 +123,8 @@ def credentials_missing(lab: Lab) -> None:
     """Without credentials the daemon idles silently; it starts working as soon as they appear."""
     lab.start_daemon(*OPTIONS)
     wait_for_log(lab, _IDLE, 2)
-    lab.moment("there are no credentials: the daemon asks nobody anything")
+    lab.moment("there are no credentials: the daemon asks nobody anything",
+               "credentials-missing")
 
     lab.step("an identifier without its authorisation is not enough")
     lab.device.change(DEVICEID=lab.account.device_id)
@@ -214,7 +216,8 @@ def rubbish_in_place_of_settings(lab: Lab) -> None:
     wait_for_log(lab, _IDLE, 2)
     assert lab.central.requests == []
     assert lab.gateway.mappings() == []
-    lab.moment("the dynamic configuration is rubbish: the daemon idles")
+    lab.moment("the dynamic configuration is rubbish: the daemon idles",
+               "credentials-missing")
 
     lab.step("the configuration is repaired")
     for path in (DYNAMIC_FILE, DYNAMIC_COPY):

@@ -90,27 +90,41 @@ int openForReading(const std::string& path, Link link) {
 
 }  // namespace
 
-FileHandle openForeignFile(const std::string& path, Part part, Link link) {
+ForeignText readForeignFile(const std::string& path, Part part, Link link) {
+    ForeignText found;
     const Descriptor file{openForReading(path, link)};
     struct stat status {};
     const bool isOpen = file.number >= 0 && fstat(file.number, &status) == 0;
-    if (!isOpen && errno != ELOOP) return nullptr;
+    if (!isOpen) found.error = errno;
+    if (!isOpen && found.error != ELOOP) return found;
     // Some kernels let everybody give a second name to a file that he may not read.
     const bool isStolen =
         link == Link::OWN && status.st_nlink > 1 && (status.st_mode & S_IROTH) == 0;
     if (!isOpen || !S_ISREG(status.st_mode) || isStolen) {
-        logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
-        errno = EINVAL;
-        return nullptr;
+        found.error = EINVAL;
+        found.isRefused = true;
+        return found;
     }
     const off_t excess = status.st_size - static_cast<off_t>(kMostForeignBytes);
     const off_t offset = part == Part::TAIL ? std::max<off_t>(excess, 0) : 0;
-    if (excess > 0 && part == Part::HEAD) {
+    found.isCut = excess > 0;
+    found.text = readFrom(file.number, offset);
+    if (!found.text) found.error = errno;
+    return found;
+}
+
+FileHandle openForeignFile(const std::string& path, Part part, Link link) {
+    const ForeignText found = readForeignFile(path, part, link);
+    if (found.isCut && part == Part::HEAD) {
         logWarning("openForeignFile - only the first %zu bytes of %s are read.\n",
                    kMostForeignBytes, path.c_str());
     }
-    const auto text = readFrom(file.number, offset);
-    return text ? streamOf(*text) : nullptr;
+    if (found.text) return streamOf(*found.text);
+    if (found.isRefused) {
+        logWarning("openForeignFile - %s is not a regular file and is not read.\n", path.c_str());
+    }
+    errno = found.error;
+    return nullptr;
 }
 
 FileHandle createFile(const std::string& path, mode_t mode) {

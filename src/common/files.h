@@ -4,6 +4,7 @@
 
 #include <sys/types.h>
 
+#include <optional>
 #include <string>
 
 #include "common/handles.h"
@@ -21,6 +22,19 @@ enum class Link {
     REFUSE,  ///< no symbolic link
     OWN,     ///< one of root, or of the file's owner; neither does a hard link give others access
 };
+
+/// What a foreign file held when it was read.
+struct ForeignText {
+    std::optional<std::string> text{};  ///< nothing when the file cannot be read
+    int error = 0;                      ///< errno then
+    bool isRefused = false;  ///< it is not a regular file, or a link that is not followed
+    bool isCut = false;      ///< it is longer than kMostForeignBytes
+};
+
+/// Reads a file that another program may write. Never blocks and never logs.
+[[nodiscard]] ForeignText readForeignFile(const std::string& path,
+                                          Part part = Part::HEAD,
+                                          Link link = Link::REFUSE);
 
 /// Opens a file that another program may write, and reads it at once: what the handle delivers is
 /// what the file held at that moment. Never blocks. Null, and errno set, when the file cannot be

@@ -5,26 +5,20 @@
 
 #include <array>
 #include <cstdarg>
-#include <sstream>
 #include <utility>
 
 #include "common/files.h"
 #include "common/log.h"
 #include "common/shell.h"
 #include "config/replace_command.h"
-#include "config/setting_line.h"
 
 namespace pelorus {
 
 namespace {
 
-constexpr std::size_t kLineSize = 300;        // bytes of one fgets, terminator included
 constexpr std::size_t kConfigLogSize = 1024;  // bytes of one log line of this store
 constexpr mode_t kCopyMode = 0666;            // other programs on the device rewrite the copy
 
-constexpr std::size_t kMostSettings = 10'000;
-
-const std::string kStaticOnlyKey = "STATIC_ONLY_KEYS";
 const std::string kTmpPathKey = "DYNAMIC_CONFIG_TMP";
 
 __attribute__((format(printf, 1, 2))) void logConfigError(const char* format, ...) {
@@ -47,7 +41,7 @@ bool namesACopy(const std::string& path) {
 
 // False when the copy is incomplete.
 bool copyFile(std::FILE* from, std::FILE* to) {
-    std::array<char, kLineSize> piece{};
+    std::array<char, kSettingLineSize> piece{};
     while (std::fgets(piece.data(), piece.size(), from) != nullptr) {
         if (std::fputs(piece.data(), to) == EOF) return false;
     }
@@ -109,10 +103,11 @@ bool GlobalConfig::loadStaticConfig() {
                        configPath.c_str());
         return false;
     }
-    staticOnlyKeys.clear();
+    properties.clearReserved();
+    reportedKeys.clear();
     isFullReported = false;
-    const bool parsed = merge(file.get(), Source::STATIC);
-    if (properties.empty()) {
+    const bool parsed = merge(file.get(), SettingsMap::Source::STATIC);
+    if (properties.values.empty()) {
         // Says "open", but means a file without a single setting.
         logConfigError("GlobalConfig::loadConfigSettings() - failed to open config file: [%s].\n",
                        configPath.c_str());
@@ -132,7 +127,7 @@ bool GlobalConfig::loadDynamicConfig(const std::string& path) {
         return false;
     }
     logConfigInfo("LOADING dynamic config file settings.\n");
-    return merge(file.get(), Source::DYNAMIC);
+    return merge(file.get(), SettingsMap::Source::DYNAMIC);
 }
 
 bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath) {
@@ -149,7 +144,7 @@ bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::
             copyPath.c_str());
         return false;
     }
-    const bool parsed = merge(copy.get(), Source::DYNAMIC);
+    const bool parsed = merge(copy.get(), SettingsMap::Source::DYNAMIC);
     copy.reset();
     struct stat status {};
     if (stat(copyPath.c_str(), &status) == 0) tmpModTime = status.st_mtime;
@@ -157,66 +152,45 @@ bool GlobalConfig::loadTemporaryCopy(const std::string& dynamicPath, const std::
 }
 
 bool GlobalConfig::loadConfigSettings(std::FILE* file) {
-    return merge(file, Source::STATIC);
+    return merge(file, SettingsMap::Source::STATIC);
 }
 
-bool GlobalConfig::merge(std::FILE* file, Source source) {
-    std::array<char, kLineSize> line{};
-    std::string key;  // outside the loop to keep its memory: the map copies new keys only
-    while (std::fgets(line.data(), line.size(), file) != nullptr) {
-        const Setting setting = parseSettingLine(line.data());
-        if (setting.key.empty()) continue;
-        key = setting.key;
-        if (!isAccepted(key, source)) continue;
-        if (source == Source::STATIC && key == kStaticOnlyKey) addStaticOnlyKeys(setting.value);
-        const auto [position, isNew] = properties.try_emplace(key, setting.value);
-        if (!isNew) position->second = setting.value;
-    }
+bool GlobalConfig::merge(std::FILE* file, SettingsMap::Source source) {
+    properties.merge(file, source, [this](const MergedLine& line) {
+        if (line.fate != MergedLine::Fate::TAKEN) reportIgnored(line);
+    });
     return true;
 }
 
-// Others can write the dynamic file's copy: it must not set what they could run commands with, nor
-// fill the memory.
-bool GlobalConfig::isAccepted(const std::string& key, Source source) {
-    if (source == Source::STATIC) return true;
-    const auto reserved = staticOnlyKeys.find(key);
-    if (reserved != staticOnlyKeys.end()) {
-        if (!std::exchange(reserved->second, true)) {
+void GlobalConfig::reportIgnored(const MergedLine& line) {
+    if (line.fate == MergedLine::Fate::RESERVED) {
+        if (reportedKeys.insert(line.key).second) {
             logConfigError(
                 "GlobalConfig::merge() - only the static config file may set %s, ignored.\n",
-                key.c_str());
+                line.key.c_str());
         }
-        return false;
-    }
-    if (properties.size() < kMostSettings || properties.count(key) != 0) return true;
-    if (!std::exchange(isFullReported, true)) {
+    } else if (!std::exchange(isFullReported, true)) {
         logConfigError("GlobalConfig::merge() - %zu settings are the most, further ones ignored.\n",
                        kMostSettings);
     }
-    return false;
-}
-
-void GlobalConfig::addStaticOnlyKeys(std::string_view keys) {
-    std::istringstream words{std::string{keys}};
-    for (std::string key; words >> key;) staticOnlyKeys.try_emplace(key, false);
 }
 
 const std::string& GlobalConfig::getProperty(const std::string& key) {
     static const std::string absent;
-    if (properties.empty()) loadConfig(configPath);
+    if (properties.values.empty()) loadConfig(configPath);
     if (key != kTmpPathKey) reloadChangedCopy();
-    const auto found = properties.find(key);
-    return found == properties.end() ? absent : found->second;
+    const auto found = properties.values.find(key);
+    return found == properties.values.end() ? absent : found->second;
 }
 
 std::string GlobalConfig::knownProperty(const std::string& key) const {
-    const auto found = properties.find(key);
-    return found == properties.end() ? std::string{} : found->second;
+    const auto found = properties.values.find(key);
+    return found == properties.values.end() ? std::string{} : found->second;
 }
 
 void GlobalConfig::reloadChangedCopy() {
-    const auto found = properties.find(kTmpPathKey);
-    if (found == properties.end() || !namesACopy(found->second)) return;
+    const auto found = properties.values.find(kTmpPathKey);
+    if (found == properties.values.end() || !namesACopy(found->second)) return;
     const std::string& path = found->second;
     struct stat status {};
     if (stat(path.c_str(), &status) != 0) {
@@ -231,15 +205,15 @@ void GlobalConfig::reloadChangedCopy() {
     const FileHandle copy = openForeignFile(path);
     if (!copy) return;
     logConfigInfo("Reload dynamicconfig.ini file.\n");
-    merge(copy.get(), Source::DYNAMIC);
+    merge(copy.get(), SettingsMap::Source::DYNAMIC);
 }
 
 std::string& GlobalConfig::setProperty(const std::string& key,
                                        const std::string& value,
                                        bool writeThrough) {
-    if (properties.empty()) loadConfig(configPath);
+    if (properties.values.empty()) loadConfig(configPath);
     if (writeThrough) writeToStaticFile(key, knownProperty(key), value);
-    return properties[key] = value;
+    return properties.values[key] = value;
 }
 
 void GlobalConfig::writeToStaticFile(const std::string& key,
@@ -249,7 +223,7 @@ void GlobalConfig::writeToStaticFile(const std::string& key,
     const std::string text =
         isNew ? key + "=" + value + "\n" : replaceCommand(key, oldValue, value, configPath);
     // A truncated line or command would damage the file, and so would a second line.
-    if (text.size() >= kLineSize || (key + value).find('\n') != std::string::npos) {
+    if (text.size() >= kSettingLineSize || (key + value).find('\n') != std::string::npos) {
         logConfigError(
             "GlobalConfig::setProperty() - setting cannot be written to config file: %s\n",
             configPath.c_str());
@@ -275,8 +249,8 @@ void GlobalConfig::writeToStaticFile(const std::string& key,
 }
 
 void GlobalConfig::deleteProperty(const std::string& key) {
-    if (properties.empty()) loadConfig(configPath);
-    properties.erase(key);
+    if (properties.values.empty()) loadConfig(configPath);
+    properties.values.erase(key);
 }
 
 bool GlobalConfig::refresh() {

@@ -4,9 +4,10 @@
 
 #include <cstdio>
 #include <ctime>
-#include <map>
+#include <set>
 #include <string>
-#include <string_view>
+
+#include "config/settings_map.h"
 
 namespace pelorus {
 
@@ -59,11 +60,8 @@ private:
     GlobalConfig() = default;
     ~GlobalConfig() = default;
 
-    enum class Source { STATIC, DYNAMIC };
-
-    bool merge(std::FILE* file, Source source);
-    void addStaticOnlyKeys(std::string_view keys);
-    bool isAccepted(const std::string& key, Source source);
+    bool merge(std::FILE* file, SettingsMap::Source source);
+    void reportIgnored(const MergedLine& line);
     bool loadStaticConfig();
     bool loadDynamicConfig(const std::string& path);
     bool loadTemporaryCopy(const std::string& dynamicPath, const std::string& copyPath);
@@ -74,8 +72,8 @@ private:
 
     time_t tmpModTime = 0;
     std::string configPath;
-    std::map<std::string, std::string> properties;
-    std::map<std::string, bool> staticOnlyKeys;  // true: a line elsewhere has been reported
+    SettingsMap properties;
+    std::set<std::string> reportedKeys;  // set elsewhere although they are reserved
     bool isFullReported = false;
 };
 

@@ -1,14 +1,128 @@
 #include "doctor/diagnosis.h"
 
+#include <array>
+#include <utility>
+
 namespace pelorus::doctor {
 
-Diagnosis diagnose(const Evidence& evidence) {
+namespace {
+
+// What the log says is over when the other has been seen by now.
+constexpr std::array<std::pair<Sign, Sign>, 9> kOver{{
+    {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
+    {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
+    {Sign::LOGGED_SERVICE_CERTIFICATE, Sign::SERVICE_REACHED},
+    {Sign::LOGGED_NO_GATEWAY, Sign::GATEWAY_FOUND},
+    {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+    {Sign::LOGGED_NAMES_LEAD_ELSEWHERE, Sign::NAMES_RIGHT},
+    {Sign::LOGGED_NAMES_UNRESOLVED, Sign::NAMES_RIGHT},
+    {Sign::LOGGED_BACK_END_SILENT, Sign::BACK_END_ANSWERS},
+    {Sign::LOGGED_TUNNEL_DIED, Sign::TUNNEL_RUNS},
+}};
+
+// Live evidence beats the log, and the reader is told so.
+void dropWhatIsOver(Evidence& evidence) {
+    for (const auto& [logged, now] : kOver) {
+        if (!evidence.has(logged) || !evidence.has(now)) continue;
+        const std::string over = "over since the log: " + evidence.signs.at(logged).text +
+                                 "; now: " + evidence.signs.at(now).text;
+        evidence.signs.erase(logged);
+        evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
+        evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+    }
+}
+
+Reach reachOfWord(const std::string& word) {
+    if (word == "portforwarded") return Reach::DIRECT;
+    if (word == "relayed") return Reach::RELAYED;
+    if (word == "failed" || word == "connecting") return Reach::NOT_REACHED;
+    return Reach::UNKNOWN;
+}
+
+// What the daemon last said, by the settings or by the log.
+Reach lastSaid(const Evidence& evidence) {
+    const Reach logged = evidence.history.empty() ? Reach::UNKNOWN : evidence.history.back().reach;
+    // Without the back end the word in the settings is not kept up to date.
+    const bool isOutdated =
+        evidence.has(Sign::LOGGED_BACK_END_SILENT) || evidence.has(Sign::LOGGED_BACK_END_REFUSES);
+    const Reach word = reachOfWord(evidence.statusWord);
+    return word == Reach::UNKNOWN || (isOutdated && logged != Reach::UNKNOWN) ? logged : word;
+}
+
+Reach reachOf(const Evidence& evidence) {
+    const bool isOff =
+        evidence.has(Sign::REMOTE_ACCESS_OFF) || evidence.has(Sign::LOGGED_REMOTE_ACCESS_OFF);
+    const bool ended = evidence.fromElsewhere ? evidence.has(Sign::LOGGED_END) ||
+                                                    evidence.has(Sign::LOGGED_START_FAILED)
+                                              : evidence.has(Sign::DAEMON_GONE);
+    if (ended) return isOff ? Reach::SWITCHED_OFF : Reach::NOT_RUNNING;
+    if (evidence.has(Sign::NO_INTERFACE_UP) || evidence.has(Sign::NO_ADDRESS)) {
+        return Reach::NOT_REACHED;
+    }
+    if (evidence.has(Sign::CREDENTIALS_MISSING)) return Reach::NOT_REACHED;
+    const Reach said = lastSaid(evidence);
+    if (said == Reach::RELAYED && evidence.has(Sign::TUNNEL_GONE)) return Reach::NOT_REACHED;
+    if (said == Reach::UNKNOWN) {
+        if (evidence.has(Sign::TUNNEL_RUNS)) return Reach::RELAYED;
+        if (evidence.has(Sign::LOGGED_ATTEMPT) || evidence.has(Sign::DAEMON_RUNS)) {
+            return Reach::NOT_REACHED;
+        }
+    }
+    return said;
+}
+
+void tellSince(const Evidence& evidence, Diagnosis& diagnosis) {
+    const auto& history = evidence.history;
+    auto last = history.rbegin();
+    if (last == history.rend() || last->reach != diagnosis.reach) return;
+    while (last + 1 != history.rend() && (last + 1)->reach == diagnosis.reach) ++last;
+    diagnosis.since = last->since;
+    if (last + 1 != history.rend()) diagnosis.before = *(last + 1);
+}
+
+void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {
+    if (diagnosis.reach != Reach::DIRECT) return;
+    diagnosis.address = evidence.setting("EXTERNAL_IP");
+    if (diagnosis.address.empty() && !evidence.history.empty()) {
+        diagnosis.address = evidence.history.back().address;
+    }
+    const std::string http = evidence.setting("EXTERNAL_HTTP_PORT");
+    const std::string https = evidence.setting("EXTERNAL_HTTPS_PORT");
+    if (!http.empty() && !https.empty()) diagnosis.ports = http + " and " + https;
+}
+
+}  // namespace
+
+Diagnosis diagnose(const Evidence& seen) {
+    Evidence evidence = seen;
+    dropWhatIsOver(evidence);
     Diagnosis diagnosis;
     diagnosis.now = evidence.now;
+    diagnosis.fromElsewhere = evidence.fromElsewhere;
+    diagnosis.reach = reachOf(evidence);
+    tellSince(evidence, diagnosis);
+    tellAddress(evidence, diagnosis);
+    diagnosis.causes = findCauses(evidence, diagnosis.reach);
+    diagnosis.checks = std::move(evidence.checks);
+    diagnosis.history = std::move(evidence.history);
+    diagnosis.daemon = std::move(evidence.daemon);
+    diagnosis.untold = std::move(evidence.untold);
     return diagnosis;
 }
 
-int exitStatus(const Diagnosis& /*diagnosis*/) {
+int exitStatus(const Diagnosis& diagnosis) {
+    switch (diagnosis.reach) {
+        case Reach::DIRECT:
+            return 0;
+        case Reach::RELAYED:
+            return 1;
+        case Reach::NOT_REACHED:
+        case Reach::SWITCHED_OFF:
+        case Reach::NOT_RUNNING:
+            return 2;
+        case Reach::UNKNOWN:
+            break;
+    }
     return 3;
 }
 

@@ -65,6 +65,7 @@ enum class Sign {
     LOGGED_END,           ///< it ended in an orderly way
     LOGGED_REMOTE_ACCESS_OFF,
     LOGGED_CREDENTIALS_MISSING,
+    LOGGED_NO_ADDRESS,  ///< no interface of the device has an address
     LOGGED_ATTEMPT,     ///< a start or a change, with no result yet
     LOGGED_SECOND_NAT,  ///< the service sees another address than the gateway's
     LOGGED_NO_GATEWAY,
@@ -75,7 +76,8 @@ enum class Sign {
     LOGGED_TEST_SKIPPED_DISK,
     LOGGED_SERVICE_WAIT,
     LOGGED_SERVICE_UNRESOLVED,
-    LOGGED_SERVICE_SILENT,  ///< no answer to requests
+    LOGGED_SERVICE_UNREACHABLE,  ///< no connection
+    LOGGED_SERVICE_SILENT,       ///< a connection, but no answer to requests
     LOGGED_SERVICE_CERTIFICATE,
     LOGGED_SERVICE_NONSENSE,
     LOGGED_OTHER_DEVICE,
@@ -90,6 +92,8 @@ enum class Sign {
     LOGGED_TUNNEL_NO_OUTPUT,  ///< the start command did not run, or could not write
     LOGGED_TUNNEL_DIED,
     LOGGED_TWO_TUNNELS,
+
+    CHANGED_SINCE,  ///< what the log says is over, by what is seen now
 };
 
 }  // namespace pelorus::doctor

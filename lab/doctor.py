@@ -1,0 +1,62 @@
+"""The doctor beside the daemon on the device: runs it and reads what it says."""
+
+from __future__ import annotations
+
+import json
+import subprocess
+from dataclasses import dataclass
+from typing import Any
+
+from lab import clock, device, network, sandbox
+from lab.messages import Messages
+from lab.support import LabError
+
+_PATIENCE = 30
+
+
+@dataclass(frozen=True)
+class Diagnosis:
+    """What the doctor says, as it says it to other programs."""
+
+    everything: dict[str, Any]
+    status: int
+
+    @property
+    def cause(self) -> str:
+        """The cause that it names first; empty when it names none."""
+        causes = self.everything["causes"]
+        return str(causes[0]["name"]) if causes else ""
+
+    @property
+    def fact(self) -> str:
+        """The first fact that proves it; empty without a cause."""
+        causes = self.everything["causes"]
+        return str(causes[0]["facts"][0]["text"]) if causes else ""
+
+    def __str__(self) -> str:
+        return json.dumps(self.everything, indent=1)
+
+
+def examine(messages: Messages, *options: str, ahead: float = 0) -> Diagnosis:
+    """Let the doctor conclude from everything it may look at.
+
+    Its clock is that of the machine, or `ahead` seconds ahead of it.
+    """
+    done = run(messages, "--json", *options, ahead=ahead)
+    try:
+        return Diagnosis(json.loads(done.stdout), done.returncode)
+    except ValueError as error:
+        raise LabError(f"the doctor ended with {done.returncode} and said {done.stdout!r}, "
+                       f"{done.stderr!r}") from error
+
+
+def run(messages: Messages, *options: str,
+        ahead: float = 0) -> subprocess.CompletedProcess[str]:
+    """Run it on the device with these options, over the log so far."""
+    messages.take_waiting()
+    environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
+                   *(clock.at(ahead) if ahead else ())]
+    return subprocess.run(
+        network.command(network.DEVICE, "env", "-i", *environment, str(sandbox.doctor()),
+                        "--log", str(messages.syslog), *options),
+        stdin=subprocess.DEVNULL, capture_output=True, text=True, timeout=_PATIENCE, check=False)

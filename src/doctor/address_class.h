@@ -1,0 +1,25 @@
+// What kind of IPv4 address a gateway has.
+#ifndef PELORUS_DOCTOR_ADDRESS_CLASS_H
+#define PELORUS_DOCTOR_ADDRESS_CLASS_H
+
+#include <string>
+
+namespace pelorus::doctor {
+
+enum class AddressClass {
+    NONE,      ///< no address at all: empty, unreadable, or in 0.0.0.0/8
+    HOME,      ///< of a private network
+    RESERVED,  ///< of no use in the internet for another reason: loopback, link-local, multicast
+    SHARED,    ///< 100.64.0.0/10, between a provider and its customers
+    PUBLIC,
+};
+
+/// The class of an address in dotted form.
+[[nodiscard]] AddressClass classOf(const std::string& address);
+
+/// True for an address that a host in a home can have: private or link-local.
+[[nodiscard]] bool isAtHome(const std::string& address);
+
+}  // namespace pelorus::doctor
+
+#endif

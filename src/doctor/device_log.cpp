@@ -1,0 +1,169 @@
+#include "doctor/device_log.h"
+
+#include <algorithm>
+#include <array>
+#include <ctime>
+#include <functional>
+#include <memory>
+#include <set>
+
+#include "doctor/log_line.h"
+#include "doctor/log_source.h"
+#include "doctor/log_story.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr std::array<const char*, 3> kSystemLogs{"syslog", "messages", "user.log"};
+constexpr std::size_t kMostHashes = 4096;
+
+// Passes on the lines of several files, without what a file repeats of the ones before.
+class LineOrder {
+public:
+    LineOrder(LogStory& listener, Time today) : story{listener}, now{today} {}
+
+    void beginFile() {
+        repeating = story.end().has_value();
+        newest = story.end().value_or(Time{});
+    }
+
+    void take(std::string_view text) {
+        const auto line = readLogLine(text, now);
+        if (!line) return;
+        if (repeating && line->when <= newest && isRepeated(*line)) return;
+        if (line->when > newest) repeating = false;
+        remember(*line);
+        story.take(*line);
+    }
+
+private:
+    [[nodiscard]] bool isRepeated(const LogLine& line) const {
+        return line.when < newest || hashes.count(std::hash<std::string_view>{}(line.text)) != 0;
+    }
+
+    // The lines of the newest second.
+    void remember(const LogLine& line) {
+        if (line.when != hashTime) hashes.clear();
+        hashTime = line.when;
+        if (hashes.size() < kMostHashes) hashes.insert(std::hash<std::string_view>{}(line.text));
+    }
+
+    LogStory& story;
+    Time now;
+    Time newest{};
+    Time hashTime{};
+    std::set<std::size_t> hashes;
+    bool repeating = false;
+};
+
+std::string shownTime(Time when) {
+    const std::time_t seconds = when.time_since_epoch().count();
+    std::tm parts{};
+    std::array<char, 32> text{};
+    if (localtime_r(&seconds, &parts) == nullptr) return "?";
+    text[std::strftime(text.data(), text.size() - 1, "%Y-%m-%d %H:%M", &parts)] = '\0';
+    return text.data();
+}
+
+std::string shownPath(const std::string& path) {
+    constexpr std::size_t kLongestPath = 100;
+    std::string shown = path == "-" ? "standard input" : path.substr(0, kLongestPath);
+    std::replace_if(
+        shown.begin(), shown.end(), [](char letter) { return letter < ' ' || letter > '~'; }, '?');
+    return shown;
+}
+
+void cannotSee(const std::string& text, Evidence& evidence) {
+    evidence.checks.push_back({Check::Verdict::NOT_SEEN, Source::LOG, text});
+}
+
+struct Entry {
+    std::string path;
+    Time begin{};
+    std::unique_ptr<LogStream> stream;  // only of what cannot be read twice
+};
+
+// Files are closed in between: there may be many.
+std::vector<Entry> inOrder(const std::vector<std::string>& files, Evidence& evidence) {
+    std::vector<Entry> entries;
+    for (const std::string& path : files) {
+        auto stream = std::make_unique<LogStream>(path, true);
+        if (!stream->isOpen()) {
+            cannotSee("log " + shownPath(path) + ": " + stream->problem, evidence);
+            continue;
+        }
+        const Time begin = stream->firstStamp(evidence.now).value_or(Time::max());
+        if (!stream->isPipe()) stream.reset();
+        entries.push_back({path, begin, std::move(stream)});
+    }
+    std::stable_sort(entries.begin(), entries.end(),
+                     [](const Entry& a, const Entry& b) { return a.begin < b.begin; });
+    return entries;
+}
+
+void readFile(LogStream& stream, const std::string& path, LineOrder& order, Evidence& evidence) {
+    order.beginFile();
+    const bool whole =
+        stream.isOpen() && stream.read([&order](std::string_view line) { order.take(line); });
+    if (!whole) cannotSee("log " + shownPath(path) + ": " + stream.problem, evidence);
+}
+
+void readChosen(const LogChoice& choice, LineOrder& order, Evidence& evidence) {
+    for (Entry& entry : inOrder(choice.files, evidence)) {
+        if (!entry.stream) entry.stream = std::make_unique<LogStream>(entry.path, true);
+        readFile(*entry.stream, entry.path, order, evidence);
+        entry.stream.reset();
+    }
+}
+
+// Each of the system's logs may hold the same lines: the first that has any is enough.
+void readSystemLogs(const std::string& folder,
+                    LogStory& story,
+                    LineOrder& order,
+                    Evidence& evidence) {
+    for (const char* const name : kSystemLogs) {
+        for (const std::string& path : rotatedLogs(folder, name)) {
+            LogStream stream{path, false};
+            readFile(stream, path, order, evidence);
+        }
+        if (story.end()) return;
+    }
+}
+
+void summarise(const LogStory& story, Evidence& evidence) {
+    const std::string more = "run the daemon with -l 6";
+    if (!story.end()) {
+        cannotSee("log: it has no line of the daemon", evidence);
+        evidence.untold.push_back("how it was before: no log of the daemon was found; " + more);
+        return;
+    }
+    const int starts = story.starts();
+    evidence.checks.push_back(
+        {Check::Verdict::OK, Source::LOG,
+         "log from " + shownTime(*story.begin()) + " to " + shownTime(*story.end()) + ", " +
+             (starts == 1 ? "1 start" : std::to_string(starts) + " starts") + " of the daemon"});
+    if (evidence.hasProgressLines) return;
+    evidence.untold.push_back(
+        "when and why it was relayed or went on to another cycle: the log has errors and notices "
+        "only; " +
+        more);
+}
+
+}  // namespace
+
+void lookAtLog(const LogChoice& choice, Evidence& evidence) {
+    LogStory story;
+    LineOrder order{story, evidence.now};
+    if (!choice.files.empty()) {
+        readChosen(choice, order, evidence);
+    } else {
+        readJournal([&order](std::string_view line) { order.take(line); });
+        if (!story.end()) readSystemLogs(choice.folder, story, order, evidence);
+    }
+    if (evidence.fromElsewhere && story.end()) evidence.now = *story.end();
+    story.finish(evidence);
+    summarise(story, evidence);
+}
+
+}  // namespace pelorus::doctor

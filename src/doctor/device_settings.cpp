@@ -1,0 +1,166 @@
+#include "doctor/device_settings.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+
+#include "common/handles.h"
+#include "doctor/shown_text.h"
+#include "doctor/write_obstacle.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr std::size_t kMostLines = 20'000;
+
+bool namesACopy(const std::string& path) {
+    return !path.empty() && path != "empty";
+}
+
+// Root puts the file there: any link is followed.
+ForeignText readStaticFile(const std::string& path) {
+    const MallocHandle<char> target{realpath(path.c_str(), nullptr)};
+    if (target) return readForeignFile(target.get());
+    ForeignText none;
+    none.error = errno;
+    return none;
+}
+
+void mergeLines(SettingsMap& map,
+                std::string text,
+                FileKind kind,
+                std::vector<SettingsLine>& lines) {
+    if (text.empty()) return;
+    const FileHandle stream{fmemopen(text.data(), text.size(), "r")};
+    if (!stream) return;
+    const auto source =
+        kind == FileKind::STATIC ? SettingsMap::Source::STATIC : SettingsMap::Source::DYNAMIC;
+    std::size_t count = 0;
+    map.merge(stream.get(), source, [&](const MergedLine& line) {
+        if (++count > kMostLines) return;
+        lines.push_back({kind, line.number, line.key, std::string{line.value}, line.fate});
+    });
+}
+
+class SettingsReader {
+public:
+    DeviceSettings read(const std::string& staticFile) {
+        found.staticFile = {staticFile, readStaticFile(staticFile)};
+        if (!merge(found.staticFile, FileKind::STATIC)) {
+            return refuse(DeviceSettings::Obstacle::STATIC_FILE, found.staticFile);
+        }
+        if (found.merged.values.empty()) {
+            found.obstacle = DeviceSettings::Obstacle::STATIC_FILE;
+            found.reason = shownText(staticFile) + " holds no setting";
+            return found;
+        }
+        readDynamicSettings();
+        return found;
+    }
+
+private:
+    bool merge(const SettingsFile& file, FileKind kind) {
+        if (!file.content.text) return false;
+        mergeLines(found.merged, *file.content.text, kind, found.lines);
+        return true;
+    }
+
+    // A lookup merges a copy that is there, which may even name other files.
+    void readDynamicSettings() {
+        const bool isCopyRead = openCopy() && merge(found.copy, FileKind::COPY);
+        const std::string before = found.copy.path;
+        found.dynamicFile.path = found.value("DYNAMIC_CONFIG") + "/dynamicconfig.ini";
+        found.dynamicFile.content = readForeignFile(found.dynamicFile.path, Part::HEAD, Link::OWN);
+        if (!openCopy()) {
+            readDynamicFile();
+        } else if (isCopyRead && found.copy.path == before) {
+            return;
+        } else if (!merge(found.copy, FileKind::COPY)) {
+            if (found.copy.needsRoot()) {
+                found.needsRoot = true;
+            } else {
+                checkNewCopy();
+                if (found.obstacle == DeviceSettings::Obstacle::NONE) readDynamicFile();
+            }
+        }
+    }
+
+    // False when none is configured.
+    bool openCopy() {
+        const std::string path = found.value("DYNAMIC_CONFIG_TMP");
+        if (!namesACopy(path)) {
+            found.copy = {};
+            return false;
+        }
+        found.copy = {path, readForeignFile(path)};
+        return true;
+    }
+
+    void checkNewCopy() {
+        const std::string obstacle = writeObstacle(found.copy.path);
+        if (obstacle.empty()) return;
+        found.obstacle = DeviceSettings::Obstacle::DYNAMIC_FILE;
+        found.reason = "the copy " + shownText(found.copy.path) + " cannot be made: " + obstacle;
+    }
+
+    void readDynamicFile() {
+        if (merge(found.dynamicFile, FileKind::DYNAMIC)) return;
+        refuse(DeviceSettings::Obstacle::DYNAMIC_FILE, found.dynamicFile);
+    }
+
+    DeviceSettings& refuse(DeviceSettings::Obstacle obstacle, const SettingsFile& file) {
+        if (file.needsRoot()) {
+            found.needsRoot = true;
+        } else {
+            found.obstacle = obstacle;
+            found.reason = file.trouble();
+        }
+        return found;
+    }
+
+    DeviceSettings found{};
+};
+
+}  // namespace
+
+bool SettingsFile::needsRoot() const {
+    const bool isForbidden = content.error == EACCES || content.error == EPERM;
+    return !content.text && isForbidden && geteuid() != 0;
+}
+
+std::string SettingsFile::trouble() const {
+    const std::string cause = content.isRefused ? "not a regular file, or a link of somebody else"
+                                                : std::strerror(content.error);
+    return shownText(path) + " cannot be read: " + cause;
+}
+
+const SettingsFile& DeviceSettings::file(FileKind kind) const {
+    if (kind == FileKind::STATIC) return staticFile;
+    return kind == FileKind::DYNAMIC ? dynamicFile : copy;
+}
+
+FileKind DeviceSettings::dynamicSource() const {
+    return copy.content.text ? FileKind::COPY : FileKind::DYNAMIC;
+}
+
+std::string DeviceSettings::value(const std::string& key) const {
+    const auto found = merged.values.find(key);
+    return found == merged.values.end() ? std::string{} : found->second;
+}
+
+DeviceSettings readDeviceSettings(const std::string& staticFile) {
+    return SettingsReader{}.read(staticFile);
+}
+
+std::vector<SettingsLine> linesOf(const SettingsFile& file, FileKind kind) {
+    std::vector<SettingsLine> lines;
+    SettingsMap map;
+    if (file.content.text) mergeLines(map, *file.content.text, kind, lines);
+    return lines;
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,182 @@
+#include "doctor/gateway_verdict.h"
+
+#include <algorithm>
+#include <array>
+#include <set>
+
+#include "common/text.h"
+#include "doctor/address_class.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+using State = GatewayAnswer::State;
+
+// The external ports that are tried first.
+constexpr int kHttpPort = 9091;
+constexpr int kHttpsPort = 9444;
+
+bool isFound(const GatewayAnswer& answer) {
+    return answer.state == State::FOUND;
+}
+
+bool tellsAddress(const GatewayAnswer& answer) {
+    return isFound(answer) && classOf(answer.address) != AddressClass::NONE;
+}
+
+// The answer that counts: one with an address before one without, UPnP before NAT-PMP.
+const GatewayAnswer& chosen(const GatewayAnswer& upnp, const GatewayAnswer& natpmp) {
+    if (tellsAddress(upnp) || !isFound(natpmp)) return upnp;
+    return tellsAddress(natpmp) || !isFound(upnp) ? natpmp : upnp;
+}
+
+std::string protocols(const GatewayAnswer& upnp, const GatewayAnswer& natpmp) {
+    if (isFound(upnp) && isFound(natpmp) && upnp.gateway == natpmp.gateway) {
+        return " (UPnP and NAT-PMP)";
+    }
+    return &chosen(upnp, natpmp) == &upnp ? " (UPnP)" : " (NAT-PMP)";
+}
+
+struct ClassWords {
+    AddressClass kind;
+    Sign sign;
+    const char* words;
+};
+
+constexpr std::array<ClassWords, 5> kClasses{{
+    {AddressClass::NONE, Sign::GATEWAY_WITHOUT_ADDRESS, " is none"},
+    {AddressClass::HOME, Sign::GATEWAY_ADDRESS_PRIVATE, " is private"},
+    {AddressClass::RESERVED, Sign::GATEWAY_ADDRESS_PRIVATE, " is not an internet address"},
+    {AddressClass::SHARED, Sign::GATEWAY_ADDRESS_SHARED, " is shared address space"},
+    {AddressClass::PUBLIC, Sign::GATEWAY_ADDRESS_PUBLIC, " is public"},
+}};
+
+const ClassWords& wordsFor(AddressClass kind) {
+    return *std::find_if(kClasses.begin(), kClasses.end(),
+                         [kind](const ClassWords& row) { return row.kind == kind; });
+}
+
+void judgeAddress(const GatewayAnswer& answer, const std::string& name, Findings& findings) {
+    const std::string line = "gateway " + name + ": ";
+    if (!tellsAddress(answer)) {
+        const std::string text = answer.address.empty() ? "has no internet address"
+                                                        : "says its address is " + answer.address;
+        findings.add(Sign::GATEWAY_WITHOUT_ADDRESS, "the gateway " + text);
+        findings.problem(line + text);
+        return;
+    }
+    const ClassWords& row = wordsFor(classOf(answer.address));
+    const std::string text = "address " + answer.address + row.words;
+    findings.add(row.sign, text);
+    if (!answer.connected) {
+        findings.add(Sign::GATEWAY_WITHOUT_ADDRESS, "the gateway says that it is not connected");
+        findings.problem(line + "says that it is not connected, " + text);
+    } else if (row.kind == AddressClass::PUBLIC) {
+        findings.ok(line + text);
+    } else {
+        findings.problem(line + text);
+    }
+}
+
+void judgeSilence(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
+    const std::string device = upnp.unanswered;
+    if (upnp.state == State::SILENT && natpmp.state == State::SILENT) {
+        const std::string text = device.empty()
+                                     ? "no gateway answers to UPnP or NAT-PMP"
+                                     : device + " announces itself, but does not act as a gateway";
+        findings.add(Sign::NO_GATEWAY_ANSWERS, text);
+        findings.problem("gateway: " + text);
+        return;
+    }
+    findings.notSeen(device.empty() ? "gateway: it did not answer in time"
+                                    : "gateway: " + device + " did not answer in time");
+}
+
+bool isOwn(const GatewayTable& table, const TableEntry& entry) {
+    const auto& own = table.ownAddresses;
+    return std::find(own.begin(), own.end(), entry.client) != own.end();
+}
+
+bool isOurs(const GatewayTable& table, const TableEntry& entry) {
+    const bool named = entry.description.empty() || entry.description == "Kavra" ||
+                       entry.description == "KavraSSL";
+    const bool leadsToServer = entry.internalPort == table.internalHttpPort ||
+                               entry.internalPort == table.internalHttpsPort;
+    return named && leadsToServer && isOwn(table, entry);
+}
+
+void append(std::string& list, const std::string& item) {
+    list += (list.empty() ? "" : ", ") + item;
+}
+
+void judgeOurs(const GatewayTable& table, Findings& findings) {
+    std::string ours;
+    bool published = false;
+    for (const TableEntry& entry : table.entries) {
+        if (entry.protocol != "TCP" || !isOwn(table, entry)) continue;
+        published = published || entry.externalPort == table.externalHttpPort;
+        if (!isOurs(table, entry)) continue;
+        append(ours,
+               std::to_string(entry.externalPort) + " to " + std::to_string(entry.internalPort));
+    }
+    if (!ours.empty()) {
+        findings.add(Sign::OUR_MAPPINGS_THERE, "the gateway maps " + ours + " of this device");
+        findings.ok("gateway maps " + ours + " of this device");
+    }
+    if (!table.complete || table.byHand || table.externalHttpPort <= 0 || published) return;
+    const std::string text = "port " + std::to_string(table.externalHttpPort) +
+                             " is published, but the gateway does not map it to this device";
+    findings.add(Sign::OUR_MAPPINGS_MISSING, text);
+    findings.problem("gateway's table: " + text);
+}
+
+void judgeOthers(const GatewayTable& table, Findings& findings) {
+    const std::set<int> published{table.externalHttpPort, table.externalHttpsPort};
+    std::set<int> wanted{kHttpPort, kHttpsPort};
+    wanted.insert(published.begin(), published.end());
+    wanted.erase(0);
+    std::string held;
+    bool inTheWay = table.externalHttpPort <= 0;
+    for (const TableEntry& entry : table.entries) {
+        if (entry.protocol != "TCP" || isOwn(table, entry)) continue;
+        if (wanted.erase(entry.externalPort) == 0) continue;
+        inTheWay = inTheWay || published.count(entry.externalPort) != 0;
+        const std::string name =
+            entry.description.empty() ? "" : " (" + plainText(entry.description, 40) + ")";
+        append(held, std::to_string(entry.externalPort) + " to " + entry.client + name);
+    }
+    if (held.empty()) return;
+    findings.add(Sign::PORT_HELD_BY_OTHER, "the gateway maps port " + held);
+    const std::string line = "gateway maps port " + held + ", another device";
+    if (inTheWay) {
+        findings.problem(line);
+    } else {
+        findings.ok(line);
+    }
+}
+
+}  // namespace
+
+std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natpmp) {
+    const GatewayAnswer& answer = chosen(upnp, natpmp);
+    return tellsAddress(answer) ? answer.address : std::string{};
+}
+
+void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
+    if (!isFound(upnp) && !isFound(natpmp)) {
+        judgeSilence(upnp, natpmp, findings);
+        return;
+    }
+    const GatewayAnswer& answer = chosen(upnp, natpmp);
+    const std::string name = answer.gateway + protocols(upnp, natpmp);
+    findings.add(Sign::GATEWAY_FOUND, "gateway " + name);
+    judgeAddress(answer, name, findings);
+}
+
+void judgeTable(const GatewayTable& table, Findings& findings) {
+    judgeOurs(table, findings);
+    judgeOthers(table, findings);
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,56 @@
+// What follows from the answers of a gateway.
+#ifndef PELORUS_DOCTOR_GATEWAY_VERDICT_H
+#define PELORUS_DOCTOR_GATEWAY_VERDICT_H
+
+#include <string>
+#include <vector>
+
+#include "doctor/findings.h"
+
+namespace pelorus::doctor {
+
+/// What came of asking the gateway through one protocol.
+struct GatewayAnswer {
+    enum class State {
+        UNKNOWN,  ///< not asked, or not finished in time
+        SILENT,
+        FOUND,
+    };
+    State state = State::UNKNOWN;
+    std::string gateway;     ///< its own address
+    std::string address;     ///< the external address it tells; empty if it tells none
+    bool connected = true;   ///< false: it says that it is not
+    std::string unanswered;  ///< a device that announces itself and then says nothing useful
+};
+
+/// Concludes from both protocols together.
+void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings);
+
+/// The external address that the answers tell, of whichever class; empty if there is none.
+[[nodiscard]] std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natpmp);
+
+/// One entry of a gateway's table.
+struct TableEntry {
+    int externalPort{};
+    std::string protocol;
+    std::string client;
+    int internalPort{};
+    std::string description;
+};
+
+/// A gateway's table, and what it is compared with.
+struct GatewayTable {
+    std::vector<TableEntry> entries;
+    bool complete = false;  ///< read to its end
+    std::vector<std::string> ownAddresses;
+    int internalHttpPort{}, internalHttpsPort{};
+    int externalHttpPort{}, externalHttpsPort{};  ///< as published; 0 if not
+    bool byHand = false;  ///< the user forwards the published ports; they need not be in the table
+};
+
+/// Concludes from a table of mappings.
+void judgeTable(const GatewayTable& table, Findings& findings);
+
+}  // namespace pelorus::doctor
+
+#endif

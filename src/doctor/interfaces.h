@@ -1,0 +1,46 @@
+// The device's own network interfaces and its default route.
+#ifndef PELORUS_DOCTOR_INTERFACES_H
+#define PELORUS_DOCTOR_INTERFACES_H
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "doctor/findings.h"
+
+namespace pelorus::doctor {
+
+struct Interface {
+    std::string name;
+    bool up = false;                     ///< and its cable plugged in
+    bool tunnel = false;                 ///< point to point; else it leads to a LAN
+    std::vector<std::string> addresses;  ///< IPv4, dotted
+};
+
+/// All but the loopback and the bridges of containers.
+[[nodiscard]] std::vector<Interface> interfaces();
+
+struct DefaultRoute {
+    std::string interface;
+    std::string gateway;  ///< empty when the route leads to no gateway
+};
+
+/// The default route of the least metric in @p table, which is in the form of /proc/net/route.
+[[nodiscard]] std::optional<DefaultRoute> readDefaultRoute(const std::string& table);
+/// That of this device.
+[[nodiscard]] std::optional<DefaultRoute> defaultRoute();
+
+/// The device's address in its LAN, preferably on the interface of the default route; empty if it
+/// has none.
+[[nodiscard]] std::string lanAddress();
+/// Every IPv4 address of this device but those of the loopback.
+[[nodiscard]] std::vector<std::string> ownAddresses();
+
+/// Concludes from the interfaces and the route.
+void judgeNetwork(const std::vector<Interface>& all,
+                  const std::optional<DefaultRoute>& route,
+                  Findings& findings);
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -1,0 +1,195 @@
+#include "doctor/log_line.h"
+
+#include <array>
+#include <cctype>
+#include <ctime>
+
+namespace pelorus::doctor {
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr int kEarliestYear = 1970;
+constexpr int kLatestYear = 9999;
+constexpr int kTmYear = 1900;
+constexpr int kYearsBack = 4;  // the last 29 February may be that far away
+// Clocks and time zones of two devices differ by less.
+constexpr auto kFuture = 24h;
+// A host name may stand before the program, and a "facility.severity" between the two.
+constexpr int kMostWords = 3;
+constexpr std::string_view kMonths = "JanFebMarAprMayJunJulAugSepOctNovDec";
+constexpr std::string_view kNewline = "#012";  // as some system loggers write it
+
+bool isDigit(char character) {
+    return std::isdigit(static_cast<unsigned char>(character)) != 0;
+}
+
+bool take(std::string_view& text, char wanted) {
+    if (text.empty() || text.front() != wanted) return false;
+    text.remove_prefix(1);
+    return true;
+}
+
+// Exactly @p digits digits.
+std::optional<int> takeNumber(std::string_view& text, std::size_t digits, int least, int most) {
+    if (text.size() < digits) return std::nullopt;
+    int number = 0;
+    for (std::size_t i = 0; i < digits; ++i) {
+        if (!isDigit(text[i])) return std::nullopt;
+        number = number * 10 + (text[i] - '0');
+    }
+    if (number < least || number > most) return std::nullopt;
+    text.remove_prefix(digits);
+    return number;
+}
+
+bool takeClock(std::string_view& text, std::tm& parts) {
+    const auto hour = takeNumber(text, 2, 0, 23);
+    if (!hour || !take(text, ':')) return false;
+    const auto minute = takeNumber(text, 2, 0, 59);
+    if (!minute || !take(text, ':')) return false;
+    const auto second = takeNumber(text, 2, 0, 60);
+    if (!second) return false;
+    parts.tm_hour = *hour;
+    parts.tm_min = *minute;
+    parts.tm_sec = *second;
+    return true;
+}
+
+// Seconds east of Greenwich. Empty when no zone follows, which is no error.
+std::optional<int> takeZone(std::string_view& text) {
+    if (take(text, 'Z')) return 0;
+    if (text.empty() || (text.front() != '+' && text.front() != '-')) return std::nullopt;
+    std::string_view rest = text;
+    const int sign = rest.front() == '-' ? -1 : 1;
+    rest.remove_prefix(1);
+    const auto hours = takeNumber(rest, 2, 0, 23);
+    if (!hours) return std::nullopt;
+    take(rest, ':');
+    const auto minutes = takeNumber(rest, 2, 0, 59);
+    if (!minutes) return std::nullopt;
+    text = rest;
+    return sign * (*hours * 3600 + *minutes * 60);
+}
+
+Time localTime(std::tm parts) {
+    parts.tm_isdst = -1;
+    return Time{std::chrono::seconds{std::mktime(&parts)}};
+}
+
+std::optional<Time> takeIsoStamp(std::string_view& line) {
+    std::string_view rest = line;
+    std::tm parts{};
+    const auto year = takeNumber(rest, 4, kEarliestYear, kLatestYear);
+    if (!year || !take(rest, '-')) return std::nullopt;
+    const auto month = takeNumber(rest, 2, 1, 12);
+    if (!month || !take(rest, '-')) return std::nullopt;
+    const auto day = takeNumber(rest, 2, 1, 31);
+    if (!day || !(take(rest, 'T') || take(rest, ' ')) || !takeClock(rest, parts)) {
+        return std::nullopt;
+    }
+    if (take(rest, '.') || take(rest, ',')) {
+        while (!rest.empty() && isDigit(rest.front())) rest.remove_prefix(1);
+    }
+    const auto zone = takeZone(rest);
+    if (!take(rest, ' ')) return std::nullopt;
+    parts.tm_year = *year - kTmYear;
+    parts.tm_mon = *month - 1;
+    parts.tm_mday = *day;
+    line = rest;
+    if (!zone) return localTime(parts);
+    return Time{std::chrono::seconds{timegm(&parts) - *zone}};
+}
+
+std::optional<Time> latestNotInFuture(std::tm parts, Time now) {
+    const std::time_t seconds = now.time_since_epoch().count();
+    std::tm today{};
+    if (localtime_r(&seconds, &today) == nullptr) return std::nullopt;
+    // A day that a year does not have becomes one of March.
+    for (int back = -1; back <= kYearsBack; ++back) {
+        std::tm tried = parts;
+        tried.tm_year = today.tm_year - back;
+        tried.tm_isdst = -1;
+        const Time when{std::chrono::seconds{std::mktime(&tried)}};
+        if (tried.tm_mday == parts.tm_mday && when <= now + kFuture) return when;
+    }
+    return std::nullopt;
+}
+
+std::optional<Time> takeClassicStamp(std::string_view& line, Time now) {
+    constexpr std::size_t kName = 3;
+    if (line.size() < kName + 1) return std::nullopt;
+    const std::size_t month = kMonths.find(line.substr(0, kName));
+    if (month == std::string_view::npos || month % kName != 0) return std::nullopt;
+    std::string_view rest = line.substr(kName);
+    if (!take(rest, ' ')) return std::nullopt;
+    std::tm parts{};
+    const auto day = take(rest, ' ') ? takeNumber(rest, 1, 1, 9) : takeNumber(rest, 2, 1, 31);
+    if (!day || !take(rest, ' ') || !takeClock(rest, parts) || !take(rest, ' ')) {
+        return std::nullopt;
+    }
+    parts.tm_mon = static_cast<int>(month / kName);
+    parts.tm_mday = *day;
+    const auto when = latestNotInFuture(parts, now);
+    if (when) line = rest;
+    return when;
+}
+
+void skipPriority(std::string_view& line) {
+    if (line.empty() || line.front() != '<') return;
+    const std::size_t end = line.find_first_not_of("0123456789", 1);
+    if (end != std::string_view::npos && end > 1 && line[end] == '>') line.remove_prefix(end + 1);
+}
+
+// "Pelorus:" or "Pelorus[123]:".
+bool isDaemon(std::string_view word) {
+    constexpr std::string_view kRest = "elorus";
+    if (word.size() < kRest.size() + 2 || word.back() != ':') return false;
+    if ((word.front() != 'P' && word.front() != 'p') || word.substr(1, kRest.size()) != kRest) {
+        return false;
+    }
+    std::string_view pid = word.substr(kRest.size() + 1, word.size() - kRest.size() - 2);
+    if (pid.empty()) return true;
+    if (pid.size() < 3 || pid.front() != '[' || pid.back() != ']') return false;
+    pid = pid.substr(1, pid.size() - 2);
+    return pid.find_first_not_of("0123456789") == std::string_view::npos;
+}
+
+std::string_view withoutEnd(std::string_view text) {
+    for (;;) {
+        while (!text.empty() && static_cast<unsigned char>(text.back()) <= ' ') {
+            text.remove_suffix(1);
+        }
+        if (text.size() < kNewline.size() ||
+            text.substr(text.size() - kNewline.size()) != kNewline) {
+            return text;
+        }
+        text.remove_suffix(kNewline.size());
+    }
+}
+
+}  // namespace
+
+std::optional<Time> takeStamp(std::string_view& line, Time now) {
+    skipPriority(line);
+    if (!line.empty() && isDigit(line.front())) return takeIsoStamp(line);
+    return takeClassicStamp(line, now);
+}
+
+std::optional<LogLine> readLogLine(std::string_view line, Time now) {
+    const auto when = takeStamp(line, now);
+    if (!when) return std::nullopt;
+    for (int words = 0; words < kMostWords; ++words) {
+        const std::size_t end = line.find(' ');
+        const std::string_view word = line.substr(0, end);
+        line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
+        if (isDaemon(word)) return LogLine{*when, withoutEnd(line)};
+        if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;
+        // Between host and program only "facility.severity".
+        if (words == 1 && word.find('.') == std::string_view::npos) return std::nullopt;
+    }
+    return std::nullopt;
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,29 @@
+// One line of a system log.
+#ifndef PELORUS_DOCTOR_LOG_LINE_H
+#define PELORUS_DOCTOR_LOG_LINE_H
+
+#include <optional>
+#include <string_view>
+
+#include "doctor/evidence.h"
+
+namespace pelorus::doctor {
+
+/// A line that the daemon logged.
+struct LogLine {
+    Time when{};
+    std::string_view text;  ///< without trailing blanks; part of the line that was read
+};
+
+/// Reads the time stamp at the start of @p line: classic ("Nov  2 12:07:01", local time, in the
+/// latest year that does not lie in the future of @p now) or RFC 3339, both also after "<134>".
+/// Removes it from @p line. Empty when there is none.
+std::optional<Time> takeStamp(std::string_view& line, Time now);
+
+/// Reads @p line if it is the daemon's: the program must be called exactly "Pelorus" or "pelorus",
+/// with or without a pid.
+std::optional<LogLine> readLogLine(std::string_view line, Time now);
+
+}  // namespace pelorus::doctor
+
+#endif

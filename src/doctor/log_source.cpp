@@ -1,0 +1,194 @@
+#include "doctor/log_source.h"
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <system_error>
+#include <utility>
+
+#include "doctor/log_line.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr std::size_t kChunk = 256 * 1024;
+constexpr std::size_t kHead = 64 * 1024;
+constexpr std::size_t kLongestLine = 8 * 1024;
+constexpr std::string_view kMark = "elorus";  // however the name begins
+
+const char* find(std::string_view text, std::string_view wanted) {
+    return static_cast<const char*>(memmem(text.data(), text.size(), wanted.data(), wanted.size()));
+}
+
+// What reading takes part in may be anything but a device, which could hang or act.
+int openToRead(const std::string& path, bool orPipe, std::string& problem) {
+    if (path == "-") return dup(STDIN_FILENO);
+    const int descriptor = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC | O_NOCTTY);
+    if (descriptor < 0) {
+        problem = std::generic_category().message(errno);
+        return -1;
+    }
+    struct stat status {};
+    const bool known = fstat(descriptor, &status) == 0;
+    if (known && S_ISREG(status.st_mode)) return descriptor;
+    if (known && orPipe && S_ISFIFO(status.st_mode)) {
+        static_cast<void>(fcntl(descriptor, F_SETFL, O_RDONLY));
+        return descriptor;
+    }
+    close(descriptor);
+    problem = "it is no regular file";
+    return -1;
+}
+
+}  // namespace
+
+void LineFilter::take(std::string_view piece) {
+    const void* const last = memrchr(piece.data(), '\n', piece.size());
+    if (last == nullptr) {
+        open.append(piece.substr(0, kLongestLine - std::min(open.size(), kLongestLine)));
+        return;
+    }
+    const std::size_t whole =
+        static_cast<std::size_t>(static_cast<const char*>(last) - piece.data());
+    if (!open.empty()) {
+        const std::size_t first = piece.find('\n');
+        open.append(
+            piece.substr(0, std::min(first, kLongestLine - std::min(open.size(), kLongestLine))));
+        finish();
+        piece.remove_prefix(first + 1);
+        takeWholeLines(piece.substr(0, whole < first + 1 ? 0 : whole - first));
+        piece.remove_prefix(whole < first + 1 ? 0 : whole - first);
+    } else {
+        takeWholeLines(piece.substr(0, whole + 1));
+        piece.remove_prefix(whole + 1);
+    }
+    open.assign(piece.substr(0, kLongestLine));
+}
+
+void LineFilter::finish() {
+    if (find(open, kMark) != nullptr) pass(open);
+    open.clear();
+}
+
+// Every line ends in a newline.
+void LineFilter::takeWholeLines(std::string_view lines) {
+    while (const char* const hit = find(lines, kMark)) {
+        const auto at = static_cast<std::size_t>(hit - lines.data());
+        const std::size_t before = lines.rfind('\n', at);
+        const std::size_t begin = before == std::string_view::npos ? 0 : before + 1;
+        const std::size_t end = lines.find('\n', at);
+        pass(lines.substr(begin, end - begin));
+        lines.remove_prefix(end + 1);
+    }
+}
+
+void LineFilter::pass(std::string_view line) {
+    taker(line.substr(0, kLongestLine));
+}
+
+LogStream::LogStream(const std::string& path, bool orPipe) {
+    const int descriptor = openToRead(path, orPipe, problem);
+    if (descriptor < 0) return;
+    struct stat status {};
+    pipe = fstat(descriptor, &status) != 0 || !S_ISREG(status.st_mode) || path == "-";
+    file.reset(gzdopen(descriptor, "rb"));
+    if (!file) close(descriptor);
+}
+
+LogStream::LogStream(int descriptor) : file{gzdopen(descriptor, "rb")} {
+    if (!file) close(descriptor);
+}
+
+std::optional<Time> LogStream::firstStamp(Time now) {
+    head.resize(kHead);
+    const int length = gzread(file.get(), head.data(), kHead);
+    head.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
+    std::string_view rest = head;
+    while (!rest.empty()) {
+        const std::size_t end = std::min(rest.find('\n'), rest.size() - 1);
+        std::string_view line = rest.substr(0, end + 1);
+        if (const auto stamp = takeStamp(line, now)) return stamp;
+        rest.remove_prefix(end + 1);
+    }
+    return std::nullopt;
+}
+
+bool LogStream::read(const LineFilter::Taker& taker) {
+    LineFilter filter{taker};
+    filter.take(std::exchange(head, {}));
+    std::vector<char> chunk(kChunk);
+    int length = 0;
+    while ((length = gzread(file.get(), chunk.data(), kChunk)) > 0) {
+        filter.take({chunk.data(), static_cast<std::size_t>(length)});
+    }
+    filter.finish();
+    int code = Z_OK;
+    const char* const message = gzerror(file.get(), &code);
+    if (length == 0 && (code == Z_OK || code == Z_STREAM_END)) return true;
+    problem = code == Z_BUF_ERROR ? "its end is missing"
+              : code == Z_ERRNO   ? "it cannot be read"
+                                  : std::string{"it is damaged: "} + message;
+    return false;
+}
+
+bool readJournal(const LineFilter::Taker& taker) {
+    std::array<int, 2> ends{};
+    if (pipe2(ends.data(), O_CLOEXEC) != 0) return false;
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_adddup2(&actions, ends[1], STDOUT_FILENO);
+    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
+    std::array<std::string, 9> words{"journalctl", "-q", "-o",      "short-iso", "-t",
+                                     "Pelorus",    "-t", "pelorus", "--no-pager"};
+    std::array<char*, 10> arguments{};
+    std::transform(words.begin(), words.end(), arguments.begin(),
+                   [](std::string& word) { return word.data(); });
+    pid_t child = 0;
+    const int error =
+        posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    close(ends[1]);
+    if (error != 0) {
+        close(ends[0]);
+        return false;
+    }
+    LogStream stream{ends[0]};
+    const bool whole = stream.isOpen() && stream.read(taker);
+    int status = 0;
+    while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
+    }
+    return whole && WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name) {
+    namespace fs = std::filesystem;
+    std::vector<std::pair<fs::file_time_type, std::string>> found;
+    std::error_code error;
+    for (fs::directory_iterator entry{folder, error}; !error && entry != fs::directory_iterator{};
+         entry.increment(error)) {
+        const std::string file = entry->path().filename();
+        if (file.compare(0, name.size(), name) != 0) continue;
+        const std::string end = file.substr(name.size());
+        const std::size_t digits = std::min(end.find_first_not_of("0123456789", 1), end.size());
+        const bool rotated = end.size() > 1 && end.front() == '.' && digits > 1 &&
+                             (digits == end.size() || end.substr(digits) == ".gz");
+        if (!end.empty() && !rotated) continue;
+        std::error_code ignored;
+        found.emplace_back(entry->last_write_time(ignored), entry->path());
+    }
+    std::sort(found.begin(), found.end());
+    std::vector<std::string> paths;
+    for (auto& [when, path] : found) paths.push_back(std::move(path));
+    return paths;
+}
+
+}  // namespace pelorus::doctor

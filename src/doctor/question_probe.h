@@ -1,0 +1,23 @@
+// Questions to the central service, asked only when the caller wants it.
+#ifndef PELORUS_DOCTOR_QUESTION_PROBE_H
+#define PELORUS_DOCTOR_QUESTION_PROBE_H
+
+#include "doctor/findings.h"
+
+namespace pelorus::doctor {
+
+/// Asks which address the service sees; judgeSeenAddress concludes from it.
+void askForAddress(const Evidence& evidence, Findings& findings);
+
+/// Asks for one test of the published port, with the device's credentials. Not while the disk is in
+/// standby, which the test might wake.
+void askForPortTest(const Evidence& evidence, Findings& findings);
+
+/// Compares the address the service sees with @p gatewayAddress, empty if that is not known.
+void judgeSeenAddress(const Findings& answer,
+                      const std::string& gatewayAddress,
+                      Findings& findings);
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -1,0 +1,231 @@
+#include "doctor/tunnel_look.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <set>
+#include <sstream>
+#include <utility>
+
+#include "common/files.h"
+#include "common/text.h"
+#include "doctor/age.h"
+#include "doctor/shown_text.h"
+#include "doctor/write_obstacle.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+using Verdict = Check::Verdict;
+
+constexpr std::size_t kOutputTail = 64UL * 1024;  // bytes
+constexpr std::size_t kMostOfLine = 100;          // characters
+constexpr std::size_t kTimeStamp = std::string_view{"2026-01-31 23:59:59 "}.size();
+
+constexpr const char* kRefused = "control message: AUTH_FAILED";
+constexpr const char* kEnds[] = {"process restarting", "process exiting", "due to fatal error"};
+constexpr const char* kFailures[] = {
+    "Connection refused",           "Connection timed out",   "TLS key negotiation failed",
+    "TLS handshake failed",         "Inactivity timeout",     "No route to host",
+    "Cannot resolve host address:", "Network is unreachable", "VERIFY ERROR",
+};
+
+template <typename Texts>
+bool containsAny(const std::string& line, const Texts& texts) {
+    for (const char* text : texts) {
+        if (contains(line, text)) return true;
+    }
+    return false;
+}
+
+std::string withoutTimeStamp(const std::string& line) {
+    const bool isStamped = line.size() > kTimeStamp && line[4] == '-' && line[13] == ':' &&
+                           line[kTimeStamp - 1] == ' ';
+    return isStamped ? line.substr(kTimeStamp) : line;
+}
+
+bool mayNotRead(const ForeignText& file) {
+    return !file.text && (file.error == EACCES || file.error == EPERM) && geteuid() != 0;
+}
+
+class TunnelLook {
+public:
+    TunnelLook(const ProcessTable& table, Evidence& found) : processes{table}, evidence{found} {}
+
+    void run() {
+        if (evidence.setting("STARTCMD").empty() && evidence.setting("OPENVPN_PID_FILE").empty()) {
+            check(Verdict::NOT_SEEN, "tunnel: no relay is configured", Source::SETTINGS);
+            return;
+        }
+        lookAtClient();
+        lookAtOutput();
+        lookAtFolders();
+    }
+
+private:
+    // As the daemon sees it, which runs in / and starts the client in its own folder.
+    [[nodiscard]] std::string path(const std::string& key, const std::string& folder) const {
+        const std::string value = evidence.setting(key);
+        if (value.empty() || value.front() == '/') return value;
+        return (folder.empty() || folder.back() != '/' ? folder + "/" : folder) + value;
+    }
+    [[nodiscard]] std::string path(const std::string& key) const {
+        return path(key, path("OPENVPN_CONFIG_PATH", "/"));
+    }
+
+    void check(Verdict verdict, std::string text, Source source = Source::NOW) {
+        evidence.checks.push_back({verdict, source, std::move(text)});
+    }
+    void conclude(Sign sign, Verdict verdict, const std::string& text) {
+        evidence.add(sign, Source::NOW, text);
+        check(verdict, text);
+    }
+
+    void lookAtClient() {
+        const std::string pidFile = path("OPENVPN_PID_FILE", "/");
+        if (pidFile.empty()) {
+            check(Verdict::NOT_SEEN, "tunnel client: OPENVPN_PID_FILE is not set");
+            return;
+        }
+        const ForeignText file = readForeignFile(pidFile);
+        if (mayNotRead(file)) {
+            check(Verdict::NOT_SEEN, "tunnel client: needs root");
+            return;
+        }
+        const auto pid = readPid(file.text.value_or(""));
+        const auto client = pid ? processes.find(*pid) : std::nullopt;
+        if (client && isTunnelClient(*client)) {
+            conclude(Sign::TUNNEL_RUNS, Verdict::OK, "tunnel client up" + described(*client));
+        } else {
+            reportNoClient(pidFile, file, pid);
+        }
+    }
+
+    static bool isTunnelClient(const Process& process) {
+        const std::string& name = process.program.empty() ? process.name : process.program;
+        return strcasestr(name.c_str(), "openvpn") != nullptr;
+    }
+
+    [[nodiscard]] std::string described(const Process& client) const {
+        const std::string pid = " (pid " + std::to_string(client.pid) + ")";
+        return client.since ? " " + ageInWords(evidence.now - *client.since) + pid : pid;
+    }
+
+    [[nodiscard]] bool isMissed() const {
+        return evidence.statusWord == "relayed" || evidence.statusWord == "failed";
+    }
+
+    void reportNoClient(const std::string& pidFile,
+                        const ForeignText& file,
+                        std::optional<pid_t> pid) {
+        const bool isRelayed = evidence.statusWord == "relayed";
+        const Verdict verdict = isMissed() ? Verdict::PROBLEM : Verdict::OK;
+        if (file.text) {
+            const std::string whose =
+                pid ? "names " + std::to_string(*pid) + ", which is not one" : "holds no pid";
+            conclude(Sign::TUNNEL_GONE, verdict,
+                     "no tunnel client: " + shownText(pidFile) + " " + whose);
+        } else if (isRelayed) {
+            conclude(Sign::TUNNEL_GONE, verdict,
+                     "no tunnel client, although the status is relayed");
+        } else {
+            check(verdict, isMissed() ? "no tunnel client" : "no tunnel client, none is needed");
+        }
+    }
+
+    void lookAtOutput() {
+        const std::string output = path("STARTCMD_OUTFILE");
+        if (output.empty()) return;
+        const ForeignText file = readForeignFile(output, Part::TAIL);
+        if (mayNotRead(file)) check(Verdict::NOT_SEEN, "tunnel client's output: needs root");
+        if (!file.text || file.text->empty()) return;
+        const std::size_t skipped = file.text->size() - std::min(file.text->size(), kOutputTail);
+        const TunnelOutput said =
+            readTunnelOutput(file.text->substr(skipped), evidence.setting("LOG_SUCCESS_TEXT"));
+        const std::string written = writtenWhen(output);
+        if (said.isUp) {
+            evidence.add(Sign::TUNNEL_SAYS_UP, Source::NOW, "the tunnel client says that it is up");
+            if (evidence.has(Sign::TUNNEL_RUNS)) check(Verdict::OK, "tunnel client says: up");
+        } else if (said.isRefused) {
+            blame(Sign::TUNNEL_REFUSED, "the relay refuses the device's credentials" + written);
+        } else if (!said.failure.empty()) {
+            blame(Sign::TUNNEL_UNANSWERED,
+                  "the relay does not answer the tunnel client: " + said.failure + written);
+        }
+    }
+
+    // The output of a tunnel that is not needed any more stays behind.
+    void blame(Sign sign, const std::string& text) {
+        evidence.add(sign, Source::NOW, text);
+        if (evidence.statusWord != "portforwarded") check(Verdict::PROBLEM, text);
+    }
+
+    [[nodiscard]] std::string writtenWhen(const std::string& file) const {
+        struct stat status {};
+        if (stat(file.c_str(), &status) != 0) return {};
+        const auto age = evidence.now - Time{std::chrono::seconds{status.st_mtime}};
+        return age.count() < 0 ? "" : " (" + ageInWords(age) + " ago)";
+    }
+
+    void lookAtFolders() {
+        std::set<std::string> reasons;  // the files are usually in one folder
+        for (const char* key : {"OPENVPN_AUTH_FILE", "STARTCMD_OUTFILE", "OPENVPN_PID_FILE"}) {
+            const std::string file =
+                key == std::string{"OPENVPN_PID_FILE"} ? path(key, "/") : path(key);
+            const std::string reason = file.empty() ? "" : writeObstacle(file);
+            if (!reason.empty()) reasons.insert(reason);
+        }
+        const std::string credentials = credentialsTrouble();
+        if (!credentials.empty()) reasons.insert(credentials);
+        for (const std::string& reason : reasons) {
+            conclude(Sign::TUNNEL_FILES_UNWRITABLE, Verdict::PROBLEM, "tunnel's files: " + reason);
+        }
+    }
+
+    // A full disk leaves an empty file.
+    [[nodiscard]] std::string credentialsTrouble() const {
+        const std::string file = path("OPENVPN_AUTH_FILE");
+        struct stat status {};
+        if (file.empty() || !isMissed()) return {};
+        const int error = stat(file.c_str(), &status) == 0 ? 0 : errno;
+        if (error == ENOENT && evidence.statusWord == "relayed") {
+            return shownText(file) + " is missing, although the status is relayed";
+        }
+        if (error != 0 || !S_ISREG(status.st_mode) || status.st_size > 0) return {};
+        return shownText(file) + " is empty";
+    }
+
+    const ProcessTable& processes;
+    Evidence& evidence;
+};
+
+}  // namespace
+
+TunnelOutput readTunnelOutput(const std::string& output, const std::string& successText) {
+    TunnelOutput said;
+    std::istringstream lines{output};
+    for (std::string line; std::getline(lines, line);) {
+        if (contains(line, successText)) {
+            said = {};
+            said.isUp = true;
+        }
+        if (contains(line, kRefused)) {
+            said = {false, true, ""};
+        } else if (containsAny(line, kFailures)) {
+            said.failure = shownText(withoutTimeStamp(line), kMostOfLine);
+            said.isRefused = false;
+        }
+        if (containsAny(line, kEnds)) said.isUp = false;
+    }
+    return said;
+}
+
+void lookAtTunnel(const ProcessTable& processes, Evidence& evidence) {
+    TunnelLook{processes, evidence}.run();
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,28 @@
+// The relay's tunnel: its client process, what that has written, and where it writes.
+#ifndef PELORUS_DOCTOR_TUNNEL_LOOK_H
+#define PELORUS_DOCTOR_TUNNEL_LOOK_H
+
+#include <string>
+
+#include "doctor/evidence.h"
+#include "doctor/process_table.h"
+
+namespace pelorus::doctor {
+
+/// What the end of the client's output says.
+struct TunnelOutput {
+    bool isUp = false;       ///< the text of success, and no restart or end since
+    bool isRefused = false;  ///< the relay has refused the credentials since
+    std::string failure{};   ///< the last line since that says that the relay does not answer
+};
+
+/// Reads @p output; an empty @p successText is in any line, as for the daemon.
+[[nodiscard]] TunnelOutput readTunnelOutput(const std::string& output,
+                                            const std::string& successText);
+
+/// Adds signs and checks. The settings and the status word must be there already.
+void lookAtTunnel(const ProcessTable& processes, Evidence& evidence);
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -1,0 +1,178 @@
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <cstring>
+#include <memory>
+
+#include "common/handles.h"
+#include "common/miniupnpc_api.h"
+#include "common/text.h"
+#include "doctor/address_class.h"
+#include "doctor/gateway_probe.h"
+#include "doctor/interfaces.h"
+#include "doctor/url_host.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using Devices = std::unique_ptr<UPNPDev, Releaser<freeUPNPDevlist>>;
+using UrlContents = std::unique_ptr<UPNPUrls, Releaser<FreeUPNPUrls>>;
+
+constexpr int kDiscoverDelay = 2000;  // milliseconds
+constexpr int kMostDevices = 100;
+constexpr std::size_t kMostGateways = 8;
+constexpr int kMostEntries = 1000;
+constexpr std::chrono::seconds kTablePatience{4};
+
+std::string textOf(const char* text) {
+    return text == nullptr ? std::string{} : text;
+}
+
+// The address behind a URL, if it can be a gateway's: another host in the home. Else empty.
+std::string gatewayBehind(const char* url) {
+    const auto found = hostOfUrl(textOf(url));
+    if (!found || !isAtHome(found->host)) return {};
+    const auto own = ownAddresses();
+    const bool isOwn = std::find(own.begin(), own.end(), found->host) != own.end();
+    return isOwn ? std::string{} : found->host;
+}
+
+bool isGateway(const UPNPDev& device) {
+    const std::string target = textOf(device.st);
+    return contains(target, ":InternetGatewayDevice:") || contains(target, ":WANIPConnection:") ||
+           contains(target, ":WANPPPConnection:");
+}
+
+// The gateways of a list, as a list of their own. The strings still belong to the first one.
+std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
+    std::vector<UPNPDev> gateways;
+    for (int count = 0; device != nullptr && count < kMostDevices; ++count) {
+        if (isGateway(*device) && !gatewayBehind(device->descURL).empty()) {
+            gateways.push_back(*device);
+        }
+        if (gateways.size() == kMostGateways) break;
+        device = device->pNext;
+    }
+    for (std::size_t i = 0; i < gateways.size(); ++i) {
+        gateways[i].pNext = i + 1 < gateways.size() ? &gateways[i + 1] : nullptr;
+    }
+    return gateways;
+}
+
+// A chosen gateway's connection service.
+struct Service {
+    std::string controlUrl;
+    std::string type;
+};
+
+std::string addressOf(const Service& service) {
+    std::array<char, 64> address{};
+    const int status = miniupnpc::call(UPNP_GetExternalIPAddress, service.controlUrl.c_str(),
+                                       service.type.c_str(), address.data());
+    return status == UPNPCOMMAND_SUCCESS ? address.data() : std::string{};
+}
+
+// The library calls a gateway with a private address unconnected, too; so the gateway is asked.
+bool saysUnconnected(const Service& service) {
+    std::array<char, 128> state{};
+    std::array<char, 128> lastError{};
+    unsigned uptime = 0;
+    const int status =
+        miniupnpc::call(UPNP_GetStatusInfo, service.controlUrl.c_str(), service.type.c_str(),
+                        state.data(), &uptime, lastError.data());
+    return status == UPNPCOMMAND_SUCCESS && contains(state.data(), "isconnect");
+}
+
+// The buffers are larger than what the library writes.
+struct EntryTexts {
+    std::array<char, 16> externalPort{}, internalPort{}, protocol{}, enabled{};
+    std::array<char, 32> client{}, lease{};
+    std::array<char, 128> description{}, remoteHost{};
+};
+
+// The library's status.
+int readEntry(const Service& service, int index, TableEntry& entry) {
+    EntryTexts texts;
+    const int status = miniupnpc::call(
+        UPNP_GetGenericPortMappingEntry, service.controlUrl.c_str(), service.type.c_str(),
+        std::to_string(index).c_str(), texts.externalPort.data(), texts.client.data(),
+        texts.internalPort.data(), texts.protocol.data(), texts.description.data(),
+        texts.enabled.data(), texts.remoteHost.data(), texts.lease.data());
+    entry = {leadingInt(texts.externalPort.data()), texts.protocol.data(),
+             plainText(texts.client.data(), 40), leadingInt(texts.internalPort.data()),
+             texts.description.data()};
+    return status;
+}
+
+// How gateways say that there is no entry with that index.
+bool isEnd(int status) {
+    constexpr int kInvalidArgs = 402;
+    constexpr int kIndexInvalid = 713;
+    constexpr int kNoSuchEntry = 714;
+    return status == kInvalidArgs || status == kIndexInvalid || status == kNoSuchEntry;
+}
+
+void readEntries(const Service& service, GatewayTable& table) {
+    const Clock::time_point end = Clock::now() + kTablePatience;
+    for (int index = 0; index < kMostEntries && Clock::now() < end; ++index) {
+        TableEntry entry;
+        const int status = readEntry(service, index, entry);
+        table.complete = isEnd(status);
+        if (status != UPNPCOMMAND_SUCCESS) return;
+        table.entries.push_back(entry);
+    }
+}
+
+int portSetting(const Evidence& evidence, const char* key, int missing) {
+    return scanInt(evidence.setting(key).c_str()).value_or(missing);
+}
+
+void lookAtTable(const Service& service, const Evidence& evidence, Findings& findings) {
+    GatewayTable table;
+    table.ownAddresses = ownAddresses();
+    table.internalHttpPort = portSetting(evidence, "INTERNAL_HTTP_PORT", 80);
+    table.internalHttpsPort = portSetting(evidence, "INTERNAL_HTTPS_PORT", 443);
+    table.externalHttpPort = portSetting(evidence, "EXTERNAL_HTTP_PORT", 0);
+    table.externalHttpsPort = portSetting(evidence, "EXTERNAL_HTTPS_PORT", 0);
+    table.byHand = evidence.setting("MANUAL_PORT_FORWARD") == "TRUE";
+    readEntries(service, table);
+    judgeTable(table, findings);
+    if (!table.complete) findings.notSeen("gateway's table: it could not be read to its end");
+}
+
+void lookAtGateway(UPNPDev& gateways, const Evidence& evidence, Findings& findings) {
+    UPNPUrls urls{};
+    IGDdatas data{};
+    std::array<char, 128> lanAddress{};
+    const int state = miniupnpc::getValidIgd(&gateways, urls, data, lanAddress.data(), 64);
+    if (state == miniupnpc::NO_IGD) return;
+    const UrlContents contents(&urls);
+    const std::string gateway = gatewayBehind(urls.controlURL);
+    if (gateway.empty()) return;
+    const char* const type = data.first.servicetype;
+    const Service service{textOf(urls.controlURL),
+                          std::string{type, strnlen(type, sizeof data.first.servicetype)}};
+    const std::string address = addressOf(service);
+    findings.set("address", address);
+    if (state == miniupnpc::UNCONNECTED_IGD && saysUnconnected(service)) {
+        findings.set("unconnected", "yes");
+    }
+    findings.set("gateway", gateway);
+    lookAtTable(service, evidence, findings);
+}
+
+}  // namespace
+
+void askThroughUpnp(const Evidence& evidence, Findings& findings) {
+    const Devices devices(miniupnpc::discover(kDiscoverDelay));
+    std::vector<UPNPDev> gateways = gatewaysOf(devices.get());
+    if (!gateways.empty()) {
+        findings.set("announced", gatewayBehind(gateways.front().descURL));
+        lookAtGateway(gateways.front(), evidence, findings);
+    }
+    if (findings.value("gateway").empty()) findings.set("silent", "yes");
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,71 @@
+#include "doctor/web_probe.h"
+
+#include "cloud/url_template.h"
+#include "common/text.h"
+#include "doctor/disk_probe.h"
+#include "doctor/interfaces.h"
+#include "doctor/tcp.h"
+#include "doctor/url_host.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr std::chrono::seconds kConnectPatience{2};
+constexpr std::chrono::seconds kAnswerPatience{3};
+constexpr const char* kBackEndKey = "LOCAL_SETCOMMSTATUSURL";
+
+void silent(Findings& findings, const std::string& text) {
+    findings.add(Sign::BACK_END_SILENT, "the local back end " + text);
+    findings.problem("local back end " + text);
+}
+
+}  // namespace
+
+void lookAtWebServer(const Evidence& evidence, Findings& findings) {
+    const int http = scanInt(evidence.setting("INTERNAL_HTTP_PORT").c_str()).value_or(80);
+    const int https = scanInt(evidence.setting("INTERNAL_HTTPS_PORT").c_str()).value_or(443);
+    const std::string lan = lanAddress();
+    const std::string address = lan.empty() ? "127.0.0.1" : lan;
+    std::string missing;
+    for (const int port : {http, https}) {
+        const TcpConnection connection{address, port, kConnectPatience};
+        if (connection.connected()) continue;
+        missing += (missing.empty() ? "" : ", ") + std::string{"port "} + std::to_string(port) +
+                   " of " + address + ": " + connection.obstacle();
+    }
+    if (missing.empty()) {
+        const std::string ports = std::to_string(http) + " and " + std::to_string(https);
+        findings.add(Sign::WEB_SERVER_LISTENS, "the web server listens on " + ports);
+        findings.ok("web server listens on " + ports);
+    } else {
+        findings.add(Sign::WEB_SERVER_SILENT, "the web server does not listen, " + missing);
+        findings.problem("web server: " + missing);
+    }
+}
+
+void lookAtBackEnd(const Evidence& evidence, Findings& findings) {
+    const std::string url =
+        fillTemplate(kBackEndKey, evidence.setting(kBackEndKey),
+                     {leadingInt(evidence.setting("INTERNAL_HTTP_PORT")), std::string{}});
+    const auto target = hostOfUrl(url);
+    if (!target) {
+        findings.notSeen(std::string{"local back end: "} + kBackEndKey + " is no URL");
+        return;
+    }
+    const std::string where = " on port " + std::to_string(target->port);
+    const TcpConnection connection{target->host, target->port, kConnectPatience};
+    if (!connection.connected()) {
+        silent(findings, "does not listen" + where + ": " + connection.obstacle());
+    } else if (diskState() == DiskState::STANDBY) {
+        findings.notSeen("local back end: it listens" + where +
+                         ", but is not asked while the disk sleeps");
+    } else if (connection.answers("HEAD / HTTP/1.0\r\n\r\n", kAnswerPatience)) {
+        findings.add(Sign::BACK_END_ANSWERS, "the local back end answers" + where);
+        findings.ok("local back end answers" + where);
+    } else {
+        silent(findings, "listens" + where + ", but does not answer");
+    }
+}
+
+}  // namespace pelorus::doctor

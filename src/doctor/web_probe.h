@@ -1,0 +1,17 @@
+#ifndef PELORUS_DOCTOR_WEB_PROBE_H
+#define PELORUS_DOCTOR_WEB_PROBE_H
+
+#include "doctor/findings.h"
+
+namespace pelorus::doctor {
+
+/// Looks whether the device's web server listens on the internal ports.
+void lookAtWebServer(const Evidence& evidence, Findings& findings);
+
+/// Looks whether the local back end answers. It is sent one request for the head of a page; not
+/// while the disk is in standby, which the request might wake.
+void lookAtBackEnd(const Evidence& evidence, Findings& findings);
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -24,14 +24,14 @@ endfunction()
 pelorus_import(miniupnpc miniupnpc/miniupnpc.h miniupnpc)
 pelorus_import(natpmp natpmp.h natpmp)
 
-# Rotated logs are compressed.
-find_package(ZLIB REQUIRED)
-
 # Header only; what is printed by pelorus-doctor --json.
 find_path(nlohmann_json_INCLUDE_DIR nlohmann/json.hpp REQUIRED)
 mark_as_advanced(nlohmann_json_INCLUDE_DIR)
 add_library(pelorus_json INTERFACE)
 target_include_directories(pelorus_json SYSTEM INTERFACE ${nlohmann_json_INCLUDE_DIR})
+
+# Rotated logs are compressed.
+find_package(ZLIB REQUIRED)
 
 # The device's structured event log; a build host rarely has it.
 add_library(pelorus_qvlog INTERFACE)

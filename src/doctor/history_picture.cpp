@@ -1,7 +1,6 @@
 #include "doctor/history_picture.h"
 
 #include <algorithm>
-#include <cmath>
 #include <set>
 
 #include "doctor/lines.h"
@@ -96,11 +95,11 @@ struct Mark {
 };
 
 std::string share(seconds part, seconds whole) {
-    const double percent = 100.0 * static_cast<double>(part.count()) /
-                           static_cast<double>(std::max<seconds::rep>(whole.count(), 1));
-    if (percent > 0 && percent < 1) return "under 1 %";
+    if (part >= whole) return "100 %";  // also of nothing
+    const auto percent = (100 * part.count() + whole.count() / 2) / whole.count();
+    if (percent < 1 && part.count() > 0) return "under 1 %";
     // Not all of it unless it is.
-    return std::to_string(part < whole ? std::min(std::lround(percent), 99L) : 100L) + " %";
+    return std::to_string(std::min<seconds::rep>(percent, 99)) + " %";
 }
 
 class HistoryPicture {

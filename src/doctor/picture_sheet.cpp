@@ -1,6 +1,6 @@
 #include "doctor/picture_sheet.h"
 
-#include <cmath>
+#include <cstdlib>
 
 #include "doctor/lines.h"
 
@@ -10,7 +10,7 @@ namespace {
 
 // To a hundredth, and the same in every locale.
 std::string number(double value) {
-    const long hundredths = std::lround(value * 100);
+    const auto hundredths = static_cast<long>(value * 100 + (value < 0 ? -0.5 : 0.5));
     std::string text = std::to_string(std::labs(hundredths) / 100);
     if (const long rest = std::labs(hundredths) % 100; rest != 0) {
         text += rest < 10 ? ".0" : ".";

@@ -10,9 +10,9 @@ namespace pelorus::doctor {
 
 struct ReachWords {
     Reach reach{};
-    const char* name;     ///< stable: for programs
-    const char* shortly;  ///< "direct"
-    const char* fully;    ///< "reached directly"
+    const char* name{};     ///< stable: for programs
+    const char* shortly{};  ///< "direct"
+    const char* fully{};    ///< "reached directly"
 };
 
 /// In the order in which a legend lists them.

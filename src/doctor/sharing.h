@@ -40,7 +40,7 @@ private:
     std::string hidePlaces(std::string_view text);
     std::string hideWord(std::string_view word);
     std::string hideAddresses(std::string_view word);
-    bool isHost(std::string_view name) const;
+    [[nodiscard]] bool isHost(std::string_view name) const;
     std::string replacement(const std::string& kind, const std::string& place);
 
     std::vector<Secret> secrets;  // the longest first

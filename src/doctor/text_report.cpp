@@ -174,14 +174,14 @@ Lines TextReport::headline() const {
 }
 
 std::string TextReport::factWithSource(const Fact& fact) const {
-    const std::string text = withoutFullStop(fact.text);
+    std::string text = withoutFullStop(fact.text);
     if (fact.source == Source::SETTINGS) return text + " (settings)";
     if (fact.source != Source::LOG) return text;
     return text + (fact.when ? " (log, " + momentShortly(*fact.when, today) + ")" : " (log)");
 }
 
 std::string TextReport::sentenceWithFacts(const NamedCause& named, std::size_t most) const {
-    const std::string sentence{named.cause->sentence};
+    std::string sentence{named.cause->sentence};
     std::vector<std::string> facts;
     for (const Fact& fact : named.proofs) {
         std::string text = factWithSource(fact);

@@ -113,7 +113,8 @@ BoundedCall::~BoundedCall() {
 
 // The library may open further sockets after the first ones were shut, hence every time.
 void BoundedCall::watch(Clock::duration limit) {
-    auto end = began + limit;
+    // With nothing left there is still time for an answer at once.
+    auto end = began + std::max<Clock::duration>(limit, kRepeat);
     bool exceeded = false;
     bool hurried = false;
     bool terminating = !onlyGateways;  // only gateways are then cut short

@@ -88,6 +88,20 @@ TEST_F(BoundedCallTest, AWaitWithinTheBoundsGoesOn) {
     close(client);
 }
 
+TEST_F(BoundedCallTest, EachHasATimeOfItsOwn) {
+    for (int pass = 0; pass < 2; ++pass) {
+        {
+            const BoundedCall bounds{Peer::ANYBODY, 3600};
+            const int client = socket(AF_INET, SOCK_DGRAM, 0);
+            pollfd waiting{client, POLLIN, 0};
+            EXPECT_EQ(poll(&waiting, 1, 60), 0);
+            close(client);
+        }
+        const BoundedCall bounds{Peer::ANYBODY, 0};
+        EXPECT_EQ(ask(SOCK_STREAM), 0);
+    }
+}
+
 TEST_F(BoundedCallTest, WithoutAThreadToWatchItNothingIsReceived) {
     pthread_attr_t usual;
     pthread_getattr_default_np(&usual);

@@ -39,7 +39,7 @@ _PAGE, _PICTURE = (sandbox.PROJECT / "docs" / name for name in ("performance.md"
 _MARK, _END = "<!-- compare -->", "<!-- end -->"
 _PATTERN = json.loads((sandbox.PROJECT / "bench/pattern.json").read_text())
 _CYCLE_SECONDS = _PATTERN["direct"]["cycle_seconds"]
-_RUNS, _CYCLES, _UPNPC_RUNS = 5, 5, 5
+_RUNS, _CYCLES = 5, 5
 _PATIENCE, _PAUSE_SECONDS = 1500, 120
 _OPTIONS, _NEW_ADDRESS = ("-l", "6", "-f", "30"), "44.128.0.30"
 _END_OF_CYCLE = re.compile(r"DaemonControl::run - (retry connection after|sleep) \d+ secs")
@@ -123,9 +123,13 @@ def _live(name: str, number: int, with_calls: bool = False) -> _Run:
         cycle()
         if "asleep" in name:
             lab.device.disk_sleeps()
-    cycles = []
+    cycles, upnpc = [], []
+    memory: _Run = {}
     before = _usage(lab)
     for _ in range(1 if name == _FAILING else _CYCLES):
+        if name == _DIRECT:
+            time.sleep(_PAUSE_SECONDS / 2)  # as long after its last run as the daemon
+            upnpc.append(_upnpc(memory))
         with (traced(lab.daemon.pid, "-c", "-o", str(_CALLS)) if with_calls else nullcontext()):
             cycle()
             after = _usage(lab)
@@ -134,10 +138,10 @@ def _live(name: str, number: int, with_calls: bool = False) -> _Run:
             summary = _CALLS.read_text().splitlines()[2:-2]
             cycles[-1]["calls"] = sum(int(line.split()[3]) for line in summary)
         before = _usage(lab)
-    memory = {"pelorus": _memory(lab.daemon.pid)}
+    memory["pelorus"] = _memory(lab.daemon.pid)
     phase = (number + 0.5) / _RUNS * _PAUSE_SECONDS
     more = _AFTERWARDS[name](lab, phase, memory) if name in _AFTERWARDS and not with_calls else {}
-    return {"cycles": cycles, "memory": memory, **more}
+    return {"cycles": cycles, "upnpc": upnpc, "memory": memory, **more}
 
 
 def _seconds(lab: Lab, done: Callable[[], bool]) -> float:
@@ -147,15 +151,14 @@ def _seconds(lab: Lab, done: Callable[[], bool]) -> float:
 
 
 def _direct_afterwards(lab: Lab, phase: float, memory: _Run) -> _Run:
-    """Another address, `phase` seconds into the pause; before it, upnpc beside the daemon."""
+    """Another address, `phase` seconds into the pause."""
     began = time.monotonic()
     memory["miniupnpd"] = _memory(daemon.running("miniupnpd")[0])
-    upnpc = [_upnpc(memory) for _ in range(_UPNPC_RUNS)]
     time.sleep(max(0, began + phase - time.monotonic()))
     lab.gateway.move_to(_NEW_ADDRESS)
     moved = _seconds(lab, lambda: _NEW_ADDRESS in str(lab.central.record))
     assert checks.pages_from_outside(address=_NEW_ADDRESS) == checks.PAGES
-    return {"upnpc": upnpc, "WAN address changes": [phase, moved]}
+    return {"WAN address changes": [phase, moved]}
 
 
 def _upnpc(memory: _Run) -> float:

@@ -15,10 +15,15 @@
 #include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <condition_variable>
 #include <csignal>
+#include <cstddef>
 #include <cstring>
 #include <exception>
 #include <limits>
+#include <mutex>
+#include <new>
+#include <thread>
 
 #include "common/own_address.h"
 #include "common/stop_budget.h"
@@ -28,7 +33,7 @@ namespace pelorus {
 namespace {
 
 // Between two looks for a termination signal, and between two attempts to end the transfers.
-constexpr std::chrono::milliseconds kLook{200}, kRepeat{20};
+constexpr std::chrono::milliseconds kLook{1000}, kRepeat{20};
 
 constexpr long kEverything = std::numeric_limits<long>::max();
 
@@ -86,52 +91,91 @@ bool isGatewayAddress(const sockaddr* address, socklen_t size) {
 
 }  // namespace
 
+// One thread for all calls: to start one takes longer than most of them. It is woken by neither the
+// end of a call nor, while calls follow each other, their beginning.
+class Watcher {
+public:
+    static Watcher& get() {
+        // Never destroyed, since the thread runs until the process ends. Allocates nothing.
+        alignas(Watcher) static std::array<std::byte, sizeof(Watcher)> storage;
+        static Watcher& watcher = *new (storage.data()) Watcher;
+        return watcher;
+    }
+
+    void begin(BoundedCall& call) {
+        const std::lock_guard lock(mutex);
+        watched = &call;
+        if (!thread.joinable()) thread = std::thread([this] { run(); });
+        if (call.nextLook() < wakeUp) begun.notify_one();
+    }
+    void end() {
+        const std::lock_guard lock(mutex);
+        watched = nullptr;
+    }
+
+private:
+    using Clock = BoundedCall::Clock;
+
+    [[noreturn]] void run() {
+        std::unique_lock lock(mutex);
+        while (true) {
+            if (watched == nullptr) {
+                wakeUp = Clock::time_point::max();
+                begun.wait(lock);
+            } else {
+                wakeUp = watched->nextLook();
+                begun.wait_until(lock, wakeUp);
+            }
+            if (watched != nullptr) watched->look();
+        }
+    }
+
+    std::thread thread;
+    std::mutex mutex;
+    std::condition_variable begun;
+    BoundedCall* watched = nullptr;
+    Clock::time_point wakeUp = Clock::time_point::min();  // nothing waits yet
+};
+
 BoundedCall::BoundedCall(Peer peer, int seconds) : before{openSockets()} {
     onlyGateways = peer == Peer::GATEWAY;
     Clock::duration limit = std::chrono::seconds(seconds);
     if (onlyGateways) limit = std::min(limit, stopBudgetLeft());
+    // With nothing left there is still time for an answer at once.
+    end = began + std::max<Clock::duration>(limit, kRepeat);
+    terminating = !onlyGateways;  // only gateways are then cut short
     mayReceive = kMostReceived;
     try {
-        watcher = std::thread([this, limit] { watch(limit); });
+        Watcher::get().begin(*this);
     } catch (const std::exception&) {
         mayReceive = 0;  // rather no answer than an unbounded one
     }
 }
 
 BoundedCall::~BoundedCall() {
-    {
-        const std::lock_guard lock(mutex);
-        over = true;
-    }
-    ended.notify_one();
-    if (watcher.joinable()) watcher.join();
+    Watcher::get().end();
     if (onlyGateways) spendStopBudget(Clock::now() - began);
-    if (cutShort) renewStopBudget({});
+    if (exceeded && hurried) renewStopBudget({});
     onlyGateways = false;
     mayReceive = kEverything;
 }
 
+BoundedCall::Clock::time_point BoundedCall::nextLook() const {
+    return exceeded ? looked + kRepeat : std::min(looked + kLook, end);
+}
+
 // The library may open further sockets after the first ones were shut, hence every time.
-void BoundedCall::watch(Clock::duration limit) {
-    auto end = began + limit;
-    bool exceeded = false;
-    bool hurried = false;
-    bool terminating = !onlyGateways;  // only gateways are then cut short
-    const auto next = [&] {
-        if (exceeded) return Clock::now() + kRepeat;
-        return terminating ? end : std::min(Clock::now() + kLook, end);
-    };
-    std::unique_lock lock(mutex);
-    while (!ended.wait_until(lock, next(), [this] { return over; })) {
-        if (!terminating && terminationPending()) {
-            terminating = true;
-            hurried = end > Clock::now() + kCycleBudget;
-            if (hurried) end = Clock::now() + kCycleBudget;
-        }
-        exceeded = exceeded || Clock::now() >= end;
-        cutShort = exceeded && hurried;
-        if (exceeded) endTransfers();
+void BoundedCall::look() {
+    const auto now = Clock::now();
+    if (!terminating && terminationPending()) {
+        terminating = true;
+        // The signal may have come just after the last look.
+        hurried = end > looked + kCycleBudget;
+        if (hurried) end = looked + kCycleBudget;
     }
+    looked = now;
+    exceeded = exceeded || now >= end;
+    if (exceeded) endTransfers();
 }
 
 void BoundedCall::endTransfers() const {

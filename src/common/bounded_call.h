@@ -5,10 +5,7 @@
 
 #include <bitset>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
-#include <mutex>
-#include <thread>
 
 #include "common/signal_block.h"
 
@@ -28,9 +25,10 @@ using Descriptors = std::bitset<kMostDescriptors>;
 /// Bounds what a library does with sockets it opens before the end of the scope. After @p seconds
 /// they are shut down: the library then fails as if the peer had closed the connection. So it does
 /// after kMostReceived, and a call to a gateway when the stop budget is spent. One that is running
-/// when a termination signal comes gets kCycleBudget from then on; if that is not enough, nothing is
-/// left for the rest of the cycle. Also holds termination signals back and keeps a closed connection
-/// from raising SIGPIPE. One at a time; not around child processes.
+/// when a termination signal comes gets at most kCycleBudget from then on; if that is not enough,
+/// nothing is left for the rest of the cycle. Also holds termination signals back and keeps a closed
+/// connection from raising SIGPIPE. One at a time; not around child processes. The first one starts
+/// a thread that stays.
 class BoundedCall {
 public:
     /// Bytes that recvfrom returns in one call, on all sockets. To parse them miniupnpc may need 35
@@ -43,20 +41,23 @@ public:
     BoundedCall& operator=(const BoundedCall&) = delete;
 
 private:
+    friend class Watcher;
     using Clock = std::chrono::steady_clock;
 
-    void watch(Clock::duration limit);
+    // The watcher's, which holds its lock meanwhile.
+    void look();
+    [[nodiscard]] Clock::time_point nextLook() const;
     void endTransfers() const;
 
     const Clock::time_point began = Clock::now();
     TerminationBlock termination;
     BrokenPipeGuard brokenPipe;
     Descriptors before;  // sockets that were open
-    std::mutex mutex;
-    std::condition_variable ended;
-    bool over = false;
-    bool cutShort = false;  // by a termination signal
-    std::thread watcher;
+    Clock::time_point looked = began;
+    Clock::time_point end;
+    bool exceeded = false;
+    bool terminating = false;
+    bool hurried = false;  // by a termination signal
 };
 
 }  // namespace pelorus

@@ -7,18 +7,21 @@
 
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <cstdint>
 #include <cstring>
 #include <ctime>
 #include <optional>
 
 #include "common/log.h"
+#include "common/stop_budget.h"
 
 namespace pelorus {
 
 namespace {
 
 constexpr int kMaxReads = 3;
+constexpr time_t kLongestWait = 1;  // seconds; the library's own last one
 constexpr int kSelectDescriptors = FD_SETSIZE;
 constexpr ssize_t kRefusalSize = 8;
 constexpr ssize_t kAddressAnswerSize = 12;
@@ -120,6 +123,15 @@ bool CMnatpmp::close() {
 }
 
 int CMnatpmp::CheckNATPMPResponse() {
+    const auto began = std::chrono::steady_clock::now();
+    const int status = readResponse();
+    const int error = errno;
+    spendStopBudget(std::chrono::steady_clock::now() - began);
+    errno = error;
+    return status;
+}
+
+int CMnatpmp::readResponse() {
     int status = NATPMP_TRYAGAIN;
     for (int reads = 0; status == NATPMP_TRYAGAIN && reads < kMaxReads; ++reads) {
         timeval timeout{};
@@ -130,6 +142,8 @@ int CMnatpmp::CheckNATPMPResponse() {
             errno = error;
             return status;
         }
+        // The library reckons with a clock that may have been set back meanwhile.
+        if (timeout.tv_sec >= kLongestWait) timeout = {kLongestWait, 0};
         waitForAnswer(natpmp.s, timeout);
         status = peekAnswer(natpmp);
         if (status == 0) status = readnatpmpresponseorretry(&natpmp, &response);

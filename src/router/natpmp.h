@@ -28,7 +28,8 @@ public:
     bool close();
 
     /// Waits for one answer. The library's status: 0 or more when an answer was read, negative on
-    /// an error, NATPMP_TRYAGAIN when nothing came.
+    /// an error, NATPMP_TRYAGAIN when nothing came. The time counts as that of a gateway's call
+    /// (see stop_budget.h).
     int CheckNATPMPResponse();
 
     /// Asks for the gateway's external address. On failure @p ip is emptied, unless the request
@@ -78,6 +79,7 @@ private:
 
     bool open(in_addr_t gateway);
     bool openForRequest();
+    int readResponse();
     std::optional<Grant> exchangeMapping(int protocol,
                                          int internalPort,
                                          int externalPort,

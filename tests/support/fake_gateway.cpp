@@ -279,7 +279,8 @@ int __wrap_sendnewportmappingrequest(natpmp_t* client, int protocol, std::uint16
 int __wrap_getnatpmprequesttimeout(natpmp_t* client, timeval* timeout) {
     if (const int status = failure("timeout")) return status;
     if (client->has_pending_request == 0) return NATPMP_ERR_NOPENDINGREQ;
-    *timeout = {0, std::max(0L, gateway.retryTime - gateway.natpmpTime) * 1000};
+    *timeout = {gateway.clockSetBack,
+                std::max(0L, gateway.retryTime - gateway.natpmpTime) * 1000};
     return 0;
 }
 
@@ -318,7 +319,7 @@ int __wrap_select(int count, fd_set* readable, fd_set* writable, fd_set* broken,
     EXPECT_EQ(count, FD_SETSIZE);
     EXPECT_TRUE(FD_ISSET(clientSocket, readable) && writable == nullptr && broken == nullptr);
     EXPECT_NE(fcntl(clientSocket, F_GETFD) & FD_CLOEXEC, 0) << "inherited by child processes";
-    const long limit = timeout->tv_usec / 1000;
+    const long limit = timeout->tv_sec * 1000 + timeout->tv_usec / 1000;
     gateway.note("natpmp wait " + std::to_string(limit) + " ms");
     if (gateway.connectionRefused) return 1;
     const long end = gateway.natpmpTime + limit;

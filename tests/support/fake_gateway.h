@@ -74,10 +74,11 @@ public:
     /// The library's choice: 0 none, 1 connected, 2 not connected, 3 no gateway.
     int igdState = 1;
 
-    bool silent = false;   ///< requests from now on are lost
-    long answerDelay = 0;  ///< requests are answered so much later
-    long natpmpTime = 0;   ///< spent waiting for answers
-    int copies = 1;        ///< of each answer
+    bool silent = false;    ///< requests from now on are lost
+    long answerDelay = 0;   ///< requests are answered so much later
+    long natpmpTime = 0;    ///< spent waiting for answers
+    long clockSetBack = 0;  ///< by so many seconds after each request
+    int copies = 1;         ///< of each answer
     /// Arrives in place of each answer, for the library itself to read.
     std::optional<std::string> datagram;
     /// NAT-PMP calls that fail with -9 and EIO: "open", "close", "address", "map", "timeout",

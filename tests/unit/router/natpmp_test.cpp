@@ -1,5 +1,7 @@
 #include "router/natpmp.h"
 
+#include "common/stop_budget.h"
+#include "common/termination.h"
 #include "unit/router/router_fixture.h"
 
 namespace pelorus {
@@ -42,6 +44,21 @@ TEST_F(NatpmpTest, EachRequestHasASocketOfItsOwn) {
                      "natpmp wait 1000 ms", "natpmp open at the same gateway", "natpmp close",
                      "natpmp map TCP 9091 -> 80 for 172800 s", "natpmp wait 250 ms"}));
     EXPECT_EQ(gateway.natpmpTime, 1750);
+}
+
+TEST_F(NatpmpTest, AStopDoesNotWaitForEachRequest) {
+    sigConnKilled = SIGTERM;
+    renewStopBudget(std::chrono::nanoseconds{1});
+    EXPECT_FALSE(stopBudgetSpent());
+    EXPECT_TRUE(client.retrieveExternalIP(ip));
+    EXPECT_TRUE(stopBudgetSpent());
+}
+
+TEST_F(NatpmpTest, AClockThatIsSetBackDoesNotProlongAWait) {
+    gateway.silent = true;
+    gateway.clockSetBack = 86400;
+    EXPECT_FALSE(client.retrieveExternalIP(ip));
+    EXPECT_EQ(gateway.natpmpTime, 3000);
 }
 
 TEST_F(NatpmpTest, AnAnswerWithoutAllItsValuesIsAnError) {

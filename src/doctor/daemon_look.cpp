@@ -26,7 +26,7 @@ std::optional<Process> findDaemon(const ProcessTable& processes, std::optional<p
 }
 
 std::string upText(const Process& process, const Evidence& evidence) {
-    std::string text = "daemon up";
+    std::string text{kDaemonUp};
     if (process.since) text += " " + ageInWords(evidence.now - *process.since);
     text += " (pid " + std::to_string(process.pid);
     if (!process.arguments.empty()) text += ", " + process.arguments;

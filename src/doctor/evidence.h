@@ -8,6 +8,7 @@
 #include <map>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "doctor/sign.h"
@@ -60,6 +61,9 @@ struct DaemonState {
     std::string options{};            ///< "-l 6 -f 120"; empty if not known
     std::optional<Time> nextCycle{};  ///< end of the pause it is in
 };
+
+/// How the check of a running daemon begins; the note for people adds the next cycle to it.
+inline constexpr std::string_view kDaemonUp = "daemon up";
 
 /// Everything found. Each looker adds to it; none reads what another one added, except settings.
 struct Evidence {

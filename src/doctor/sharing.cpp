@@ -5,18 +5,18 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
-#include <cstdint>
 #include <optional>
 
 #include "common/masks.h"
 #include "config/scrub.h"
+#include "doctor/address_class.h"
+#include "doctor/url_host.h"
 
 namespace pelorus::doctor {
 
 namespace {
 
 constexpr std::size_t kLeastSecret = 3;
-constexpr const char* kServiceDomain = ".kavra.example";
 
 bool isDigit(char letter) {
     return letter >= '0' && letter <= '9';
@@ -70,24 +70,19 @@ bool endsWith(std::string_view text, std::string_view end) {
     return text.size() > end.size() && text.substr(text.size() - end.size()) == end;
 }
 
-// As in SERVER_BASE_URL, where the scheme may be missing.
-std::string hostOf(const std::string& url) {
-    const std::size_t slashes = url.find("//");
-    const std::size_t start = slashes == std::string::npos ? 0 : slashes + 2;
-    return lowerCase(trimmed(url.substr(start, url.find_first_of("/:", start) - start)));
+// The host that SERVER_BASE_URL names.
+std::string hostOf(const std::string& baseUrl) {
+    const std::string host = serviceHost(baseUrl);
+    return lowerCase(host.substr(0, host.find_first_of("/:")));
 }
 
 // What an IPv4 address is called; empty if it tells nothing.
-std::string kindOf(const in_addr& address) {
-    const std::uint32_t value = ntohl(address.s_addr);
-    const auto isIn = [&](std::uint32_t network, unsigned bits) {
-        return value >> (32 - bits) == network >> (32 - bits);
-    };
-    if (isIn(0x7F000000, 8) || isIn(0xFF000000, 8) || value == 0) return "";
-    if (isIn(0x64400000, 10)) return "shared-address";
-    const bool isPrivate =
-        isIn(0x0A000000, 8) || isIn(0xAC100000, 12) || isIn(0xC0A80000, 16) || isIn(0xA9FE0000, 16);
-    return isPrivate ? "private-address" : "address";
+std::string kindOf(const std::string& address) {
+    for (const char* quiet : {"0.", "127.", "255."}) {
+        if (address.rfind(quiet, 0) == 0) return "";
+    }
+    if (isAtHome(address)) return "private-address";
+    return classOf(address) == AddressClass::SHARED ? "shared-address" : "address";
 }
 
 std::string kindOf(const in6_addr& address) {
@@ -120,7 +115,7 @@ bool isMac(std::string_view word) {
 }
 
 // Length of the IPv4 address at a place of a word, 0 if there is none.
-std::size_t ipv4Length(std::string_view word, std::size_t at, in_addr& address) {
+std::size_t ipv4Length(std::string_view word, std::size_t at) {
     const auto isNumber = [&](std::size_t index) {
         return index < word.size() && isDigit(word[index]);
     };
@@ -130,6 +125,7 @@ std::size_t ipv4Length(std::string_view word, std::size_t at, in_addr& address) 
     std::size_t end = at;
     while (isNumber(end) || (end < word.size() && word[end] == '.' && isNumber(end + 1))) ++end;
     const std::string text{word.substr(at, end - at)};
+    in_addr address{};
     return inet_pton(AF_INET, text.c_str(), &address) == 1 ? text.size() : 0;
 }
 
@@ -138,7 +134,7 @@ std::size_t ipv4Length(std::string_view word, std::size_t at, in_addr& address) 
 Masks::Masks(const std::map<std::string, std::string>& settings,
              bool sharing,
              const std::string& deviceName)
-    : isSharing{sharing}, ownName{lowerCase(deviceName)}, domains{kServiceDomain} {
+    : isSharing{sharing}, ownName{lowerCase(deviceName)} {
     const auto value = [&](const char* key) {
         const auto found = settings.find(key);
         return found == settings.end() ? std::string{} : trimmed(found->second);
@@ -157,9 +153,8 @@ Masks::Masks(const std::map<std::string, std::string>& settings,
     std::stable_sort(secrets.begin(), secrets.end(), [](const Secret& left, const Secret& right) {
         return left.value.size() > right.value.size();
     });
-    serviceHost = hostOf(value("SERVER_BASE_URL"));
-    const std::size_t dot = serviceHost.find('.');
-    if (dot != std::string::npos) domains.push_back(serviceHost.substr(dot));
+    service = hostOf(value("SERVER_BASE_URL"));
+    domain = domainOfNames(service);
 }
 
 std::string Masks::hide(std::string text) {
@@ -226,10 +221,9 @@ std::string Masks::hideWord(std::string_view word) {
 std::string Masks::hideAddresses(std::string_view word) {
     std::string result;
     for (std::size_t at = 0; at < word.size();) {
-        in_addr address{};
-        const std::size_t length = ipv4Length(word, at, address);
-        const std::string kind = length == 0 ? "" : kindOf(address);
+        const std::size_t length = ipv4Length(word, at);
         const std::string place{word.substr(at, std::max<std::size_t>(length, 1))};
+        const std::string kind = length == 0 ? "" : kindOf(place);
         result += kind.empty() ? place : replacement(kind, place);
         at += place.size();
     }
@@ -238,10 +232,9 @@ std::string Masks::hideAddresses(std::string_view word) {
 
 bool Masks::isHost(std::string_view name) const {
     if (name.empty()) return false;
-    if (name == ownName || name == serviceHost) return true;
+    if (name == ownName || name == service) return true;
     if (name.substr(0, name.find('.')) == ownName) return true;
-    return std::any_of(domains.begin(), domains.end(),
-                       [&](const std::string& domain) { return endsWith(name, domain); });
+    return endsWith(name, domain);
 }
 
 std::string Masks::replacement(const std::string& kind, const std::string& place) {

@@ -45,8 +45,8 @@ private:
 
     std::vector<Secret> secrets;  // the longest first
     bool isSharing;
-    std::string ownName, serviceHost;
-    std::vector<std::string> domains;  // with the leading dot
+    std::string ownName, service;
+    std::string domain;  // of the public names, with its leading dot
     std::map<std::string, std::string> replacements;
     std::map<std::string, int> counts;
 };

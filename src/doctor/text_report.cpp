@@ -106,7 +106,8 @@ private:
     [[nodiscard]] Lines causes() const;
     [[nodiscard]] std::string sentenceWithFacts(const NamedCause& named, std::size_t most) const;
     [[nodiscard]] std::string factWithSource(const Fact& fact) const;
-    [[nodiscard]] std::string daemonLine() const;
+    [[nodiscard]] std::string nextCycle() const;
+    void addNextCycle(std::vector<Check>& all) const;
     [[nodiscard]] std::vector<Check> checksToShow(const Compactness& compactness) const;
     [[nodiscard]] Lines checks(const Compactness& compactness) const;
     // Room for the text of a check between its verdict and its source.
@@ -225,31 +226,31 @@ Lines TextReport::causes() const {
     return lines;
 }
 
-// Empty if nothing is known of the process.
-std::string TextReport::daemonLine() const {
-    const DaemonState& daemon = diagnosis.daemon;
-    std::string text;
-    if (daemon.pid > 0 || daemon.since) text = "daemon up";
-    if (daemon.since) text += " " + timeBetween(*daemon.since, diagnosis.now);
-    std::string details;
-    if (daemon.pid > 0) details = "pid " + std::to_string(daemon.pid);
-    if (!daemon.options.empty()) details += (details.empty() ? "" : ", ") + daemon.options;
-    if (!text.empty() && !details.empty()) text += " (" + details + ")";
-    if (daemon.nextCycle && !diagnosis.fromElsewhere) {
-        text += text.empty() ? "next cycle " : ", next cycle ";
-        const bool isDue = *daemon.nextCycle <= diagnosis.now;
-        text += isDue ? "due now" : "in " + timeBetween(diagnosis.now, *daemon.nextCycle);
+// Empty if it is not known, or was that of a log's end.
+std::string TextReport::nextCycle() const {
+    const auto& when = diagnosis.daemon.nextCycle;
+    if (!when || diagnosis.fromElsewhere || diagnosis.reach == Reach::NOT_RUNNING) return "";
+    const bool isDue = *when <= diagnosis.now;
+    return "next cycle " + (isDue ? "due now" : "in " + timeBetween(diagnosis.now, *when));
+}
+
+// Beside the daemon it takes no line of its own.
+void TextReport::addNextCycle(std::vector<Check>& all) const {
+    const std::string text = nextCycle();
+    if (text.empty()) return;
+    const auto daemon = std::find_if(all.begin(), all.end(), [](const Check& check) {
+        return check.text.rfind(kDaemonUp, 0) == 0;
+    });
+    if (daemon == all.end()) {
+        all.push_back({Verdict::OK, Source::LOG, text});
+    } else {
+        daemon->text += ", " + text;
     }
-    return text;
 }
 
 std::vector<Check> TextReport::checksToShow(const Compactness& compactness) const {
     std::vector<Check> all = diagnosis.checks;
-    const bool isUp = diagnosis.reach != Reach::NOT_RUNNING;
-    if (const std::string line = daemonLine(); isUp && !line.empty()) {
-        const Source source = diagnosis.daemon.pid > 0 ? Source::NOW : Source::LOG;
-        all.insert(all.begin(), {Verdict::OK, source, line});
-    }
+    addNextCycle(all);
     if (compactness.joinsAll) {
         std::stable_sort(all.begin(), all.end(), [](const Check& left, const Check& right) {
             const bool isLeftOk = left.verdict == Verdict::OK;

@@ -32,7 +32,9 @@ TEST(JsonReport, HasEverything) {
                     "facts": [{"text": "the gateway says 100.64.3.9", "source": "now", "when": null},
                               {"text": "the service sees 203.0.113.7", "source": "log",
                                "when": "2026-11-22T12:07:00+00:00"}]}],
-        "checks": [{"verdict": "ok", "source": "now", "text": "web server answers on 80 and 443"},
+        "checks": [{"verdict": "ok", "source": "now", "text": "daemon up 12 days (pid 812)"
+},
+                   {"verdict": "ok", "source": "now", "text": "web server answers on 80 and 443"},
                    {"verdict": "problem", "source": "now", "text": "gateway has a shared address"},
                    {"verdict": "not-seen", "source": "settings", "text": "copy: not root"}],
         "daemon": {"pid": 812, "since": "2026-11-10T15:27:00+00:00", "options": "-l 6 -f 120",
@@ -42,7 +44,8 @@ TEST(JsonReport, HasEverything) {
                      "until": "2026-11-22T12:07:00+00:00", "address": "203.0.113.7",
                      "cause": "ports forwarded"},
                     {"reach": "relayed", "since": "2026-11-22T12:07:00+00:00", "until": null,
-                     "address": null, "cause": "second router found by the port test"}]})"));
+                     "address": null, "cause": "second router found by the port test"}]
+})"));
 }
 
 TEST(JsonReport, AnyBytesMakeValidJson) {

@@ -41,7 +41,8 @@ inline Diagnosis relayed() {
     diagnosis.causes = {{&kSecondNat,
                          {{Source::NOW, "the gateway says 100.64.3.9", {}},
                           {Source::LOG, "the service sees 203.0.113.7", since}}}};
-    diagnosis.checks = {{Check::Verdict::OK, Source::NOW, "web server answers on 80 and 443"},
+    diagnosis.checks = {{Check::Verdict::OK, Source::NOW, "daemon up 12 days (pid 812)"},
+                        {Check::Verdict::OK, Source::NOW, "web server answers on 80 and 443"},
                         {Check::Verdict::PROBLEM, Source::NOW, "gateway has a shared address"},
                         {Check::Verdict::NOT_SEEN, Source::SETTINGS, "copy: not root"}};
     diagnosis.daemon = {812, now - hours{12 * 24}, "-l 6 -f 120", now + seconds{40}};

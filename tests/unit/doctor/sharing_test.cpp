@@ -46,7 +46,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"ip=203.0.113.7&x http://203.0.113.7/", "ip=address-1&x http://address-1/"},
         {"NAS nas.local nasty", "host-1 host-2 nasty"},
         {"https://cloud.tavik.example:443/x", "https://host-1:443/x"},
-        {"cloud.tavik.example. relay3.tavik.example nas-devicedev7.kavra.example", "host-1. host-2 host-3"},
+        {"cloud.tavik.example. relay3.tavik.example nas-devicedev7.tavik.example", "host-1. host-2 host-3"},
         {"7.113.0.203.in-addr.arpa", "address-1.in-addr.arpa"},
         {"", ""}};
     // clang-format on

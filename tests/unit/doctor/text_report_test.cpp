@@ -26,10 +26,10 @@ Why    A second router stands in front of your gateway: the gateway says 100.64.
        sees 203.0.113.7 (log, 12:07).
 Helps  Put the provider's box into bridge mode.
 
-ok       daemon up 12 days (pid 812, -l 6 -f 120), next cycle in 40 s seen now
-ok       web server answers on 80 and 443                             seen now
-PROBLEM  gateway has a shared address                                 seen now
-not seen copy: not root                                               settings
+ok       daemon up 12 days (pid 812), next cycle in 40 s seen now
+ok       web server answers on 80 and 443                seen now
+PROBLEM  gateway has a shared address                    seen now
+not seen copy: not root                                  settings
 
 10 Nov 12:07  direct             12 days     ports forwarded                      log
 12:07         direct -> relayed  3 h 20 min  second router found by the port test log

@@ -19,7 +19,7 @@ TEST(JsonReport, HasEverything) {
     EXPECT_FALSE(report.at("version").get<std::string>().empty());
     report.erase("version");
     report.erase("exit_status");
-    EXPECT_EQ(report, json::parse(R"({
+    EXPECT_EQ(report, json::parse(R"json({
         "schema": 1, "now": "2026-11-22T15:27:00+00:00", "from_elsewhere": false,
         "reach": "relayed", "address": null, "ports": [9091, 9444],
         "since": "2026-11-22T12:07:00+00:00",
@@ -32,8 +32,7 @@ TEST(JsonReport, HasEverything) {
                     "facts": [{"text": "the gateway says 100.64.3.9", "source": "now", "when": null},
                               {"text": "the service sees 203.0.113.7", "source": "log",
                                "when": "2026-11-22T12:07:00+00:00"}]}],
-        "checks": [{"verdict": "ok", "source": "now", "text": "daemon up 12 days (pid 812)"
-},
+        "checks": [{"verdict": "ok", "source": "now", "text": "daemon up 12 days (pid 812)"},
                    {"verdict": "ok", "source": "now", "text": "web server answers on 80 and 443"},
                    {"verdict": "problem", "source": "now", "text": "gateway has a shared address"},
                    {"verdict": "not-seen", "source": "settings", "text": "copy: not root"}],
@@ -44,8 +43,7 @@ TEST(JsonReport, HasEverything) {
                      "until": "2026-11-22T12:07:00+00:00", "address": "203.0.113.7",
                      "cause": "ports forwarded"},
                     {"reach": "relayed", "since": "2026-11-22T12:07:00+00:00", "until": null,
-                     "address": null, "cause": "second router found by the port test"}]
-})"));
+                     "address": null, "cause": "second router found by the port test"}]})json"));
 }
 
 TEST(JsonReport, AnyBytesMakeValidJson) {

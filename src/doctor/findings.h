@@ -43,7 +43,7 @@ public:
     /// Takes what another process has sent. False when it is not a sequence of such lines, signs
     /// that no probe gives included; the records before the fault are then taken. A last line
     /// without its end is ignored.
-    [[nodiscard]] bool read(std::string_view lines);
+    [[nodiscard]] bool read(std::string_view text);
 
     [[nodiscard]] const std::vector<Seen>& signs() const { return seen; }
     [[nodiscard]] const std::vector<Check>& checks() const { return lines; }

@@ -84,6 +84,15 @@ void judgeRoute(const Interface& lan,
     }
 }
 
+void judgeTunnels(const std::vector<Interface>& all, Findings& findings) {
+    for (const Interface& entry : all) {
+        if (!entry.up || !entry.tunnel || entry.addresses.empty()) continue;
+        const std::string text = entry.name + " with " + entry.addresses.front();
+        findings.add(Sign::TUNNEL_INTERFACE_UP, "tunnel interface " + text);
+        findings.ok("tunnel interface: " + text);
+    }
+}
+
 }  // namespace
 
 std::vector<Interface> interfaces() {
@@ -148,16 +157,9 @@ void judgeNetwork(const std::vector<Interface>& all,
     const Interface* up = nullptr;
     const Interface* addressed = nullptr;
     for (const Interface& entry : all) {
-        if (!entry.up) continue;
-        if (entry.tunnel) {
-            if (entry.addresses.empty()) continue;
-            const std::string text = entry.name + " with " + entry.addresses.front();
-            findings.add(Sign::TUNNEL_INTERFACE_UP, "tunnel interface " + text);
-            findings.ok("tunnel interface: " + text);
-        } else {
-            if (up == nullptr) up = &entry;
-            if (addressed == nullptr && hasUsableAddress(entry)) addressed = &entry;
-        }
+        if (!entry.up || entry.tunnel) continue;
+        if (up == nullptr) up = &entry;
+        if (addressed == nullptr && hasUsableAddress(entry)) addressed = &entry;
     }
     if (up == nullptr) {
         findings.add(Sign::NO_INTERFACE_UP, "no network interface is up");
@@ -168,6 +170,7 @@ void judgeNetwork(const std::vector<Interface>& all,
     } else {
         judgeRoute(*addressed, route, findings);
     }
+    judgeTunnels(all, findings);
 }
 
 }  // namespace pelorus::doctor

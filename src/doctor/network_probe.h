@@ -1,3 +1,4 @@
+// The network interfaces, and what the relay needs.
 #ifndef PELORUS_DOCTOR_NETWORK_PROBE_H
 #define PELORUS_DOCTOR_NETWORK_PROBE_H
 

@@ -38,6 +38,7 @@ bool isProgram(const std::string& path) {
     settleChild(parent);
     static_cast<void>(dup2(output, STDOUT_FILENO));
     std::vector<char*> arguments;
+    arguments.reserve(words.size() + 1);
     for (std::string& word : words) arguments.push_back(word.data());
     arguments.push_back(nullptr);
     execv(program.c_str(), arguments.data());
@@ -69,8 +70,9 @@ std::string findProgram(const std::string& name) {
     const char* const path = std::getenv("PATH");
     std::istringstream folders{std::string{path == nullptr ? "" : path} + kMoreFolders};
     for (std::string folder; std::getline(folders, folder, ':');) {
-        std::string candidate = folder + "/" + name;
-        if (!folder.empty() && isProgram(candidate)) return candidate;
+        if (folder.empty()) continue;
+        folder.append("/").append(name);
+        if (isProgram(folder)) return folder;
     }
     return {};
 }
@@ -81,7 +83,8 @@ std::string relayClientOf(const std::string& startCommand, const std::string& fo
     for (std::string word; words >> word;) {
         const std::string name = word.substr(word.rfind('/') + 1);
         if (name.rfind("openvpn", 0) == 0 && name.find_first_of(".=>") == std::string::npos) {
-            return contains(word, "/") && word.front() != '/' ? folder + "/" + word : word;
+            const bool relative = contains(word, "/") && word.front() != '/';
+            return relative ? word.insert(0, folder + "/") : word;
         }
         if (absolute.empty() && word.front() == '/') absolute = word;
     }

@@ -99,6 +99,7 @@ private:
 // Negative descriptors are left out by poll.
 std::vector<pollfd> waitedFor(const std::vector<Child>& children) {
     std::vector<pollfd> waited;
+    waited.reserve(children.size());
     for (const Child& child : children) waited.push_back({child.descriptor(), POLLIN, 0});
     return waited;
 }
@@ -148,6 +149,7 @@ std::vector<Findings> runSideBySide(const std::vector<Probe>& probes,
     for (const Probe& probe : probes) children.emplace_back(probe);
     receiveUntil(end, children);
     std::vector<Findings> found;
+    found.reserve(children.size());
     for (const Child& child : children) found.push_back(child.findings());
     return found;
 }

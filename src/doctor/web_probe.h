@@ -1,3 +1,4 @@
+// The device's own web server and back end.
 #ifndef PELORUS_DOCTOR_WEB_PROBE_H
 #define PELORUS_DOCTOR_WEB_PROBE_H
 

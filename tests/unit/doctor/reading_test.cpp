@@ -87,7 +87,7 @@ TEST(Network, IsJudgedByItsFirstLack) {
     const Network rows[] = {
         {{}, false, {Sign::NO_INTERFACE_UP}},
         {{down}, true, {Sign::NO_INTERFACE_UP}},
-        {{down, tunnel}, true, {Sign::TUNNEL_INTERFACE_UP, Sign::NO_INTERFACE_UP}},
+        {{down, tunnel}, true, {Sign::NO_INTERFACE_UP, Sign::TUNNEL_INTERFACE_UP}},
         {{bare}, true, {Sign::NO_ADDRESS}},
         {{good}, false, {Sign::NO_DEFAULT_ROUTE}},
         {{bare, good}, true, {}},

@@ -58,7 +58,7 @@ private:
 };
 
 std::string shownTime(Time when) {
-    const std::time_t seconds = when.time_since_epoch().count();
+    const auto seconds = static_cast<std::time_t>(when.time_since_epoch().count());
     std::tm parts{};
     std::array<char, 32> text{};
     if (localtime_r(&seconds, &parts) == nullptr) return "?";

@@ -103,7 +103,7 @@ std::optional<Time> takeIsoStamp(std::string_view& line) {
 }
 
 std::optional<Time> latestNotInFuture(const std::tm& parts, Time now) {
-    const std::time_t seconds = now.time_since_epoch().count();
+    const auto seconds = static_cast<std::time_t>(now.time_since_epoch().count());
     std::tm today{};
     if (localtime_r(&seconds, &today) == nullptr) return std::nullopt;
     // A day that a year does not have becomes one of March.

@@ -34,7 +34,7 @@ protected:
         // No journal of this machine.
         setenv("PATH", folder.c_str(), 1);
     }
-    ~DeviceLogTest() override { fs::remove_all(folder); }
+    void TearDown() override { fs::remove_all(folder); }
 
     [[nodiscard]] std::string path(const std::string& name) const { return folder + "/" + name; }
 

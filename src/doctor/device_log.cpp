@@ -58,7 +58,7 @@ private:
 };
 
 std::string shownTime(Time when) {
-    const std::time_t seconds = when.time_since_epoch().count();
+    const auto seconds = static_cast<std::time_t>(when.time_since_epoch().count());
     std::tm parts{};
     std::array<char, 32> text{};
     if (localtime_r(&seconds, &parts) == nullptr) return "?";
@@ -102,17 +102,19 @@ std::vector<Entry> inOrder(const std::vector<std::string>& files, Evidence& evid
     return entries;
 }
 
-void readFile(LogStream& stream, const std::string& path, LineOrder& order, Evidence& evidence) {
+// Empty when it was read to its end.
+std::string readFile(LogStream& stream, const std::string& path, LineOrder& order) {
     order.beginFile();
     const bool whole =
         stream.isOpen() && stream.read([&order](std::string_view line) { order.take(line); });
-    if (!whole) cannotSee("log " + shownPath(path) + ": " + stream.problem, evidence);
+    return whole ? std::string{} : "log " + shownPath(path) + ": " + stream.problem;
 }
 
 void readChosen(const LogChoice& choice, LineOrder& order, Evidence& evidence) {
     for (Entry& entry : inOrder(choice.files, evidence)) {
         if (!entry.stream) entry.stream = std::make_unique<LogStream>(entry.path, true);
-        readFile(*entry.stream, entry.path, order, evidence);
+        const std::string problem = readFile(*entry.stream, entry.path, order);
+        if (!problem.empty()) cannotSee(problem, evidence);
         entry.stream.reset();
     }
 }
@@ -123,10 +125,14 @@ void readSystemLogs(const std::string& folder,
                     LineOrder& order,
                     Evidence& evidence) {
     for (const char* const name : kSystemLogs) {
+        std::string problem;
         for (const std::string& path : rotatedLogs(folder, name)) {
             LogStream stream{path, false};
-            readFile(stream, path, order, evidence);
+            const std::string found = readFile(stream, path, order);
+            if (!found.empty()) problem = found;
         }
+        // The rotated ones mostly have the newest one's fault.
+        if (!problem.empty()) cannotSee(problem, evidence);
         if (story.end()) return;
     }
 }

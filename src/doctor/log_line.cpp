@@ -102,8 +102,8 @@ std::optional<Time> takeIsoStamp(std::string_view& line) {
     return Time{std::chrono::seconds{timegm(&parts) - *zone}};
 }
 
-std::optional<Time> latestNotInFuture(std::tm parts, Time now) {
-    const std::time_t seconds = now.time_since_epoch().count();
+std::optional<Time> latestNotInFuture(const std::tm& parts, Time now) {
+    const auto seconds = static_cast<std::time_t>(now.time_since_epoch().count());
     std::tm today{};
     if (localtime_r(&seconds, &today) == nullptr) return std::nullopt;
     // A day that a year does not have becomes one of March.
@@ -115,6 +115,26 @@ std::optional<Time> latestNotInFuture(std::tm parts, Time now) {
         if (tried.tm_mday == parts.tm_mday && when <= now + kFuture) return when;
     }
     return std::nullopt;
+}
+
+// Time zones change on the hour: the lines of one hour share the costly part. Only hours that lie
+// well in the past are kept.
+std::optional<Time> classicTime(const std::tm& parts, Time now) {
+    struct Hour {
+        int month = -1, day = -1, hour = -1;
+        Time now{}, begin{};
+    };
+    thread_local Hour known;
+    const auto within = std::chrono::seconds{parts.tm_min * 60 + parts.tm_sec};
+    if (known.month == parts.tm_mon && known.day == parts.tm_mday && known.hour == parts.tm_hour &&
+        known.now == now) {
+        return known.begin + within;
+    }
+    const auto when = latestNotInFuture(parts, now);
+    if (when && *when + 1h <= now + kFuture) {
+        known = {parts.tm_mon, parts.tm_mday, parts.tm_hour, now, *when - within};
+    }
+    return when;
 }
 
 std::optional<Time> takeClassicStamp(std::string_view& line, Time now) {
@@ -131,7 +151,7 @@ std::optional<Time> takeClassicStamp(std::string_view& line, Time now) {
     }
     parts.tm_mon = static_cast<int>(month / kName);
     parts.tm_mday = *day;
-    const auto when = latestNotInFuture(parts, now);
+    const auto when = classicTime(parts, now);
     if (when) line = rest;
     return when;
 }

@@ -1,5 +1,6 @@
 #include "doctor/log_rules.h"
 
+#include <algorithm>
 #include <cctype>
 
 namespace pelorus::doctor {
@@ -44,6 +45,7 @@ LogRule ruleFor(int severity, std::string_view text) {
     LogRule rule;
     rule.severity = severity;
     rule.text = text;
+    rule.beginning = std::min(text.find('%'), text.size());
     return rule;
 }
 
@@ -312,6 +314,11 @@ bool takeValue(std::string_view& text, char kind, std::string_view next, std::st
     return true;
 }
 
+// Both begin with the same letters as far as the first conversion. Most rules go by this alone.
+bool begin(std::string_view text, const LogRule& rule) {
+    return text.compare(0, rule.beginning, rule.text, 0, rule.beginning) == 0;
+}
+
 bool fits(std::string_view text, std::string_view pattern, LogValues& values) {
     std::size_t count = 0;
     for (;;) {
@@ -359,7 +366,9 @@ const std::vector<LogRule>& logRules() {
 }
 
 const LogRule* findLogRule(std::string_view text, LogValues& values) {
+    values = {};
     for (const LogRule& rule : logRules()) {
+        if (!begin(text, rule)) continue;
         values = {};
         if (!fits(text, rule.text, values)) continue;
         const auto& [value, wanted] = rule.condition;

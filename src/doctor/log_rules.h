@@ -56,6 +56,7 @@ struct LogRule {
     int severity{};  ///< as syslog counts
     /// As in the source, conversions included; the end of the line may be missing.
     std::string_view text;
+    std::size_t beginning{};  ///< bytes of it before the first conversion
     LogEvent event = LogEvent::NOTHING;
     std::vector<Sign> set{};
     std::vector<Sign> cleared{};

@@ -235,8 +235,7 @@ void LogStory::happenInLife(LogEvent event, Time when) {
             break;
         case LogEvent::COPY_MISSING:
             // Only a machine that was restarted loses the copy, and with it every tunnel.
-            if (!nextCycle && history.size() > 0 && history.back().cause == kStarted)
-                orphan = false;
+            if (!history.empty() && history.back().cause == kStarted) orphan = false;
             break;
         default:
             break;

@@ -60,7 +60,7 @@ private:
     void explainStart();
     void assumeFrom(std::string_view status);
     void assume(Reach status);
-    void become(Reach reach, Time when, const std::string& cause);
+    void become(Reach next, Time when, const std::string& cause);
     [[nodiscard]] bool isInBetween(Reach next, Time when) const;
     [[nodiscard]] Reach reach() const;
     [[nodiscard]] std::string reasonText() const;

@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 
 #include "doctor/log_source.h"
 
@@ -33,7 +34,7 @@ protected:
         // No journal of this machine.
         setenv("PATH", folder.c_str(), 1);
     }
-    ~DeviceLogTest() override { fs::remove_all(folder); }
+    void TearDown() override { fs::remove_all(folder); }
 
     [[nodiscard]] std::string path(const std::string& name) const { return folder + "/" + name; }
 
@@ -101,8 +102,9 @@ TEST_F(DeviceLogTest, TheJournalComesFirst) {
 
 TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
     const std::string whole = zipped("whole.gz", kFirst + std::string(100000, 'x') + kSecond);
-    std::string bytes(fs::file_size(whole) - 20, '\0');
-    std::ifstream{whole}.read(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+    std::ifstream file{whole};
+    std::string bytes{std::istreambuf_iterator<char>{file}, {}};
+    bytes.resize(bytes.size() - 20);
     const struct {
         std::string file;
         std::string problem;

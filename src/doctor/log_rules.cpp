@@ -69,8 +69,8 @@ LogRule info(std::string_view text) {
     return ruleFor(6, text);
 }
 
-const std::vector<Sign> kService{Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_SERVICE_SILENT,
-                                 Sign::LOGGED_SERVICE_CERTIFICATE};
+const std::vector<Sign> kService{Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_SERVICE_UNREACHABLE,
+                                 Sign::LOGGED_SERVICE_SILENT, Sign::LOGGED_SERVICE_CERTIFICATE};
 const std::vector<Sign> kGateway{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
                                  Sign::LOGGED_NO_ADDRESS};
 const std::vector<Sign> kRefusals{Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER};
@@ -174,7 +174,7 @@ Rules testRules() {
     info("TavikClient::testPort[1-3] - Port Test URL: [%s]").keeps(Kept::PORT)
         .clears({Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_SERVICE_WAIT, Sign::LOGGED_CREDENTIALS_MISSING}),
     notice("TavikClient::testPort[%d] - httpGet got %s, %d bytes from central server.").happens(LogEvent::TEST_ANSWER),
-    error("TavikClient::testPort[%d] - httpGet for %s, no response from central server.").happens(LogEvent::SERVICE_FAILED),
+    error("TavikClient::testPort[%d] - httpGet for %s, no response from central server.").happens(LogEvent::TEST_UNANSWERED),
     error("TavikClient::testPort - Enforce connection as RELAY (double-NAT detected")
         .sets(Sign::LOGGED_SECOND_NAT, "the gateway says {gateway}, the service sees {service}")
         .clears({Sign::LOGGED_TEST_FAILED}).happens(LogEvent::PORTS_LOST),
@@ -207,7 +207,8 @@ Rules serviceRules() {
     error("TavikClient::httpGet  Error: [%s]").keeps(Kept::ERROR),
     info("TavikClient::pollServerForSleepTime - sleep time from server is %d secs.").keeps(Kept::WAIT).clears(kService),
     info("TavikClient::pollServerForSleepTime - central server gave permission to proceed.")
-        .clears({Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_SERVICE_SILENT, Sign::LOGGED_SERVICE_WAIT}),
+        .clears({Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
+                 Sign::LOGGED_SERVICE_WAIT}),
     info("TavikClient::pollServerForSleepTime - received garbage sleep time")
         .sets(Sign::LOGGED_SERVICE_NONSENSE, "the service's answer about waiting is not understood"),
     info("TavikClient::pollServerForSleepTime - malformed wait_time")

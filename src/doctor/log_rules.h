@@ -16,20 +16,21 @@ namespace pelorus::doctor {
 /// What a line does to the story beyond setting and clearing signs.
 enum class LogEvent {
     NOTHING,
-    ANNOUNCED,       ///< the first line of a start; not there without a log option
-    STARTED,         ///< the daemon's process is there
-    START_FAILED,    ///< and ends
-    SIGNALLED,       ///< told to end by a signal
-    SWITCHED_OFF,    ///< remote access goes off, by a signal or by the settings
-    ENDED,           ///< the orderly end
-    IDLE,            ///< a cycle without credentials
-    CYCLE,           ///< a cycle begins
-    CYCLE_ENDS,      ///< value 1: seconds until the next one
-    STATUS,          ///< value 1: the status word that is reported
-    STATUS_THERE,    ///< value 1: the status word that was reported earlier
-    TYPE,            ///< value 1: number of the connection type that a cycle ended with
-    TEST_ANSWER,     ///< value 2: the service's answer to a port test
-    TEST_FAILED,     ///< the port test as a whole
+    ANNOUNCED,     ///< the first line of a start; not there without a log option
+    STARTED,       ///< the daemon's process is there
+    START_FAILED,  ///< and ends
+    SIGNALLED,     ///< told to end by a signal
+    SWITCHED_OFF,  ///< remote access goes off, by a signal or by the settings
+    ENDED,         ///< the orderly end
+    IDLE,          ///< a cycle without credentials
+    CYCLE,         ///< a cycle begins
+    CYCLE_ENDS,    ///< value 1: seconds until the next one
+    STATUS,        ///< value 1: the status word that is reported
+    STATUS_THERE,  ///< value 1: the status word that was reported earlier
+    TYPE,          ///< value 1: number of the connection type that a cycle ended with
+    TEST_ANSWER,   ///< value 2: the service's answer to a port test
+    TEST_FAILED,   ///< the port test as a whole
+    TEST_UNANSWERED,
     SERVICE_FAILED,  ///< a request to the service got no answer
     PUBLISHED,       ///< the service has the record; the back end is told next
     PUBLISHING_FAILED,

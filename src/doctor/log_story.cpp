@@ -16,15 +16,21 @@ constexpr std::string_view kStarted = "the daemon started";
 constexpr std::string_view kPassed = "the ports passed their test and were published";
 constexpr std::string_view kTunnelUp = "the tunnel came up";
 
-const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_SERVICE_SILENT,
+const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
+                                      Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
                                       Sign::LOGGED_SERVICE_CERTIFICATE};
 // What a published port disproves.
-const std::vector<Sign> kDirectSigns{
-    Sign::LOGGED_ATTEMPT,          Sign::LOGGED_TEST_FAILED,
-    Sign::LOGGED_SECOND_NAT,       Sign::LOGGED_PUBLISHING_FAILED,
-    Sign::LOGGED_GATEWAY_REFUSES,  Sign::LOGGED_PORT_HELD_BY_OTHER,
-    Sign::LOGGED_SERVICE_WAIT,     Sign::LOGGED_CREDENTIALS_MISSING,
-    Sign::LOGGED_MANUAL_RULED_OUT, Sign::LOGGED_MANUAL_PORT_INVALID};
+const std::vector<Sign> kDirectSigns{Sign::LOGGED_ATTEMPT,
+                                     Sign::LOGGED_TEST_FAILED,
+                                     Sign::LOGGED_TEST_UNANSWERED,
+                                     Sign::LOGGED_SECOND_NAT,
+                                     Sign::LOGGED_PUBLISHING_FAILED,
+                                     Sign::LOGGED_GATEWAY_REFUSES,
+                                     Sign::LOGGED_PORT_HELD_BY_OTHER,
+                                     Sign::LOGGED_SERVICE_WAIT,
+                                     Sign::LOGGED_CREDENTIALS_MISSING,
+                                     Sign::LOGGED_MANUAL_RULED_OUT,
+                                     Sign::LOGGED_MANUAL_PORT_INVALID};
 const std::vector<Sign> kRelaySolves{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
                                      Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
                                      Sign::LOGGED_SECOND_NAT};
@@ -176,6 +182,10 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             break;
         case LogEvent::TEST_FAILED:
             failTest(when);
+            break;
+        case LogEvent::TEST_UNANSWERED:
+            failService(when);
+            set(Sign::LOGGED_TEST_UNANSWERED, when, "no answer to the port test");
             break;
         case LogEvent::SERVICE_FAILED:
             failService(when);
@@ -346,8 +356,9 @@ void LogStory::takeStatus(std::string_view word, Time when) {
 
 void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     clear(kServiceSigns);
-    clear({Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT, Sign::LOGGED_TEST_SKIPPED_DISK,
-           Sign::LOGGED_CREDENTIALS_MISSING, Sign::LOGGED_MANUAL_PORT_INVALID});
+    clear({Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,
+           Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_CREDENTIALS_MISSING,
+           Sign::LOGGED_MANUAL_PORT_INVALID});
     const std::string asked = shown(tagged(answer, "external_ip"));
     const std::string seen = shown(tagged(answer, "remote_external_ip"));
     if (!asked.empty()) value(Kept::TESTED) = asked;
@@ -367,7 +378,8 @@ void LogStory::takeTestAnswer(std::string_view answer, Time when) {
 }
 
 void LogStory::failTest(Time when) {
-    if (!serviceFails() && signs.count(Sign::LOGGED_SERVICE_NONSENSE) == 0) {
+    if (!serviceFails() && signs.count(Sign::LOGGED_SERVICE_NONSENSE) == 0 &&
+        signs.count(Sign::LOGGED_TEST_UNANSWERED) == 0) {
         const std::string& port = value(Kept::PORT);
         set(Sign::LOGGED_TEST_FAILED, when,
             "the service could not reach " + (port.empty() ? "the port" : "port " + port));
@@ -382,6 +394,8 @@ void LogStory::failService(Time when) {
     } else if (contains(error, "certificate") || contains(error, "CA cert")) {
         set(Sign::LOGGED_SERVICE_CERTIFICATE, when,
             "the service's certificate is not accepted: " + error);
+    } else if (contains(error, "connect to")) {
+        set(Sign::LOGGED_SERVICE_UNREACHABLE, when, "no connection to the service: " + error);
     } else {
         set(Sign::LOGGED_SERVICE_SILENT, when,
             "no answer from the service" + (error.empty() ? "" : ": " + error));

@@ -78,6 +78,7 @@ enum class Sign {
     LOGGED_SERVICE_UNRESOLVED,
     LOGGED_SERVICE_UNREACHABLE,  ///< no connection
     LOGGED_SERVICE_SILENT,       ///< a connection, but no answer to requests
+    LOGGED_TEST_UNANSWERED,      ///< no answer to the last port test
     LOGGED_SERVICE_CERTIFICATE,
     LOGGED_SERVICE_NONSENSE,
     LOGGED_OTHER_DEVICE,

@@ -1,7 +1,9 @@
 """The Debian package's life on a device: installed, set up, upgraded, removed and purged.
 
 The device is a whole Debian system that is booted by systemd, so that the package's scripts, the
-unit and its restrictions are at work. Its home network and the internet are the lab's.
+unit and its restrictions are at work. Its home network and the internet are the lab's. With another
+processor's programs, under qemu, systemd does not run: there the package is installed, set up,
+started as an init script would, stopped and purged.
 """
 
 from __future__ import annotations
@@ -18,8 +20,8 @@ import traceback
 from pathlib import Path
 
 from lab import sandbox
-from lab.booted import ROOT, Booted
-from lab.checks import BOTH_MAPPED, RELAYED, SILENT, assert_published
+from lab.booted import ROOT, Booted, Chrooted, System
+from lab.checks import BOTH_MAPPED, RELAYED, SILENT, assert_published, wait_for_log
 from lab.clock import fast_pauses
 from lab.device import DYNAMIC_COPY, DYNAMIC_FILE, HOME
 from lab.gateway import GatewaySetup
@@ -33,6 +35,7 @@ _STATIC = ROOT / "etc/pelorus/globalconfig.ini"
 _OPTIONS = ROOT / "etc/default/pelorus"
 _SETTINGS = ROOT / "var/lib/pelorus/dynamicconfig.ini"
 _COPY = ROOT / "run/pelorus/dynamicconfig.ini"
+_PID_FILE = ROOT / "tmp/tavik_cm_pid"
 _TUNNEL = ROOT / "etc/openvpn/pelorus"
 _OLD_SETTINGS = ROOT / "var/www/rest-api/config"
 _RELEASED_OPTIONS = """\
@@ -54,10 +57,10 @@ _VOLATILE = ("var/log", "var/cache", "var/lib/dpkg", "var/lib/apt", "var/lib/sys
              "etc/ld.so.cache", "run/initctl", "run/utmp")
 
 
-class Installed:
-    """One package on one booted device."""
+class Package:
+    """A package on a device: what a booted and an emulated one have in common."""
 
-    def __init__(self, lab: Lab, system: Booted, package: Path) -> None:
+    def __init__(self, lab: Lab, system: System, package: Path) -> None:
         self._lab = lab
         self._system = system
         self._package = package
@@ -65,6 +68,77 @@ class Installed:
 
     def play(self, stay: bool) -> None:
         """Go through the package's life; with `stay` wait for Ctrl-C after the installation."""
+        raise NotImplementedError
+
+    def _prepare(self) -> None:
+        """Start a device that trusts the lab's service; the lab's back end writes its settings."""
+        authority = ROOT / "usr/local/share/ca-certificates/lab.crt"
+        authority.write_text(Path("/etc/netns/device/ssl/certs/ca-certificates.crt").read_text())
+        shutil.copy(HOME / "bin/hdparm", ROOT / "usr/local/sbin")
+        self._system.start()
+        self._system.run("update-ca-certificates")
+        (ROOT / "run/device").mkdir()
+        shutil.copy(HOME / "drive_state", ROOT / "run/device")
+        (ROOT / "tmp/minutes_since_disk_access").write_text("0\n")
+        for folder, own in ((DYNAMIC_COPY.parent, _COPY.parent),
+                            (DYNAMIC_FILE.parent, _SETTINGS.parent)):
+            shutil.rmtree(folder)
+            folder.symlink_to(own)
+        self._before = _listing()
+
+    def _has_its_files(self) -> None:
+        for path, (mode, group) in _MODES.items():
+            found = (ROOT / path).stat()
+            wanted = (mode, 0, {"root": 0, "www-data": 33}[group])
+            assert (found.st_mode & 0o7777, found.st_uid, found.st_gid) == wanted, path
+
+    def _has_asked_nothing(self) -> None:
+        assert not self._lab.central.requests, self._lab.central.state()
+        assert not self._lab.gateway.mappings()
+
+    def _has_cleaned_up(self) -> None:
+        assert not self._lab.gateway.mappings(), self._lab.gateway.mappings()
+        assert self._lab.central.record is None
+        assert self._lab.device.status == "disabled"
+
+    def _has_left_nothing(self) -> None:
+        left = _listing() - self._before
+        assert not left, sorted(left)
+
+    def _install(self, package: Path, word: str) -> None:
+        shutil.copy(package, ROOT / "root")
+        self._run_documented(word)
+        (ROOT / "root" / package.name).unlink()
+
+    def _run_documented(self, word: str) -> None:
+        """Run the commands in docs/install.md that contain a word, in root's folder."""
+        text = (sandbox.PROJECT / "docs/install.md").read_text()
+        [commands] = [block for block in re.findall(r"^```sh$(.*?)^```$", text, re.M | re.S)
+                      if word in block]
+        self._system.run("sh", "-euc", f"cd /root{commands}")
+
+    def _wait_for_status(self, status: str) -> None:
+        self._lab.wait_for(lambda: self._lab.device.status == status, f"status {status}", _PATIENCE)
+
+    def _look_around(self) -> None:
+        account = self._lab.account
+        print(f"""
+The package is installed on the device and idles. Its credentials would be
+  DEVICEID={account.device_id}
+  DEVICEAUTH={account.auth}
+The lab stays up until Ctrl-C. From another terminal, as root:
+  a shell on the device   nsenter -a -t {sandbox.pid_outside()} {' '.join(
+            self._system.enter('bash'))}""", flush=True)
+        while True:
+            time.sleep(1)
+
+
+class Installed(Package):
+    """The package on a device that systemd boots."""
+
+    _system: Booted
+
+    def play(self, stay: bool) -> None:
         self._prepare()
         self._installs_and_idles()
         self._gives_local_users_nothing()
@@ -82,21 +156,8 @@ class Installed:
         self._purges()
 
     def _prepare(self) -> None:
-        """Boot a device that trusts the lab's service; the lab's back end writes its settings."""
-        authority = ROOT / "usr/local/share/ca-certificates/lab.crt"
-        authority.write_text(Path("/etc/netns/device/ssl/certs/ca-certificates.crt").read_text())
-        shutil.copy(HOME / "bin/hdparm", ROOT / "usr/local/sbin")
         self._speed_up()
-        self._system.start()
-        self._system.run("update-ca-certificates")
-        (ROOT / "run/device").mkdir()
-        shutil.copy(HOME / "drive_state", ROOT / "run/device")
-        (ROOT / "tmp/minutes_since_disk_access").write_text("0\n")
-        for folder, own in ((DYNAMIC_COPY.parent, _COPY.parent),
-                            (DYNAMIC_FILE.parent, _SETTINGS.parent)):
-            shutil.rmtree(folder)
-            folder.symlink_to(own)
-        self._before = _listing()
+        super()._prepare()
         self._system.follow(UNIT, self._lab.timeline)
 
     def _speed_up(self) -> None:
@@ -117,15 +178,11 @@ class Installed:
         self._lab.step("the package is installed and left as it is")
         self._run_as("nobody", "ln -s /etc/passwd /tmp/tavik_cm_pid")
         self._install(self._package, "install -y ./")
-        for path, (mode, group) in _MODES.items():
-            found = (ROOT / path).stat()
-            wanted = (mode, 0, {"root": 0, "www-data": 33}[group])
-            assert (found.st_mode & 0o7777, found.st_uid, found.st_gid) == wanted, path
+        self._has_its_files()
         assert self._system.run("systemctl", "is-enabled", UNIT).strip() == "enabled"
         self._wait_for_log("Deviceid and DeviceAuth is empty. Idle Process.")
-        assert not self._lab.central.requests, self._lab.central.state()
-        assert not self._lab.gateway.mappings()
-        assert not (ROOT / "tmp/tavik_cm_pid").is_symlink()
+        self._has_asked_nothing()
+        assert not _PID_FILE.is_symlink()
         restrictions = self._system.run("cat", f"/proc/{self._main()}/status")
         assert "NoNewPrivs:\t1\nSeccomp:\t2\n" in restrictions, restrictions
 
@@ -210,9 +267,7 @@ class Installed:
         self._lab.step("the package is removed")
         self._run_documented("apt-get remove")
         assert not self._system.running("pelorus", "pelorus (deleted)")
-        assert not self._lab.gateway.mappings(), self._lab.gateway.mappings()
-        assert self._lab.central.record is None
-        assert self._lab.device.status == "disabled"
+        self._has_cleaned_up()
         assert _STATIC.exists() and _SETTINGS.exists()
 
     def _purges(self) -> None:
@@ -223,8 +278,7 @@ class Installed:
         # Made by the test, but for the credentials.
         for folder in (_TUNNEL, ROOT / "var/www"):
             shutil.rmtree(folder, ignore_errors=True)
-        left = _listing() - self._before
-        assert not left, sorted(left)
+        self._has_left_nothing()
 
     def _upgrades_an_older_device(self) -> None:
         self._lab.step("a device set up with the first release is upgraded: it keeps its settings")
@@ -269,18 +323,6 @@ class Installed:
         DYNAMIC_FILE.parent.symlink_to(_OLD_SETTINGS)
         _set_up_tunnel()
 
-    def _install(self, package: Path, word: str) -> None:
-        shutil.copy(package, ROOT / "root")
-        self._run_documented(word)
-        (ROOT / "root" / package.name).unlink()
-
-    def _run_documented(self, word: str) -> None:
-        """Run the commands in docs/install.md that contain a word, in root's folder."""
-        text = (sandbox.PROJECT / "docs/install.md").read_text()
-        [commands] = [block for block in re.findall(r"^```sh$(.*?)^```$", text, re.M | re.S)
-                      if word in block]
-        self._system.run("sh", "-euc", f"cd /root{commands}")
-
     def _may(self, user: str, access: str, path: str) -> bool:
         return self._system.attempt(*_AS[user], "test", access, f"/{path}").returncode == 0
 
@@ -290,23 +332,44 @@ class Installed:
     def _main(self) -> int:
         return self._system.main_process(UNIT)
 
-    def _wait_for_status(self, status: str) -> None:
-        self._lab.wait_for(lambda: self._lab.device.status == status, f"status {status}", _PATIENCE)
-
     def _wait_for_log(self, part: str) -> None:
         wait_until(lambda: any(part in line for line in self._system.log), f"[{part}]", _PATIENCE)
 
-    def _look_around(self) -> None:
-        account = self._lab.account
-        print(f"""
-The package is installed on the device and idles. Its credentials would be
-  DEVICEID={account.device_id}
-  DEVICEAUTH={account.auth}
-The lab stays up until Ctrl-C. From another terminal, as root:
-  a shell on the device   nsenter -a -t {sandbox.pid_outside()} {' '.join(
-            self._system.enter('bash'))}""", flush=True)
-        while True:
-            time.sleep(1)
+
+class Emulated(Package):
+    """The package for another processor, whose programs run under qemu."""
+
+    def play(self, stay: bool) -> None:
+        self._prepare()
+        self._lab.step("the package is installed and left as it is")
+        self._install(self._package, "install -y ./")
+        self._has_its_files()
+        assert (ROOT / f"etc/systemd/system/multi-user.target.wants/{UNIT}").is_symlink()
+        daemon = self._start()
+        wait_for_log(self._lab, "Deviceid and DeviceAuth is empty. Idle Process.")
+        self._has_asked_nothing()
+        if stay:
+            return self._look_around()
+        _stop(daemon)
+        self._lab.step("the credentials are filled in")
+        self._run_documented("DEVICEID")
+        daemon = self._start()
+        self._wait_for_status("portforwarded")
+        assert_published(self._lab)
+        self._lab.step("the daemon is stopped, the package removed and purged")
+        _stop(daemon)
+        self._has_cleaned_up()
+        self._run_documented("apt-get remove")
+        assert _STATIC.exists() and _SETTINGS.exists()
+        self._run_documented("apt-get purge")
+        self._has_left_nothing()
+
+    def _start(self) -> int:
+        """Start the daemon as the unit does, and return its pid."""
+        unit = (ROOT / f"lib/systemd/system/{UNIT}").read_text()
+        assert "\nExecStart=/usr/sbin/pelorus $PELORUS_OPTIONS\n" in unit
+        self._run_documented("/usr/sbin/pelorus $PELORUS_OPTIONS")
+        return int(wait_until(_PID_FILE.read_text, "the pid", _PATIENCE))
 
 
 def _listing() -> set[str]:
@@ -315,6 +378,12 @@ def _listing() -> set[str]:
                            text=True, check=True).stdout.splitlines()
     names = (name.removeprefix(f"{ROOT}/") for name in found)
     return {name for name in names if not name.startswith(_VOLATILE)}
+
+
+def _stop(daemon: int) -> None:
+    """End the daemon, which has become a child of the sandbox's first process: this one."""
+    os.kill(daemon, signal.SIGTERM)
+    wait_until(lambda: os.waitpid(daemon, os.WNOHANG)[0], "the daemon's end", _PATIENCE)
 
 
 def _set_up_tunnel() -> None:
@@ -363,11 +432,11 @@ def _released(package: Path) -> Path:
     return old
 
 
-def _obstacle() -> str:
-    """Why this machine cannot boot a system inside the lab; empty when it can."""
+def _obstacle(boots: bool) -> str:
+    """Why this machine cannot have, or boot, a system inside the lab; empty when it can."""
     if os.geteuid() != 0:
         return "needs root: the device's files belong to several users"
-    if not _cgroup_folder():
+    if boots and not _cgroup_folder():
         return "this machine has no cgroup2 file system that can be written"
     return sandbox.why_forbidden() or ""
 
@@ -381,11 +450,13 @@ def _cgroup_folder() -> Path | None:
     return None
 
 
-def _outside() -> int:
-    """Open a sandbox, with a control group that is removed afterwards."""
-    if reason := _obstacle():
+def _outside(boots: bool) -> int:
+    """Open a sandbox; for what boots, with a control group that is removed afterwards."""
+    if reason := _obstacle(boots):
         print(f"test-deb: {reason}")
         return sandbox.FORBIDDEN
+    if not boots:
+        return _open_sandbox()
     parent = _cgroup_folder()
     assert parent
     group = parent / f"pelorus-lab-{os.getpid()}"
@@ -393,23 +464,27 @@ def _outside() -> int:
         signal.signal(number, lambda received, _: sys.exit(128 + received))
     group.mkdir()
     try:
-        status = sandbox.run("lab.installed", [*sys.argv[1:], "--cgroup", str(group)],
-                             own_users=False).returncode
-        return status if status >= 0 else 128 - status
+        return _open_sandbox("--cgroup", str(group))
     finally:
         wait_until(lambda: "populated 0" in (group / "cgroup.events").read_text(), "its end", 10)
         for folder, _, _ in os.walk(group, topdown=False):
             os.rmdir(folder)
 
 
-def _play(package: Path, archive: Path, cgroup: Path, stay: bool) -> int:
+def _open_sandbox(*more: str) -> int:
+    status = sandbox.run("lab.installed", [*sys.argv[1:], *more], own_users=False).returncode
+    return status if status >= 0 else 128 - status
+
+
+def _play(package: Path, archive: Path, cgroup: Path | None, stay: bool) -> int:
     signal.signal(signal.SIGINT, signal.default_int_handler)
     timeline = Timeline()
     timeline.listen(lambda event: print(event, flush=True))
-    lab = Lab(Situation(relay=True, clock=1 if stay else RELAYED), timeline)
-    system = Booted(archive, cgroup, lab.account.host_name)
+    lab = Lab(Situation(relay=True, clock=RELAYED if cgroup and not stay else 1), timeline)
+    name = lab.account.host_name
+    system = Booted(archive, cgroup, name) if cgroup else Chrooted(archive, name)
     try:
-        Installed(lab, system, package).play(stay)
+        (Installed if cgroup else Emulated)(lab, system, package).play(stay)
     except KeyboardInterrupt:
         print("\nthe lab has been removed")
     except (LabError, AssertionError):
@@ -427,10 +502,12 @@ def main() -> int:
     parser.add_argument("archive", type=Path, help="files of a Debian system")
     parser.add_argument("--stay", action="store_true",
                         help="install and keep the device up until Ctrl-C, to look around")
+    parser.add_argument("--emulated", action="store_true",
+                        help="the system is another processor's, as lab.foreign runs it")
     parser.add_argument("--cgroup", type=Path, help=argparse.SUPPRESS)
     arguments = parser.parse_args()
     if not sandbox.is_inside():
-        return _outside()
+        return _outside(not arguments.emulated)
     return _play(arguments.package, arguments.archive, arguments.cgroup, arguments.stay)
 
 

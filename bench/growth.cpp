@@ -1,5 +1,5 @@
 // growth MEASURE SIZE CYCLES: CPU time of the whole daemon on the unit tests' doubles, whose work is
-// included, without noise and watcher threads. Prints lines of a name, a size and microseconds.
+// included, without noise and the watcher's thread. Prints lines of a name, a size and microseconds.
 //   table   the first cycle and later ones, with SIZE foreign entries in the gateway's table
 //   keys    cycles that read changed settings with SIZE keys
 //   bad     searches for ports, by the number of ports found bad before

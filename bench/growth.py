@@ -1,13 +1,14 @@
 #!/usr/bin/python3
 """Measures with growth.cpp whether a cost of the daemon grows faster than what it depends on.
 
-Prints a table and draws docs/growth.svg. Exit status 1 when something grows faster than linearly.
+Writes the table in docs/performance.md and draws docs/growth.svg. Exit status 1 when something grows faster than linearly.
 """
 
 from __future__ import annotations
 
 import argparse
 import math
+import re
 import statistics
 import subprocess
 import sys
@@ -20,6 +21,7 @@ sys.path.insert(0, str(Path(__file__).resolve().parent.parent))
 from bench import plot  # noqa: E402
 from lab import sandbox  # noqa: E402
 
+_PAGE = sandbox.PROJECT / "docs/performance.md"
 _PROGRAM = sandbox.PROJECT / "build/bench/bench/growth"
 _SIZES = (10, 50, 100, 250, 500, 1000, 2000, 5000)
 _RUNS = [*(("table", size, 60) for size in _SIZES), *(("keys", size, 60) for size in _SIZES),
@@ -27,11 +29,11 @@ _RUNS = [*(("table", size, 60) for size in _SIZES), *(("keys", size, 60) for siz
 _REPETITIONS = 5
 # Above 1 by what noise adds, and by the logarithm in sorting keys.
 _STEEPEST = 1.15
-_MEASURES = {"first": ("First cycle, with its clean-up", "entries in the gateway's table"),
-             "steady": ("A cycle in which nothing changes", "entries in the gateway's table"),
-             "keys": ("A cycle that reads changed settings", "keys in the settings"),
-             "bad": ("A search for ports that work", "ports known to be bad"),
-             "uptime": ("All cycles since the start", "cycles")}
+_MEASURES = {"first": ("the first cycle, with its clean-up", "entries in the gateway's table"),
+             "steady": ("a cycle in which nothing changes", "entries in the gateway's table"),
+             "keys": ("a cycle that reads changed settings", "keys in the settings"),
+             "bad": ("a search for ports that work", "ports known to be bad"),
+             "uptime": ("all cycles since the start", "cycles")}
 
 
 def slope(points: plot.Points) -> float:
@@ -39,6 +41,11 @@ def slope(points: plot.Points) -> float:
     logs = [(math.log(x), math.log(y)) for x, y in points]
     upper = [point for point in logs if point[0] >= (logs[0][0] + logs[-1][0]) / 2 - 1e-9]
     return statistics.linear_regression([x for x, _ in upper], [y for _, y in upper]).slope
+
+
+def _milliseconds(micros: float) -> str:
+    places = 0 if micros >= 10_000 else 1 if micros >= 1000 else 2
+    return f"{micros / 1000:,.{places}f} ms"
 
 
 def main() -> int:
@@ -56,14 +63,18 @@ def main() -> int:
     # The axes are logarithmic, and with all 99 ports bad there is nothing to search.
     found["bad"] = {size: found["bad"][size] for size in found["bad"] if 0 < size < 99}
     panels, worst = [], 0.0
-    print(f"{'microseconds of CPU':<38} {'least':>16} {'most':>18}  slope")
+    rows = ["| CPU time of | depends on | least | most | slope |", "| --- | --- | --- | --- | --- |"]
     for name, (title, x_name) in _MEASURES.items():
         points = [(size, statistics.median(times)) for size, times in sorted(found[name].items())]
         worst = max(worst, slope(points))
-        ends = [f"{y:,.0f} at {x:,.0f}" for x, y in (points[0], points[-1])]
-        verdict = "ok" if slope(points) <= _STEEPEST else "FASTER THAN LINEAR"
-        print(f"{title:<38} {ends[0]:>16} {ends[1]:>18}  {slope(points):5.2f}  {verdict}")
-        panels.append(plot.Panel(f"{title}, µs", x_name, {"": points}, logarithmic=True))
+        ends = [f"{_milliseconds(y)} at {x:,.0f}" for x, y in (points[0], points[-1])]
+        rows.append(f"| {title} | {x_name} | {ends[0]} | {ends[1]} | {slope(points):.2f} |")
+        heading = f"{title[0].upper()}{title[1:]}, µs"
+        panels.append(plot.Panel(heading, x_name, {"": points}, logarithmic=True))
+    table = "\n".join(rows)
+    print(table)
+    _PAGE.write_text(re.sub("(?<=<!-- growth -->\n).*?(?=\n\n<!-- end -->)", lambda _: table,
+                            _PAGE.read_text(), flags=re.DOTALL))
     (sandbox.PROJECT / "docs/growth.svg").write_text(plot.svg(
         "What a cycle costs as its surroundings grow (CPU time)", panels, columns=3, height=250))
     return int(worst > _STEEPEST)

@@ -87,8 +87,8 @@ def _wake_ups(pid: int) -> int:
 
 
 def _times_run(pid: int) -> int:
-    status = Path(f"/proc/{pid}/status").read_text()
-    return sum(map(int, re.findall(r"ctxt_switches:\s+(\d+)", status)))
+    threads = [file.read_text() for file in Path(f"/proc/{pid}/task").glob("*/status")]
+    return sum(map(int, re.findall(r"ctxt_switches:\s+(\d+)", "".join(threads))))
 
 
 @contextmanager

@@ -106,7 +106,8 @@ public:
         const std::lock_guard lock(mutex);
         watched = &call;
         if (!thread.joinable()) thread = std::thread([this] { run(); });
-        if (call.nextLook() < wakeUp) begun.notify_one();
+        // Where waits go by a clock that can be set back, one may last past its end.
+        if (call.nextLook() < wakeUp || wakeUp <= Clock::now()) begun.notify_one();
     }
     void end() {
         const std::lock_guard lock(mutex);

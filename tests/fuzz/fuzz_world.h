@@ -67,7 +67,7 @@ inline void begin(const char* deviceType) {
     support::resetFakes();
     auto& log = support::LogCapture::get();
     log.onLine(checkLine);
-    // A watcher for each library call would take most of the time; the fakes answer at once.
+    // The fakes answer at once: nobody has to watch the calls.
     support::FakeProcess::get().startsThreads = false;
     auto* config = GlobalConfig::getInstance();
     config->setProperty("DEVICETYPE", deviceType, false);

@@ -28,10 +28,11 @@ from lab.timeline import Timeline
 from lab.zoo import ZOO
 
 ROOT = sandbox.PROJECT
-PAGES = (ROOT / "README.md", ROOT / "CONTRIBUTING.md", *ROOT.glob("docs/*.md"))
+PAGES = (ROOT / "README.md", ROOT / "CONTRIBUTING.md", ROOT / "bench/README.md",
+         *ROOT.glob("docs/*.md"))
 BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
-    r"((scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+|/usr/bin/python3|apt|apt-get|cat"
+    r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+|/usr/bin/python3|apt|apt-get|cat"
     r"|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
     r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
@@ -45,12 +46,15 @@ ELSEWHERE = {
     r"cmake --build --preset dev --target \w+|/usr/bin/python3 .*-m pytest .*":
         "scripts/test, which leaves nothing out",
     r"scripts/demo\b.*": "test_demo, with and without --stay, and test_scenarios",
-    r"scripts/(endure( (?!hours).*)?|fuzz\b.*)":
+    r"([A-Z]+=\S+ )?scripts/(endure( (?!hours).*)?|fuzz\b.*)":
         "scripts/test in short; each takes minutes to hours",
     r"packaging/build-deb": "packaging/test-deb",
     r"upnpc -a": "bench/compare.py, with its arguments",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
+    "chrt -r 1 bench/compare.py start": "takes minutes, and needs root",
+    "bench/compare.py KIND...": "as below",
+    "bench/pattern.py NAME...": "as below",
     "bench/compare.py": "takes a quarter of an hour; --help is run here",
     "bench/growth.py": "takes minutes; --help is run here",
     "bench/run [--quick]": "takes minutes; --help is run here",

@@ -101,7 +101,7 @@ TEST_F(PortMappingTest, UnmappingAllRemovesOnlyEntriesOfThisDevice) {
 }
 
 TEST_F(PortMappingTest, AnEndlessTableIsCutOff) {
-    support::FakeProcess::get().startsThreads = false;  // a watcher for each entry takes its time
+    support::FakeProcess::get().startsThreads = false;  // the fakes answer at once
     discovered();
     ASSERT_TRUE(map(443, 9444));
     const std::string big(99, '9');

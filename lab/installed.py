@@ -9,6 +9,7 @@ started as an init script would, stopped and purged.
 from __future__ import annotations
 
 import argparse
+import json
 import os
 import re
 import shutil
@@ -185,6 +186,7 @@ class Installed(Package):
         assert not _PID_FILE.is_symlink()
         restrictions = self._system.run("cat", f"/proc/{self._main()}/status")
         assert "NoNewPrivs:\t1\nSeccomp:\t2\n" in restrictions, restrictions
+        self._doctor_names("credentials-missing")
 
     def _gives_local_users_nothing(self) -> None:
         self._lab.step("a local user looks for something to gain")
@@ -201,6 +203,7 @@ class Installed(Package):
         self._run_documented("DEVICEID")
         self._wait_for_status("portforwarded")
         assert_published(self._lab)
+        self._doctor_names("")
         before = self._main()
         for command in ("systemctl status", "--since", "ReadWritePaths"):
             assert self._main() == before, command
@@ -322,6 +325,12 @@ class Installed(Package):
         DYNAMIC_FILE.parent.unlink()
         DYNAMIC_FILE.parent.symlink_to(_OLD_SETTINGS)
         _set_up_tunnel()
+
+    def _doctor_names(self, cause: str) -> None:
+        """The doctor finds the package's files and names this cause first, or none if empty."""
+        told = self._system.attempt("pelorus-doctor", "--no-probes", "--json").stdout
+        named = [entry["name"] for entry in json.loads(told)["causes"]]
+        assert (named or [""])[0] == cause, told
 
     def _may(self, user: str, access: str, path: str) -> bool:
         return self._system.attempt(*_AS[user], "test", access, f"/{path}").returncode == 0

@@ -2,6 +2,7 @@
 
 from __future__ import annotations
 
+import json
 import os
 import signal
 import socket
@@ -125,9 +126,10 @@ class Lab:
         if self.asks_doctor:
             diagnosis = self.diagnosis(ahead=ahead)
             if "DIAGNOSES" in os.environ:
-                import json
+                test = os.environ.get("PYTEST_CURRENT_TEST", "")
                 with open(os.environ["DIAGNOSES"], "a") as file:
-                    file.write(json.dumps([os.environ.get("PYTEST_CURRENT_TEST",""), what, cause, diagnosis.cause, diagnosis.everything])+"\n")
+                    file.write(json.dumps([test, what, cause, diagnosis.cause,
+                                           diagnosis.everything]) + "\n")
             else:
                 assert diagnosis.cause == cause, f"the doctor says\n{diagnosis}"
 

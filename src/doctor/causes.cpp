@@ -1,24 +1,22 @@
 #include "doctor/causes.h"
 
 #include <algorithm>
+#include <utility>
 
 namespace pelorus::doctor {
 
 namespace {
 
 using Reaches = std::vector<Reach>;
+using S = Sign;
 
 const Reaches kEnded{Reach::NOT_RUNNING};
 const Reaches kOff{Reach::SWITCHED_OFF};
 const Reaches kNotReached{Reach::NOT_REACHED, Reach::UNKNOWN};
 const Reaches kNotDirect{Reach::RELAYED, Reach::NOT_REACHED, Reach::UNKNOWN};
 const Reaches kRunning{Reach::DIRECT, Reach::RELAYED, Reach::NOT_REACHED, Reach::UNKNOWN};
-const Reaches kPublished{Reach::DIRECT, Reach::RELAYED, Reach::NOT_REACHED, Reach::UNKNOWN};
 
-// First what keeps the daemon from working at all, then what it needs for both ways, then what
-// keeps the relay away, then the direct way.
-std::vector<Cause> table() {
-    using S = Sign;
+std::vector<Cause> workingCauses() {
     return {
         {"settings-unreadable",
          kEnded,
@@ -57,6 +55,11 @@ std::vector<Cause> table() {
          {S::GATEWAY_ADDRESS_PUBLIC},
          "The gateway has no internet address.",
          "Check the gateway's connection to the provider, and restart it."},
+    };
+}
+
+std::vector<Cause> serviceCauses() {
+    return {
         {"clock-wrong",
          kRunning,
          {{S::CLOCK_WRONG}},
@@ -101,6 +104,11 @@ std::vector<Cause> table() {
          {},
          "The central service answers with something that the daemon cannot use.",
          "The maker has to look at the service and its URL in the settings."},
+    };
+}
+
+std::vector<Cause> publishingCauses() {
+    return {
         {"another-device-answers",
          kNotDirect,
          {{S::LOGGED_OTHER_DEVICE}},
@@ -133,18 +141,23 @@ std::vector<Cause> table() {
          "The ports work, but the service did not take their record.",
          "Nothing can be done here: the next search publishes them. If it lasts, tell the maker."},
         {"names-lead-elsewhere",
-         kPublished,
+         kRunning,
          {{S::NAMES_LEAD_ELSEWHERE}, {S::LOGGED_NAMES_LEAD_ELSEWHERE}},
          {S::NAMES_RIGHT},
          "The device's public names lead to another address.",
          "After a change this takes some minutes. If it lasts, restart the service; then the maker "
          "has to look at the names."},
         {"names-unresolved",
-         kPublished,
+         kRunning,
          {{S::NAMES_UNRESOLVED}, {S::LOGGED_NAMES_UNRESOLVED}},
          {S::NAMES_RIGHT, S::NAMES_LEAD_ELSEWHERE},
          "The device's public names do not lead to one address.",
          "After a change this takes some minutes. If it lasts, the maker has to look at the names."},
+    };
+}
+
+std::vector<Cause> deviceCauses() {
+    return {
         {"web-server-silent",
          kRunning,
          {{S::WEB_SERVER_SILENT}},
@@ -175,6 +188,11 @@ std::vector<Cause> table() {
          {},
          "The relay cannot be used, because the system has no tunnel device.",
          "Load the kernel's tun module."},
+    };
+}
+
+std::vector<Cause> relayCauses() {
+    return {
         {"tunnel-files-unwritable",
          kNotReached,
          {{S::TUNNEL_FILES_UNWRITABLE}},
@@ -212,6 +230,11 @@ std::vector<Cause> table() {
          {S::TUNNEL_SAYS_UP},
          "The relay does not answer, so no tunnel comes up.",
          "Check that the provider lets the relay's port through; otherwise the relay is down."},
+    };
+}
+
+std::vector<Cause> gatewayCauses() {
+    return {
         {"shared-address",
          kNotDirect,
          {{S::GATEWAY_ADDRESS_SHARED}},
@@ -255,6 +278,11 @@ std::vector<Cause> table() {
          "The gateway refuses every port that the device asks for.",
          "Allow this device to open ports in the gateway's settings. Some gateways forward only to "
          "ports from 1024 up: then move the web server there."},
+    };
+}
+
+std::vector<Cause> outsideCauses() {
+    return {
         {"port-filtered",
          kNotDirect,
          {{S::LOGGED_TEST_FAILED}, {S::PORT_TEST_FAILS}},
@@ -276,6 +304,17 @@ std::vector<Cause> table() {
          "The daemon is at work, or has not noticed yet that something has changed.",
          "Wait for the end of the next cycle, and ask again."},
     };
+}
+
+// First what keeps the daemon from working at all, then what it needs for both ways, then what
+// keeps the relay away, then the direct way.
+std::vector<Cause> table() {
+    std::vector<Cause> rows;
+    for (const auto& group : {workingCauses, serviceCauses, publishingCauses, deviceCauses,
+                              relayCauses, gatewayCauses, outsideCauses}) {
+        for (Cause& cause : group()) rows.push_back(std::move(cause));
+    }
+    return rows;
 }
 
 bool isAmong(const Reaches& reaches, Reach reach) {

@@ -1,6 +1,5 @@
 #include "doctor/device_log.h"
 
-#include <algorithm>
 #include <array>
 #include <ctime>
 #include <functional>
@@ -10,6 +9,7 @@
 #include "doctor/log_line.h"
 #include "doctor/log_source.h"
 #include "doctor/log_story.h"
+#include "doctor/shown_text.h"
 
 namespace pelorus::doctor {
 
@@ -68,10 +68,7 @@ std::string shownTime(Time when) {
 
 std::string shownPath(const std::string& path) {
     constexpr std::size_t kLongestPath = 100;
-    std::string shown = path == "-" ? "standard input" : path.substr(0, kLongestPath);
-    std::replace_if(
-        shown.begin(), shown.end(), [](char letter) { return letter < ' ' || letter > '~'; }, '?');
-    return shown;
+    return path == "-" ? "standard input" : shownText(path, kLongestPath);
 }
 
 void cannotSee(const std::string& text, Evidence& evidence) {

@@ -27,8 +27,8 @@ struct Diagnosis {
     std::vector<std::string> untold;  ///< what could not be told, and how to get it
 };
 
-/// Concludes from @p evidence.
-Diagnosis diagnose(const Evidence& evidence);
+/// Concludes from what was @p seen.
+Diagnosis diagnose(const Evidence& seen);
 
 /// Exit status of a diagnosis: 0 reached directly, 1 relayed, 2 not reached, 3 not known.
 int exitStatus(const Diagnosis& diagnosis);

@@ -120,10 +120,7 @@ void judgeOurs(const GatewayTable& table, Findings& findings) {
         append(ours,
                std::to_string(entry.externalPort) + " to " + std::to_string(entry.internalPort));
     }
-    if (!ours.empty()) {
-        findings.add(Sign::OUR_MAPPINGS_THERE, "the gateway maps " + ours + " of this device");
-        findings.ok("gateway maps " + ours + " of this device");
-    }
+    if (!ours.empty()) findings.ok("gateway maps " + ours + " of this device");
     if (!table.complete || table.byHand || table.externalHttpPort <= 0 || published) return;
     const std::string text = "port " + std::to_string(table.externalHttpPort) +
                              " is published, but the gateway does not map it to this device";

@@ -19,7 +19,7 @@ std::string digits(int number, std::size_t width) {
     return text;
 }
 
-bool isDay(const std::tm& one, const std::tm& other) {
+bool isSameDay(const std::tm& one, const std::tm& other) {
     return one.tm_year == other.tm_year && one.tm_yday == other.tm_yday;
 }
 
@@ -53,26 +53,23 @@ std::string dayInWords(Time when, Time today) {
 
 std::string momentInWords(Time when, Time today) {
     std::tm yesterday = localTime(today);
-    if (isSameDay(when, today)) return timeOfDay(when) + " today";
+    if (isSameDay(localTime(when), localTime(today))) return timeOfDay(when) + " today";
     --yesterday.tm_mday;
     yesterday.tm_hour = 12;
     yesterday.tm_isdst = -1;
     static_cast<void>(std::mktime(&yesterday));
-    if (isDay(localTime(when), yesterday)) return timeOfDay(when) + " yesterday";
+    if (isSameDay(localTime(when), yesterday)) return timeOfDay(when) + " yesterday";
     return timeOfDay(when) + " on " + dayInWords(when, today);
 }
 
 std::string momentShortly(Time when, Time today) {
     const std::string time = timeOfDay(when);
-    return isSameDay(when, today) ? time : dayInWords(when, today) + " " + time;
+    return isSameDay(localTime(when), localTime(today)) ? time
+                                                        : dayInWords(when, today) + " " + time;
 }
 
 std::string timeBetween(Time since, Time until) {
     return ageInWords(std::max(until - since, std::chrono::seconds{0}));
-}
-
-bool isSameDay(Time one, Time other) {
-    return isDay(localTime(one), localTime(other));
 }
 
 std::string rfc3339(Time when) {

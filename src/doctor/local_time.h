@@ -30,9 +30,6 @@ namespace pelorus::doctor {
 /// "3 h 20 min"; "0 s" where @p until is not after @p since, as when the clock was set.
 [[nodiscard]] std::string timeBetween(Time since, Time until);
 
-/// True when both are on one day.
-[[nodiscard]] bool isSameDay(Time one, Time other);
-
 /// "2026-11-21T12:07:00+01:00".
 [[nodiscard]] std::string rfc3339(Time when);
 

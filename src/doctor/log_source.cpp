@@ -20,9 +20,9 @@ namespace pelorus::doctor {
 
 namespace {
 
-constexpr std::size_t kChunk = 256 * 1024;
-constexpr std::size_t kHead = 64 * 1024;
-constexpr std::size_t kLongestLine = 8 * 1024;
+constexpr std::size_t kChunk = std::size_t{256} * 1024;
+constexpr std::size_t kHead = std::size_t{64} * 1024;
+constexpr std::size_t kLongestLine = std::size_t{8} * 1024;
 constexpr std::string_view kMark = "elorus";  // however the name begins
 
 const char* find(std::string_view text, std::string_view wanted) {
@@ -187,6 +187,7 @@ std::vector<std::string> rotatedLogs(const std::string& folder, const std::strin
     }
     std::sort(found.begin(), found.end());
     std::vector<std::string> paths;
+    paths.reserve(found.size());
     for (auto& [when, path] : found) paths.push_back(std::move(path));
     return paths;
 }

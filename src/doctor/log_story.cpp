@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <charconv>
 
+#include "doctor/shown_text.h"
+
 namespace pelorus::doctor {
 
 namespace {
@@ -10,7 +12,6 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr std::size_t kMostPeriods = 2000;
-constexpr std::size_t kLongestValue = 80;
 constexpr auto kAttemptTime = 6min;  // a relay that does not come up takes nearly as long
 constexpr std::string_view kStarted = "the daemon started";
 constexpr std::string_view kPassed = "the ports passed their test and were published";
@@ -64,14 +65,6 @@ bool startsWith(std::string_view text, std::string_view beginning) {
 
 bool contains(std::string_view text, std::string_view part) {
     return text.find(part) != std::string_view::npos;
-}
-
-// Fit for a terminal: whoever wrote it.
-std::string shown(std::string_view value) {
-    std::string text{value.substr(0, kLongestValue)};
-    std::replace_if(
-        text.begin(), text.end(), [](char letter) { return letter < ' ' || letter > '~'; }, '?');
-    return text;
 }
 
 std::string_view tagged(std::string_view answer, std::string_view tag) {
@@ -139,7 +132,7 @@ void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
 }
 
 void LogStory::keep(const LogRule& rule, std::string_view value) {
-    this->value(rule.kept) = shown(rule.kept == Kept::PORT ? portOf(value) : value);
+    this->value(rule.kept) = shownText(rule.kept == Kept::PORT ? portOf(value) : value);
 }
 
 void LogStory::setSigns(const LogRule& rule, Time when, const LogValues& values) {
@@ -359,8 +352,8 @@ void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     clear({Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,
            Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_CREDENTIALS_MISSING,
            Sign::LOGGED_MANUAL_PORT_INVALID});
-    const std::string asked = shown(tagged(answer, "external_ip"));
-    const std::string seen = shown(tagged(answer, "remote_external_ip"));
+    const std::string asked = shownText(tagged(answer, "external_ip"));
+    const std::string seen = shownText(tagged(answer, "remote_external_ip"));
     if (!asked.empty()) value(Kept::TESTED) = asked;
     if (!seen.empty()) value(Kept::SERVICE) = seen;
     if (contains(answer, "Success")) {
@@ -370,7 +363,7 @@ void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     }
     if (!contains(answer, "<status>") && asked.empty() && seen.empty()) {
         set(Sign::LOGGED_SERVICE_NONSENSE, when,
-            "the service's answer to a port test is not understood: " + shown(answer));
+            "the service's answer to a port test is not understood: " + shownText(answer));
         return;
     }
     if (!asked.empty()) value(Kept::GATEWAY) = asked;
@@ -502,9 +495,9 @@ std::string LogStory::filled(std::string_view words, const LogValues& values) co
         text.append(words.substr(0, open));
         words.remove_prefix(close + 1);
         const Kept known = keptNamed(name);
-        const std::string value = known == Kept::NOTHING
-                                      ? shown(values[static_cast<std::size_t>(name.front() - '1')])
-                                      : kept[static_cast<std::size_t>(known)];
+        const std::string value =
+            known == Kept::NOTHING ? shownText(values[static_cast<std::size_t>(name.front() - '1')])
+                                   : kept[static_cast<std::size_t>(known)];
         text.append(value.empty() ? "(not logged)" : value);
     }
     return text.append(words);

@@ -51,6 +51,7 @@ std::vector<Subject> subjectsFor(const ProbeChoice& choice, const Evidence& evid
 
 void run(std::vector<Subject>& subjects) {
     std::vector<Probe> probes;
+    probes.reserve(subjects.size());
     for (const Subject& subject : subjects) probes.push_back(subject.probe);
     std::vector<Findings> found = runSideBySide(probes, kLimit);
     for (std::size_t i = 0; i < subjects.size(); ++i) subjects[i].found = std::move(found[i]);

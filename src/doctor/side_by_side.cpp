@@ -70,7 +70,7 @@ public:
     Child(const Child&) = delete;
     Child& operator=(const Child&) = delete;
 
-    /// -1 when nothing more can come.
+    // -1 when nothing more can come.
     [[nodiscard]] int descriptor() const { return input; }
 
     void receive() {

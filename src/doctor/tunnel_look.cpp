@@ -71,7 +71,7 @@ public:
 private:
     // As the daemon sees it, which runs in / and starts the client in its own folder.
     [[nodiscard]] std::string path(const std::string& key, const std::string& folder) const {
-        const std::string value = evidence.setting(key);
+        std::string value = evidence.setting(key);
         if (value.empty() || value.front() == '/') return value;
         return (folder.empty() || folder.back() != '/' ? folder + "/" : folder) + value;
     }
@@ -212,7 +212,7 @@ TunnelOutput readTunnelOutput(const std::string& output, const std::string& succ
     bool isWaiting = false;  // for the relay's first packet
     std::istringstream lines{output};
     for (std::string line; std::getline(lines, line);) {
-        if (contains(line, successText)) {
+        if (line.find(successText) != std::string::npos) {
             said = {};
             said.isUp = true;
         }

@@ -35,9 +35,8 @@ void lookAtWebServer(const Evidence& evidence, Findings& findings) {
                    " of " + address + ": " + connection.obstacle();
     }
     if (missing.empty()) {
-        const std::string ports = std::to_string(http) + " and " + std::to_string(https);
-        findings.add(Sign::WEB_SERVER_LISTENS, "the web server listens on " + ports);
-        findings.ok("web server listens on " + ports);
+        findings.ok("web server listens on " + std::to_string(http) + " and " +
+                    std::to_string(https));
     } else {
         findings.add(Sign::WEB_SERVER_SILENT, "the web server does not listen, " + missing);
         findings.problem("web server: " + missing);

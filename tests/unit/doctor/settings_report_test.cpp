@@ -39,7 +39,7 @@ protected:
     [[nodiscard]] SettingsReport check(const std::string& more = {},
                                        const std::string& moreDynamic = {}) const {
         writeFile("dynamicconfig.ini", dynamic + moreDynamic);
-        const auto report = checkSettings(writeFile("static.ini", fixed + more));
+        auto report = checkSettings(writeFile("static.ini", fixed + more));
         for (const auto& list : {report.problems, report.remarks}) {
             for (const auto& line : list) EXPECT_FALSE(holds(line, kDeviceAuth)) << line;
         }

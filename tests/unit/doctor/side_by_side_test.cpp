@@ -47,7 +47,7 @@ TEST_P(FailingProbe, LeavesTheOthersTheirFindings) {
     EXPECT_LT(std::chrono::steady_clock::now() - began, std::chrono::seconds(5));
     ASSERT_EQ(found.size(), 2U);
     EXPECT_FALSE(found[0].finished());
-    EXPECT_EQ(found[0].has(Sign::DISK_ACTIVE), GetParam().keepsFindings);
+    EXPECT_EQ(found[0].has(Sign::BACK_END_ANSWERS), GetParam().keepsFindings);
     EXPECT_TRUE(found[1].finished());
     EXPECT_TRUE(found[1].has(Sign::GATEWAY_FOUND));
     EXPECT_EQ(found[1].checks().at(0).text, "a check");
@@ -60,7 +60,7 @@ const Ending kEndings[] = {
     {"Hangs", hang, false},
     {"HangsAfterAFinding",
      [](Findings& findings) {
-         findings.add(Sign::DISK_ACTIVE, "");
+         findings.add(Sign::BACK_END_ANSWERS, "");
          hang(findings);
      },
      true},
@@ -72,21 +72,21 @@ const Ending kEndings[] = {
      false},
     {"Crashes",
      [](Findings& findings) {
-         findings.add(Sign::DISK_ACTIVE, "");
+         findings.add(Sign::BACK_END_ANSWERS, "");
          static_cast<void>(raise(SIGSEGV));
      },
      true},
     {"Throws", [](Findings&) { throw std::runtime_error("no"); }, false},
     {"WritesRubbish",
      [](Findings& findings) {
-         findings.add(Sign::DISK_ACTIVE, "");
+         findings.add(Sign::BACK_END_ANSWERS, "");
          writeToPipe("rubbish\n");
          hang(findings);
      },
      false},
     {"Floods",
      [](Findings& findings) {
-         findings.add(Sign::DISK_ACTIVE, "");
+         findings.add(Sign::BACK_END_ANSWERS, "");
          while (true) writeToPipe(std::string(1000, 'x'));
      },
      false},
@@ -126,7 +126,7 @@ TEST_P(SentLines, AreValidated) {
 }
 
 const std::string kGoodSign =
-    "S " + std::to_string(static_cast<int>(Sign::DISK_ACTIVE)) + " the disk is active\n";
+    "S " + std::to_string(static_cast<int>(Sign::BACK_END_ANSWERS)) + " the back end answers\n";
 
 const Lines kLines[] = {
     {"Nothing", "", true},

@@ -43,7 +43,7 @@ def main() -> int:
             print(f"{scenario.name:<{width}}  {scenario.title}")
         return 0
     if sandbox.is_inside():
-        return _show(arguments.scenario, arguments.stay)
+        return _show(arguments.scenario, _guest(arguments))
     if reason := obstacle(arguments.scenario):
         print(f"demo: {reason}")
         return sandbox.FORBIDDEN
@@ -62,9 +62,12 @@ def _parse() -> argparse.Namespace:
     parser.add_argument("--zoo", action="store_true",
                         help="list the behaviours of home gateways, one per line")
     parser.add_argument("--svg", metavar="FILE", help="save the timeline as an SVG picture")
-    parser.add_argument("--stay", action="store_true",
-                        help="keep the lab as it is in the story's telling moment, with the daemon "
-                        "running, until Enter or Ctrl-C")
+    guest = parser.add_mutually_exclusive_group()
+    guest.add_argument("--stay", action="store_true",
+                       help="keep the lab as it is in the story's telling moment, with the daemon "
+                       "running, until Enter or Ctrl-C")
+    guest.add_argument("--diagnose", action="store_true",
+                       help="end in the story's telling moment, with what pelorus-doctor says")
     arguments = parser.parse_args()
     if arguments.scenario and arguments.scenario not in _KNOWN:
         parser.error(f"no scenario {arguments.scenario!r}; see --list and --zoo")
@@ -112,7 +115,16 @@ class _Left(Exception):
     """The visitor of a story's telling moment has left the lab."""
 
 
-def _show(name: str | None, stay: bool) -> int:
+_Guest = Callable[[Lab, str, float], None]  # of that moment: what is special, and its clock
+
+
+def _guest(arguments: argparse.Namespace) -> _Guest | None:
+    if arguments.stay:
+        return _look_around
+    return _diagnose if arguments.diagnose else None
+
+
+def _show(name: str | None, guest: _Guest | None) -> int:
     """Play in the sandbox, printing events as they happen."""
     signal.signal(signal.SIGINT, signal.default_int_handler)
     timeline = Timeline()
@@ -120,9 +132,10 @@ def _show(name: str | None, stay: bool) -> int:
     title = _KNOWN[name].title if name else "A device behind a home router becomes reachable"
     print(f"{title}\n")
     try:
-        _play(name, timeline, title if stay else "")
+        _play(name, timeline, title, guest)
     except _Left:
-        print("\nthe lab has been removed")
+        if guest is _look_around:
+            print("\nthe lab has been removed")
     except (LabError, AssertionError) as failure:
         print(f"\nFAILED: {failure or 'a check did not hold'}")
         return 1
@@ -134,18 +147,19 @@ def _show(name: str | None, stay: bool) -> int:
     return 0
 
 
-def _play(name: str | None, timeline: Timeline, visited: str) -> None:
-    """Play a story; with `visited`, its title, only up to its telling moment. _Left after that."""
+def _play(name: str | None, timeline: Timeline, title: str, guest: _Guest | None) -> None:
+    """Play a story; with a guest only up to its telling moment. _Left after that."""
     story: Callable[[Lab], None] = _KNOWN[name].play if name else _reach_the_device
     lab = Lab(_KNOWN[name].situation if name else _MAIN_JOB, timeline)
     left: list[_Left] = []
 
-    def visit(what: str) -> None:
-        _look_around(lab, what or visited)
+    def visit(what: str, ahead: float = 0) -> None:
+        assert guest
+        guest(lab, what or title, ahead)
         left.append(_Left())
         raise left[0]
 
-    if visited:
+    if guest:
         lab.visit_by(visit, first_stop=not (name and _KNOWN[name].tells_moment))
     timeline.add("lab", "device, gateway, central service and name server are up")
     try:
@@ -158,7 +172,7 @@ def _play(name: str | None, timeline: Timeline, visited: str) -> None:
         raise
     if name:
         print("\nall checks passed")
-    if visited:
+    if guest:
         visit("")
 
 
@@ -197,7 +211,13 @@ def _close(lab: Lab) -> None:
         print(f"public name     {name} -> {lab.names.resolve(name)}")
 
 
-def _look_around(lab: Lab, special: str) -> None:
+def _diagnose(lab: Lab, special: str, ahead: float) -> None:
+    """Tell what is special now, and print what the doctor says to the device's owner."""
+    print(f"\n{special[:1].upper()}{special[1:]}\n\n$ pelorus-doctor", flush=True)
+    lab.show_diagnosis(ahead)
+
+
+def _look_around(lab: Lab, special: str, _ahead: float) -> None:
     """Tell what is special now and how to enter the lab, and wait for Enter or Ctrl-C."""
     if lab.daemon.ended():
         state = f"ended with {lab.daemon.ended()}"

@@ -7,7 +7,7 @@ import os
 import signal
 import socket
 from collections.abc import Callable, Mapping, Sequence
-from contextlib import nullcontext
+from contextlib import AbstractContextManager, nullcontext
 from dataclasses import dataclass, field
 from pathlib import Path
 
@@ -58,7 +58,7 @@ class Lab:
         self.timeline = timeline
         self.account = Account()
         self._daemon: Daemon | None = None
-        self._visitor: Callable[[str], None] | None = None
+        self._visitor: Callable[[str, float], None] | None = None
         self._visits_first_stop = False
         self.asks_doctor = False  # in each telling moment
         self._told = False
@@ -107,8 +107,10 @@ class Lab:
         """Begin the next step; a failure report shows the device's log from here on."""
         self.timeline.step(heading)
 
-    def visit_by(self, visitor: Callable[[str], None], first_stop: bool) -> None:
+    def visit_by(self, visitor: Callable[[str, float], None], first_stop: bool) -> None:
         """Call `visitor` in each telling moment, with what is special in it.
+
+        Its other argument: how many seconds the device's clock is ahead.
 
         With `first_stop` the moment before the daemon is first stopped is one, with no text.
         """
@@ -122,7 +124,7 @@ class Lab:
         """
         self._told = True
         if self._visitor:
-            self._visitor(what)
+            self._visitor(what, ahead)
         if self.asks_doctor:
             diagnosis = self.diagnosis(ahead=ahead)
             if "DIAGNOSES" in os.environ:
@@ -138,12 +140,20 @@ class Lab:
 
         No secret of the device may be in it.
         """
-        runs = self._daemon is not None and not self._daemon.ended()
-        with self.daemon.held() if runs else nullcontext():
+        with self._standing_still():
             diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis
+
+    def show_diagnosis(self, ahead: float = 0) -> None:
+        """Print what the doctor says to people now. The daemon is held meanwhile."""
+        with self._standing_still():
+            doctor.show(self.device.messages, ahead=ahead)
+
+    def _standing_still(self) -> AbstractContextManager[None]:
+        runs = self._daemon is not None and not self._daemon.ended()
+        return self.daemon.held() if runs else nullcontext()
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""

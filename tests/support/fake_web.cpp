@@ -87,6 +87,7 @@ CURLcode __wrap_curl_easy_perform(CURL* handle) {
 }
 
 const char* __wrap_curl_easy_strerror(CURLcode code) {
+    if (code == CURLE_COULDNT_CONNECT) return "Couldn't connect to server";
     return code == CURLE_OPERATION_TIMEDOUT ? "Timeout was reached" : "Another error";
 }
 

@@ -69,6 +69,14 @@ def test_demo_lists_plays_and_draws_scenarios_and_stays_in_one(tmp_path: Path) -
     assert re.search("there are no credentials.*pelorus is running.*been removed", text, re.DOTALL)
 
 
+def test_demo_ends_with_the_doctors_words() -> None:
+    text = output_of("credentials-missing", "--diagnose")
+    note = text.partition("$ pelorus-doctor\n")[2].splitlines()
+    assert note[0].startswith("NOT REACHED since "), text
+    assert note[2].startswith("Why    The device has no credentials for the service"), text
+    assert max(map(len, note)) <= 100, text
+
+
 def test_demo_fails_with_a_daemon_that_does_nothing() -> None:
     assert "FAILED: waited" in output_of(binary="/bin/true", status=1)
 

@@ -34,12 +34,12 @@ BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
     r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+|/usr/bin/python3|apt|apt-get|cat"
     r"|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
-    r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
+    r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pelorus-doctor|pgrep|pkill|printf|python3|rm|sed|sudo"
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"
                   r"|ctest --preset dev -[RN].*|build/dev/tests/unit/.*")
 ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc (?!-a$).*|natpmpc|hdparm .* .*|pgrep .*|touch .*"
-                       r"|pelorus -u.*")
+                       r"|pelorus -u.*|pelorus-doctor(?!.* --log).*")
 ELSEWHERE = {
     r"scripts/(deps|lint|test|test-32bit)|cmake (--build )?--preset \w+|ctest --preset asan":
         "scripts/test",
@@ -50,6 +50,7 @@ ELSEWHERE = {
         "scripts/test in short; each takes minutes to hours",
     r"packaging/build-deb": "packaging/test-deb",
     r"upnpc -a": "bench/compare.py, with its arguments",
+    r"pelorus-doctor .*--log .*": "scenarios with --log, scripts/history with --svg",
     r"pelorus -l \d|hdparm -C|kill -9": "scenarios, with all that belongs to it"}
 NOT_RUN = {
     "chrt -r 1 bench/compare.py start": "takes minutes, and needs root",
@@ -74,6 +75,7 @@ NOT_RUN = {
     "scripts/endure hours 30 1": "takes 20 minutes at least",
     "scripts/gallery": "takes up to an hour; --help is run here",
     "scripts/gallery [NAME...]": "takes up to an hour; --help is run here",
+    "scripts/history": "builds a debug program, and rewrites a picture",
     "scripts/lint --fix": "changes sources",
     "scripts/lint [--fix]": "changes sources",
     "scripts/matrix": "takes ten minutes and more",
@@ -173,11 +175,15 @@ def test_commands_on_the_device() -> None:
     lab = Lab(Situation(gateway=GatewaySetup(upnp=True, natpmp=True)), Timeline())
     lab.start_daemon("-l", "6")
     lab.wait_for(lambda: lab.device.status == "portforwarded", "the ports", 55)
-    (HOME / "bin/pelorus").symlink_to(sandbox.binary())
+    for program in (sandbox.binary(), sandbox.doctor()):
+        (HOME / "bin" / program.name).symlink_to(program)
     shutil.copy("/bin/sleep", HOME / "bin/openvpn")
     subprocess.Popen([HOME / "bin/openvpn", "600"])  # ends with the sandbox
-    for command in filter(ON_DEVICE.fullmatch, commands()):
-        if command.startswith("pelorus") and not lab.daemon.ended():
+    ends = "pelorus -u"
+    # What ends the daemon comes last.
+    for command in sorted(filter(ON_DEVICE.fullmatch, commands()),
+                          key=lambda command: command.startswith(ends)):
+        if command.startswith(ends) and not lab.daemon.ended():
             assert lab.stop_daemon(signal.SIGKILL) == "SIGKILL" and lab.gateway.mappings()
         argv = network.command(network.DEVICE, "env", f"PATH={PATH}",
                                f"TAVIK_STATIC_CONFIG={STATIC_FILE}", "sh", "-c", command)

@@ -1,0 +1,33 @@
+#include <gtest/gtest.h>
+
+#include <fstream>
+
+#include "doctor/causes.h"
+
+namespace pelorus::doctor {
+namespace {
+
+// The rows of the table in docs/doctor.md, without their last cell: when the cause is named is told
+// there in the page's own words.
+std::string documentedCauses() {
+    std::ifstream file{PELORUS_SOURCES "/../docs/doctor.md"};
+    std::string line, rows;
+    while (std::getline(file, line) && line != "## Causes") continue;
+    while (std::getline(file, line) && line.find("| ---") != 0) continue;
+    while (std::getline(file, line) && !line.empty()) {
+        rows += line.substr(0, line.rfind(" | ") + 2) + "\n";
+    }
+    return rows;
+}
+
+TEST(CausesDocument, HasEachCauseWithItsWordsInTheOrderOfWeight) {
+    std::string rows;
+    for (const Cause& cause : allCauses()) {
+        rows.append("| `").append(cause.name).append("` | ").append(cause.sentence);
+        rows.append(" | ").append(cause.remedy).append(" |\n");
+    }
+    EXPECT_EQ(documentedCauses(), rows);
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

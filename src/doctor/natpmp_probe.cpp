@@ -42,9 +42,9 @@ int askForAddress(natpmp_t& client, natpmpresp_t& response) {
         const auto left =
             std::chrono::duration_cast<std::chrono::milliseconds>(end - Clock::now()).count();
         if (left <= 0) return NATPMP_TRYAGAIN;
-        const long wanted = pause.tv_sec * 1000 + pause.tv_usec / 1000 + 1;
+        const auto wanted = decltype(left){pause.tv_sec} * 1000 + pause.tv_usec / 1000 + 1;
         pollfd waited{client.s, POLLIN, 0};
-        static_cast<void>(poll(&waited, 1, static_cast<int>(std::min<long>(wanted, left))));
+        static_cast<void>(poll(&waited, 1, static_cast<int>(std::min(wanted, left))));
         if (!hasWholeAnswer(client.s)) return NATPMP_ERR_UNDEFINEDERROR;
         status = readnatpmpresponseorretry(&client, &response);
     } while (status == NATPMP_TRYAGAIN);

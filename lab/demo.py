@@ -14,8 +14,9 @@ import subprocess
 import sys
 import traceback
 from collections.abc import Callable
+from contextlib import nullcontext
 
-from lab import network, picture, sandbox, web
+from lab import doctor, network, picture, sandbox, web
 from lab.device import DYNAMIC_FILE, HOME
 from lab.gateway import GatewaySetup
 from lab.relay import TUNNEL_DEVICE
@@ -214,7 +215,8 @@ def _close(lab: Lab) -> None:
 def _diagnose(lab: Lab, special: str, ahead: float) -> None:
     """Tell what is special now, and print what the doctor says to the device's owner."""
     print(f"\n{special[:1].upper()}{special[1:]}\n\n$ pelorus-doctor", flush=True)
-    lab.show_diagnosis(ahead)
+    with lab.daemon.held() if not lab.daemon.ended() else nullcontext():
+        doctor.show(lab.device.messages, ahead)
 
 
 def _look_around(lab: Lab, special: str, _ahead: float) -> None:

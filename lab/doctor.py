@@ -6,7 +6,6 @@ import json
 import os
 import subprocess
 import sys
-from collections.abc import Sequence
 from dataclasses import dataclass
 from typing import Any
 
@@ -57,25 +56,25 @@ def examine(messages: Messages, *options: str, ahead: float = 0) -> Diagnosis:
 def run(messages: Messages, *options: str,
         ahead: float = 0) -> subprocess.CompletedProcess[str]:
     """Run it on the device with these options, over the log so far."""
-    return subprocess.run(_command(messages, options, ahead), stdin=subprocess.DEVNULL,
-                          capture_output=True, text=True, timeout=_PATIENCE, check=False)
+    messages.take_waiting()
+    environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
+                   *(clock.at(ahead) if ahead else ())]
+    return subprocess.run(
+        network.command(network.DEVICE, "env", "-i", *environment, str(sandbox.doctor()),
+                        "--log", str(messages.syslog), *options),
+        stdin=subprocess.DEVNULL, capture_output=True, text=True, timeout=_PATIENCE, check=False)
 
 
 def show(messages: Messages, ahead: float = 0) -> None:
     """Have it print its note here, as wide and as coloured as the terminal is."""
-    sys.stdout.flush()
+    messages.take_waiting()
     terminal = [f"{name}={os.environ[name]}" for name in ("NO_COLOR", "TERM") if name in os.environ]
-    done = subprocess.run(_command(messages, (), ahead, *terminal), stdin=subprocess.DEVNULL,
-                          timeout=_PATIENCE, check=False)
+    environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}", *terminal,
+                   *(clock.at(ahead) if ahead else ())]
+    sys.stdout.flush()
+    done = subprocess.run(
+        network.command(network.DEVICE, "env", "-i", *environment, str(sandbox.doctor()),
+                        "--log", str(messages.syslog)),
+        stdin=subprocess.DEVNULL, timeout=_PATIENCE, check=False)
     if done.returncode not in _ANSWERS:
         raise LabError(f"the doctor ended with {done.returncode}")
-
-
-def _command(messages: Messages, options: Sequence[str], ahead: float,
-             *environment: str) -> list[str]:
-    messages.take_waiting()
-    return network.command(
-        network.DEVICE, "env", "-i", f"PATH={device.PATH}",
-        f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}", *environment,
-        *(clock.at(ahead) if ahead else ()), str(sandbox.doctor()),
-        "--log", str(messages.syslog), *options)

@@ -7,7 +7,7 @@ import os
 import signal
 import socket
 from collections.abc import Callable, Mapping, Sequence
-from contextlib import AbstractContextManager, nullcontext
+from contextlib import nullcontext
 from dataclasses import dataclass, field
 from pathlib import Path
 
@@ -140,20 +140,12 @@ class Lab:
 
         No secret of the device may be in it.
         """
-        with self._standing_still():
+        runs = self._daemon is not None and not self._daemon.ended()
+        with self.daemon.held() if runs else nullcontext():
             diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis
-
-    def show_diagnosis(self, ahead: float = 0) -> None:
-        """Print what the doctor says to people now. The daemon is held meanwhile."""
-        with self._standing_still():
-            doctor.show(self.device.messages, ahead=ahead)
-
-    def _standing_still(self) -> AbstractContextManager[None]:
-        runs = self._daemon is not None and not self._daemon.ended()
-        return self.daemon.held() if runs else nullcontext()
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""

@@ -199,6 +199,7 @@ std::string Masks::hidePlaces(std::string_view text) {
 }
 
 std::string Masks::hideWord(std::string_view word) {
+    if (word.empty()) return "";
     if (const auto address = ipv6(word)) {
         const std::string kind = kindOf(*address);
         return kind.empty() ? std::string{word} : replacement(kind, canonical(*address));

@@ -48,6 +48,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"https://cloud.tavik.example:443/x", "https://host-1:443/x"},
         {"cloud.tavik.example. relay3.tavik.example nas-devicedev7.tavik.example", "host-1. host-2 host-3"},
         {"7.113.0.203.in-addr.arpa", "address-1.in-addr.arpa"},
+        {"LOCAL_... URLs: . :", "LOCAL_... URLs: . :"},
         {"", ""}};
     // clang-format on
     const Settings settings{{"DEVICEID", "dev7"},

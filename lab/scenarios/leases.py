@@ -50,7 +50,6 @@ def upnp_leases(lab: Lab) -> None:
     """UPnP mappings are renewed over ten leases; the device is reachable all the time."""
     _start_leasing(lab, _LEASE)
     changes = mapping_changes(lab)
-    lab.moment("the lease is short, so the mappings are renewed every few seconds")
 
     lab.step("a visitor fetches pages all the time, over ten leases")
     with _visitor():
@@ -67,6 +66,7 @@ def upnp_leases(lab: Lab) -> None:
         assert [gateway_log.count(f"updating existing port mapping {port} TCP")
                 for port in (9091, 9444)] == [len(renewals) // 2] * 2
     assert_published(lab)
+    lab.moment("the lease is short, so the mappings are renewed every few seconds")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 

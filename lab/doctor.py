@@ -7,6 +7,7 @@ import os
 import subprocess
 import sys
 from dataclasses import dataclass
+from pathlib import Path
 from typing import Any
 
 from lab import clock, device, network, sandbox
@@ -40,12 +41,14 @@ class Diagnosis:
         return json.dumps(self.everything, indent=1)
 
 
-def examine(messages: Messages, *options: str, ahead: float = 0) -> Diagnosis:
+def examine(messages: Messages, *options: str, ahead: float = 0,
+            log: Path | None = None) -> Diagnosis:
     """Let the doctor conclude from everything it may look at.
 
-    Its clock is that of the machine, or `ahead` seconds ahead of it.
+    Its clock is that of the machine, or `ahead` seconds ahead of it. It reads the whole log, or
+    the file `log`.
     """
-    done = run(messages, "--json", *options, ahead=ahead)
+    done = run(messages, "--json", *options, ahead=ahead, log=log)
     try:
         return Diagnosis(json.loads(done.stdout), done.returncode)
     except ValueError as error:
@@ -53,15 +56,15 @@ def examine(messages: Messages, *options: str, ahead: float = 0) -> Diagnosis:
                        f"{done.stderr!r}") from error
 
 
-def run(messages: Messages, *options: str,
-        ahead: float = 0) -> subprocess.CompletedProcess[str]:
+def run(messages: Messages, *options: str, ahead: float = 0,
+        log: Path | None = None) -> subprocess.CompletedProcess[str]:
     """Run it on the device with these options, over the log so far."""
     messages.take_waiting()
     environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
                    *(clock.at(ahead) if ahead else ())]
     return subprocess.run(
         network.command(network.DEVICE, "env", "-i", *environment, str(sandbox.doctor()),
-                        "--log", str(messages.syslog), *options),
+                        "--log", str(log or messages.syslog), *options),
         stdin=subprocess.DEVNULL, capture_output=True, text=True, timeout=_PATIENCE, check=False)
 
 

@@ -18,6 +18,7 @@ FOLDER = Path("/run/syslog")
 _LOG_SOCKET = FOLDER / "socket"
 _LINK = Path("/dev/log")
 _LOOK_SECONDS = 0.2
+_DEFAULT_SEVERITY = 5
 _DATAGRAM = re.compile(r"<(\d+)>(?:\w{3} [ \d]\d [\d:]{8} )?([^:\[]+)(?:\[\d+\])?: ?(.*)", re.S)
 _SEVERITIES = ("emerg", "alert", "crit", "err", "warning", "notice", "info", "debug")
 
@@ -39,7 +40,8 @@ class Message:
 class Messages:
     """Receives and keeps the log; `file` holds the same lines for a human reader.
 
-    `syslog` holds them as a log daemon writes them, with the machine's time.
+    `syslog` holds them as a log daemon writes them, with the machine's time, and `default_syslog`
+    those of them that a daemon logs without an option for more.
 
     A reader gets every line sent before its call, however busy the receiving thread is.
     """
@@ -47,6 +49,7 @@ class Messages:
     def __init__(self, file: Path) -> None:
         self.file = file
         self.syslog = file.with_name("syslog")
+        self.default_syslog = file.with_name("syslog.default")
         self._kept: list[Message] = []
         self._listeners: list[Callable[[Message], None]] = []
         self._lock = threading.Lock()
@@ -63,6 +66,7 @@ class Messages:
         self.file.parent.mkdir(parents=True, exist_ok=True)
         self.file.touch()
         self.syslog.touch()
+        self.default_syslog.touch()
         self._receiver = receiver
         threading.Thread(target=self._receive, args=(receiver,), daemon=True).start()
 
@@ -102,7 +106,8 @@ class Messages:
     def take_waiting(self) -> None:
         """Store the lines waiting in the socket."""
         with self._lock, self.file.open("a", errors="replace") as file, \
-                self.syslog.open("a", errors="replace") as syslog:
+                self.syslog.open("a", errors="replace") as syslog, \
+                self.default_syslog.open("a", errors="replace") as default_syslog:
             while self._receiver:
                 try:
                     datagram = self._receiver.recv(65536, socket.MSG_DONTWAIT)
@@ -113,7 +118,10 @@ class Messages:
                 file.write(f"{message}\n")
                 stamp = datetime.now().astimezone().isoformat(timespec="milliseconds")
                 text = message.text.replace("\n", "#012")
-                syslog.write(f"{stamp} {socket.gethostname()} {message.ident}: {text}\n")
+                line = f"{stamp} {socket.gethostname()} {message.ident}: {text}\n"
+                syslog.write(line)
+                if message.severity <= _DEFAULT_SEVERITY:
+                    default_syslog.write(line)
                 for listener in self._listeners:
                     listener(message)
 

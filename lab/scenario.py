@@ -2,12 +2,11 @@
 
 from __future__ import annotations
 
-import json
-import os
 import signal
 import socket
 from collections.abc import Callable, Mapping, Sequence
-from contextlib import nullcontext
+from concurrent.futures import ThreadPoolExecutor
+from contextlib import AbstractContextManager, nullcontext
 from dataclasses import dataclass, field
 from pathlib import Path
 
@@ -50,6 +49,15 @@ class Situation:
     own_router: bool = False
 
 
+@dataclass(frozen=True)
+class Moment:
+    """A moment in which the doctor was asked: what was special, what it named first, and why."""
+
+    what: str
+    cause: str
+    fact: str
+
+
 class Lab:
     """The network with everything in it; there is one per sandbox, and it ends with it."""
 
@@ -61,6 +69,7 @@ class Lab:
         self._visitor: Callable[[str, float], None] | None = None
         self._visits_first_stop = False
         self.asks_doctor = False  # in each telling moment
+        self.moments: list[Moment] = []  # in which it was
         self._told = False
         socket.sethostname(self.account.host_name)
         network.raise_home_network(situation.own_router)
@@ -116,36 +125,52 @@ class Lab:
         """
         self._visitor, self._visits_first_stop = visitor, first_stop
 
-    def moment(self, what: str, cause: str = "", ahead: float = 0) -> None:
-        """Tell what is special now, at the moment of the story that is most worth a visit.
+    def moment(self, what: str, cause: str = "", ahead: float = 0, default: str = "") -> None:
+        """Tell what is special now, at a moment of the story that is worth a visit.
 
         The doctor must then name this cause first, or none if it is empty. The device's clock is
-        `ahead` seconds ahead.
+        `ahead` seconds ahead. From the log that a daemon keeps by default it must conclude the
+        same or nothing, or else the cause `default`.
         """
         self._told = True
         if self._visitor:
             self._visitor(what, ahead)
-        if self.asks_doctor:
-            diagnosis = self.diagnosis(ahead=ahead)
-            if "DIAGNOSES" in os.environ:
-                test = os.environ.get("PYTEST_CURRENT_TEST", "")
-                with open(os.environ["DIAGNOSES"], "a") as file:
-                    file.write(json.dumps([test, what, cause, diagnosis.cause,
-                                           diagnosis.everything]) + "\n")
-            else:
-                assert diagnosis.cause == cause, f"the doctor says\n{diagnosis}"
+        if not self.asks_doctor:
+            return
+        whole, usual = self._diagnoses(ahead)
+        assert whole.cause == cause, f"the doctor says\n{whole}"
+        assert usual.cause in ({default} if default else {cause, "", "settling"}), (
+            f"from the log of a default daemon the doctor says\n{usual}")
+        self.moments.append(Moment(what, cause, whole.fact))
+
+    def moment_follows(self) -> None:
+        """The moment before the daemon is first stopped tells nothing: a later one does."""
+        self._told = True
+
+    def _diagnoses(self, ahead: float) -> tuple[doctor.Diagnosis, doctor.Diagnosis]:
+        """With the whole log, and with the one of a daemon without `-l`."""
+        with self._held(), ThreadPoolExecutor() as pool:
+            usual = pool.submit(self._examine, (), ahead, self.device.messages.default_syslog)
+            return self._examine((), ahead), usual.result()
 
     def diagnosis(self, *options: str, ahead: float = 0) -> doctor.Diagnosis:
         """What the doctor concludes now. The daemon is held meanwhile.
 
         No secret of the device may be in it.
         """
-        runs = self._daemon is not None and not self._daemon.ended()
-        with self.daemon.held() if runs else nullcontext():
-            diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead)
+        with self._held():
+            return self._examine(options, ahead)
+
+    def _examine(self, options: Sequence[str], ahead: float,
+                 log: Path | None = None) -> doctor.Diagnosis:
+        diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis
+
+    def _held(self) -> AbstractContextManager[None]:
+        runs = self._daemon is not None and not self._daemon.ended()
+        return self.daemon.held() if runs else nullcontext()
 
     def stop_daemon(self, number: int = signal.SIGTERM) -> str:
         """Send a signal that ends the daemon and return how it ended."""

@@ -122,6 +122,7 @@ def relayed_device_address_changes(lab: Lab) -> None:
     assert [request.url for request in lab.device.local_requests[sent:]] == [
         f"/local/local_ip?address={_NEW_LAN_ADDRESS}"]
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the page to come through", 20)
+    lab.moment("the device is relayed at its new address", "no-gateway-protocol")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
@@ -168,6 +169,7 @@ def gateway_falls_silent(lab: Lab) -> None:
     wait_for_status(lab, "portforwarded")
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
+    lab.moment("the gateway answers again, and the device is reached directly")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed", "relayed",
                                           "portforwarded", "disabled"]

@@ -50,6 +50,7 @@ def started_oddly_while_relayed(lab: Lab) -> None:
     wait_for_status(lab, "relayed")
     assert page_through_the_tunnel(lab) == PAGES[0]
     client = tunnel_client()
+    lab.moment("no gateway answers, so the device is relayed", "no-gateway-protocol")
     lab.step("the gateway maps ports: the tunnel ends at the first attempt")
     lab.gateway.become(GatewaySetup())
     wait_for_status(lab, "portforwarded")
@@ -67,6 +68,7 @@ def tmp_cannot_be_written(lab: Lab) -> None:
             _start(lab)
             assert not daemon.PID_FILE.exists() or daemon.PID_FILE.read_text() == ""
             wait_for_next_cycle(lab)
+            lab.moment("there is no pid file, and the device is reached all the same")
         assert_stops_clean(lab)
         daemon.PID_FILE.unlink(missing_ok=True)
 
@@ -80,6 +82,8 @@ def copy_cannot_be_written(lab: Lab) -> None:
         assert wait_until(lab.daemon.ended, "the daemon to end", 10) == "exit 1"
         assert lab.device.messages.count("main - config file failed to load.") == 1
         assert not DYNAMIC_COPY.exists()
+        lab.moment("there is no space for the copy of the settings: the daemon has ended",
+                   "settings-unreadable")
     assert lab.central.requests == []
     lab.step("there is space again")
     _start(lab)
@@ -103,6 +107,7 @@ def tunnel_files_cannot_be_written(lab: Lab) -> None:
     lab.step("there is space again")
     wait_for_status(lab, "relayed")
     client = tunnel_client()
+    lab.moment("there is space again, and the device is relayed", "no-gateway-protocol")
     assert len(daemon.running("openvpn")) == 2
     assert (folder / "auth.txt").stat().st_mode & 0o777 == 0o600
     assert_stops_clean(lab)
@@ -145,7 +150,7 @@ def processes_exhausted(lab: Lab) -> None:
 @scenario(_NO_RELAY)
 def cable_unplugged(lab: Lab) -> None:
     """The network interface is down for two cycles: the device is reached again soon after."""
-    _assert_recovers_from(lab, faults.cable_unplugged)
+    _assert_recovers_from(lab, faults.cable_unplugged, "no-network")
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
 
@@ -174,6 +179,7 @@ def clock_jumps(lab: Lab) -> None:
     with faults.host_renamed(lab):
         wait_for_next_cycle(lab)
     assert pages_from_outside() == PAGES
+    lab.moment("the clock is right again, and the device is reached directly")
     assert_stops_clean(lab)
 
 
@@ -217,6 +223,8 @@ def _assert_touches_nothing(lab: Lab, status: str) -> None:
     written = [line for line in seen if _WRITES.search(line) and not _OF_THE_LAB.search(line)]
     assert written == [], written
     assert lab.device.statuses_sent() == ["connecting", status]
+    lab.moment(f"nothing changes, and the device stays {status}",
+               "no-gateway-protocol" if status == "relayed" else "")
     assert_stops_clean(lab)
 
 
@@ -241,18 +249,24 @@ def _own_file_system(folder: Path) -> None:
     run_tool("mount", "-t", "tmpfs", "-o", "mode=770", "lab-small", str(folder))
 
 
-def _assert_recovers_from(lab: Lab, trouble: faults.Begin) -> None:
-    """The running daemon lives through two cycles of the fault, and then does its work."""
+def _assert_recovers_from(lab: Lab, trouble: faults.Begin, cause: str = "") -> None:
+    """The running daemon lives through two cycles of the fault, and then does its work.
+
+    The doctor sees the fault if it has a cause.
+    """
     start_direct(lab)
     with trouble(lab) as met:
         lab.device.change(NICKNAME="box")  # has the settings read again
         wait_for_next_cycle(lab, 2)
         lab.wait_for(met, "the daemon to meet the fault", 60)
         assert len(daemon.running("pelorus")) == 1
+        if cause:
+            lab.moment("in the fault", cause)
     lab.step("the fault is over")
     wait_for_next_cycle(lab, 2)
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     assert pages_from_outside() == PAGES
     assert_log_is_proper(lab)
+    lab.moment("the fault is over, and the device is reached directly")
     assert_stops_clean(lab)

@@ -161,6 +161,8 @@ def default_ports_only(lab: Lab) -> None:
     assert lab.gateway.upnp_requests() == start + 2 * attempt
     assert lab.gateway.mappings() == others
     assert ports_tested(lab) == []
+    lab.moment("another computer holds the only port that is allowed, so the device is relayed",
+               "ports-taken")
     assert_stops_clean(lab, left=others)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
 
@@ -266,9 +268,6 @@ def privileged_ports_refused(lab: Lab) -> None:
         assert lab.gateway.upnp_requests() == start + attempt
         assert lab.device.status == "relayed"
         assert page_through_the_tunnel(lab) == PAGES[0]
-    lab.moment("the gateway refuses ports below 1024, so every cycle searches, and the device is "
-               "relayed",
-               "gateway-refuses")
 
     lab.step("every cycle searches again")
     wait_for_cycle(lab, 2)
@@ -277,6 +276,9 @@ def privileged_ports_refused(lab: Lab) -> None:
         assert lab.device.messages.count(_REFUSED) == 100 + 5 * 99
         assert lab.gateway.upnp_requests() == start + attempt + next_attempt
         assert ports_tested(lab) == []
+        lab.moment("the gateway refuses ports below 1024, so every cycle searches, and the device "
+                   "is relayed",
+                   "gateway-refuses")
 
         lab.step("the user moves the web server to ports 8080 and 8443")
         lab.device.serve_on(8080, 8443)

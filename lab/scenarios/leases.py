@@ -50,7 +50,6 @@ def upnp_leases(lab: Lab) -> None:
     """UPnP mappings are renewed over ten leases; the device is reachable all the time."""
     _start_leasing(lab, _LEASE)
     changes = mapping_changes(lab)
-    lab.moment("the lease is short, so the mappings are renewed every few seconds")
 
     lab.step("a visitor fetches pages all the time, over ten leases")
     with _visitor():
@@ -67,6 +66,7 @@ def upnp_leases(lab: Lab) -> None:
         assert [gateway_log.count(f"updating existing port mapping {port} TCP")
                 for port in (9091, 9444)] == [len(renewals) // 2] * 2
     assert_published(lab)
+    lab.moment("the lease is short, so the mappings are renewed every few seconds")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
@@ -76,7 +76,6 @@ def natpmp_leases(lab: Lab) -> None:
     """NAT-PMP mappings are renewed over ten leases, and expire after the daemon is killed."""
     _start_leasing(lab, _LEASE)
     changes = len(mapping_changes(lab))
-    lab.moment("the lease is short, so the mappings are renewed every few seconds")
 
     lab.step("a visitor fetches pages all the time, over ten leases")
     with _visitor():
@@ -216,10 +215,12 @@ def _assert_in_time(renewals: list[_Renewal], ports: set[tuple[str, int]], lease
 def _assert_end_unrenewed(lab: Lab, mappings: list[Mapping]) -> None:
     """Kill the daemon: the gateway keeps the mappings for the rest of their lease, not longer."""
     lab.step("the daemon is killed: the mappings expire with their leases")
+    lab.moment_follows()  # to hold the daemon would cost it a lease
     assert lab.stop_daemon(signal.SIGKILL) == "SIGKILL"
     assert lab.gateway.mappings() == mappings
     wait_until(lambda: lab.gateway.mappings() == [], "the leases to end", 30)
     assert_log_is_proper(lab)
+    lab.moment("the daemon was killed, and its mappings have expired", "not-running")
 
 
 def _descriptions(lab: Lab) -> list[str]:

@@ -41,6 +41,8 @@ def unmap_all(lab: Lab) -> None:
     assert lab.gateway.mappings() == [neighbours, *BOTH_MAPPED]
     assert lab.central.record == PUBLISHED
     assert lab.device.status == "portforwarded"
+    lab.moment("the daemon was killed with kill -9, and everything is left in place",
+               "not-running")
     requests, sent = len(lab.central.requests), len(lab.device.local_requests)
 
     lab.step("pelorus -u cleans up and exits")
@@ -52,6 +54,7 @@ def unmap_all(lab: Lab) -> None:
         "/local/comm_status?status=disabled",
         "/local/local_ip?address=192.168.77.10",
         "/local/port_forward_delete?internal_port=80"]
+    lab.moment("pelorus -u has removed everything", "not-running")
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
@@ -59,8 +62,11 @@ def unmap_all_while_relayed(lab: Lab) -> None:
     """A tunnel that outlives its daemon keeps working until `pelorus -u` stops it."""
     start(lab, "relayed")
     client = tunnel_client()
+    lab.moment("the device is relayed: see what a daemon killed with kill -9 leaves",
+               "no-gateway-protocol")
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
+    lab.moment("the daemon was killed, and its tunnel still works", "not-running")
 
     lab.step("pelorus -u cleans up and exits")
     _clean_up(lab)
@@ -73,7 +79,7 @@ def stopped_in_discovery(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT during gateway discovery: it ends without trying anything else."""
     # A refusal would end the NAT-PMP search at once.
     lab.gateway.fall_silent()
-    for time in _until_each_signal(lab, "during gateway discovery"):
+    for time in _until_each_signal(lab, "during gateway discovery", "no-gateway-protocol"):
         wait_for_log(lab, "setting localIP to: [192.168.77.10]", time)
     assert lab.device.messages.count(_CYCLE) == 0
     assert lab.device.statuses_sent() == ["connecting", "disabled"] * len(_SIGNALS)
@@ -83,7 +89,7 @@ def stopped_in_discovery(lab: Lab) -> None:
 def stopped_in_a_port_test(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT during a slow port test: published after it, then withdrawn."""
     lab.central.misbehave(PORT_TEST, Fault(delay=2))
-    for time in _until_each_signal(lab, "while the service tests the port"):
+    for time in _until_each_signal(lab, "while the service tests the port", "settling"):
         lab.wait_for(lambda: len(lab.central.requests_for(PORT_TEST)) == time,
                      "the port test", 60)
         assert lab.gateway.mappings() == BOTH_MAPPED[:1]
@@ -100,6 +106,7 @@ def stopped_in_a_handshake(lab: Lab) -> None:
     assert wait_until(lab.daemon.ended, "the daemon to end", 60) == "SIGTERM"
     assert lab.device.messages.count("sigTrap - Received SIGTERM signal.") == 1
     assert_log_is_proper(lab)
+    lab.moment("SIGTERM ended the daemon in a handshake", "not-running")
 
 
 # When the back end does not accept the ports, the relay is tried while both are mapped.
@@ -107,7 +114,7 @@ def stopped_in_a_handshake(lab: Lab) -> None:
                             "STARTCMD": "touch openvpn.out"}, clock=FAST))
 def stopped_in_the_relay_start(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT while no tunnel comes up: it keeps trying for five minutes."""
-    for time in _until_each_signal(lab, "while the tunnel does not come up"):
+    for time in _until_each_signal(lab, "while no tunnel comes up", "publishing-failed"):
         wait_for_log(lab, _TUNNEL_NOT_UP, (time - 1) * _LOOKS_AT_THE_TUNNEL + 1)
         assert lab.gateway.mappings() == BOTH_MAPPED
     assert lab.device.messages.count(_TUNNEL_NOT_UP) == len(_SIGNALS) * _LOOKS_AT_THE_TUNNEL
@@ -119,6 +126,7 @@ def stopped_as_the_tunnel_starts(lab: Lab) -> None:
     """SIGTERM while the tunnel client starts: briefly relayed, then everything is torn down."""
     lab.start_daemon(*OPTIONS)
     lab.wait_for(lab.device.tunnel_output().exists, "the client", 60)
+    lab.moment("the tunnel client is starting", "no-gateway-protocol")
     lab.step("SIGTERM before the daemon knows that the tunnel is up")
     assert_stops_clean(lab)
     assert lab.relay.connections() == 1
@@ -130,7 +138,7 @@ def stopped_as_the_tunnel_starts(lab: Lab) -> None:
 @scenario(Situation(clock=FAST))
 def stopped_in_its_sleep(lab: Lab) -> None:
     """SIGTERM, SIGINT or SIGQUIT between two cycles: it ends without another one."""
-    for time in _until_each_signal(lab, "between two cycles"):
+    for time in _until_each_signal(lab, "between two cycles", ""):
         wait_for_status(lab, "portforwarded")
         with lab.daemon.held():
             assert_published(lab)
@@ -177,6 +185,7 @@ def killed_while_relayed(lab: Lab) -> None:
     """The next daemon forgets a killed one's tunnel, which fights the new one until stopped."""
     start(lab, "relayed")
     old = tunnel_client()
+    lab.moment("the device is relayed", "no-gateway-protocol")
     _kill(lab)
     assert page_through_the_tunnel(lab) == PAGES[0]
 
@@ -199,14 +208,15 @@ def killed_while_relayed(lab: Lab) -> None:
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 60)
     wait_for_next_cycle(lab)
     assert tunnel_client() == new
+    lab.moment("only the new daemon's tunnel client is left", "no-gateway-protocol")
     assert_stops_clean(lab)
     wait_for_client_end(new)
 
 
-def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
+def _until_each_signal(lab: Lab, phase: str, cause: str) -> Iterator[int]:
     """Start the daemon once for each signal, let the caller wait for the phase, and stop it.
 
-    One signal must be enough.
+    One signal must be enough. Before the first one the doctor must name this cause.
     """
     # SIGQUIT would leave a core file in the machine's root folder.
     resource.setrlimit(resource.RLIMIT_CORE, (0, 0))
@@ -214,6 +224,8 @@ def _until_each_signal(lab: Lab, phase: str) -> Iterator[int]:
         lab.step(f"{number.name} {phase}")
         lab.start_daemon(*OPTIONS)
         yield time
+        if time == 1:
+            lab.moment(f"{phase}, before the signal", cause)
         assert_stops_clean(lab, number)
 
 

@@ -55,6 +55,7 @@ def manual_ports(lab: Lab) -> None:
     wait_for_status(lab, "portforwarded")
     _assert_published_by_hand(lab)
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
+    lab.moment("the settings name the right ports again, and the device is reached on them")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
@@ -116,7 +117,6 @@ def manual_and_back(lab: Lab) -> None:
         changed = len(lab.device.messages.all)
     _wait_for_port(lab, 8081)
     assert_logged_by_next_cycle(lab, changed, _BEGIN)
-    lab.moment("ports forwarded by hand are in use, and the daemon has removed its own two")
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
@@ -139,6 +139,7 @@ def manual_and_back(lab: Lab) -> None:
     assert pages_from_outside() == PAGES
     assert [request.argument("http_port") for request in lab.central.requests_for(PORT_FORWARD)
             ] == ["0", "9091", "8081", "9091"]
+    lab.moment("the ports forwarded by hand are gone, and the daemon has mapped its own two again")
 
     lab.step("stopping leaves the other ports alone")
     assert_stops_clean(lab, left=others)

@@ -123,6 +123,8 @@ def own_router_offline(lab: Lab) -> None:
     assert _changes(lab)[2:] == [_remove(9091, 80), _remove(9444, 443)]
     assert lab.own_router.mappings() == []
     assert lab.central.record is None
+    lab.moment("the router has lost its internet address, so its ports are closed",
+               "gateway-without-address")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "failed", "portforwarded", "failed",
                                           "disabled"]

@@ -57,6 +57,8 @@ def no_gateway_protocol(lab: Lab) -> None:
     wait_for_next_cycle(lab)
     assert (lab.central.requests, lab.device.local_requests) == (requests, sent)
     assert (tunnel_client(), lab.relay.connections()) == (client, 1)
+    lab.moment("no protocol opens a port at the gateway, so the device is relayed",
+               "no-gateway-protocol")
 
     lab.step("the tunnel ends with the daemon")
     assert_stops_clean(lab)
@@ -121,6 +123,8 @@ def tunnel_client_dies(lab: Lab) -> None:
         wait_for_client_end(client)
         assert page_through_the_tunnel(lab) is None
         assert lab.device.status == "relayed"
+        lab.moment("the tunnel client was killed, and the daemon has not noticed yet",
+                   "tunnel-died")
 
     lab.step("the next cycle notices and restarts the tunnel")
     wait_for_log(lab, f"isVPNRunning() - unlink stale openVPN pid file {TUNNEL_PID_FILE}")
@@ -128,6 +132,7 @@ def tunnel_client_dies(lab: Lab) -> None:
     lab.wait_for(lambda: page_through_the_tunnel(lab) == PAGES[0], "the device's page", 20)
     assert lab.relay.connections() == 2
     second = tunnel_client()
+    lab.moment("another tunnel client has been started", "no-gateway-protocol")
     assert_stops_clean(lab)
     wait_for_client_end(second)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
@@ -161,6 +166,8 @@ def relay_refuses(lab: Lab) -> None:
     assert lab.device.messages.count(_NOT_UP) == 28
     assert lab.device.messages.count("not-its-own") == 0
     wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay's own process", 20)
+    lab.moment("the relay refuses the credentials of the device: the status is failed",
+               "relay-refused")
     assert lab.stop_daemon() == "SIGTERM"
     assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"]
     assert_log_is_proper(lab)
@@ -182,6 +189,7 @@ def second_nat(lab: Lab) -> None:
     with lab.daemon.held():
         lab.provider.remove()
     _wait_for_direct(lab, client)
+    lab.moment("the second NAT is gone, and the device is reached directly")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded", "disabled"]
 

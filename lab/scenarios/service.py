@@ -193,6 +193,8 @@ def failed_test_leaves_https_open(lab: Lab) -> None:
         # A wider search would have removed it before its second candidate.
         assert lab.gateway.mappings() == BOTH_MAPPED[1:]
         assert pages_from_outside() == [None, PAGES[1]]
+        lab.moment("the test fails, and the HTTPS port stays open",
+                   "service-silent")
 
     lab.step("a normal shutdown closes it")
     assert_stops_clean(lab)
@@ -224,6 +226,14 @@ def publishing_fails(lab: Lab) -> None:
     assert lab.device.messages.count("Router::unmapPort() - success") == 0
     assert_published(lab)
     assert_stops_clean(lab)
+
+    lab.step("another start, and it cannot publish them again")
+    lab.central.misbehave(PORT_FORWARD, Fault(drop=True, times=2))
+    lab.start_daemon(*OPTIONS)
+    wait_for_log(lab, NOT_RELAYED, 3)
+    lab.moment("the ports pass their test, but the service does not take their record",
+               "publishing-failed")
+    assert lab.stop_daemon() == "SIGTERM"
 
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=IMPATIENT))
@@ -284,6 +294,11 @@ def names_lead_elsewhere(lab: Lab) -> None:
     assert lab.device.messages.count(f"{_CHECK}forceDNSCheck or exceeded nslookup check") == 1
     assert lab.central.record == PUBLISHED
     assert lab.gateway.mappings() == BOTH_MAPPED
+    lab.moment("the device is reached directly, but its names still point elsewhere",
+               "names-lead-elsewhere")
+    for name in lab.account.names:
+        lab.names.unpin(name)
+    lab.moment("the names lead to the device again")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
@@ -350,6 +365,8 @@ def relay_names_lead_elsewhere(lab: Lab) -> None:
     assert len(set(daemon.running("openvpn")) - before) == 1
     assert lab.relay.connections() == 2
     assert lab.relay.client_address()
+    lab.moment("the device is relayed, but its names still point elsewhere",
+               "names-lead-elsewhere")
     assert_stops_clean(lab)
     wait_until(lambda: not set(daemon.running("openvpn")) - before, "the tunnel to end", 20)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "relayed", "disabled"]
@@ -360,8 +377,10 @@ def _play_fault(lab: Lab, fault: Fault, error: str, count: int, *operations: str
     for operation in operations:
         lab.central.misbehave(operation, fault)
     _assert_fails(lab, error, count)
+    # Which answer it was is logged at severity 6.
     lab.moment("the service misbehaves in each port test: the status is failed",
-               "service-answers-nonsense" if fault.body else "service-silent")
+               "service-answers-nonsense" if fault.body else "service-silent",
+               default="tunnel-client-does-not-start" if fault.body else "")
     lab.step("the service answers properly")
     for operation in operations:
         lab.central.misbehave(operation, None)
@@ -386,6 +405,7 @@ def _assert_recovers(lab: Lab, *statuses: str) -> None:
     """The daemon that failed makes the device reachable, without a restart."""
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
+    lab.moment("the service is all right again, and the device is reached directly")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", *(statuses or ["failed"]),
                                           "portforwarded", "disabled"]

@@ -18,8 +18,10 @@ _MOST_GROWTH = 16 * 1024  # KiB, of which the libraries at their first use take 
 @scenario(Situation(static=_ONE_PORT, clock=FAST))
 def service_cannot_prove_itself(lab: Lab) -> None:
     """The service's TLS is expired, forged, downgraded or missing: it gets no authorisation."""
-    _assert_fails_under(lab, faults.certificate_expired, faults.authority_unknown,
-                        faults.tls_outdated, faults.tls_missing)
+    _assert_fails_under(lab, (faults.certificate_expired, "service-certificate"),
+                        (faults.authority_unknown, "service-certificate"),
+                        (faults.tls_outdated, "service-unreachable"),
+                        (faults.tls_missing, "service-unreachable"))
     assert lab.central.withdrawals == 0
     assert set(asked(lab)) == {WAIT}
     _assert_recovers(lab)
@@ -28,33 +30,45 @@ def service_cannot_prove_itself(lab: Lab) -> None:
 @scenario(_HASTY)
 def service_stalls_or_floods(lab: Lab) -> None:
     """The service keeps silent, drips or floods: each request ends in time and in its bounds."""
-    _assert_fails_under(lab, faults.service_stalls, faults.service_drips, faults.service_floods)
+    _assert_fails_under(lab, (faults.service_stalls, "service-unreachable"),
+                        (faults.service_drips, "service-answers-nonsense"),
+                        (faults.service_floods, "service-silent"))
     _assert_recovers(lab)
 
 
 @scenario(_HASTY)
 def name_server_fails(lab: Lab) -> None:
     """The name server keeps silent, or leads to nobody or to the device itself: as without one."""
-    _assert_fails_under(lab, faults.names_time_out, faults.names_lead_nowhere,
-                        faults.names_lead_home)
+    _assert_fails_under(lab, (faults.names_time_out, "service-unresolved"),
+                        (faults.names_lead_nowhere, "service-unreachable"),
+                        (faults.names_lead_home, "service-unresolved"))
     assert lab.central.requests == []
     _assert_recovers(lab)
 
 
-def _assert_fails_under(lab: Lab, *causes: faults.Begin) -> None:
-    """Under each fault a cycle fails and publishes nothing, and SIGTERM ends the daemon."""
-    for cycle, cause in enumerate(causes, 1):
-        with cause(lab):
+def _assert_fails_under(lab: Lab, *faults_and_causes: tuple[faults.Begin, str]) -> None:
+    """Under each fault a cycle fails and publishes nothing, and SIGTERM ends the daemon.
+
+    The doctor must name the cause that stands beside the fault.
+    """
+    for cycle, (fault, cause) in enumerate(faults_and_causes, 1):
+        with fault(lab):
+            before = lab.device.messages.count(PAUSE)
             lab.start_daemon(*OPTIONS)
             idle = lab.daemon.memory("VmHWM")
-            wait_for_log(lab, PAUSE, cycle)
+            wait_for_log(lab, PAUSE, before + 1)
             assert lab.daemon.memory("VmHWM") - idle < _MOST_GROWTH
             assert lab.device.status == "failed"
             assert lab.gateway.mappings() == []
+            lab.moment(_last_fault(lab), cause)
             assert lab.stop_daemon() == "SIGTERM"
         assert lab.central.record is None
         assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"] * cycle
         assert_log_is_proper(lab)
+
+
+def _last_fault(lab: Lab) -> str:
+    return [event.what for event in lab.timeline.events if event.who == "fault"][-1]
 
 
 def _assert_recovers(lab: Lab) -> None:

@@ -44,6 +44,7 @@ def disk_asleep(lab: Lab) -> None:
     wait_for_next_cycle(lab)
     assert lab.device.local_requests == sent
     assert_published(lab)
+    lab.moment("the disk is in use, and the ports have been tested again")
     assert_stops_clean(lab)
 
 
@@ -115,6 +116,7 @@ def disk_asleep_while_relayed(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "relayed", "portforwarded"]
     wait_for_client_end(client)
     assert_published(lab)
+    lab.moment("the disk was woken for a test, and the device is reached directly")
     assert_stops_clean(lab)
 
 
@@ -143,6 +145,7 @@ def credentials_missing(lab: Lab) -> None:
     assert asked(lab) == [WAIT, PORT_TEST, PORT_FORWARD]
     assert_published(lab)
     assert lab.device.messages.count(_STARTED) == 1
+    lab.moment("the device has been registered, and is reached directly")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["disabled", "connecting", "portforwarded", "disabled"]
 

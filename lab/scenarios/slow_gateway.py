@@ -60,6 +60,8 @@ def natpmp_too_slow(lab: Lab) -> None:
     assert {text.split()[-1] for text in fetched} == {network.GATEWAY_WAN_ADDRESS}
     assert _tracked(lab) == set()
     assert lab.gateway.mappings() == []
+    lab.moment("the gateway answers too late for a mapping, and no tunnel client starts",
+               "tunnel-client-does-not-start")
     assert_stops_clean(lab)
 
 

@@ -8,7 +8,7 @@ namespace pelorus::doctor {
 namespace {
 
 // What the log says is over when the other has been seen by now.
-constexpr std::array<std::pair<Sign, Sign>, 9> kOver{{
+constexpr std::array<std::pair<Sign, Sign>, 10> kOver{{
     {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_CERTIFICATE, Sign::SERVICE_REACHED},
@@ -18,6 +18,7 @@ constexpr std::array<std::pair<Sign, Sign>, 9> kOver{{
     {Sign::LOGGED_NAMES_UNRESOLVED, Sign::NAMES_RIGHT},
     {Sign::LOGGED_BACK_END_SILENT, Sign::BACK_END_ANSWERS},
     {Sign::LOGGED_TUNNEL_DIED, Sign::TUNNEL_RUNS},
+    {Sign::LOGGED_TWO_TUNNELS, Sign::TUNNEL_CLIENT_ALONE},
 }};
 
 // Live evidence beats the log, and the reader is told so.
@@ -29,6 +30,10 @@ void dropWhatIsOver(Evidence& evidence) {
         evidence.signs.erase(logged);
         evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
         evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+    }
+    // A run with -u logs the same as a daemon that is switched off.
+    if (evidence.setting("ENABLEREMOTEACCESS") == "1") {
+        evidence.signs.erase(Sign::LOGGED_REMOTE_ACCESS_OFF);
     }
 }
 

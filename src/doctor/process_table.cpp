@@ -21,7 +21,7 @@ namespace pelorus::doctor {
 namespace {
 
 constexpr std::string_view kDeleted = " (deleted)";  // what the kernel adds to a removed program
-constexpr int kFieldsBeforeStart = 19;               // of the status line, after the name
+constexpr int kFieldsToStart = 17;                   // between the parent and the start
 constexpr std::size_t kMostArguments = 200;          // characters
 
 using FolderHandle = std::unique_ptr<DIR, Releaser<closedir>>;
@@ -58,9 +58,10 @@ std::string linkTarget(const std::string& path) {
     return size <= 0 ? std::string{} : std::string(target.data(), static_cast<std::size_t>(size));
 }
 
-// State letter and start, in clock ticks since the machine started.
+// State letter, parent and start, in clock ticks since the machine started.
 struct StatusLine {
     char state{};
+    pid_t parent{};
     long start{};
 };
 
@@ -71,8 +72,8 @@ std::optional<StatusLine> readStatusLine(const std::string& text) {
     std::istringstream fields{text.substr(nameEnd + 1)};
     StatusLine line;
     std::string skipped;
-    fields >> line.state;
-    for (int field = 1; field < kFieldsBeforeStart; ++field) fields >> skipped;
+    fields >> line.state >> line.parent;
+    for (int field = 0; field < kFieldsToStart; ++field) fields >> skipped;
     fields >> line.start;
     return fields ? std::optional{line} : std::nullopt;
 }
@@ -92,9 +93,11 @@ std::string ProcessTable::read(pid_t pid, const std::string& file) const {
 std::optional<Process> ProcessTable::find(pid_t pid) const {
     const auto status = readStatusLine(read(pid, "stat"));
     if (!status || status->state == 'Z' || status->state == 'X') return std::nullopt;
-    Process process{pid, read(pid, "comm"), "", "", std::nullopt};
+    Process process{pid, status->parent, read(pid, "comm"), "", "", "", std::nullopt};
     while (!process.name.empty() && process.name.back() == '\n') process.name.pop_back();
-    process.program = fileName(linkTarget(folder + "/" + std::to_string(pid) + "/exe"));
+    const std::string ownFolder = folder + "/" + std::to_string(pid);
+    process.program = fileName(linkTarget(ownFolder + "/exe"));
+    process.workingFolder = linkTarget(ownFolder + "/cwd");
     process.arguments = argumentsOf(read(pid, "cmdline"));
     const long ticks = sysconf(_SC_CLK_TCK);
     if (bootTime && ticks > 0) {

@@ -14,9 +14,11 @@ namespace pelorus::doctor {
 
 struct Process {
     pid_t pid{};
+    pid_t parent{};
     std::string name;             ///< as the kernel knows it, at most 15 characters
     std::string program;          ///< file name without its folder; empty if only root may know it
     std::string arguments;        ///< separated by blanks
+    std::string workingFolder;    ///< empty if only root may know it
     std::optional<Time> since{};  ///< its start
 };
 

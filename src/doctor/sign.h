@@ -20,9 +20,11 @@ enum class Sign {
     DAEMON_GONE,  ///< there is no such process
     TUNNEL_RUNS,  ///< the process that the pid file names
     TUNNEL_GONE,
-    TUNNEL_SAYS_UP,     ///< the client's output has the text of success
-    TUNNEL_REFUSED,     ///< the client's output says that the relay refuses the credentials
-    TUNNEL_UNANSWERED,  ///< the client's output says that the relay does not answer
+    SECOND_TUNNEL_CLIENT,  ///< beside the process that the pid file names
+    TUNNEL_CLIENT_ALONE,   ///< no other one beside it
+    TUNNEL_SAYS_UP,        ///< the client's output has the text of success
+    TUNNEL_REFUSED,        ///< the client's output says that the relay refuses the credentials
+    TUNNEL_UNANSWERED,     ///< the client's output says that the relay does not answer
     TUNNEL_FILES_UNWRITABLE,
     DISK_UNUSED,  ///< for longer than the daemon lets a port test wake it
 

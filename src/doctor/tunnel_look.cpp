@@ -102,9 +102,25 @@ private:
         const auto client = pid ? processes.find(*pid) : std::nullopt;
         if (client && isTunnelClient(*client)) {
             conclude(Sign::TUNNEL_RUNS, Verdict::OK, "tunnel client up" + described(*client));
+            lookForSecond(*client);
         } else {
             reportNoClient(pidFile, file, pid);
         }
+    }
+
+    // A daemon that was killed leaves its client running, and the next one does not know of it.
+    void lookForSecond(const Process& client) {
+        if (client.workingFolder.empty()) return;
+        for (const Process& other : processes.named(client.name)) {
+            const bool isPart = other.parent == client.pid || client.parent == other.pid;
+            if (other.pid == client.pid || isPart) continue;
+            if (other.workingFolder != client.workingFolder) continue;
+            if (other.arguments != client.arguments) continue;
+            conclude(Sign::SECOND_TUNNEL_CLIENT, Verdict::PROBLEM,
+                     "a second tunnel client is up" + described(other));
+            return;
+        }
+        evidence.add(Sign::TUNNEL_CLIENT_ALONE, Source::NOW, "there is one tunnel client");
     }
 
     static bool isTunnelClient(const Process& process) {

@@ -72,6 +72,8 @@ NOT_RUN = {
     "packaging/test-deb [--arch arm64] [--stay]": "as above",
     "scripts/cross arm64": "needs what scripts/deps --cross makes",
     "scripts/cross arm64 COMMAND": "scripts/test-cross uses it",
+    "scripts/diagnoses": "takes a quarter of an hour; --help is run here",
+    "scripts/diagnoses [NAME...]": "test_scenarios asks the doctor as well; --help is run here",
     "scripts/endure hours 30 1": "takes 20 minutes at least",
     "scripts/gallery": "takes up to an hour; --help is run here",
     "scripts/gallery [NAME...]": "takes up to an hour; --help is run here",

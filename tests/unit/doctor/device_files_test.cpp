@@ -53,6 +53,8 @@ protected:
         writeFile(own + "cmdline", line);
         fs::remove(path(own + "exe"));
         fs::create_symlink(program, path(own + "exe"));
+        fs::remove(path(own + "cwd"));
+        fs::create_symlink(path("vpn"), path(own + "cwd"));
     }
 
     [[nodiscard]] Evidence look(const Settings& changed = {}, const Settings& dynamic = {}) const {
@@ -183,6 +185,9 @@ TEST_F(DeviceFilesTest, TheTunnelIsJudgedByItsProcessAndItsFiles) {
     EXPECT_EQ(problems(up), "");
     EXPECT_TRUE(up.has(Sign::TUNNEL_SAYS_UP));
     EXPECT_EQ(up.signs.at(Sign::TUNNEL_RUNS).text, "tunnel client up 3 h 20 min (pid 77)");
+    EXPECT_TRUE(up.has(Sign::TUNNEL_CLIENT_ALONE));
+    process(78, "openvpn", "/usr/sbin/openvpn");
+    EXPECT_TRUE(look({}, relayed).has(Sign::SECOND_TUNNEL_CLIENT));
     process(77, "bash", "/bin/bash");
     EXPECT_TRUE(look({}, relayed).has(Sign::TUNNEL_GONE));
     writeFile("vpn/out", "AUTH: Received control message: AUTH_FAILED\nprocess exiting\n");

@@ -9,7 +9,7 @@ from lab.scenarios import direct  # noqa: F401
 from lab.scenarios import changes, leases, slow_gateway  # noqa: F401
 from lab.scenarios import relay, manual, service, settings  # noqa: F401
 from lab.scenarios import own_router, lifecycle, hostile_gateway  # noqa: F401
-from lab.scenarios import service_faults, device_faults  # noqa: F401
+from lab.scenarios import service_faults, device_faults, beside  # noqa: F401
 from lab.scenarios.registry import SCENARIOS, Scenario
 
 __all__ = ["SCENARIOS", "Scenario"]

@@ -17,12 +17,8 @@ bool isDaemon(const Process& process) {
     return process.name == kDaemon || process.program == kDaemon;
 }
 
-std::optional<Process> findDaemon(const ProcessTable& processes, std::optional<pid_t> pid) {
-    auto named = pid ? processes.find(*pid) : std::nullopt;
-    if (named && isDaemon(*named)) return named;
-    // In a full or read-only /tmp there is no pid file.
-    auto others = processes.named(kDaemon);
-    return others.empty() ? std::nullopt : std::optional{std::move(others.front())};
+std::optional<pid_t> pidIn(const std::string& pidFile) {
+    return readPid(readForeignFile(pidFile).text.value_or(""));
 }
 
 std::string upText(const Process& process, const Evidence& evidence) {
@@ -45,9 +41,17 @@ std::string goneText(const std::string& pidFile, std::optional<pid_t> pid, Time 
 
 }  // namespace
 
+std::optional<Process> findDaemon(const ProcessTable& processes, const std::string& pidFile) {
+    const auto pid = pidIn(pidFile);
+    auto named = pid ? processes.find(*pid) : std::nullopt;
+    if (named && isDaemon(*named)) return named;
+    // In a full or read-only /tmp there is no pid file.
+    auto others = processes.named(kDaemon);
+    return others.empty() ? std::nullopt : std::optional{std::move(others.front())};
+}
+
 void lookAtDaemon(const ProcessTable& processes, const std::string& pidFile, Evidence& evidence) {
-    const auto pid = readPid(readForeignFile(pidFile).text.value_or(""));
-    const auto daemon = findDaemon(processes, pid);
+    const auto daemon = findDaemon(processes, pidFile);
     if (daemon) {
         evidence.daemon.pid = daemon->pid;
         evidence.daemon.since = daemon->since;
@@ -59,7 +63,7 @@ void lookAtDaemon(const ProcessTable& processes, const std::string& pidFile, Evi
         evidence.checks.push_back(
             {Check::Verdict::NOT_SEEN, Source::NOW, "daemon's process: needs root"});
     } else {
-        const std::string text = goneText(pidFile, pid, evidence.now);
+        const std::string text = goneText(pidFile, pidIn(pidFile), evidence.now);
         evidence.add(Sign::DAEMON_GONE, Source::NOW, text);
         evidence.checks.push_back({Check::Verdict::PROBLEM, Source::NOW, text});
     }

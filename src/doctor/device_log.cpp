@@ -134,6 +134,11 @@ void readSystemLogs(const std::string& folder,
     }
 }
 
+std::string startsInWords(int starts) {
+    if (starts == 0) return "without a start of the daemon";
+    return std::to_string(starts) + (starts == 1 ? " start" : " starts") + " of the daemon";
+}
+
 void summarise(const LogStory& story, Evidence& evidence) {
     const std::string more = "run the daemon with -l 6";
     if (!story.end()) {
@@ -141,16 +146,14 @@ void summarise(const LogStory& story, Evidence& evidence) {
         evidence.untold.push_back("how it was before: no log of the daemon was found; " + more);
         return;
     }
-    const int starts = story.starts();
-    evidence.checks.push_back(
-        {Check::Verdict::OK, Source::LOG,
-         "log from " + shownTime(*story.begin()) + " to " + shownTime(*story.end()) + ", " +
-             (starts == 1 ? "1 start" : std::to_string(starts) + " starts") + " of the daemon"});
+    evidence.checks.push_back({Check::Verdict::OK, Source::LOG,
+                               "log from " + shownTime(*story.begin()) + " to " +
+                                   shownTime(*story.end()) + ", " + startsInWords(story.starts())});
     if (evidence.hasProgressLines) return;
     evidence.untold.push_back(
-        "when and why it was relayed or went on to another cycle: the log has errors and notices "
-        "only; " +
-        more);
+        "whether a tunnel came up or was kept, and when the next cycle comes: the log has errors "
+        "and notices only; " +
+        more + " to have the rest logged");
 }
 
 }  // namespace

@@ -82,7 +82,11 @@ void tellSince(const Evidence& evidence, Diagnosis& diagnosis) {
     if (last == history.rend() || last->reach != diagnosis.reach) return;
     while (last + 1 != history.rend() && (last + 1)->reach == diagnosis.reach) ++last;
     diagnosis.since = last->since;
-    if (last + 1 != history.rend()) diagnosis.before = *(last + 1);
+    auto before = last + 1;
+    if (before == history.rend()) return;
+    // A sudden end of which only the next start tells has no length.
+    if (before->since == last->since && before + 1 != history.rend()) ++before;
+    diagnosis.before = *before;
 }
 
 void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {

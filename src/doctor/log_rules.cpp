@@ -245,6 +245,7 @@ Rules backEndRules() {
         .sets(Sign::LOGGED_BACK_END_REFUSES, kBackEndRefuses).clears({Sign::LOGGED_BACK_END_SILENT}),
     error("TavikClient::deleteServerMapping - failure response received from localhost")
         .sets(Sign::LOGGED_BACK_END_REFUSES, kBackEndRefuses).clears({Sign::LOGGED_BACK_END_SILENT}),
+    error("Response: %s").happens(LogEvent::BACK_END_SAID),
     info("TavikClient::updateLocalCommStatus - Successful update status.").clears(kBackEnd),
     info("ConnectionManager::createRelayConnection() - deleted port mappings from server.").clears(kBackEnd),
     notice("ConnectionManager::killConnection() - successfully deleted port mappings on central server.").clears(kBackEnd),
@@ -266,7 +267,7 @@ Rules relayRules() {
     error("VPNManager::openVPNConnection() - failed to open VPN Auth file for write!")
         .sets(Sign::LOGGED_TUNNEL_NO_OUTPUT, "the tunnel's credentials could not be written"),
     error("VPNManager::openVPNConnection() - failed to open openVPN stdout file!")
-        .sets(Sign::LOGGED_TUNNEL_NO_OUTPUT, "ten seconds after the start of the tunnel's client there was no output"),
+        .sets(Sign::LOGGED_TUNNEL_NO_OUTPUT, "the tunnel's client had no output ten seconds after its start"),
     error("VPNManager::openVPNConnection() - Failed to establish VPN connection, retries exceeded")
         .sets(Sign::LOGGED_RELAY_DOES_NOT_COME_UP, "the tunnel did not come up in four starts of its client"),
     error("ConnectionManager::createRelayConnection() - failed to create VPN connection.").happens(LogEvent::RELAY_FAILED)

@@ -13,8 +13,10 @@ using namespace std::chrono_literals;
 
 constexpr std::size_t kMostPeriods = 2000;
 constexpr auto kAttemptTime = 6min;  // a relay that does not come up takes nearly as long
+constexpr auto kShortRun = 1min;     // of a daemon that ends without a result
 constexpr std::string_view kStarted = "the daemon started";
 constexpr std::string_view kPassed = "the ports passed their test and were published";
+constexpr std::string_view kNoGateway = "no gateway answers UPnP or NAT-PMP";
 constexpr std::string_view kTunnelUp = "the tunnel came up";
 
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
@@ -142,7 +144,8 @@ void LogStory::setSigns(const LogRule& rule, Time when, const LogValues& values)
 void LogStory::set(Sign sign, Time when, const std::string& text) {
     if (reason == sign && signs.count(sign) != 0) return;  // the first of several tells most
     signs[sign] = {Source::LOG, text, when};
-    if (!reason && sign != Sign::LOGGED_ATTEMPT) reason = sign;
+    const bool explains = sign != Sign::LOGGED_ATTEMPT && sign != Sign::LOGGED_TWO_TUNNELS;
+    if (!reason && explains) reason = sign;
 }
 
 void LogStory::clear(const std::vector<Sign>& cleared) {
@@ -178,13 +181,19 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             break;
         case LogEvent::TEST_UNANSWERED:
             failService(when);
-            set(Sign::LOGGED_TEST_UNANSWERED, when, "no answer to the port test");
+            // Unlike the sign of the service as a whole, this one outlives its other answers.
+            if (signs.count(Sign::LOGGED_SERVICE_SILENT) != 0) {
+                set(Sign::LOGGED_TEST_UNANSWERED, when, "no answer to the port test");
+            }
             break;
         case LogEvent::SERVICE_FAILED:
             failService(when);
             break;
         case LogEvent::PUBLISHED:
             pending = {Reach::DIRECT, when};
+            break;
+        case LogEvent::BACK_END_SAID:
+            takeRefusal(values[0], when);
             break;
         default:
             happenAtGateway(event, when);
@@ -206,6 +215,9 @@ void LogStory::happenAtGateway(LogEvent event, Time when) {
             break;
         case LogEvent::NATPMP_SILENT:
             natpmp = false;
+            if (const auto found = signs.find(Sign::LOGGED_NO_GATEWAY); found != signs.end()) {
+                found->second.text = kNoGateway;
+            }
             break;
         default:
             break;
@@ -248,6 +260,8 @@ void LogStory::happenInLife(LogEvent event, Time when) {
 void LogStory::happenInRelay(LogEvent event, Time when) {
     switch (event) {
         case LogEvent::PUBLISHING_FAILED:
+            reason = Sign::LOGGED_PUBLISHING_FAILED;
+            [[fallthrough]];
         case LogEvent::PORTS_LOST:
             pending.reset();
             if (reach() != Reach::RELAYED) lose(when);
@@ -286,10 +300,14 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
 }
 
 void LogStory::start(Time when) {
+    // A failure to publish would have come before; a client may run without a tunnel yet.
+    const bool hadClient = pending && pending->reach == Reach::RELAYED;
+    if (pending && pending->reach == Reach::DIRECT) becomePending();
     pending.reset();
     if (!ended && lastLine) {
-        orphan = orphan || reach() == Reach::RELAYED;
-        become(Reach::NOT_RUNNING, *lastLine, "the daemon ended suddenly");
+        orphan = orphan || hadClient || reach() == Reach::RELAYED;
+        // Without progress it is silent for days.
+        become(Reach::NOT_RUNNING, progress ? *lastLine : when, "the daemon ended suddenly");
     }
     signs.clear();
     reason.reset();
@@ -306,9 +324,10 @@ void LogStory::switchOff(Time when) {
     if (signalled) {
         become(Reach::NOT_RUNNING, when, "the daemon was told to end by a signal");
     } else {
-        const std::string text = "remote access is off in the settings, or this was a run with -u";
-        set(Sign::LOGGED_REMOTE_ACCESS_OFF, when, text);
-        become(Reach::SWITCHED_OFF, when, text);
+        set(Sign::LOGGED_REMOTE_ACCESS_OFF, when,
+            "the daemon said so as it ended; so does a run with -u");
+        become(Reach::SWITCHED_OFF, when,
+               "remote access is off in the settings, or this was a run with -u");
         orphan = false;
     }
     end(when);
@@ -370,6 +389,18 @@ void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     if (!asked.empty() && asked == seen) clear({Sign::LOGGED_SECOND_NAT});
 }
 
+// An answer that stops in the middle was cut off by time.
+void LogStory::takeRefusal(std::string_view answer, Time when) {
+    if (signs.count(Sign::LOGGED_BACK_END_REFUSES) == 0) return;
+    if (startsWith(answer, "[")) answer.remove_prefix(1);
+    const bool isCut =
+        startsWith(answer, "<") && !contains(answer, "</") && !contains(answer, "/>");
+    if (!isCut) return;
+    clear({Sign::LOGGED_BACK_END_REFUSES});
+    set(Sign::LOGGED_BACK_END_SILENT, when,
+        "an answer of the local back end stopped in the middle");
+}
+
 void LogStory::failTest(Time when) {
     if (!serviceFails() && signs.count(Sign::LOGGED_SERVICE_NONSENSE) == 0 &&
         signs.count(Sign::LOGGED_TEST_UNANSWERED) == 0) {
@@ -428,7 +459,7 @@ void LogStory::explainStart() {
 void LogStory::assumeFrom(std::string_view status) {
     if (status == "portforwarded" || status == "1") assume(Reach::DIRECT);
     if (status == "relayed" || status == "2") assume(Reach::RELAYED);
-    if (status == "failed") assume(Reach::NOT_REACHED);
+    if (status == "failed" || status == "connecting") assume(Reach::NOT_REACHED);
 }
 
 // How it was when the log began.
@@ -455,7 +486,9 @@ void LogStory::become(Reach next, Time when, const std::string& cause) {
         if (period.cause.empty()) period.cause = kTunnelUp;
     }
     if (!history.empty() && isInBetween(next, when)) history.pop_back();
-    history.push_back(std::move(period));
+    const bool goesOn = !history.empty() && history.back().reach == next &&
+                        history.back().address == period.address;
+    if (!goesOn) history.push_back(std::move(period));
     if (history.size() > kMostPeriods) history.pop_front();
     passing = next == Reach::NOT_REACHED;
 }
@@ -467,7 +500,9 @@ bool LogStory::isInBetween(Reach next, Time when) const {
     if (!passing || last.reach != Reach::NOT_REACHED || when - last.since > kAttemptTime) {
         return false;
     }
-    if (next != Reach::DIRECT && next != Reach::RELAYED) return last.cause == kStarted;
+    if (next != Reach::DIRECT && next != Reach::RELAYED) {
+        return last.cause == kStarted && when - last.since <= kShortRun;
+    }
     return history.size() == 1 || history[history.size() - 2].reach != next;
 }
 
@@ -478,7 +513,10 @@ Reach LogStory::reach() const {
 std::string LogStory::reasonText() const {
     if (!reason) return {};
     const auto found = signs.find(*reason);
-    return found == signs.end() ? std::string{} : found->second.text;
+    if (found == signs.end()) return {};
+    // Two addresses alone would be a riddle.
+    const std::string_view before = *reason == Sign::LOGGED_SECOND_NAT ? "a second router: " : "";
+    return std::string{before} + found->second.text;
 }
 
 bool LogStory::serviceFails() const {
@@ -505,6 +543,7 @@ std::string LogStory::filled(std::string_view words, const LogValues& values) co
 
 void LogStory::finish(Evidence& evidence) {
     if (pending && evidence.now - pending->since > kAttemptTime) becomePending();
+    if (passing && evidence.now - history.back().since > kAttemptTime) explainStart();
     evidence.hasLog = firstLine.has_value();
     evidence.hasProgressLines = progress;
     evidence.logBegin = firstLine;

@@ -53,6 +53,7 @@ private:
     void endCycle(Time when, std::string_view seconds);
     void takeStatus(std::string_view word, Time when);
     void takeTestAnswer(std::string_view answer, Time when);
+    void takeRefusal(std::string_view answer, Time when);
     void failTest(Time when);
     void failService(Time when);
     void lose(Time when);

@@ -24,6 +24,7 @@
 #include "doctor/probes.h"
 #include "doctor/settings_report.h"
 #include "doctor/sharing.h"
+#include "doctor/static_file.h"
 #include "doctor/text_report.h"
 
 namespace pelorus::doctor {
@@ -32,19 +33,9 @@ namespace {
 
 constexpr int kNotWritten = 73;
 constexpr int kUnusableSettings = 2;
-constexpr const char* kStaticConfigVariable = "TAVIK_STATIC_CONFIG";
-constexpr const char* kDefaultStaticConfig = "/var/www/rest-api/config/globalconfig.ini";
-constexpr const char* kPackagedStaticConfig = "/etc/pelorus/globalconfig.ini";
 
 bool exists(const std::string& path) {
     return access(path.c_str(), F_OK) == 0;
-}
-
-// The package names its file to the daemon only.
-std::string staticFile() {
-    const char* named = std::getenv(kStaticConfigVariable);
-    std::string path = named != nullptr ? named : kDefaultStaticConfig;
-    return !exists(path) && exists(kPackagedStaticConfig) ? kPackagedStaticConfig : path;
 }
 
 Time now() {
@@ -82,7 +73,7 @@ void probeWithProgress(const ProbeChoice& choice, Evidence& evidence) {
 Evidence look(const DoctorOptions& options) {
     Evidence evidence;
     evidence.now = now();
-    const std::string file = staticFile();
+    const std::string file = findStaticFile();
     evidence.fromElsewhere = !options.logs.empty() && !options.probes && !exists(file);
     if (!evidence.fromElsewhere) {
         DevicePaths paths;
@@ -127,7 +118,7 @@ void addLines(std::string& text, const char* label, const std::string& line, con
 }
 
 int reportSettings(const DoctorOptions& options) {
-    const std::string file = staticFile();
+    const std::string file = findStaticFile();
     DevicePaths paths;
     paths.staticFile = file;
     Evidence evidence;

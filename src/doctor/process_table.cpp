@@ -116,6 +116,10 @@ std::vector<Process> ProcessTable::named(const std::string& name) const {
     return found;
 }
 
+std::optional<std::string> ProcessTable::environment(pid_t pid) const {
+    return readForeignFile(folder + "/" + std::to_string(pid) + "/environ").text;
+}
+
 bool ProcessTable::showsAll() const {
     struct stat status {};
     return geteuid() == 0 || stat((folder + "/1").c_str(), &status) == 0;

@@ -34,6 +34,9 @@ public:
     /// lowest pid first.
     [[nodiscard]] std::vector<Process> named(const std::string& name) const;
 
+    /// Its environment, each variable followed by a zero byte. Nothing when this user may not know.
+    [[nodiscard]] std::optional<std::string> environment(pid_t pid) const;
+
     /// False when this user cannot see the processes of others.
     [[nodiscard]] bool showsAll() const;
 

@@ -192,13 +192,12 @@ std::string TextReport::sentenceWithFacts(const NamedCause& named, std::size_t m
     if (facts.empty()) return sentence;
     std::string text = withoutFullStop(sentence);
     // One colon is enough in a sentence.
-    std::string separator = text.find(": ") == std::string::npos ? ": " : " (";
-    const std::string end = separator == " (" ? ")." : ".";
+    std::string separator = text.find(": ") == std::string::npos ? ": " : "; ";
     for (const std::string& fact : facts) {
         text += separator + fact;
         separator = "; ";
     }
-    return text + end;
+    return text + ".";
 }
 
 Lines TextReport::causes() const {

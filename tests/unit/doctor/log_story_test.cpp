@@ -89,7 +89,7 @@ TEST(LogStory, HistoryAndSigns) {
           {140, kPassed},
           {141, kPublished},
           {142, kStatusDirect}},
-         "16 relayed: " + std::string{kSecondNatFact} + "|142 " + direct,
+         "16 relayed: a second router: " + std::string{kSecondNatFact} + "|142 " + direct,
          {}},
         {"errors and notices only",
          {{0, kStart},
@@ -99,7 +99,7 @@ TEST(LogStory, HistoryAndSigns) {
           {140, kPassed},
           {141, kPublished},
           {400, kPassed}},
-         "6 relayed: " + std::string{kSecondNatFact} + "|141 " + direct,
+         "6 relayed: a second router: " + std::string{kSecondNatFact} + "|141 " + direct,
          {}},
         {"no result yet",
          {{0, kStart}, {5, kNoUpnp}, {6, kTunnelStarts}},
@@ -151,8 +151,73 @@ TEST(LogStory, HistoryAndSigns) {
           {106, kTunnelStarts},
           {116, kTunnelUp}},
          "16 relayed: the tunnel came up|16 not running: the daemon ended suddenly|"
-         "116 relayed: an earlier daemon ended suddenly and left its tunnel running|",
+         "116 relayed: the tunnel came up|",
          {Sign::LOGGED_TWO_TUNNELS}},
+        {"a sudden end soon after the client's start, without progress",
+         {{0, kStart},
+          {6, kTunnelStarts},
+          {100, kStart},
+          {106, kTunnelStarts},
+          {900, kStart},
+          {906, kTunnelStarts},
+          {1500, kSigterm}},
+         "0 not reached: the daemon started|100 not running: the daemon ended suddenly|106 relayed: the tunnel came up|"
+         "900 not running: the daemon ended suddenly|906 relayed: the tunnel came up|",
+         {Sign::LOGGED_TWO_TUNNELS}},
+        {"power cuts soon after publishing, and in every start after that",
+         {{0, kStart},
+          {9, kPublished},
+          {40, kStart},
+          {45, kPassed},
+          {50, kStart},
+          {55, kPassed},
+          {60, kStart},
+          {69, kPublished},
+          {70, kPause}},
+         "9 direct: the ports passed their test and were published|"
+         "40 not running: the daemon ended suddenly|69 " +
+             direct,
+         {}},
+        {"publishing fails, and the relay after it",
+         {{0, kStart},
+          {5, kPassed},
+          {6, "TavikClient::httpGet  Error: [Server returned nothing (no headers, no data)]"},
+          {6,
+           "TavikClient::updateServerMapping - httpGet failed to get response from central server "
+           "for url: [x]."},
+          {6, "ConnectionManager::createDirectConnection() - failed to update mapping info for x"},
+          {7, "TavikClient::deleteServerMapping - httpGet got <status>Success</status>, 24 bytes."},
+          {8, kTunnelStarts},
+          {18, "VPNManager::openVPNConnection() - failed to open openVPN stdout file!"},
+          {18, kRelayFailed},
+          {18, kPause}},
+         "0 not reached: the ports that passed their test could not be published|",
+         {Sign::LOGGED_PUBLISHING_FAILED, Sign::LOGGED_TUNNEL_NO_OUTPUT}},
+        {"no connection to the service is no silence",
+         {{0,
+           "ConnectionManager::createDirectConnection - Current Status in file system: "
+           "[portforwarded]."},
+          {9, "TavikClient::httpGet  Error: [Couldn't connect to server]"},
+          {9, "TavikClient::testPort[1] - httpGet for https://x, no response from central server."},
+          {9, kTestFailed}},
+         "0 direct: |9 not reached: no connection to the service: Couldn't connect to server|",
+         {Sign::LOGGED_SERVICE_UNREACHABLE}},
+        {"the back end's answer is cut off by time",
+         {{0, kStart},
+          {31,
+           "TavikClient::updateLocalCommStatus - failure response received from localhost for url: "
+           "[x]"},
+          {31, "Response: [<result>]."}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_BACK_END_SILENT}},
+        {"the back end refuses",
+         {{0, kStart},
+          {1,
+           "TavikClient::updateLocalCommStatus - failure response received from localhost for url: "
+           "[x]"},
+          {1, "Response: [<result>failure</result>]."}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_BACK_END_REFUSES}},
         {"an orderly end",
          {{0, kStart}, {9, kPublished}, {20, kSigterm}, {20, kOff}},
          "9 direct: the ports passed their test and were published|"
@@ -208,6 +273,7 @@ TEST(LogStory, KeepsTheLast2000Periods) {
     LogStory story;
     for (int cycle = 0; cycle < 3000; ++cycle) {
         story.take({at(cycle * 100), kStart});
+        story.take({at(cycle * 100 + 8), kPublished});
         story.take({at(cycle * 100 + 9), kSigterm});
         story.take({at(cycle * 100 + 9), kOff});
     }

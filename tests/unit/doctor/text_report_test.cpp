@@ -108,7 +108,7 @@ TEST(TextReport, NamesWhatLiesBehindTheCause) {
         diagnosis.causes.push_back({&other, {{Source::SETTINGS, "a fact.", {}}}});
     }
     const std::string text = textReport(diagnosis, {});
-    EXPECT_NE(text.find("Also   Two things: one of them is odd (a fact (settings)).\n"),
+    EXPECT_NE(text.find("Also   Two things: one of them is odd; a fact (settings).\n"),
               std::string::npos)
         << text;
     EXPECT_NE(text.find("And    other, other.\n"), std::string::npos);

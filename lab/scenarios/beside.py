@@ -1,0 +1,83 @@
+"""The doctor at work beside the daemon, which must not notice it."""
+
+from __future__ import annotations
+
+import re
+import threading
+from collections.abc import Iterator
+from contextlib import contextmanager
+from dataclasses import dataclass
+
+from lab import doctor
+from lab.checks import (FAST, NO_TUNNEL, OPTIONS, assert_stops_clean, mapping_changes, start,
+                        wait_for_next_cycle, wait_for_status)
+from lab.scenario import Lab, Situation
+from lab.scenarios.registry import scenario
+
+_CYCLES = 10
+_DIRECT = 0
+# What differs from run to run of the daemon: pids, seconds that have passed, seconds since 1970.
+_CHANGING = re.compile(r"(?<=[PS]ID: \[)\d+|(?<=Elapsed time )\d+|\b1\d{9}\b")
+
+
+@dataclass(frozen=True)
+class _Run:
+    """What the daemon did from its start to its end."""
+
+    lines: list[str]
+    requests: list[str]
+    local_requests: list[str]
+    changes: list[str]
+
+
+@scenario(Situation(static=NO_TUNNEL, clock=FAST))
+def doctor_beside(lab: Lab) -> None:
+    """The doctor runs again and again for ten cycles: the daemon does what it does without it."""
+    start(lab, "portforwarded")  # the first start of all also creates the copy of the settings
+    assert_stops_clean(lab)
+
+    lab.step(f"{_CYCLES} cycles without the doctor")
+    alone = _run(lab)
+    lab.step(f"{_CYCLES} cycles with it, from the first moment")
+    with _examined(lab) as verdicts:
+        watched = _run(lab)
+    assert len(verdicts) >= _CYCLES / 2, verdicts
+    assert verdicts.count(_DIRECT) >= len(verdicts) / 2, verdicts
+    assert watched.lines == alone.lines
+    assert watched == alone
+
+
+def _run(lab: Lab) -> _Run:
+    """Start the daemon, and stop it in the pause after the last cycle."""
+    seen = _seen(lab)
+    lab.start_daemon(*OPTIONS)
+    wait_for_status(lab, "portforwarded")
+    wait_for_next_cycle(lab, _CYCLES)
+    assert_stops_clean(lab)
+    now = _seen(lab)
+    return _Run(*(getattr(now, name)[len(before):] for name, before in vars(seen).items()))
+
+
+def _seen(lab: Lab) -> _Run:
+    """Everything so far."""
+    return _Run([_CHANGING.sub("*", str(message)) for message in lab.device.messages.all],
+                [f"{request.scheme} {request.url}" for request in lab.central.requests],
+                [request.url for request in lab.device.local_requests], mapping_changes(lab))
+
+
+@contextmanager
+def _examined(lab: Lab) -> Iterator[list[int]]:
+    """Run the doctor meanwhile, one time after the other; the value has its exit statuses."""
+    over, statuses = threading.Event(), list[int]()
+
+    def examine() -> None:
+        while not over.is_set():
+            statuses.append(doctor.run(lab.device.messages, "--json").returncode)
+
+    examiner = threading.Thread(target=examine)
+    examiner.start()
+    try:
+        yield statuses
+    finally:
+        over.set()
+        examiner.join()

@@ -1,7 +1,8 @@
 #!/usr/bin/python3
 """Measures with growth.cpp whether a cost of the daemon grows faster than what it depends on.
 
-Writes the table in docs/performance.md and draws docs/growth.svg. Exit status 1 when something grows faster than linearly.
+Writes the table in docs/performance.md and draws docs/growth.svg. Exit status 1 when
+something grows faster than linearly.
 """
 
 from __future__ import annotations
@@ -63,7 +64,8 @@ def main() -> int:
     # The axes are logarithmic, and with all 99 ports bad there is nothing to search.
     found["bad"] = {size: found["bad"][size] for size in found["bad"] if 0 < size < 99}
     panels, worst = [], 0.0
-    rows = ["| CPU time of | depends on | least | most | slope |", "| --- | --- | --- | --- | --- |"]
+    rows = ["| CPU time of | depends on | least | most | slope |",
+            "| --- | --- | --- | --- | --- |"]
     for name, (title, x_name) in _MEASURES.items():
         points = [(size, statistics.median(times)) for size, times in sorted(found[name].items())]
         worst = max(worst, slope(points))

@@ -32,8 +32,8 @@ PAGES = (ROOT / "README.md", ROOT / "CONTRIBUTING.md", ROOT / "bench/README.md",
          *ROOT.glob("docs/*.md"))
 BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
-    r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+|/usr/bin/python3|apt|apt-get|cat"
-    r"|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
+    r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+"
+    r"|/usr/bin/python3|apt|apt-get|cat|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
     r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"

@@ -33,8 +33,8 @@ PAGES = (ROOT / "README.md", ROOT / "CONTRIBUTING.md", ROOT / "bench/README.md",
 BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
     r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+"
-    r"|/usr/bin/python3|apt|apt-get|cat|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep|hdparm|ip|journalctl|kill|ls|mkdir"
-    r"|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
+    r"|/usr/bin/python3|apt|apt-get|cat|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep"
+    r"|hdparm|ip|journalctl|kill|ls|mkdir|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
     r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"
                   r"|ctest --preset dev -[RN].*|build/dev/tests/unit/.*")

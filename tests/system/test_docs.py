@@ -34,8 +34,8 @@ BLOCK = re.compile(r"^```\w*\n(.*?)^```", re.M | re.S)
 COMMAND = re.compile(
     r"((chrt -r 1 |[A-Z]+=\S+ )?(scripts|bench|packaging)/[\w.-]+|build/\w+/tests/unit/\w+"
     r"|/usr/bin/python3|apt|apt-get|cat|cd|chmod|chown|cmake|cp|ctest|curl|dpkg(-\w+)?|git|grep"
-    r"|hdparm|ip|journalctl|kill|ls|mkdir|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill|printf|python3|rm|sed|sudo"
-    r"|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
+    r"|hdparm|ip|journalctl|kill|ls|mkdir|mv|natpmpc|nft|nsenter|openvpn|pelorus|pgrep|pkill"
+    r"|printf|python3|rm|sed|sudo|systemctl|systemd-\w+|tail|touch|upnpc)(?= |$).*")
 HERE = re.compile(r"scripts/demo --(list|zoo)|cmake --(list-presets|install .*)|grep .*"
                   r"|ctest --preset dev -[RN].*|build/dev/tests/unit/.*")
 ON_DEVICE = re.compile(r"cat .*|ls .*|upnpc (?!-a$).*|natpmpc|hdparm .* .*|pgrep .*|touch .*"

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <unordered_map>
 
 namespace pelorus::doctor {
 
@@ -321,6 +322,23 @@ bool begin(std::string_view text, const LogRule& rule) {
     return text.compare(0, rule.beginning, rule.text, 0, rule.beginning) == 0;
 }
 
+// What a line begins with, mostly the name of a function: few rules share it.
+std::string_view subject(std::string_view text) {
+    return text.substr(0, text.find_first_of(" (["));
+}
+
+using RulesBySubject = std::unordered_map<std::string_view, std::vector<const LogRule*>>;
+
+// In the order of the table.
+const RulesBySubject& rulesBySubject() {
+    static const RulesBySubject sorted = [] {
+        RulesBySubject rules;
+        for (const LogRule& rule : logRules()) rules[subject(rule.text)].push_back(&rule);
+        return rules;
+    }();
+    return sorted;
+}
+
 bool fits(std::string_view text, std::string_view pattern, LogValues& values) {
     std::size_t count = 0;
     for (;;) {
@@ -369,12 +387,14 @@ const std::vector<LogRule>& logRules() {
 
 const LogRule* findLogRule(std::string_view text, LogValues& values) {
     values = {};
-    for (const LogRule& rule : logRules()) {
-        if (!begin(text, rule)) continue;
+    const auto rules = rulesBySubject().find(subject(text));
+    if (rules == rulesBySubject().end()) return nullptr;
+    for (const LogRule* const rule : rules->second) {
+        if (!begin(text, *rule)) continue;
         values = {};
-        if (!fits(text, rule.text, values)) continue;
-        const auto& [value, wanted] = rule.condition;
-        if (value == 0 || values[value - 1] == wanted) return &rule;
+        if (!fits(text, rule->text, values)) continue;
+        const auto& [value, wanted] = rule->condition;
+        if (value == 0 || values[value - 1] == wanted) return rule;
     }
     return nullptr;
 }

@@ -62,6 +62,12 @@ TEST(LogRules, EachWordKnowsItsValue) {
     }
 }
 
+TEST(LogRules, NoneHasAValueInTheNameItIsFoundBy) {
+    for (const LogRule& rule : logRules()) {
+        EXPECT_LT(rule.text.find_first_of(" (["), rule.beginning) << rule.text;
+    }
+}
+
 TEST(LogRules, FindsValues) {
     LogValues values;
     const LogRule* rule = findLogRule(

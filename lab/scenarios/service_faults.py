@@ -68,7 +68,7 @@ def _assert_fails_under(lab: Lab, *faults_and_causes: tuple[faults.Begin, str]) 
 
 
 def _last_fault(lab: Lab) -> str:
-    return [event.what for event in lab.timeline.events if event.who == "fault"][-1]
+    return [event.what for event in lab.timeline.events if event.who == "fault"][-1].rstrip(".")
 
 
 def _assert_recovers(lab: Lab) -> None:

@@ -27,7 +27,7 @@ _HEAD = ("| scenario | moment | cause | first fact |", "| --- | --- | --- | --- 
 _FIRST_STOP = "before the daemon is stopped"
 # What differs from one run to the next.
 _VOLATILE = ((r"\d+ (s|min) ago", "N s ago"), (r"\bpid \d+", "pid N"),
-             (r"\d+ (s|min) \(pid", "N s (pid"))
+             (r"\d+ (s|min) \(pid", "N s (pid"), (r"\d{4}-\d\d-\d\d", "DATE"))
 
 
 def main() -> int:

@@ -261,7 +261,7 @@ def _assert_recovers_from(lab: Lab, trouble: faults.Begin, cause: str = "") -> N
         lab.wait_for(met, "the daemon to meet the fault", 60)
         assert len(daemon.running("pelorus")) == 1
         if cause:
-            lab.moment("in the fault", cause)
+            lab.moment("while the fault lasts", cause)
     lab.step("the fault is over")
     wait_for_next_cycle(lab, 2)
     wait_for_status(lab, "portforwarded")

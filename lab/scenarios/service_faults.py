@@ -32,7 +32,7 @@ def service_stalls_or_floods(lab: Lab) -> None:
     """The service keeps silent, drips or floods: each request ends in time and in its bounds."""
     _assert_fails_under(lab, (faults.service_stalls, "service-unreachable"),
                         (faults.service_drips, "service-answers-nonsense"),
-                        (faults.service_floods, "service-silent"))
+                        (faults.service_floods, "service-answers-nonsense"))
     _assert_recovers(lab)
 
 
@@ -68,7 +68,7 @@ def _assert_fails_under(lab: Lab, *faults_and_causes: tuple[faults.Begin, str]) 
 
 
 def _last_fault(lab: Lab) -> str:
-    return [event.what for event in lab.timeline.events if event.who == "fault"][-1]
+    return [event.what for event in lab.timeline.events if event.who == "fault"][-1].rstrip(".")
 
 
 def _assert_recovers(lab: Lab) -> None:

@@ -75,7 +75,7 @@ std::vector<Cause> serviceCauses() {
         {"service-certificate",
          kRunning,
          {{S::SERVICE_CERTIFICATE_BAD}, {S::LOGGED_SERVICE_CERTIFICATE}},
-         {S::SERVICE_REACHED, S::SERVICE_UNRESOLVED},
+         {S::SERVICE_REACHED, S::SERVICE_UNRESOLVED, S::CLOCK_WRONG},
          "The central service cannot prove that it is the right one, so the device tells it nothing.",
          "If other devices are all right, look for a proxy or filter that intercepts TLS, and for "
          "outdated certificate authorities on this device. Otherwise the maker has to act."},
@@ -232,7 +232,7 @@ std::vector<Cause> relayCauses() {
         {"relay-does-not-come-up",
          kNotReached,
          {{S::LOGGED_RELAY_DOES_NOT_COME_UP}, {S::TUNNEL_UNANSWERED}},
-         {S::TUNNEL_SAYS_UP},
+         {S::TUNNEL_SAYS_UP, S::TUNNEL_REFUSED, S::TUNNEL_FILES_UNWRITABLE},
          "The relay does not answer, so no tunnel comes up.",
          "Check that the provider lets the relay's port through; otherwise the relay is down."},
     };
@@ -252,7 +252,7 @@ std::vector<Cause> gatewayCauses() {
           {S::LOGGED_SECOND_NAT},
           {S::GATEWAY_ADDRESS_PRIVATE},
           {S::SERVICE_SEES_OTHER_ADDRESS}},
-         {},
+         {S::LOGGED_MANUAL_RULED_OUT},
          "A second router stands in front of your gateway, and no port opened on the gateway can be "
          "reached.",
          "Put the provider's box into bridge mode, or ask the provider for a public IPv4 address. "
@@ -260,7 +260,7 @@ std::vector<Cause> gatewayCauses() {
         {"no-gateway-protocol",
          kNotDirect,
          {{S::NO_GATEWAY_ANSWERS}, {S::LOGGED_NO_GATEWAY}},
-         {S::GATEWAY_FOUND},
+         {S::GATEWAY_FOUND, S::OWN_ROUTER, S::NO_INTERFACE_UP, S::NO_ADDRESS},
          "The gateway lets no device open ports: it answers neither UPnP nor NAT-PMP.",
          "Switch UPnP on in the gateway's settings, or forward two ports by hand."},
         {"disk-asleep",
@@ -291,7 +291,7 @@ std::vector<Cause> outsideCauses() {
         {"port-filtered",
          kNotDirect,
          {{S::LOGGED_TEST_FAILED}, {S::PORT_TEST_FAILS}},
-         {},
+         {S::MANUAL_MODE, S::NO_GATEWAY_ANSWERS},
          "The gateway opens the ports, but nothing from the internet comes through them.",
          "A filter in the gateway or at the provider is in the way: look there for a firewall, or "
          "ask the provider."},

@@ -137,7 +137,7 @@ TEST(LogStory, HistoryAndSigns) {
            "TavikClient::testPort[1] - httpGet for https://x, no response from central server."},
           {250, kTestFailed}},
          "9 " + direct + "250 not reached: the service's name does not resolve|",
-         {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::LOGGED_TEST_UNANSWERED}},
+         {Sign::LOGGED_SERVICE_UNRESOLVED}},
         {"a tunnel that died",
          {{0, kStart}, {6, kTunnelStarts}, {16, kTunnelUp}, {16, kPause}, {140, kStaleTunnel}},
          "16 relayed: the tunnel came up|140 not reached: the tunnel's client was found dead|",

@@ -118,7 +118,7 @@ void readChosen(const LogChoice& choice, LineOrder& order, Evidence& evidence) {
 
 // Each of the system's logs may hold the same lines: the first that has any is enough.
 void readSystemLogs(const std::string& folder,
-                    LogStory& story,
+                    const LogStory& story,
                     LineOrder& order,
                     Evidence& evidence) {
     for (const char* const name : kSystemLogs) {

@@ -131,7 +131,7 @@ std::optional<Time> classicTime(const std::tm& parts, Time now) {
         return known.begin + within;
     }
     const auto when = latestNotInFuture(parts, now);
-    if (when && *when + 1h <= now + kFuture) {
+    if (when && *when + std::chrono::hours{1} <= now + kFuture) {
         known = {parts.tm_mon, parts.tm_mday, parts.tm_hour, now, *when - within};
     }
     return when;

@@ -134,8 +134,8 @@ bool LogStream::read(const LineFilter::Taker& taker) {
     int code = Z_OK;
     const char* const message = gzerror(file.get(), &code);
     if (length == 0 && (code == Z_OK || code == Z_STREAM_END)) return true;
-    problem = code == Z_BUF_ERROR ? "its end is missing"
-              : code == Z_ERRNO   ? "it cannot be read"
+    problem = code == Z_BUF_ERROR ? std::string{"its end is missing"}
+              : code == Z_ERRNO   ? std::string{"it cannot be read"}
                                   : std::string{"it is damaged: "} + message;
     return false;
 }

@@ -71,11 +71,12 @@ bool contains(std::string_view text, std::string_view part) {
 
 std::string_view tagged(std::string_view answer, std::string_view tag) {
     const std::string opening = "<" + std::string{tag} + ">";
+    const std::string closing = "</" + std::string{tag} + ">";
     const std::size_t begin = answer.find(opening);
     if (begin == std::string_view::npos) return {};
-    answer.remove_prefix(begin + opening.size());
-    const std::size_t end = answer.find("</" + std::string{tag} + ">");
-    return end == std::string_view::npos ? std::string_view{} : answer.substr(0, end);
+    const std::string_view rest = answer.substr(begin + opening.size());
+    const std::size_t end = rest.find(closing);
+    return end == std::string_view::npos ? std::string_view{} : rest.substr(0, end);
 }
 
 // The number after "port=" in a URL; how the URL is built is a setting.

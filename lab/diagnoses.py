@@ -26,7 +26,7 @@ BEGIN, END = "<!-- diagnoses -->", "<!-- end -->"
 _HEAD = ("| scenario | moment | cause | first fact |", "| --- | --- | --- | --- |")
 _FIRST_STOP = "before the daemon is stopped"
 # What differs from one run to the next.
-_VOLATILE = ((r"\d+ (s|min) ago", "N s ago"), (r"\bpid \d+", "pid N"),
+_VOLATILE = ((r"\d+ (s|min) ago", "N s ago"), (r"\b(pid|names) \d+", r"\1 N"),
              (r"\d+ (s|min) \(pid", "N s (pid"), (r"\d{4}-\d\d-\d\d", "DATE"))
 
 
@@ -60,9 +60,9 @@ def main() -> int:
 
 
 def table(found: dict[str, list[Moment]]) -> list[str]:
-    """The lines of the table, a row for each moment."""
-    return [*_HEAD, *(_row(name, *astuple(moment))
-                      for name, moments in found.items() for moment in moments)]
+    """The lines of the table, a row for each moment that differs from the others."""
+    return [*_HEAD, *dict.fromkeys(_row(name, *astuple(moment))
+                                   for name, moments in found.items() for moment in moments)]
 
 
 def _row(name: str, what: str, cause: str, fact: str) -> str:

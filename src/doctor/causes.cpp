@@ -86,6 +86,11 @@ std::vector<Cause> serviceCauses() {
          "The central service cannot be reached.",
          "Check whether other devices get into the internet. If they do, the service is down or "
          "filtered: wait, the daemon tries again in every cycle."},
+    };
+}
+
+std::vector<Cause> answerCauses() {
+    return {
         {"service-asks-to-wait",
          kNotReached,
          {{S::LOGGED_SERVICE_WAIT}},
@@ -315,8 +320,8 @@ std::vector<Cause> outsideCauses() {
 // keeps the relay away, then the direct way.
 std::vector<Cause> table() {
     std::vector<Cause> rows;
-    for (const auto& group : {workingCauses, serviceCauses, publishingCauses, deviceCauses,
-                              relayCauses, gatewayCauses, outsideCauses}) {
+    for (const auto& group : {workingCauses, serviceCauses, answerCauses, publishingCauses,
+                              deviceCauses, relayCauses, gatewayCauses, outsideCauses}) {
         for (Cause& cause : group()) rows.push_back(std::move(cause));
     }
     return rows;

@@ -153,7 +153,7 @@ Rules gatewayRules() {
     info("ConnectionManager::forwardPort - forwarding internal port: %d ").clears(kRefusals),
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
-        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the gateway maps the port that internal port {1} needs to {2}"),
+        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d")
         .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (UPnP error {3})"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d")

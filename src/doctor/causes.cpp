@@ -232,7 +232,7 @@ std::vector<Cause> relayCauses() {
          {Reach::RELAYED},
          {{S::SECOND_TUNNEL_CLIENT}, {S::LOGGED_TWO_TUNNELS}},
          {},
-         "Two tunnel clients run and disconnect each other.",
+         "Two tunnel clients run, and may disconnect each other.",
          "Stop the older one with kill -9, or restart the device."},
         {"relay-does-not-come-up",
          kNotReached,

@@ -1,5 +1,6 @@
 #include "doctor/device_log.h"
 
+#include <algorithm>
 #include <array>
 #include <ctime>
 #include <functional>
@@ -25,7 +26,8 @@ public:
 
     void beginFile() {
         repeating = story.end().has_value();
-        newest = story.end().value_or(Time{});
+        // A clock that once ran ahead must not hide what came later.
+        newest = std::min(story.end().value_or(Time{}), now);
     }
 
     void take(std::string_view text) {

@@ -61,7 +61,8 @@ Reach reachOf(const Evidence& evidence) {
                                                     evidence.has(Sign::LOGGED_START_FAILED)
                                               : evidence.has(Sign::DAEMON_GONE);
     if (ended) return isOff ? Reach::SWITCHED_OFF : Reach::NOT_RUNNING;
-    if (evidence.has(Sign::NO_INTERFACE_UP) || evidence.has(Sign::NO_ADDRESS)) {
+    if (evidence.has(Sign::NO_INTERFACE_UP) || evidence.has(Sign::NO_ADDRESS) ||
+        evidence.has(Sign::NO_DEFAULT_ROUTE)) {
         return Reach::NOT_REACHED;
     }
     if (evidence.has(Sign::CREDENTIALS_MISSING)) return Reach::NOT_REACHED;
@@ -69,9 +70,9 @@ Reach reachOf(const Evidence& evidence) {
     if (said == Reach::RELAYED && evidence.has(Sign::TUNNEL_GONE)) return Reach::NOT_REACHED;
     if (said == Reach::UNKNOWN) {
         if (evidence.has(Sign::TUNNEL_RUNS)) return Reach::RELAYED;
-        if (evidence.has(Sign::LOGGED_ATTEMPT) || evidence.has(Sign::DAEMON_RUNS)) {
-            return Reach::NOT_REACHED;
-        }
+        // Without the settings, that the daemon runs says nothing.
+        const bool isKnown = evidence.has(Sign::DAEMON_RUNS) && !evidence.settings.empty();
+        if (evidence.has(Sign::LOGGED_ATTEMPT) || isKnown) return Reach::NOT_REACHED;
     }
     return said;
 }

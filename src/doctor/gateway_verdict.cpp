@@ -47,7 +47,7 @@ struct ClassWords {
 constexpr std::array<ClassWords, 5> kClasses{{
     {AddressClass::NONE, Sign::GATEWAY_WITHOUT_ADDRESS, " is none"},
     {AddressClass::HOME, Sign::GATEWAY_ADDRESS_PRIVATE, " is private"},
-    {AddressClass::RESERVED, Sign::GATEWAY_ADDRESS_PRIVATE, " is not an internet address"},
+    {AddressClass::RESERVED, Sign::GATEWAY_WITHOUT_ADDRESS, " is not an internet address"},
     {AddressClass::SHARED, Sign::GATEWAY_ADDRESS_SHARED, " is shared address space"},
     {AddressClass::PUBLIC, Sign::GATEWAY_ADDRESS_PUBLIC, " is public"},
 }};

@@ -397,8 +397,7 @@ void LogStory::takeRefusal(std::string_view answer, Time when) {
     const bool isCut =
         startsWith(answer, "<") && !contains(answer, "</") && !contains(answer, "/>");
     if (!isCut) return;
-    clear({Sign::LOGGED_BACK_END_REFUSES});
-    set(Sign::LOGGED_BACK_END_SILENT, when,
+    set(Sign::LOGGED_BACK_END_REFUSES, when,
         "an answer of the local back end stopped in the middle");
 }
 
@@ -549,8 +548,8 @@ void LogStory::finish(Evidence& evidence) {
     evidence.hasProgressLines = progress;
     evidence.logBegin = firstLine;
     evidence.logEnd = lastLine;
-    evidence.daemon.since = since;
-    evidence.daemon.nextCycle = nextCycle;
+    if (!evidence.daemon.since) evidence.daemon.since = since;
+    if (!evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
     for (const auto& [sign, fact] : signs) evidence.signs[sign] = fact;
     evidence.history.assign(history.begin(), history.end());
 }

@@ -209,7 +209,7 @@ TEST(LogStory, HistoryAndSigns) {
            "[x]"},
           {31, "Response: [<result>]."}},
          "0 not reached: the daemon started|",
-         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_BACK_END_SILENT}},
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_BACK_END_REFUSES}},
         {"the back end refuses",
          {{0, kStart},
           {1,

@@ -515,8 +515,8 @@ std::string LogStory::reasonText() const {
     const auto found = signs.find(*reason);
     if (found == signs.end()) return {};
     // Two addresses alone would be a riddle.
-    const std::string_view before = *reason == Sign::LOGGED_SECOND_NAT ? "a second router: " : "";
-    return std::string{before} + found->second.text;
+    if (*reason == Sign::LOGGED_SECOND_NAT) return "a second router: " + found->second.text;
+    return found->second.text;
 }
 
 bool LogStory::serviceFails() const {

@@ -116,6 +116,7 @@ void lookAtMinutes(const std::string& path, Evidence& evidence) {
     const int minutes =
         leadingInt(file.text.value_or("").substr(0, file.text.value_or("").find('\n')));
     if (file.text && minutes <= kMostIdleMinutes) {
+        evidence.add(Sign::DISK_IN_USE, Source::NOW, "disk in use");
         check(evidence, Verdict::OK, Source::NOW, "disk in use");
         return;
     }
@@ -132,15 +133,14 @@ void lookAtMinutes(const std::string& path, Evidence& evidence) {
 void lookAtFiles(const DevicePaths& paths, Evidence& evidence) {
     const DeviceSettings settings = readDeviceSettings(paths.staticFile);
     evidence.settings = settings.merged.values;
+    evidence.unreadSettings = settings.needsRoot ? "the settings need root" : settings.reason;
     evidence.statusWord = shownText(evidence.setting("COMMUNICATION_STATUS"), 20);
     const ProcessTable processes{paths.processes};
     lookAtDaemon(processes, paths.pidFile, evidence);
     lookAtFilesThemselves(settings, evidence);
-    const bool isWhole = settings.obstacle == DeviceSettings::Obstacle::NONE && !settings.needsRoot;
-    if (isWhole) {
-        lookAtSettings(evidence);
-        lookAtTunnel(processes, evidence);
-    }
+    if (!evidence.hasSettings()) return;
+    lookAtSettings(evidence);
+    lookAtTunnel(processes, evidence);
     lookAtMinutes(paths.minutesFile, evidence);
 }
 

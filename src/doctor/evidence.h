@@ -73,7 +73,8 @@ struct Evidence {
     bool hasProgressLines = false;                ///< the log includes severity 6
     std::optional<Time> logBegin{}, logEnd{};     ///< first and last line of the daemon
     std::map<std::string, std::string> settings;  ///< as the daemon merges them; has secrets
-    std::string statusWord{};                     ///< COMMUNICATION_STATUS of the settings
+    std::string unreadSettings{};  ///< why a file was not read: "the settings need root"
+    std::string statusWord{};      ///< COMMUNICATION_STATUS of the settings
     DaemonState daemon{};
     std::map<Sign, Fact> signs;
     std::vector<Check> checks;
@@ -86,8 +87,12 @@ struct Evidence {
         signs[sign] = {source, std::move(text), when};
     }
 
-    /// The value of @p key, empty when it is absent.
+    /// True when both files were read. Otherwise any value may be missing or overridden.
+    [[nodiscard]] bool hasSettings() const { return unreadSettings.empty(); }
+
+    /// The value of @p key, empty when it is absent or not known for certain.
     [[nodiscard]] std::string setting(const std::string& key) const {
+        if (!hasSettings()) return {};
         const auto found = settings.find(key);
         return found == settings.end() ? std::string{} : found->second;
     }

@@ -27,7 +27,10 @@ void lookAtRelayNeeds(const Evidence& evidence, Findings& findings) {
         relayClientOf(evidence.setting("STARTCMD"), evidence.setting("OPENVPN_CONFIG_PATH"));
     const bool hasClient = !findProgram(client).empty();
     const bool hasDevice = hasTunnelDevice();
-    if (!hasClient) {
+    if (!hasClient && !evidence.hasSettings()) {
+        findings.notSeen("relay client: no program openvpn; of another name: " +
+                         evidence.unreadSettings);
+    } else if (!hasClient) {
         const std::string text = "there is no program " + plainText(client, 80);
         findings.add(Sign::RELAY_CLIENT_MISSING, text);
         findings.problem("relay client: " + text);

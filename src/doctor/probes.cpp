@@ -1,5 +1,6 @@
 #include "doctor/probes.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "common/text.h"
@@ -23,6 +24,7 @@ constexpr int kMakersRouter = 5;
 struct Subject {
     const char* name;
     Probe probe;
+    bool needsSettings = false;
     Findings found{};
 };
 
@@ -32,21 +34,35 @@ std::vector<Subject> subjectsFor(const ProbeChoice& choice, const Evidence& evid
         return [&evidence, look](Findings& findings) { look(evidence, findings); };
     };
     std::vector<Subject> subjects{{"network", lookAtNetwork},
-                                  {"web server", with(lookAtWebServer)},
-                                  {"local back end", with(lookAtBackEnd)},
+                                  {"web server", with(lookAtWebServer), true},
+                                  {"local back end", with(lookAtBackEnd), true},
                                   {"disk", lookAtDisk},
-                                  {"central service", with(lookAtService)}};
+                                  {"central service", with(lookAtService), true}};
     if (leadingInt(evidence.setting("DEVICETYPE")) != kMakersRouter) {
         subjects.push_back({"UPnP", with(askThroughUpnp)});
         subjects.push_back({"NAT-PMP", askThroughNatpmp});
     }
     if (choice.askService) {
-        subjects.push_back({"public address", with(askForAddress)});
-        subjects.push_back({"port test", with(askForPortTest)});
+        subjects.push_back({"public address", with(askForAddress), true});
+        subjects.push_back({"port test", with(askForPortTest), true});
     }
-    subjects.push_back({"public names", with(lookAtNames)});
+    subjects.push_back({"public names", with(lookAtNames), true});
     subjects.push_back({"relay client", with(lookAtRelayNeeds)});
     return subjects;
+}
+
+// Without the settings only what needs none is looked at.
+void leaveOut(std::vector<Subject>& subjects, Evidence& evidence) {
+    if (evidence.hasSettings()) return;
+    const auto rest = std::stable_partition(subjects.begin(), subjects.end(),
+                                            [](const Subject& one) { return !one.needsSettings; });
+    std::string names;
+    for (auto one = rest; one != subjects.end(); ++one) {
+        names += (names.empty() ? "" : ", ") + std::string{one->name};
+    }
+    evidence.checks.push_back(
+        {Check::Verdict::NOT_SEEN, Source::SETTINGS, names + ": " + evidence.unreadSettings});
+    subjects.erase(rest, subjects.end());
 }
 
 void run(std::vector<Subject>& subjects) {
@@ -98,6 +114,7 @@ private:
 
 void probe(const ProbeChoice& choice, Evidence& evidence) {
     std::vector<Subject> subjects = subjectsFor(choice, evidence);
+    leaveOut(subjects, evidence);
     run(subjects);
     const Conclusions conclusions{subjects};
     for (const Subject& subject : subjects) {

@@ -13,7 +13,8 @@ struct ProbeChoice {
 };
 
 /// Looks at the device and its surroundings, all at once, for at most 10 seconds, and adds what was
-/// seen to @p evidence, of which it reads only the settings and the status. It changes nothing
+/// seen to @p evidence, of which it reads only the settings, the status and whether the disk
+/// is in use. It changes nothing
 /// anywhere, and does not wake the disk. Call it while this process has one thread.
 void probe(const ProbeChoice& choice, Evidence& evidence);
 

@@ -27,10 +27,12 @@ enum class Sign {
     TUNNEL_UNANSWERED,     ///< the client's output says that the relay does not answer
     TUNNEL_FILES_UNWRITABLE,
     DISK_UNUSED,  ///< for longer than the daemon lets a port test wake it
+    DISK_IN_USE,  ///< by the minutes file
 
     // From probes.
     NO_INTERFACE_UP,
-    NO_ADDRESS,
+    NO_ADDRESS,   ///< no usable one of IPv4
+    HAS_ADDRESS,  ///< a usable one of IPv4, in a LAN
     NO_DEFAULT_ROUTE,
     GATEWAY_FOUND,  ///< through UPnP or NAT-PMP
     NO_GATEWAY_ANSWERS,
@@ -38,7 +40,7 @@ enum class Sign {
     GATEWAY_ADDRESS_PRIVATE,
     GATEWAY_ADDRESS_SHARED,
     GATEWAY_ADDRESS_PUBLIC,
-    OUR_MAPPINGS_MISSING,  ///< the table was read to its end, and the published ports are not ours
+    OUR_MAPPINGS_MISSING,  ///< the gateway, asked for a published port, does not map it to us
     PORT_HELD_BY_OTHER,
     WEB_SERVER_SILENT,
     BACK_END_ANSWERS,
@@ -55,6 +57,7 @@ enum class Sign {
     TUNNEL_DEVICE_MISSING,
     SERVICE_SEES_OTHER_ADDRESS,
     PORT_TEST_PASSES,
+    OTHER_DEVICE_ANSWERS,  ///< to the port test
     PORT_TEST_FAILS,
 
     // From the log: the last time that the daemon dealt with the matter it was so.

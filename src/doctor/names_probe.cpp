@@ -1,38 +1,21 @@
 #include "doctor/names_probe.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 
+#include "common/files.h"
 #include "doctor/address_class.h"
 #include "doctor/resolver.h"
+#include "doctor/tunnel_look.h"
 #include "doctor/url_host.h"
 
 namespace pelorus::doctor {
 
 namespace {
 
-constexpr std::size_t kMostOutput = 256UL * 1024;
 constexpr std::string_view kPeerText = "Peer Connection Initiated with [AF_INET]";
-
-// The end of a regular file, empty if it cannot be read.
-std::string tailOf(const std::string& path) {
-    const int file = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC | O_NOCTTY);
-    if (file < 0) return {};
-    struct stat status {};
-    std::string text;
-    if (fstat(file, &status) == 0 && S_ISREG(status.st_mode)) {
-        text.resize(kMostOutput);
-        const off_t start = std::max<off_t>(0, status.st_size - static_cast<off_t>(kMostOutput));
-        const ssize_t size = pread(file, text.data(), text.size(), start);
-        text.resize(size > 0 ? static_cast<std::size_t>(size) : 0);
-    }
-    static_cast<void>(close(file));
-    return text;
-}
 
 std::vector<std::string> namesOf(const Evidence& evidence) {
     const std::string id = evidence.setting("DEVICEID");
@@ -46,9 +29,11 @@ std::vector<std::string> namesOf(const Evidence& evidence) {
     return names;
 }
 
-std::string statusOf(const Evidence& evidence) {
-    return evidence.statusWord.empty() ? evidence.setting("COMMUNICATION_STATUS")
-                                       : evidence.statusWord;
+// Where the names should lead; empty when nothing tells it.
+std::string expectedAddress(const Evidence& evidence, bool relayed) {
+    if (!relayed) return evidence.setting("EXTERNAL_IP");
+    const std::string output = tunnelFile(evidence, "STARTCMD_OUTFILE");
+    return relayInOutput(readForeignFile(output, Part::TAIL).text.value_or(""));
 }
 
 void unresolved(Findings& findings, const std::string& text) {
@@ -79,22 +64,25 @@ void judgeNames(const std::vector<std::string>& addresses,
     const std::string& wanted = expected.empty() ? addresses.front() : expected;
     const auto wrong = std::find_if(addresses.begin(), addresses.end(),
                                     [&](const std::string& address) { return address != wanted; });
-    if (wrong != addresses.end()) {
+    if (expected.empty() && wrong != addresses.end()) {
+        unresolved(findings, "the public names lead to " + wanted + " and " + *wrong);
+    } else if (expected.empty()) {
+        findings.notSeen("public names: they lead to " + wanted +
+                         ", but nothing tells where they should lead");
+    } else if (wrong != addresses.end()) {
         const std::string text = "the public names lead to " + *wrong + " instead of " + wanted;
         findings.add(Sign::NAMES_LEAD_ELSEWHERE, text);
         findings.problem(text);
-        return;
+    } else {
+        const std::string text = "public names lead to " + std::string{relayed ? "the relay " : ""};
+        findings.add(Sign::NAMES_RIGHT, "the " + text + wanted);
+        findings.ok(text + wanted);
     }
-    const std::string where = relayed && !expected.empty() ? "the relay " : "";
-    const std::string text = "public names lead to " + where + wanted;
-    findings.add(Sign::NAMES_RIGHT, "the " + text);
-    findings.ok(text);
 }
 
 void lookAtNames(const Evidence& evidence, Findings& findings) {
-    const std::string status = statusOf(evidence);
-    const bool relayed = status == "relayed";
-    if (!relayed && status != "portforwarded") return;
+    const bool relayed = evidence.statusWord == "relayed";
+    if (!relayed && evidence.statusWord != "portforwarded") return;
     const std::vector<std::string> names = namesOf(evidence);
     if (names.empty()) return;
     hurryResolver();
@@ -107,10 +95,7 @@ void lookAtNames(const Evidence& evidence, Findings& findings) {
         }
         addresses.push_back(found.addresses.empty() ? "" : found.addresses.front());
     }
-    const std::string expected = relayed
-                                     ? relayInOutput(tailOf(evidence.setting("STARTCMD_OUTFILE")))
-                                     : evidence.setting("EXTERNAL_IP");
-    judgeNames(addresses, plainText(expected, 40), relayed, findings);
+    judgeNames(addresses, plainText(expectedAddress(evidence, relayed), 40), relayed, findings);
 }
 
 }  // namespace pelorus::doctor

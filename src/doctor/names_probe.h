@@ -17,7 +17,7 @@ void lookAtNames(const Evidence& evidence, Findings& findings);
 [[nodiscard]] std::string relayInOutput(std::string_view output);
 
 /// Concludes from the address of each name, empty for a name without one. @p expected is empty when
-/// it is not known; the names then only have to agree.
+/// it is not known; that the names agree is then no sign that they are right.
 void judgeNames(const std::vector<std::string>& addresses,
                 const std::string& expected,
                 bool relayed,

@@ -54,6 +54,16 @@ bool mayNotRead(const ForeignText& file) {
     return !file.text && (file.error == EACCES || file.error == EPERM) && geteuid() != 0;
 }
 
+std::string pathIn(const std::string& folder, const std::string& value) {
+    if (value.empty() || value.front() == '/') return value;
+    return (folder.empty() || folder.back() != '/' ? folder + "/" : folder) + value;
+}
+
+// The daemon runs in / and looks for the client there.
+std::string pidFileOf(const Evidence& evidence) {
+    return pathIn("/", evidence.setting("OPENVPN_PID_FILE"));
+}
+
 class TunnelLook {
 public:
     TunnelLook(const ProcessTable& table, Evidence& found) : processes{table}, evidence{found} {}
@@ -69,16 +79,6 @@ public:
     }
 
 private:
-    // As the daemon sees it, which runs in / and starts the client in its own folder.
-    [[nodiscard]] std::string path(const std::string& key, const std::string& folder) const {
-        std::string value = evidence.setting(key);
-        if (value.empty() || value.front() == '/') return value;
-        return (folder.empty() || folder.back() != '/' ? folder + "/" : folder) + value;
-    }
-    [[nodiscard]] std::string path(const std::string& key) const {
-        return path(key, path("OPENVPN_CONFIG_PATH", "/"));
-    }
-
     void check(Verdict verdict, std::string text, Source source = Source::NOW) {
         evidence.checks.push_back({verdict, source, std::move(text)});
     }
@@ -88,7 +88,7 @@ private:
     }
 
     void lookAtClient() {
-        const std::string pidFile = path("OPENVPN_PID_FILE", "/");
+        const std::string pidFile = pidFileOf(evidence);
         if (pidFile.empty()) {
             check(Verdict::NOT_SEEN, "tunnel client: OPENVPN_PID_FILE is not set");
             return;
@@ -156,7 +156,7 @@ private:
     }
 
     void lookAtOutput() {
-        const std::string output = path("STARTCMD_OUTFILE");
+        const std::string output = tunnelFile(evidence, "STARTCMD_OUTFILE");
         if (output.empty()) return;
         const ForeignText file = readForeignFile(output, Part::TAIL);
         if (mayNotRead(file)) check(Verdict::NOT_SEEN, "tunnel client's output: needs root");
@@ -191,9 +191,9 @@ private:
 
     void lookAtFolders() {
         std::set<std::string> reasons;  // the files are usually in one folder
-        for (const char* key : {"OPENVPN_AUTH_FILE", "STARTCMD_OUTFILE", "OPENVPN_PID_FILE"}) {
-            const std::string file =
-                key == std::string{"OPENVPN_PID_FILE"} ? path(key, "/") : path(key);
+        for (const std::string& file :
+             {tunnelFile(evidence, "OPENVPN_AUTH_FILE"), tunnelFile(evidence, "STARTCMD_OUTFILE"),
+              pidFileOf(evidence)}) {
             const std::string reason = file.empty() ? "" : writeObstacle(file);
             if (!reason.empty()) reasons.insert(reason);
         }
@@ -206,7 +206,7 @@ private:
 
     // A full disk leaves an empty file.
     [[nodiscard]] std::string credentialsTrouble() const {
-        const std::string file = path("OPENVPN_AUTH_FILE");
+        const std::string file = tunnelFile(evidence, "OPENVPN_AUTH_FILE");
         struct stat status {};
         if (file.empty() || !isMissed()) return {};
         const int error = stat(file.c_str(), &status) == 0 ? 0 : errno;
@@ -222,6 +222,10 @@ private:
 };
 
 }  // namespace
+
+std::string tunnelFile(const Evidence& evidence, const std::string& key) {
+    return pathIn(pathIn("/", evidence.setting("OPENVPN_CONFIG_PATH")), evidence.setting(key));
+}
 
 TunnelOutput readTunnelOutput(const std::string& output, const std::string& successText) {
     TunnelOutput said;

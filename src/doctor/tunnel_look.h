@@ -20,6 +20,10 @@ struct TunnelOutput {
 [[nodiscard]] TunnelOutput readTunnelOutput(const std::string& output,
                                             const std::string& successText);
 
+/// The file that the setting @p key names. A relative one is in the folder in which the daemon
+/// starts the client, as the client writes it there. Empty when the setting is.
+[[nodiscard]] std::string tunnelFile(const Evidence& evidence, const std::string& key);
+
 /// Adds signs and checks. The settings and the status word must be there already.
 void lookAtTunnel(const ProcessTable& processes, Evidence& evidence);
 

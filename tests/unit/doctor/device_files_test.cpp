@@ -101,7 +101,8 @@ protected:
 TEST_F(DeviceFilesTest, AHealthyDeviceHasNoProblem) {
     const Evidence evidence = look({}, {{"COMMUNICATION_STATUS", "portforwarded"}});
     EXPECT_EQ(problems(evidence), "");
-    EXPECT_EQ(evidence.signs.size(), 1U) << shown(evidence);
+    EXPECT_EQ(evidence.signs.size(), 2U) << shown(evidence);
+    EXPECT_TRUE(evidence.has(Sign::DISK_IN_USE));
     EXPECT_EQ(evidence.signs.at(Sign::DAEMON_RUNS).text,
               "daemon up 3 h 20 min (pid 812, -l 6 -f 120)");
     EXPECT_EQ(evidence.statusWord, "portforwarded");
@@ -147,12 +148,15 @@ TEST_F(DeviceFilesTest, TheCopyCountsAndIsNotMade) {
     EXPECT_FALSE(lookAtAll().has(Sign::DYNAMIC_FILE_UNREADABLE));
     fs::remove(path("copy.ini"));
     EXPECT_TRUE(lookAtAll().has(Sign::DYNAMIC_FILE_UNREADABLE));
+    EXPECT_EQ(lookAtAll().setting("STARTCMD"), "") << "the other file may change it";
     mkfifo(path("dynamicconfig.ini").c_str(), 0600);
     EXPECT_TRUE(lookAtAll().has(Sign::DYNAMIC_FILE_UNREADABLE));
     fs::remove(path("static.ini"));
     const Evidence evidence = lookAtAll();
     EXPECT_TRUE(evidence.has(Sign::STATIC_FILE_UNREADABLE));
     EXPECT_FALSE(evidence.has(Sign::CREDENTIALS_MISSING));
+    EXPECT_EQ(evidence.unreadSettings,
+              path("static.ini") + " cannot be read: No such file or directory");
 }
 
 TEST_F(DeviceFilesTest, TheDaemonIsFoundWithoutItsPidFileButNoOtherProcess) {
@@ -194,6 +198,8 @@ TEST_F(DeviceFilesTest, TheTunnelIsJudgedByItsProcessAndItsFiles) {
     EXPECT_TRUE(look({}, relayed).has(Sign::TUNNEL_REFUSED));
     writeFile("vpn/auth.txt", "");
     EXPECT_TRUE(holds(problems(look({}, relayed)), "vpn/auth.txt is empty\n"));
+    EXPECT_EQ(doctor::tunnelFile(up, "STARTCMD_OUTFILE"), path("vpn/out"));
+    EXPECT_EQ(doctor::tunnelFile(up, "UNKNOWN"), "");
     const Evidence noFolder = look({{"OPENVPN_CONFIG_PATH", "/gone"}});
     EXPECT_TRUE(holds(problems(noFolder), "tunnel's files: /gone does not exist\n"));
 }

@@ -5,15 +5,29 @@
 
 namespace pelorus::doctor {
 
+namespace {
+
+DiskState diskState() {
+    constexpr std::chrono::seconds kPatience{2};
+    return readDiskState(outputOf({"hdparm", "-C", "/dev/sda"}, kPatience).value_or(""));
+}
+
+}  // namespace
+
 DiskState readDiskState(const std::string& output) {
     if (contains(output, "standby")) return DiskState::STANDBY;
     const bool active = contains(output, "active") || contains(output, "idle");
     return active ? DiskState::ACTIVE : DiskState::UNKNOWN;
 }
 
-DiskState diskState() {
-    constexpr std::chrono::seconds kPatience{2};
-    return readDiskState(outputOf({"hdparm", "-C", "/dev/sda"}, kPatience).value_or(""));
+std::string diskObstacle(DiskState state, const Evidence& evidence) {
+    if (state == DiskState::STANDBY) return "while the disk sleeps";
+    const bool isAwake = state == DiskState::ACTIVE || evidence.has(Sign::DISK_IN_USE);
+    return isAwake ? "" : "as nothing tells whether the disk sleeps";
+}
+
+std::string diskObstacle(const Evidence& evidence) {
+    return diskObstacle(diskState(), evidence);
 }
 
 void lookAtDisk(Findings& findings) {

@@ -10,8 +10,11 @@ enum class DiskState { UNKNOWN, STANDBY, ACTIVE };
 
 /// The state that the output of hdparm -C tells.
 [[nodiscard]] DiskState readDiskState(const std::string& output);
-/// That of the disk the daemon looks at. Takes at most two seconds.
-[[nodiscard]] DiskState diskState();
+/// Why no request may be sent that might touch a disk in @p state: "while the disk sleeps". Empty
+/// when it is awake for certain.
+[[nodiscard]] std::string diskObstacle(DiskState state, const Evidence& evidence);
+/// The same for the disk the daemon looks at. Takes at most two seconds.
+[[nodiscard]] std::string diskObstacle(const Evidence& evidence);
 
 void lookAtDisk(Findings& findings);
 

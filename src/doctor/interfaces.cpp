@@ -163,9 +163,11 @@ void judgeNetwork(const std::vector<Interface>& all,
         findings.add(Sign::NO_INTERFACE_UP, "no network interface is up");
         findings.problem("network: no interface is up, or no cable is plugged in");
     } else if (addressed == nullptr) {
-        findings.add(Sign::NO_ADDRESS, up->name + " is up, but has no address");
-        findings.problem("network: " + up->name + " is up, but has no address");
+        const std::string text = up->name + " is up, but has no usable IPv4 address";
+        findings.add(Sign::NO_ADDRESS, text);
+        findings.problem("network: " + text);
     } else {
+        findings.add(Sign::HAS_ADDRESS, addressed->name + " is up with an address");
         judgeRoute(*addressed, route, findings);
     }
     judgeTunnels(all, findings);

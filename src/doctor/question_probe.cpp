@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "cloud/port_test_answer.h"
+#include "cloud/public_address.h"
 #include "cloud/url_template.h"
 #include "common/handles.h"
 #include "common/text.h"
@@ -47,28 +48,13 @@ std::optional<std::string> fetch(const std::string& url) {
     return body;
 }
 
-void judgePortTest(const std::string& text, const std::string& port, Findings& findings) {
-    const PortTestAnswer answer = readPortTestAnswer(text);
-    const bool here =
-        !answer.requestedDevice.empty() && answer.requestedDevice == answer.respondingDevice;
-    if (answer.passed && here) {
-        findings.add(Sign::PORT_TEST_PASSES, "the service reaches port " + port);
-        findings.ok("port test: the service reaches port " + port);
-        return;
-    }
-    const std::string fault = answer.passed ? "another device answers on port " + port
-                                            : "the service does not reach port " + port;
-    findings.add(Sign::PORT_TEST_FAILS, fault);
-    findings.problem("port test: " + fault);
-}
-
 }  // namespace
 
 void askForAddress(const Evidence& evidence, Findings& findings) {
     const std::string server = serviceHost(evidence.setting("SERVER_BASE_URL"));
     if (server.empty()) return;
     const auto body = fetch("http://" + server + kAddressPath);
-    if (body && classOf(*body) != AddressClass::NONE) {
+    if (body && isIpv4Address(*body) && classOf(*body) != AddressClass::NONE) {
         findings.set("seen", *body);
     } else {
         findings.notSeen("public address: the service does not tell it");
@@ -81,8 +67,8 @@ void askForPortTest(const Evidence& evidence, Findings& findings) {
     const std::string id = evidence.setting("DEVICEID");
     const std::string auth = evidence.setting("DEVICEAUTH");
     if (server.empty() || leadingInt(port) <= 0 || id.empty() || auth.empty()) return;
-    if (diskState() == DiskState::STANDBY) {
-        findings.notSeen("port test: not asked for while the disk sleeps");
+    if (const std::string obstacle = diskObstacle(evidence); !obstacle.empty()) {
+        findings.notSeen("port test: not asked for " + obstacle);
         return;
     }
     const std::string url =
@@ -94,6 +80,28 @@ void askForPortTest(const Evidence& evidence, Findings& findings) {
         judgePortTest(*body, std::to_string(leadingInt(port)), findings);
     } else {
         findings.notSeen("port test: the service does not answer");
+    }
+}
+
+void judgePortTest(const std::string& text, const std::string& port, Findings& findings) {
+    const PortTestAnswer answer = readPortTestAnswer(text);
+    const bool areNamed = !answer.requestedDevice.empty() && !answer.respondingDevice.empty();
+    const bool isOther = areNamed && answer.requestedDevice != answer.respondingDevice;
+    if (answer.passed && areNamed && !isOther) {
+        findings.add(Sign::PORT_TEST_PASSES, "the service reaches port " + port);
+        findings.ok("port test: the service reaches port " + port);
+    } else if (!contains(text, "<status>")) {
+        findings.notSeen("port test: the service's answer is not understood");
+    } else if (answer.passed || isOther) {
+        const std::string fault =
+            isOther ? "another device answers on port " + port
+                    : "what answers on port " + port + " does not say that it is this device";
+        findings.add(Sign::OTHER_DEVICE_ANSWERS, fault);
+        findings.problem("port test: " + fault);
+    } else {
+        const std::string fault = "the service does not reach port " + port;
+        findings.add(Sign::PORT_TEST_FAILS, fault);
+        findings.problem("port test: " + fault);
     }
 }
 

@@ -56,9 +56,8 @@ void lookAtBackEnd(const Evidence& evidence, Findings& findings) {
     const TcpConnection connection{target->host, target->port, kConnectPatience};
     if (!connection.connected()) {
         silent(findings, "does not listen" + where + ": " + connection.obstacle());
-    } else if (diskState() == DiskState::STANDBY) {
-        findings.notSeen("local back end: it listens" + where +
-                         ", but is not asked while the disk sleeps");
+    } else if (const std::string obstacle = diskObstacle(evidence); !obstacle.empty()) {
+        findings.notSeen("local back end: it listens" + where + ", but is not asked " + obstacle);
     } else if (connection.answers("HEAD / HTTP/1.0\r\n\r\n", kAnswerPatience)) {
         findings.add(Sign::BACK_END_ANSWERS, "the local back end answers" + where);
         findings.ok("local back end answers" + where);

@@ -9,8 +9,8 @@ namespace pelorus::doctor {
 /// Looks whether the device's web server listens on the internal ports.
 void lookAtWebServer(const Evidence& evidence, Findings& findings);
 
-/// Looks whether the local back end answers. It is sent one request for the head of a page; not
-/// while the disk is in standby, which the request might wake.
+/// Looks whether the local back end answers. It is sent one request for the head of a page, but
+/// only while the disk is awake for certain: the request might wake it.
 void lookAtBackEnd(const Evidence& evidence, Findings& findings);
 
 }  // namespace pelorus::doctor

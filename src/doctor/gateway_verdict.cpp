@@ -110,32 +110,51 @@ void append(std::string& list, const std::string& item) {
     list += (list.empty() ? "" : ", ") + item;
 }
 
-void judgeOurs(const GatewayTable& table, Findings& findings) {
+void tellOurs(const GatewayTable& table, Findings& findings) {
     std::string ours;
-    bool published = false;
     for (const TableEntry& entry : table.entries) {
-        if (entry.protocol != "TCP" || !isOwn(table, entry)) continue;
-        published = published || entry.externalPort == table.externalHttpPort;
-        if (!isOurs(table, entry)) continue;
+        if (entry.protocol != "TCP" || !isOurs(table, entry)) continue;
         append(ours,
                std::to_string(entry.externalPort) + " to " + std::to_string(entry.internalPort));
     }
     if (!ours.empty()) findings.ok("gateway maps " + ours + " of this device");
-    if (!table.complete || table.byHand || table.externalHttpPort <= 0 || published) return;
-    const std::string text = "port " + std::to_string(table.externalHttpPort) +
-                             " is published, but the gateway does not map it to this device";
-    findings.add(Sign::OUR_MAPPINGS_MISSING, text);
-    findings.problem("gateway's table: " + text);
+}
+
+// What is wrong with the mapping of a published port; empty if nothing is, or it is not known. Some
+// gateways name the other device instead of telling its address.
+std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
+    if (!port.told) return {};
+    if (!port.entry) return "the gateway does not map it";
+    const TableEntry& entry = *port.entry;
+    if (classOf(entry.client) == AddressClass::NONE) return {};
+    if (isOwn(table, entry) && entry.internalPort == port.internalPort) return {};
+    return "the gateway maps it to port " + std::to_string(entry.internalPort) + " of " +
+           entry.client;
+}
+
+void judgePublished(const GatewayTable& table, Findings& findings) {
+    for (const PublishedPort& port : table.published) {
+        const std::string fault = mappingFault(table, port);
+        if (fault.empty()) continue;
+        const std::string text =
+            "port " + std::to_string(port.externalPort) + " is published, but " + fault;
+        findings.add(Sign::OUR_MAPPINGS_MISSING, text);
+        findings.problem("gateway's table: " + text);
+    }
 }
 
 void judgeOthers(const GatewayTable& table, Findings& findings) {
-    const std::set<int> published{table.externalHttpPort, table.externalHttpsPort};
+    std::set<int> published;
+    std::vector<TableEntry> entries = table.entries;
+    for (const PublishedPort& port : table.published) {
+        published.insert(port.externalPort);
+        if (port.entry) entries.push_back(*port.entry);
+    }
     std::set<int> wanted{kHttpPort, kHttpsPort};
     wanted.insert(published.begin(), published.end());
-    wanted.erase(0);
     std::string held;
-    bool inTheWay = table.externalHttpPort <= 0;
-    for (const TableEntry& entry : table.entries) {
+    bool inTheWay = published.empty();
+    for (const TableEntry& entry : entries) {
         if (entry.protocol != "TCP" || isOwn(table, entry)) continue;
         if (wanted.erase(entry.externalPort) == 0) continue;
         inTheWay = inTheWay || published.count(entry.externalPort) != 0;
@@ -172,7 +191,8 @@ void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findin
 }
 
 void judgeTable(const GatewayTable& table, Findings& findings) {
-    judgeOurs(table, findings);
+    tellOurs(table, findings);
+    judgePublished(table, findings);
     judgeOthers(table, findings);
 }
 

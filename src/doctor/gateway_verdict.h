@@ -2,6 +2,7 @@
 #ifndef PELORUS_DOCTOR_GATEWAY_VERDICT_H
 #define PELORUS_DOCTOR_GATEWAY_VERDICT_H
 
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -38,14 +39,20 @@ struct TableEntry {
     std::string description;
 };
 
+/// A published port, and what the gateway says when it is asked for that one.
+struct PublishedPort {
+    int externalPort{};
+    int internalPort{};  ///< where it should lead
+    bool told = false;   ///< the gateway has said which entry there is, or that none is
+    std::optional<TableEntry> entry;  ///< nothing: there is none
+};
+
 /// A gateway's table, and what it is compared with.
 struct GatewayTable {
-    std::vector<TableEntry> entries;
-    bool complete = false;  ///< read to its end
+    std::vector<TableEntry> entries;  ///< as far as it was read
     std::vector<std::string> ownAddresses;
     int internalHttpPort{}, internalHttpsPort{};
-    int externalHttpPort{}, externalHttpsPort{};  ///< as published; 0 if not
-    bool byHand = false;  ///< the user forwards the published ports; they need not be in the table
+    std::vector<PublishedPort> published;
 };
 
 /// Concludes from a table of mappings.

@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstring>
 #include <memory>
+#include <utility>
 
 #include "common/handles.h"
 #include "common/miniupnpc_api.h"
@@ -24,6 +25,7 @@ constexpr int kDiscoverDelay = 2000;  // milliseconds
 constexpr int kMostDevices = 100;
 constexpr std::size_t kMostGateways = 8;
 constexpr int kMostEntries = 1000;
+constexpr int kNoSuchEntry = 714;  // in the gateway's table
 constexpr std::chrono::seconds kTablePatience{4};
 
 std::string textOf(const char* text) {
@@ -106,40 +108,76 @@ int readEntry(const Service& service, int index, TableEntry& entry) {
     return status;
 }
 
-// How gateways say that there is no entry with that index.
-bool isEnd(int status) {
+// How gateways say that there is no entry with that index. One that rejects the arguments of the
+// first question may not know the question.
+bool isEnd(int status, int index) {
     constexpr int kInvalidArgs = 402;
     constexpr int kIndexInvalid = 713;
-    constexpr int kNoSuchEntry = 714;
-    return status == kInvalidArgs || status == kIndexInvalid || status == kNoSuchEntry;
+    return status == kIndexInvalid || status == kNoSuchEntry ||
+           (status == kInvalidArgs && index > 0);
 }
 
-void readEntries(const Service& service, GatewayTable& table) {
-    const Clock::time_point end = Clock::now() + kTablePatience;
+// False when the end was not reached.
+bool readEntries(const Service& service, Clock::time_point end, std::vector<TableEntry>& entries) {
     for (int index = 0; index < kMostEntries && Clock::now() < end; ++index) {
         TableEntry entry;
         const int status = readEntry(service, index, entry);
-        table.complete = isEnd(status);
-        if (status != UPNPCOMMAND_SUCCESS) return;
-        table.entries.push_back(entry);
+        if (status != UPNPCOMMAND_SUCCESS) return isEnd(status, index);
+        entries.push_back(entry);
     }
+    return false;
+}
+
+void askFor(const Service& service, PublishedPort& port) {
+    EntryTexts texts;
+    const int status = miniupnpc::getSpecificPortMappingEntry(
+        service.controlUrl.c_str(), service.type.c_str(), std::to_string(port.externalPort).c_str(),
+        "TCP", texts.client.data(), texts.internalPort.data(), texts.description.data(),
+        texts.enabled.data(), texts.lease.data());
+    port.told = status == UPNPCOMMAND_SUCCESS || status == kNoSuchEntry;
+    if (status != UPNPCOMMAND_SUCCESS) return;
+    port.entry = {port.externalPort, "TCP", plainText(texts.client.data(), 40),
+                  leadingInt(texts.internalPort.data()), texts.description.data()};
 }
 
 int portSetting(const Evidence& evidence, const char* key, int missing) {
     return scanInt(evidence.setting(key).c_str()).value_or(missing);
 }
 
+std::vector<PublishedPort> publishedPorts(const Evidence& evidence, const GatewayTable& table) {
+    std::vector<PublishedPort> ports;
+    for (const auto& [key, internal] :
+         {std::pair{"EXTERNAL_HTTP_PORT", table.internalHttpPort},
+          std::pair{"EXTERNAL_HTTPS_PORT", table.internalHttpsPort}}) {
+        const int external = portSetting(evidence, key, 0);
+        if (external > 0) ports.push_back({external, internal, false, {}});
+    }
+    return ports;
+}
+
+// What the user forwards by hand need not be in the table.
+bool isMappedByDaemon(const Evidence& evidence) {
+    return evidence.statusWord == "portforwarded" &&
+           evidence.setting("MANUAL_PORT_FORWARD") != "TRUE";
+}
+
 void lookAtTable(const Service& service, const Evidence& evidence, Findings& findings) {
+    if (!evidence.hasSettings()) {
+        findings.notSeen("gateway's table: " + evidence.unreadSettings);
+        return;
+    }
+    const Clock::time_point end = Clock::now() + kTablePatience;
     GatewayTable table;
     table.ownAddresses = ownAddresses();
     table.internalHttpPort = portSetting(evidence, "INTERNAL_HTTP_PORT", 80);
     table.internalHttpsPort = portSetting(evidence, "INTERNAL_HTTPS_PORT", 443);
-    table.externalHttpPort = portSetting(evidence, "EXTERNAL_HTTP_PORT", 0);
-    table.externalHttpsPort = portSetting(evidence, "EXTERNAL_HTTPS_PORT", 0);
-    table.byHand = evidence.setting("MANUAL_PORT_FORWARD") == "TRUE";
-    readEntries(service, table);
+    table.published = publishedPorts(evidence, table);
+    for (PublishedPort& port : table.published) {
+        if (isMappedByDaemon(evidence) && Clock::now() < end) askFor(service, port);
+    }
+    const bool isComplete = readEntries(service, end, table.entries);
     judgeTable(table, findings);
-    if (!table.complete) findings.notSeen("gateway's table: it could not be read to its end");
+    if (!isComplete) findings.notSeen("gateway's table: it could not be read to its end");
 }
 
 void lookAtGateway(UPNPDev& gateways, const Evidence& evidence, Findings& findings) {

@@ -114,42 +114,40 @@ INSTANTIATE_TEST_SUITE_P(Answers, Gateway, ::testing::ValuesIn(kAnswers), [](con
 struct Table {
     std::string name;
     std::vector<TableEntry> entries;
-    bool complete;
-    int published;
-    bool byHand;
+    std::vector<PublishedPort> published;
     std::set<Sign> signs;
 };
 
 const TableEntry kOurs{9091, "TCP", "192.168.1.5", 80, "Kavra"};
+const TableEntry kOursForHttps{9444, "TCP", "192.168.1.5", 443, "KavraSSL"};
 const TableEntry kNeighbour{9091, "TCP", "192.168.1.9", 80, "Kavra"};
-const TableEntry kElsewhere{9092, "TCP", "192.168.1.5", 80, ""};
+const TableEntry kForHttpElsewhere{9091, "TCP", "192.168.1.5", 8080, "web"};
+const TableEntry kByName{9091, "TCP", "nas.lan", 80, ""};
+
+PublishedPort http(const std::optional<TableEntry>& entry) {
+    return {9091, 80, true, entry};
+}
 
 class Mappings : public ::testing::TestWithParam<Table> {};
 
 TEST_P(Mappings, AreJudged) {
     const Table& row = GetParam();
     Findings findings;
-    judgeTable({row.entries, row.complete, {"192.168.1.5"}, 80, 443, row.published, 0, row.byHand},
-               findings);
+    judgeTable({row.entries, {"192.168.1.5"}, 80, 443, row.published}, findings);
     EXPECT_EQ(signsOf(findings), row.signs);
 }
 
 const Table kTables[] = {
-    {"NothingMappedNothingPublished", {}, true, 0, false, {}},
-    {"Ours", {kOurs}, true, 9091, false, {}},
-    {"OursUnderAnotherPort", {kElsewhere}, true, 9091, false, {Sign::OUR_MAPPINGS_MISSING}},
-    {"Lost", {}, true, 9091, false, {Sign::OUR_MAPPINGS_MISSING}},
-    {"NotReadToItsEnd", {}, false, 9091, false, {}},
-    {"ForwardedByHand", {}, true, 9091, true, {}},
-    {"HeldByAnother", {kNeighbour}, true, 0, false, {Sign::PORT_HELD_BY_OTHER}},
-    {"TakenAway",
-     {kNeighbour},
-     true,
-     9091,
-     false,
-     {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
-    {"OfAnotherProtocol", {{9091, "UDP", "192.168.1.9", 80, ""}}, true, 0, false, {}},
-    {"OfAnotherProgramHere", {{9091, "TCP", "192.168.1.5", 80, "web"}}, true, 9091, false, {}},
+    {"NothingMappedNothingPublished", {}, {}, {}},
+    {"Ours", {kOurs}, {http(kOurs), {9444, 443, true, kOursForHttps}}, {}},
+    {"Lost", {kOurs}, {http({})}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"NotToldAndNotInTheTable", {}, {{9091, 80, false, {}}}, {}},
+    {"ToAHostByName", {}, {http(kByName)}, {Sign::PORT_HELD_BY_OTHER}},
+    {"HeldByAnother", {kNeighbour}, {}, {Sign::PORT_HELD_BY_OTHER}},
+    {"TakenAway", {}, {http(kNeighbour)}, {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
+    {"OfAnotherProtocol", {{9091, "UDP", "192.168.1.9", 80, ""}}, {}, {}},
 };
 
 INSTANTIATE_TEST_SUITE_P(Tables, Mappings, ::testing::ValuesIn(kTables), [](const auto& row) {
@@ -158,7 +156,7 @@ INSTANTIATE_TEST_SUITE_P(Tables, Mappings, ::testing::ValuesIn(kTables), [](cons
 
 TEST(Mappings, NameWhoHoldsThePort) {
     Findings findings;
-    judgeTable({{kNeighbour}, true, {"192.168.1.5"}, 80, 443, 0, 0, false}, findings);
+    judgeTable({{kNeighbour}, {"192.168.1.5"}, 80, 443, {}}, findings);
     EXPECT_EQ(findings.signs().at(0).text, "the gateway maps port 9091 to 192.168.1.9 (Kavra)");
 }
 

@@ -44,8 +44,8 @@ std::vector<Cause> workingCauses() {
          "The device has no credentials for the service, so the daemon waits for them.",
          "Register the device with the service; the daemon notices the credentials by itself."},
         {"no-network",
-         kRunning,
-         {{S::NO_INTERFACE_UP}, {S::NO_ADDRESS}, {S::NO_DEFAULT_ROUTE}},
+         kNotReached,
+         {{S::NO_INTERFACE_UP}, {S::NO_ADDRESS}, {S::NO_DEFAULT_ROUTE}, {S::LOGGED_NO_ADDRESS}},
          {},
          "The device has no working connection to the home network.",
          "Check the cable or the wireless connection, and that the gateway gives out addresses."},
@@ -119,7 +119,7 @@ std::vector<Cause> publishingCauses() {
     return {
         {"another-device-answers",
          kNotDirect,
-         {{S::LOGGED_OTHER_DEVICE}},
+         {{S::OTHER_DEVICE_ANSWERS}, {S::LOGGED_OTHER_DEVICE}},
          {},
          "Another device answers at the ports that were opened for this one.",
          "Look in the gateway's pages which device the ports lead to, and remove old entries."},
@@ -293,6 +293,13 @@ std::vector<Cause> gatewayCauses() {
 
 std::vector<Cause> outsideCauses() {
     return {
+        {"mapping-lost",
+         {Reach::DIRECT, Reach::NOT_REACHED},
+         {{S::OUR_MAPPINGS_MISSING}},
+         {},
+         "The gateway no longer forwards the published ports.",
+         "Nothing needs to be done: the next port test notices, and the ports are mapped again. "
+         "Restarting the service does it at once."},
         {"port-filtered",
          kNotDirect,
          {{S::LOGGED_TEST_FAILED}, {S::PORT_TEST_FAILS}},
@@ -300,13 +307,6 @@ std::vector<Cause> outsideCauses() {
          "The gateway opens the ports, but nothing from the internet comes through them.",
          "A filter in the gateway or at the provider is in the way: look there for a firewall, or "
          "ask the provider."},
-        {"mapping-lost",
-         {Reach::DIRECT},
-         {{S::OUR_MAPPINGS_MISSING}},
-         {},
-         "The gateway no longer forwards the published ports.",
-         "Nothing needs to be done: the next port test notices, and the ports are mapped again. "
-         "Restarting the service does it at once."},
         {"settling",
          kNotReached,
          {{S::LOGGED_ATTEMPT}, {S::CHANGED_SINCE}},

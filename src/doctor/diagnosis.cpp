@@ -1,5 +1,6 @@
 #include "doctor/diagnosis.h"
 
+#include <algorithm>
 #include <array>
 #include <utility>
 
@@ -8,12 +9,18 @@ namespace pelorus::doctor {
 namespace {
 
 // What the log says is over when the other has been seen by now.
-constexpr std::array<std::pair<Sign, Sign>, 10> kOver{{
+constexpr std::array<std::pair<Sign, Sign>, 16> kOver{{
+    {Sign::LOGGED_NO_ADDRESS, Sign::HAS_ADDRESS},
     {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_CERTIFICATE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_NO_GATEWAY, Sign::GATEWAY_FOUND},
     {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+    {Sign::LOGGED_SECOND_NAT, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_OTHER_DEVICE, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_TEST_FAILED, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_FAILS},
     {Sign::LOGGED_NAMES_LEAD_ELSEWHERE, Sign::NAMES_RIGHT},
     {Sign::LOGGED_NAMES_UNRESOLVED, Sign::NAMES_RIGHT},
     {Sign::LOGGED_BACK_END_SILENT, Sign::BACK_END_ANSWERS},
@@ -54,6 +61,14 @@ Reach lastSaid(const Evidence& evidence) {
     return word == Reach::UNKNOWN || (isOutdated && logged != Reach::UNKNOWN) ? logged : word;
 }
 
+// The service's view of a device that says that it is reached directly. Ports forwarded by hand may
+// lead through a second router, too.
+bool isDisproved(const Evidence& evidence) {
+    if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
+    return evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
+           (evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) && !evidence.has(Sign::MANUAL_MODE));
+}
+
 Reach reachOf(const Evidence& evidence) {
     const bool isOff =
         evidence.has(Sign::REMOTE_ACCESS_OFF) || evidence.has(Sign::LOGGED_REMOTE_ACCESS_OFF);
@@ -68,13 +83,23 @@ Reach reachOf(const Evidence& evidence) {
     if (evidence.has(Sign::CREDENTIALS_MISSING)) return Reach::NOT_REACHED;
     const Reach said = lastSaid(evidence);
     if (said == Reach::RELAYED && evidence.has(Sign::TUNNEL_GONE)) return Reach::NOT_REACHED;
+    if (said == Reach::DIRECT && isDisproved(evidence)) return Reach::NOT_REACHED;
     if (said == Reach::UNKNOWN) {
         if (evidence.has(Sign::TUNNEL_RUNS)) return Reach::RELAYED;
         // Without the settings, that the daemon runs says nothing.
-        const bool isKnown = evidence.has(Sign::DAEMON_RUNS) && !evidence.settings.empty();
+        const bool isKnown = evidence.has(Sign::DAEMON_RUNS) && evidence.hasSettings();
         if (evidence.has(Sign::LOGGED_ATTEMPT) || isKnown) return Reach::NOT_REACHED;
     }
     return said;
+}
+
+// What is seen now explains nothing while nothing tells that the device is not reached.
+void dropWhatExplainsNothing(std::vector<NamedCause>& causes) {
+    const auto isSeenNow = [](const Fact& fact) { return fact.source == Source::NOW; };
+    const auto isOnlySeenNow = [&](const NamedCause& named) {
+        return std::all_of(named.proofs.begin(), named.proofs.end(), isSeenNow);
+    };
+    causes.erase(std::remove_if(causes.begin(), causes.end(), isOnlySeenNow), causes.end());
 }
 
 void tellSince(const Evidence& evidence, Diagnosis& diagnosis) {
@@ -113,6 +138,7 @@ Diagnosis diagnose(const Evidence& seen) {
     tellSince(evidence, diagnosis);
     tellAddress(evidence, diagnosis);
     diagnosis.causes = findCauses(evidence, diagnosis.reach);
+    if (diagnosis.reach == Reach::UNKNOWN) dropWhatExplainsNothing(diagnosis.causes);
     diagnosis.checks = std::move(evidence.checks);
     diagnosis.history = std::move(evidence.history);
     diagnosis.daemon = std::move(evidence.daemon);

@@ -66,7 +66,11 @@ void askForPortTest(const Evidence& evidence, Findings& findings) {
     const std::string port = evidence.setting("EXTERNAL_HTTP_PORT");
     const std::string id = evidence.setting("DEVICEID");
     const std::string auth = evidence.setting("DEVICEAUTH");
-    if (server.empty() || leadingInt(port) <= 0 || id.empty() || auth.empty()) return;
+    if (server.empty() || id.empty() || auth.empty()) return;
+    if (leadingInt(port) <= 0) {
+        findings.notSeen("port test: no port is published");
+        return;
+    }
     if (const std::string obstacle = diskObstacle(evidence); !obstacle.empty()) {
         findings.notSeen("port test: not asked for " + obstacle);
         return;

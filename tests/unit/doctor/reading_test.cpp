@@ -154,9 +154,9 @@ TEST(DiskState, MustBeKnownBeforeTheDiskIsTouched) {
     Evidence used;
     used.add(Sign::DISK_IN_USE, Source::NOW, "");
     const struct {
-        DiskState state;
-        Evidence evidence;
-        bool mayBeTouched;
+        DiskState state{};
+        Evidence evidence{};
+        bool mayBeTouched{};
     } rows[] = {
         {DiskState::ACTIVE, {}, true},
         {DiskState::UNKNOWN, used, true},

@@ -28,7 +28,7 @@ void lookAtRelayNeeds(const Evidence& evidence, Findings& findings) {
     const bool hasClient = !findProgram(client).empty();
     const bool hasDevice = hasTunnelDevice();
     if (!hasClient && !evidence.hasSettings()) {
-        findings.notSeen("relay client: no program openvpn; of another name: " +
+        findings.notSeen("relay client: no openvpn here, and STARTCMD is not known: " +
                          evidence.unreadSettings);
     } else if (!hasClient) {
         const std::string text = "there is no program " + plainText(client, 80);

@@ -75,6 +75,7 @@ struct Evidence {
     std::map<std::string, std::string> settings;  ///< as the daemon merges them; has secrets
     std::string statusWord{};                     ///< COMMUNICATION_STATUS of the settings
     DaemonState daemon{};
+    std::optional<Time> tunnelSince{};  ///< start of the tunnel client that runs
     std::map<Sign, Fact> signs;
     std::vector<Check> checks;
     std::vector<Period> history;      ///< oldest first

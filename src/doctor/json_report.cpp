@@ -131,6 +131,7 @@ std::string jsonReport(const Diagnosis& diagnosis) {
                       {"address", textOrNull(diagnosis.address)},
                       {"ports", portList(diagnosis.ports)},
                       {"since", moment(diagnosis.since)},
+                      {"since_at_least", diagnosis.isSinceAtLeast},
                       {"before", before},
                       {"causes", causeList(diagnosis.causes)},
                       {"checks", checkList(diagnosis.checks)},

@@ -145,7 +145,7 @@ std::string TextReport::sinceWhen() const {
     }
     if (diagnosis.since) {
         if (!text.empty()) text += diagnosis.fromElsewhere ? ";" : ",";
-        text += " since ";
+        text += diagnosis.isSinceAtLeast ? " since at least " : " since ";
         text += momentInWords(*diagnosis.since, today) + " (" +
                 timeBetween(*diagnosis.since, diagnosis.now) + ")";
     } else if (diagnosis.reach != Reach::UNKNOWN && !diagnosis.fromElsewhere) {

@@ -18,6 +18,9 @@ constexpr std::string_view kStarted = "the daemon started";
 constexpr std::string_view kPassed = "the ports passed their test and were published";
 constexpr std::string_view kNoGateway = "no gateway answers UPnP or NAT-PMP";
 constexpr std::string_view kTunnelUp = "the tunnel came up";
+constexpr std::string_view kMissing = "(not logged)";
+// libcurl's words for an answer that was not taken: the line before says why.
+constexpr std::string_view kDropped = "Failed writing received data";
 
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
                                       Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
@@ -175,12 +178,15 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             assumeFrom(values[0]);
             break;
         case LogEvent::TEST_ANSWER:
+            concludeGateway();
             takeTestAnswer(values[1], when);
             break;
         case LogEvent::TEST_FAILED:
+            concludeGateway();
             failTest(when);
             break;
         case LogEvent::TEST_UNANSWERED:
+            concludeGateway();
             failService(when);
             // Unlike the sign of the service as a whole, this one outlives its other answers.
             if (signs.count(Sign::LOGGED_SERVICE_SILENT) != 0) {
@@ -191,6 +197,8 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             failService(when);
             break;
         case LogEvent::PUBLISHED:
+            concludeGateway();
+            published = true;
             pending = {Reach::DIRECT, when};
             break;
         case LogEvent::BACK_END_SAID:
@@ -223,6 +231,15 @@ void LogStory::happenAtGateway(LogEvent event, Time when) {
         default:
             break;
     }
+}
+
+// Without progress NAT-PMP's success is not logged, but nothing is mapped without a gateway, and a
+// port that is not mapped is not tested. One that was mapped earlier is tested without a gateway.
+void LogStory::concludeGateway() {
+    if (progress || published || ports == Ports::MANUAL) return;
+    if (signs.count(Sign::LOGGED_NO_GATEWAY) == 0) return;
+    clear({Sign::LOGGED_NO_GATEWAY});
+    natpmp = true;
 }
 
 void LogStory::happenInLife(LogEvent event, Time when) {
@@ -261,7 +278,7 @@ void LogStory::happenInLife(LogEvent event, Time when) {
 void LogStory::happenInRelay(LogEvent event, Time when) {
     switch (event) {
         case LogEvent::PUBLISHING_FAILED:
-            reason = Sign::LOGGED_PUBLISHING_FAILED;
+            blameForPublishing();
             [[fallthrough]];
         case LogEvent::PORTS_LOST:
             pending.reset();
@@ -313,7 +330,7 @@ void LogStory::start(Time when) {
     signs.clear();
     reason.reset();
     nextCycle.reset();
-    signalled = ended = progress = natpmp = tornDown = false;
+    signalled = ended = progress = natpmp = published = tornDown = false;
     ++startCount;
     since = when;
     become(Reach::NOT_REACHED, when, std::string{kStarted});
@@ -347,6 +364,7 @@ void LogStory::end(Time when) {
 void LogStory::endCycle(Time when, std::string_view seconds) {
     int pause = 0;
     std::from_chars(seconds.data(), seconds.data() + seconds.size(), pause);
+    pauseBegin = when;
     nextCycle = when + std::chrono::seconds{pause};
     explainStart();
     passing = false;
@@ -413,6 +431,7 @@ void LogStory::failTest(Time when) {
 
 void LogStory::failService(Time when) {
     const std::string error = std::exchange(value(Kept::ERROR), {});
+    if (contains(error, kDropped)) return;
     if (contains(error, "resolve")) {
         set(Sign::LOGGED_SERVICE_UNRESOLVED, when, "the service's name does not resolve");
     } else if (contains(error, "certificate") || contains(error, "CA cert")) {
@@ -423,6 +442,17 @@ void LogStory::failService(Time when) {
     } else {
         set(Sign::LOGGED_SERVICE_SILENT, when,
             "no answer from the service" + (error.empty() ? "" : ": " + error));
+    }
+}
+
+// The service has taken the record: then it is the back end that could not be told.
+void LogStory::blameForPublishing() {
+    reason = Sign::LOGGED_PUBLISHING_FAILED;
+    const auto silent = signs.find(Sign::LOGGED_BACK_END_SILENT);
+    if (silent == signs.end() || !pending || pending->reach != Reach::DIRECT) return;
+    std::string& text = signs[Sign::LOGGED_PUBLISHING_FAILED].text;
+    if (silent->second.when >= pending->since && !contains(text, ": ")) {
+        text += ": " + silent->second.text;
     }
 }
 
@@ -525,6 +555,15 @@ bool LogStory::serviceFails() const {
 }
 
 std::string LogStory::filled(std::string_view words, const LogValues& values) const {
+    for (;;) {
+        const std::size_t end = words.find('|');
+        std::string text = filledWording(words.substr(0, end), values);
+        if (end == std::string_view::npos || !contains(text, kMissing)) return text;
+        words.remove_prefix(end + 1);
+    }
+}
+
+std::string LogStory::filledWording(std::string_view words, const LogValues& values) const {
     std::string text;
     for (std::size_t open = words.find('{'); open != std::string_view::npos;
          open = words.find('{')) {
@@ -536,7 +575,7 @@ std::string LogStory::filled(std::string_view words, const LogValues& values) co
         const std::string value =
             known == Kept::NOTHING ? shownText(values[static_cast<std::size_t>(name.front() - '1')])
                                    : kept[static_cast<std::size_t>(known)];
-        text.append(value.empty() ? "(not logged)" : value);
+        text.append(value.empty() ? kMissing : value);
     }
     return text.append(words);
 }
@@ -549,7 +588,9 @@ void LogStory::finish(Evidence& evidence) {
     evidence.logBegin = firstLine;
     evidence.logEnd = lastLine;
     if (!evidence.daemon.since) evidence.daemon.since = since;
-    if (!evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
+    // A clock that was set makes nonsense of it.
+    const bool pauses = nextCycle && *pauseBegin <= evidence.now && evidence.now <= *nextCycle;
+    if (pauses && !evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
     for (const auto& [sign, fact] : signs) evidence.signs[sign] = fact;
     evidence.history.assign(history.begin(), history.end());
 }

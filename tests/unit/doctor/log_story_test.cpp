@@ -21,6 +21,9 @@ constexpr const char* kPause = "DaemonControl::run - retry connection after 120 
 constexpr const char* kPassed =
     "TavikClient::testPort[1] - httpGet got <port_test><status>Success</status>"
     "<external_ip>203.0.113.7</external_ip></port_test>, 90 bytes from central server.";
+constexpr const char* kFailedAnswer =
+    "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status></port_test>, 52 "
+    "bytes from central server.";
 constexpr const char* kSecondNatAnswer =
     "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status><remote_external_ip>"
     "203.0.113.7</remote_external_ip><external_ip>100.64.3.9</external_ip></port_test>, 90 bytes "
@@ -240,6 +243,25 @@ TEST(LogStory, HistoryAndSigns) {
           {130, kNoUpnp}},
          "4 direct: the ports passed their test and were published|",
          {}},
+        {"NAT-PMP only, of which nothing is logged, and a filter",
+         {{0, kStart}, {2, kNoUpnp}, {9, kFailedAnswer}, {9, kTestFailed}, {130, kNoUpnp}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_TEST_FAILED}},
+        {"a gateway that is gone, and its ports with it",
+         {{0, kStart}, {4, kPublished}, {130, kNoUpnp}, {139, kFailedAnswer}, {139, kTestFailed}},
+         "4 direct: the ports passed their test and were published|"
+         "139 not reached: no gateway answers UPnP|",
+         {Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_TEST_FAILED}},
+        {"an answer that is too long",
+         {{0, kStart},
+          {5,
+           "TavikClient curlRcvData - Buffer overrun detected, read buffer too small, transfer "
+           "aborted"},
+          {5, "TavikClient::httpGet  Error: [Failed writing received data to disk/application]"},
+          {5,
+           "TavikClient::testPort[1] - httpGet for https://x, no response from central server."}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_SERVICE_NONSENSE}},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
@@ -267,6 +289,32 @@ TEST(LogStory, TellsValuesAndTimes) {
     EXPECT_EQ(evidence.daemon.since, at(0));
     EXPECT_EQ(evidence.daemon.nextCycle, at(140));
     EXPECT_TRUE(evidence.hasProgressLines);
+}
+
+TEST(LogStory, WordsWhatWasNotLogged) {
+    const Evidence evidence = told({{0, kSecondNat}}, 30);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_SECOND_NAT).text,
+              "the service sees another address than the gateway's");
+}
+
+TEST(LogStory, SaysWhoDidNotTakeThePorts) {
+    const char* const unsaid =
+        "TavikClient::updateServerMapping - failed to get response from localhost for url: [x].";
+    const char* const failed =
+        "ConnectionManager::createDirectConnection() - failed to update mapping info for x";
+    const Evidence evidence = told({{0, kStart}, {9, kPublished}, {9, unsaid}, {9, failed}}, 30);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_PUBLISHING_FAILED).text,
+              "the ports that passed their test could not be published: the local back end does "
+              "not answer");
+}
+
+// Before a clock that was set back, in the pause, and after it.
+TEST(LogStory, TheNextCycleIsToldDuringThePauseBeforeIt) {
+    const std::pair<int, bool> rows[]{{99, false}, {100, true}, {220, true}, {221, false}};
+    for (const auto& [now, isTold] : rows) {
+        EXPECT_EQ(told({{0, kStart}, {100, kPause}}, now).daemon.nextCycle.has_value(), isTold)
+            << now;
+    }
 }
 
 TEST(LogStory, KeepsTheLast2000Periods) {

@@ -4,6 +4,7 @@
 
 #include <zlib.h>
 
+#include <chrono>
 #include <functional>
 #include <optional>
 #include <string>
@@ -65,11 +66,14 @@ private:
     bool pipe = false;
 };
 
-/// The lines of the system's journal that the daemon logged. False when there is no journal.
-bool readJournal(const LineFilter::Taker& taker);
+/// The lines of the system's journal that the daemon logged. Gives up when no line comes for
+/// @p patience. Returns why the journal could not be read to its end; empty when it could, or when
+/// there is no journal.
+[[nodiscard]] std::string readJournal(const LineFilter::Taker& taker,
+                                      std::chrono::milliseconds patience);
 
 /// The files in which system loggers of Debian and its relatives keep @p name under @p folder, with
-/// the rotated ones, oldest first.
+/// the rotated ones (numbered or dated), oldest first.
 std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name);
 
 }  // namespace pelorus::doctor

@@ -7,6 +7,7 @@
 #include <memory>
 #include <set>
 
+#include "doctor/journal.h"
 #include "doctor/log_line.h"
 #include "doctor/log_source.h"
 #include "doctor/log_story.h"

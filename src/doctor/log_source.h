@@ -4,7 +4,6 @@
 
 #include <zlib.h>
 
-#include <chrono>
 #include <functional>
 #include <optional>
 #include <string>
@@ -65,12 +64,6 @@ private:
     std::string head;  // read by firstStamp()
     bool pipe = false;
 };
-
-/// The lines of the system's journal that the daemon logged. Gives up when no line comes for
-/// @p patience. Returns why the journal could not be read to its end; empty when it could, or when
-/// there is no journal.
-[[nodiscard]] std::string readJournal(const LineFilter::Taker& taker,
-                                      std::chrono::milliseconds patience);
 
 /// The files in which system loggers of Debian and its relatives keep @p name under @p folder, with
 /// the rotated ones (numbered or dated), oldest first.

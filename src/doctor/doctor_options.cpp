@@ -54,16 +54,16 @@ int complain(const std::string& what) {
 
 // What an option without an argument does.
 struct Switch {
-    int option;
     bool DoctorOptions::*field;
+    int option;
     bool value;
 };
 
-constexpr Switch kSwitches[]{{NO_PROBES, &DoctorOptions::probes, false},
-                             {ASK_SERVICE, &DoctorOptions::askService, true},
-                             {SETTINGS, &DoctorOptions::settingsOnly, true},
-                             {JSON, &DoctorOptions::json, true},
-                             {SHARE, &DoctorOptions::share, true}};
+constexpr Switch kSwitches[]{{&DoctorOptions::probes, NO_PROBES, false},
+                             {&DoctorOptions::askService, ASK_SERVICE, true},
+                             {&DoctorOptions::settingsOnly, SETTINGS, true},
+                             {&DoctorOptions::json, JSON, true},
+                             {&DoctorOptions::share, SHARE, true}};
 
 // What getopt_long() stopped at: a short option, or the whole argument.
 std::string badArgument(char** argv) {

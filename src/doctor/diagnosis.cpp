@@ -96,7 +96,7 @@ void tellSinceAtLeast(const Evidence& evidence, Diagnosis& diagnosis) {
     diagnosis.isSinceAtLeast = diagnosis.since && diagnosis.since == evidence.logBegin &&
                                evidence.history.front().cause.empty();
     const bool isTunnel = diagnosis.reach == Reach::RELAYED && evidence.has(Sign::TUNNEL_RUNS);
-    if (!isTunnel || !evidence.tunnelSince) return;
+    if (!isTunnel || !evidence.tunnelSince || *evidence.tunnelSince > evidence.now) return;
     if (diagnosis.since && *diagnosis.since <= *evidence.tunnelSince) return;
     diagnosis.since = evidence.tunnelSince;
     diagnosis.isSinceAtLeast = true;

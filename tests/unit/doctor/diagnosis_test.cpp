@@ -175,6 +175,7 @@ TEST(Diagnosis, SaysSinceWhenAtLeast) {
              {"the tunnel is older", {first}, at(50), at(50), true},
              {"the tunnel is younger", {later}, at(300), at(200), false},
              {"the log is silent", {}, at(300), at(300), true},
+             {"the clock was set back", {}, at(501), {}, false},
              {"nothing tells", {}, {}, {}, false}};
     for (const auto& row : rows) {
         Evidence evidence;

@@ -145,7 +145,7 @@ std::vector<Cause> publishingCauses() {
         {"publishing-failed",
          kNotDirect,
          {{S::LOGGED_PUBLISHING_FAILED}},
-         {},
+         {S::BACK_END_SILENT, S::LOGGED_BACK_END_SILENT},
          "The ports work, but their record could not be stored.",
          "Nothing needs to be done: the next search publishes them. If it lasts, look at the log of "
          "the device's back end, and tell the maker."},

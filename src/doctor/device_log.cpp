@@ -7,6 +7,7 @@
 #include <memory>
 #include <set>
 
+#include "doctor/journal.h"
 #include "doctor/log_line.h"
 #include "doctor/log_source.h"
 #include "doctor/log_story.h"
@@ -161,12 +162,15 @@ void summarise(const LogStory& story, Evidence& evidence) {
 }  // namespace
 
 void lookAtLog(const LogChoice& choice, Evidence& evidence) {
-    LogStory story;
+    LogStory story{evidence.has(Sign::MANUAL_MODE) ? LogStory::Ports::MANUAL
+                                                   : LogStory::Ports::AUTOMATIC};
     LineOrder order{story, evidence.now};
     if (!choice.files.empty()) {
         readChosen(choice, order, evidence);
     } else {
-        readJournal([&order](std::string_view line) { order.take(line); });
+        const std::string problem = readJournal(
+            [&order](std::string_view line) { order.take(line); }, choice.journalPatience);
+        if (!problem.empty()) cannotSee("journal: " + problem, evidence);
         if (!story.end()) readSystemLogs(choice.folder, story, order, evidence);
     }
     if (evidence.fromElsewhere && story.end()) evidence.now = *story.end();

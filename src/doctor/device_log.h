@@ -2,6 +2,7 @@
 #ifndef PELORUS_DOCTOR_DEVICE_LOG_H
 #define PELORUS_DOCTOR_DEVICE_LOG_H
 
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -14,7 +15,8 @@ struct LogChoice {
     /// In any order; compressed by gzip or not; "-" is standard input. Empty: the journal when it
     /// has lines of the daemon, else the system logger's files.
     std::vector<std::string> files;
-    std::string folder = "/var/log";  ///< where the system logger keeps its files
+    std::string folder = "/var/log";                   ///< where the system logger keeps its files
+    std::chrono::milliseconds journalPatience{10000};  ///< with a journal that gives no line
 };
 
 /// Adds what the log tells: history, signs, when the daemon started and goes on. For a log from

@@ -115,6 +115,18 @@ void tellSince(const Evidence& evidence, Diagnosis& diagnosis) {
     diagnosis.before = *before;
 }
 
+// What the log does not tell. The client's age is the least that a tunnel can be old.
+void tellSinceAtLeast(const Evidence& evidence, Diagnosis& diagnosis) {
+    if (diagnosis.before) return;
+    diagnosis.isSinceAtLeast = diagnosis.since && diagnosis.since == evidence.logBegin &&
+                               evidence.history.front().cause.empty();
+    const bool isTunnel = diagnosis.reach == Reach::RELAYED && evidence.has(Sign::TUNNEL_RUNS);
+    if (!isTunnel || !evidence.tunnelSince || *evidence.tunnelSince > evidence.now) return;
+    if (diagnosis.since && *diagnosis.since <= *evidence.tunnelSince) return;
+    diagnosis.since = evidence.tunnelSince;
+    diagnosis.isSinceAtLeast = true;
+}
+
 void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {
     if (diagnosis.reach != Reach::DIRECT) return;
     diagnosis.address = evidence.setting("EXTERNAL_IP");
@@ -133,9 +145,10 @@ Diagnosis diagnose(const Evidence& seen) {
     dropWhatIsOver(evidence);
     Diagnosis diagnosis;
     diagnosis.now = evidence.now;
-    diagnosis.fromElsewhere = evidence.fromElsewhere;
+    diagnosis.fromElsewhere = evidence.fromElsewhere && evidence.hasLog;
     diagnosis.reach = reachOf(evidence);
     tellSince(evidence, diagnosis);
+    tellSinceAtLeast(evidence, diagnosis);
     tellAddress(evidence, diagnosis);
     diagnosis.causes = findCauses(evidence, diagnosis.reach);
     if (diagnosis.reach == Reach::UNKNOWN) dropWhatExplainsNothing(diagnosis.causes);

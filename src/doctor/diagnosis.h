@@ -14,11 +14,12 @@ namespace pelorus::doctor {
 /// Everything the outputs show. Points into the table of causes only.
 struct Diagnosis {
     Time now{};
-    bool fromElsewhere = false;  ///< `now` is then the end of the log
+    bool fromElsewhere = false;  ///< only the log of another device was read; `now` is its end
     Reach reach = Reach::UNKNOWN;
     std::string address{};  ///< where it is reached directly; empty otherwise
     std::string ports{};    ///< "9091 and 9444"; empty otherwise
     std::optional<Time> since{};
+    bool isSinceAtLeast = false;     ///< it may have been so before `since`, too
     std::optional<Period> before{};  ///< how it was before `since`
     std::vector<NamedCause> causes;  ///< the first is the answer; the others lie behind it
     std::vector<Check> checks;

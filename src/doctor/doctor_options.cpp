@@ -1,6 +1,8 @@
 #include "doctor/doctor_options.h"
 
 #include <getopt.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <cstdio>
 
@@ -50,6 +52,19 @@ int complain(const std::string& what) {
     return kWrongUsage;
 }
 
+// What an option without an argument does.
+struct Switch {
+    bool DoctorOptions::*field;
+    int option;
+    bool value;
+};
+
+constexpr Switch kSwitches[]{{&DoctorOptions::probes, NO_PROBES, false},
+                             {&DoctorOptions::askService, ASK_SERVICE, true},
+                             {&DoctorOptions::settingsOnly, SETTINGS, true},
+                             {&DoctorOptions::json, JSON, true},
+                             {&DoctorOptions::share, SHARE, true}};
+
 // What getopt_long() stopped at: a short option, or the whole argument.
 std::string badArgument(char** argv) {
     if (optopt > 0 && optopt < LOG) return std::string{"-"} + static_cast<char>(optopt);
@@ -57,6 +72,11 @@ std::string badArgument(char** argv) {
 }
 
 std::optional<int> readOption(int found, char** argv, DoctorOptions& options) {
+    for (const Switch& known : kSwitches) {
+        if (known.option != found) continue;
+        options.*known.field = known.value;
+        return std::nullopt;
+    }
     switch (found) {
         case 'h':
             static_cast<void>(std::fputs(kHelp, stdout));
@@ -70,26 +90,20 @@ std::optional<int> readOption(int found, char** argv, DoctorOptions& options) {
         case SVG:
             options.picture = optarg;
             return std::nullopt;
-        case NO_PROBES:
-            options.probes = false;
-            return std::nullopt;
-        case ASK_SERVICE:
-            options.askService = true;
-            return std::nullopt;
-        case SETTINGS:
-            options.settingsOnly = true;
-            return std::nullopt;
-        case JSON:
-            options.json = true;
-            return std::nullopt;
-        case SHARE:
-            options.share = true;
-            return std::nullopt;
         case ':':
             return complain(std::string{argv[optind - 1]} + " needs a file");
         default:
             return complain("no such option: " + badArgument(argv));
     }
+}
+
+// Also through links, and through standard input.
+bool isSameFile(const std::string& log, const std::string& picture) {
+    struct stat left {};
+    struct stat right {};
+    const int found = log == "-" ? fstat(STDIN_FILENO, &left) : stat(log.c_str(), &left);
+    return found == 0 && stat(picture.c_str(), &right) == 0 && S_ISREG(left.st_mode) &&
+           left.st_dev == right.st_dev && left.st_ino == right.st_ino;
 }
 
 std::optional<int> contradiction(const DoctorOptions& options) {
@@ -98,6 +112,9 @@ std::optional<int> contradiction(const DoctorOptions& options) {
     if (options.settingsOnly && hasOthers) return complain("--settings goes only with --share");
     if (options.askService && !options.probes) {
         return complain("--ask-service is a probe, it does not go with --no-probes");
+    }
+    for (const std::string& log : options.logs) {
+        if (isSameFile(log, options.picture)) return complain("--svg would overwrite a log");
     }
     return std::nullopt;
 }

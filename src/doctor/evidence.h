@@ -76,6 +76,7 @@ struct Evidence {
     std::string unreadSettings{};  ///< why a file was not read: "the settings need root"
     std::string statusWord{};      ///< COMMUNICATION_STATUS of the settings
     DaemonState daemon{};
+    std::optional<Time> tunnelSince{};  ///< start of the tunnel client that runs
     std::map<Sign, Fact> signs;
     std::vector<Check> checks;
     std::vector<Period> history;      ///< oldest first

@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "common/version.h"
+#include "doctor/check_words.h"
 #include "doctor/local_time.h"
 #include "doctor/reach_words.h"
 
@@ -23,30 +24,6 @@ Json moment(const std::optional<Time>& when) {
 
 Json textOrNull(const std::string& text) {
     return text.empty() ? Json(nullptr) : Json(text);
-}
-
-const char* sourceName(Source source) {
-    switch (source) {
-        case Source::NOW:
-            return "now";
-        case Source::LOG:
-            return "log";
-        case Source::SETTINGS:
-            return "settings";
-    }
-    return "";
-}
-
-const char* verdictName(Check::Verdict verdict) {
-    switch (verdict) {
-        case Check::Verdict::OK:
-            return "ok";
-        case Check::Verdict::PROBLEM:
-            return "problem";
-        case Check::Verdict::NOT_SEEN:
-            return "not-seen";
-    }
-    return "";
 }
 
 // The numbers in "9091 and 9444".
@@ -78,7 +55,7 @@ Json causeList(const std::vector<NamedCause>& causes) {
         Json facts = Json::array();
         for (const Fact& fact : named.proofs) {
             facts.push_back({{"text", fact.text},
-                             {"source", sourceName(fact.source)},
+                             {"source", wordsFor(fact.source).name},
                              {"when", moment(fact.when)}});
         }
         list.push_back({{"name", named.cause->name},
@@ -92,8 +69,8 @@ Json causeList(const std::vector<NamedCause>& causes) {
 Json checkList(const std::vector<Check>& checks) {
     Json list = Json::array();
     for (const Check& check : checks) {
-        list.push_back({{"verdict", verdictName(check.verdict)},
-                        {"source", sourceName(check.source)},
+        list.push_back({{"verdict", wordsFor(check.verdict).name},
+                        {"source", wordsFor(check.source).name},
                         {"text", check.text}});
     }
     return list;
@@ -131,6 +108,7 @@ std::string jsonReport(const Diagnosis& diagnosis) {
                       {"address", textOrNull(diagnosis.address)},
                       {"ports", portList(diagnosis.ports)},
                       {"since", moment(diagnosis.since)},
+                      {"since_at_least", diagnosis.isSinceAtLeast},
                       {"before", before},
                       {"causes", causeList(diagnosis.causes)},
                       {"checks", checkList(diagnosis.checks)},

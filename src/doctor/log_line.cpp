@@ -78,7 +78,7 @@ Time localTime(std::tm parts) {
     return Time{std::chrono::seconds{std::mktime(&parts)}};
 }
 
-std::optional<Time> takeIsoStamp(std::string_view& line) {
+std::optional<Time> takeIsoStamp(std::string_view& line, Time now) {
     std::string_view rest = line;
     std::tm parts{};
     const auto year = takeNumber(rest, 4, kEarliestYear, kLatestYear);
@@ -97,9 +97,10 @@ std::optional<Time> takeIsoStamp(std::string_view& line) {
     parts.tm_year = *year - kTmYear;
     parts.tm_mon = *month - 1;
     parts.tm_mday = *day;
+    const Time when = zone ? Time{std::chrono::seconds{timegm(&parts) - *zone}} : localTime(parts);
+    if (when > now + kFuture) return std::nullopt;
     line = rest;
-    if (!zone) return localTime(parts);
-    return Time{std::chrono::seconds{timegm(&parts) - *zone}};
+    return when;
 }
 
 std::optional<Time> latestNotInFuture(const std::tm& parts, Time now) {
@@ -193,7 +194,7 @@ std::string_view withoutEnd(std::string_view text) {
 
 std::optional<Time> takeStamp(std::string_view& line, Time now) {
     skipPriority(line);
-    if (!line.empty() && isDigit(line.front())) return takeIsoStamp(line);
+    if (!line.empty() && isDigit(line.front())) return takeIsoStamp(line, now);
     return takeClassicStamp(line, now);
 }
 

@@ -17,7 +17,7 @@ struct LogLine {
 
 /// Reads the time stamp at the start of @p line: classic ("Nov  2 12:07:01", local time, in the
 /// latest year that does not lie in the future of @p now) or RFC 3339, both also after "<134>".
-/// Removes it from @p line. Empty when there is none.
+/// Removes it from @p line. Empty when there is none, or it is more than a day after @p now.
 std::optional<Time> takeStamp(std::string_view& line, Time now);
 
 /// Reads @p line if it is the daemon's: the program must be called exactly "Pelorus" or "pelorus",

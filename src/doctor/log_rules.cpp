@@ -82,6 +82,7 @@ const std::vector<Sign> kBackEnd{Sign::LOGGED_BACK_END_SILENT, Sign::LOGGED_BACK
 
 constexpr std::string_view kNoBackEnd = "the local back end does not answer";
 constexpr std::string_view kBackEndRefuses = "the local back end refuses what it is told";
+constexpr std::string_view kWait = "the service asked to wait {wait} s|the service asked to wait";
 constexpr std::string_view kNoCredentials = "device id or authorisation is missing";
 constexpr std::string_view kDiffer = "the public names do not lead to one address";
 constexpr std::string_view kUnresolved = "a public name does not resolve";
@@ -94,7 +95,7 @@ Rules lifeRules() {
     alert("main - syslog severity level set to %d.").happens(LogEvent::ANNOUNCED),
     notice("main - %s daemon starting up, Version: [%s]").happens(LogEvent::STARTED),
     error("main - config file failed to load.").happens(LogEvent::START_FAILED)
-        .sets(Sign::LOGGED_START_FAILED, "the settings could not be read at the start: {file}"),
+        .sets(Sign::LOGGED_START_FAILED, "the settings could not be read at the start: {file}|the settings could not be read at the start"),
     error("GlobalConfig::loadConfig() - failed to open dynamic config settings file: %s").keeps(Kept::FILE),
     error("GlobalConfig::loadConfig() - failed to create temporary dynamic config file: %s").keeps(Kept::FILE),
     error("GlobalConfig::loadConfig() - failed to write temporary dynamic config file: %s").keeps(Kept::FILE),
@@ -153,7 +154,7 @@ Rules gatewayRules() {
     info("ConnectionManager::forwardPort - forwarding internal port: %d ").clears(kRefusals),
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
-        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}"),
+        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d")
         .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (UPnP error {3})"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d")
@@ -171,13 +172,13 @@ Rules testRules() {
     error("TavikClient::checkHddStandByMode - failed to get open Ostrel sleep count file.")
         .sets(Sign::LOGGED_TEST_SKIPPED_DISK, "the port test was skipped: nothing tells how long the disk was unused"),
     info("TavikClient::testPort - server has requested sleep.")
-        .sets(Sign::LOGGED_SERVICE_WAIT, "the service asked to wait {wait} s"),
+        .sets(Sign::LOGGED_SERVICE_WAIT, kWait),
     info("TavikClient::testPort[1-3] - Port Test URL: [%s]").keeps(Kept::PORT)
         .clears({Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_SERVICE_WAIT, Sign::LOGGED_CREDENTIALS_MISSING}),
     notice("TavikClient::testPort[%d] - httpGet got %s, %d bytes from central server.").happens(LogEvent::TEST_ANSWER),
     error("TavikClient::testPort[%d] - httpGet for %s, no response from central server.").happens(LogEvent::TEST_UNANSWERED),
     error("TavikClient::testPort - Enforce connection as RELAY (double-NAT detected")
-        .sets(Sign::LOGGED_SECOND_NAT, "the gateway says {gateway}, the service sees {service}")
+        .sets(Sign::LOGGED_SECOND_NAT, "the gateway says {gateway}, the service sees {service}|the service sees another address than the gateway's")
         .clears({Sign::LOGGED_TEST_FAILED}).happens(LogEvent::PORTS_LOST),
     info("TavikClient::testPort - Requested external IP: [%s] / Respond remote external IP: [%s].").keeps(Kept::GATEWAY),
     info("TavikClient::testPort - Response remote external IP: [%s].").keeps(Kept::SERVICE),
@@ -218,7 +219,7 @@ Rules serviceRules() {
         .sets(Sign::LOGGED_SERVICE_NONSENSE, "the service's answer about waiting is not understood"),
     error("TavikClient::pollServerForSleepTime - httpGet for %s, failed to get response").happens(LogEvent::SERVICE_FAILED),
     info("TavikClient::getMyIP - server has requested sleep %d seconds.").keeps(Kept::WAIT)
-        .sets(Sign::LOGGED_SERVICE_WAIT, "the service asked to wait {wait} s"),
+        .sets(Sign::LOGGED_SERVICE_WAIT, kWait),
     error("TavikClient::getMyIP - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
     info("TavikClient::getMyIP - httpGet Response [%d bytes]").clears(kService),
     error("TavikClient::updateServerMapping - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
@@ -262,7 +263,7 @@ Rules relayRules() {
     info("VPNManager::openVPNConnection() - openVPN is already running").happens(LogEvent::RELAY_UP).clears(kTunnel),
     info("ConnectionManager::createRelayConnection() - openVPN process is running.").happens(LogEvent::RELAY_UP).clears(kTunnel),
     info("ConnectionManager::createRelayConnection() - server requested sleep, therefore openVPN will not be started")
-        .sets(Sign::LOGGED_SERVICE_WAIT, "the service asked to wait {wait} s"),
+        .sets(Sign::LOGGED_SERVICE_WAIT, kWait),
     error("VPNManager::openVPNConnection() - failed to get DEVICEID and/or DEVICEAUTH settings")
         .sets(Sign::LOGGED_CREDENTIALS_MISSING, kNoCredentials),
     error("VPNManager::openVPNConnection() - failed to open VPN Auth file for write!")
@@ -291,7 +292,7 @@ Rules nameRules() {
         .happens(LogEvent::ADDRESS_LOST).sets(Sign::LOGGED_NAMES_LEAD_ELSEWHERE, kDiffer).clears({Sign::LOGGED_NAMES_UNRESOLVED}),
     error("ConnectionManager::checkDNS - DNS check failed for 4-level device domain name, DNS IP address is %s, local value of IP address is %s")
         .happens(LogEvent::ADDRESS_LOST).clears({Sign::LOGGED_NAMES_UNRESOLVED})
-        .sets(Sign::LOGGED_NAMES_LEAD_ELSEWHERE, "the public names lead to {1} instead of {2}"),
+        .sets(Sign::LOGGED_NAMES_LEAD_ELSEWHERE, "the public names lead to {1} instead of {2}|the public names lead to another address than the published one"),
     info("ConnectionManager::checkDNS - DNS matches local value for device domain names").clears(kNames),
     };
 }

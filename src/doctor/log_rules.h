@@ -62,7 +62,8 @@ struct LogRule {
     LogEvent event = LogEvent::NOTHING;
     std::vector<Sign> set{};
     std::vector<Sign> cleared{};
-    /// The fact's text: "{2}" stands for the second value, "{gateway}" for a kept one.
+    /// The fact's text: "{2}" stands for the second value, "{gateway}" for a kept one. Wordings
+    /// are separated by "|": the first counts of which no value is empty, else the last.
     std::string_view words{};
     Kept kept = Kept::NOTHING;
     std::size_t keptValue = 1;        ///< which one is kept, counted from 1

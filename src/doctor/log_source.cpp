@@ -1,9 +1,7 @@
 #include "doctor/log_source.h"
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -47,6 +45,16 @@ int openToRead(const std::string& path, bool orPipe, std::string& problem) {
     close(descriptor);
     problem = "it is no regular file";
     return -1;
+}
+
+// What follows the name of a log that was rotated: ".1", "-20261101", both also with ".gz".
+bool isRotated(std::string_view end) {
+    constexpr std::size_t kDate = 8;
+    if (end.empty() || (end.front() != '.' && end.front() != '-')) return false;
+    const std::size_t digits = std::min(end.find_first_not_of("0123456789", 1), end.size()) - 1;
+    if (digits < (end.front() == '-' ? kDate : 1)) return false;
+    end.remove_prefix(digits + 1);
+    return end.empty() || end == ".gz";
 }
 
 }  // namespace
@@ -140,35 +148,6 @@ bool LogStream::read(const LineFilter::Taker& taker) {
     return false;
 }
 
-bool readJournal(const LineFilter::Taker& taker) {
-    std::array<int, 2> ends{};
-    if (pipe2(ends.data(), O_CLOEXEC) != 0) return false;
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, ends[1], STDOUT_FILENO);
-    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-    std::array<std::string, 9> words{"journalctl", "-q", "-o",      "short-iso", "-t",
-                                     "Pelorus",    "-t", "pelorus", "--no-pager"};
-    std::array<char*, 10> arguments{};
-    std::transform(words.begin(), words.end(), arguments.begin(),
-                   [](std::string& word) { return word.data(); });
-    pid_t child = 0;
-    const int error =
-        posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    close(ends[1]);
-    if (error != 0) {
-        close(ends[0]);
-        return false;
-    }
-    LogStream stream{ends[0]};
-    const bool whole = stream.isOpen() && stream.read(taker);
-    int status = 0;
-    while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
-    }
-    return whole && WIFEXITED(status) && WEXITSTATUS(status) == 0;
-}
-
 std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name) {
     namespace fs = std::filesystem;
     std::vector<std::pair<fs::file_time_type, std::string>> found;
@@ -178,10 +157,7 @@ std::vector<std::string> rotatedLogs(const std::string& folder, const std::strin
         const std::string file = entry->path().filename();
         if (file.compare(0, name.size(), name) != 0) continue;
         const std::string end = file.substr(name.size());
-        const std::size_t digits = std::min(end.find_first_not_of("0123456789", 1), end.size());
-        const bool rotated = end.size() > 1 && end.front() == '.' && digits > 1 &&
-                             (digits == end.size() || end.substr(digits) == ".gz");
-        if (!end.empty() && !rotated) continue;
+        if (!end.empty() && !isRotated(end)) continue;
         std::error_code ignored;
         found.emplace_back(entry->last_write_time(ignored), entry->path());
     }

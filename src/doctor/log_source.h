@@ -65,11 +65,8 @@ private:
     bool pipe = false;
 };
 
-/// The lines of the system's journal that the daemon logged. False when there is no journal.
-bool readJournal(const LineFilter::Taker& taker);
-
 /// The files in which system loggers of Debian and its relatives keep @p name under @p folder, with
-/// the rotated ones, oldest first.
+/// the rotated ones (numbered or dated), oldest first.
 std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name);
 
 }  // namespace pelorus::doctor

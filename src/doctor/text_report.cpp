@@ -4,7 +4,7 @@
 #include <cctype>
 #include <string_view>
 
-#include "doctor/age.h"
+#include "doctor/check_words.h"
 #include "doctor/history_text.h"
 #include "doctor/lines.h"
 #include "doctor/local_time.h"
@@ -24,33 +24,9 @@ constexpr std::size_t kVerdictWidth = 9;
 constexpr std::size_t kSourceWidth = 8;
 constexpr const char* kEndOfColour = "\033[0m";
 
-const char* sourceName(Source source) {
-    switch (source) {
-        case Source::NOW:
-            return "seen now";
-        case Source::LOG:
-            return "log";
-        case Source::SETTINGS:
-            return "settings";
-    }
-    return "";
-}
-
-struct VerdictWords {
-    std::string name;
-    const char* colour;
-};
-
-VerdictWords verdictWords(Verdict verdict) {
-    switch (verdict) {
-        case Verdict::OK:
-            return {"ok", "\033[32m"};
-        case Verdict::PROBLEM:
-            return {"PROBLEM", "\033[1;31m"};
-        case Verdict::NOT_SEEN:
-            return {"not seen", "\033[33m"};
-    }
-    return {"", ""};
+const char* verdictColour(Verdict verdict) {
+    if (verdict == Verdict::OK) return "\033[32m";
+    return verdict == Verdict::PROBLEM ? "\033[1;31m" : "\033[33m";
 }
 
 const char* headlineColour(Reach reach) {
@@ -145,7 +121,7 @@ std::string TextReport::sinceWhen() const {
     }
     if (diagnosis.since) {
         if (!text.empty()) text += diagnosis.fromElsewhere ? ";" : ",";
-        text += " since ";
+        text += diagnosis.isSinceAtLeast ? " since at least " : " since ";
         text += momentInWords(*diagnosis.since, today) + " (" +
                 timeBetween(*diagnosis.since, diagnosis.now) + ")";
     } else if (diagnosis.reach != Reach::UNKNOWN && !diagnosis.fromElsewhere) {
@@ -281,14 +257,14 @@ Lines TextReport::checks(const Compactness& compactness) const {
     const std::size_t textWidth = std::min(longest, checkWidth());
     Lines lines;
     for (const Check& check : shown) {
-        const VerdictWords verdict = verdictWords(check.verdict);
+        const std::string name{wordsFor(check.verdict).inReport};
         Lines wrapped =
             hang(std::string(kVerdictWidth, ' '), check.text, kVerdictWidth + textWidth);
         std::string& first = wrapped.front();
-        first = padded(first, kVerdictWidth + textWidth + 1) + sourceName(check.source);
-        const std::string name =
-            colours ? verdict.colour + verdict.name + kEndOfColour : verdict.name;
-        first.replace(0, verdict.name.size(), name);
+        first = padded(first, kVerdictWidth + textWidth + 1);
+        first += wordsFor(check.source).inReport;
+        first.replace(0, name.size(),
+                      colours ? verdictColour(check.verdict) + name + kEndOfColour : name);
         append(lines, wrapped);
     }
     for (const std::string& text : diagnosis.untold) append(lines, hang("unknown  ", text, width));

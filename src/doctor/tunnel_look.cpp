@@ -102,6 +102,7 @@ private:
         const auto client = pid ? processes.find(*pid) : std::nullopt;
         if (client && isTunnelClient(*client)) {
             conclude(Sign::TUNNEL_RUNS, Verdict::OK, "tunnel client up" + described(*client));
+            evidence.tunnelSince = client->since;
             lookForSecond(*client);
         } else {
             reportNoClient(pidFile, file, pid);

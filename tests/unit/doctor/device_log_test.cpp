@@ -50,6 +50,11 @@ protected:
         return path(name);
     }
 
+    void journal(const std::string& script) {
+        plain("journalctl", "#!/bin/sh\n" + script + "\n");
+        chmod(path("journalctl").c_str(), 0700);
+    }
+
     Evidence look(const std::vector<std::string>& files) {
         Evidence evidence;
         evidence.now = Time{std::chrono::seconds{1795316400}};
@@ -57,6 +62,7 @@ protected:
         LogChoice choice;
         choice.files = files;
         choice.folder = folder;
+        choice.journalPatience = std::chrono::seconds{1};
         lookAtLog(choice, evidence);
         return evidence;
     }
@@ -86,18 +92,45 @@ TEST_F(DeviceLogTest, FilesInAnyOrderPlainOrZippedAndRepeated) {
 TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
     plain("messages", kFirst + kSecond);  // the same lines once more
     plain("syslog", kSecond);
-    const std::string rotated = zipped("syslog.2.gz", kFirst);
     plain("syslog.1.old", kFirst);
-    fs::last_write_time(rotated, fs::file_time_type::clock::now() - std::chrono::hours{24});
-    expectWhole(look({}));
+    for (const char* const name : {"syslog.2.gz", "syslog-20261121.gz"}) {
+        const std::string rotated = zipped(name, kFirst);
+        fs::last_write_time(rotated, fs::file_time_type::clock::now() - std::chrono::hours{24});
+        expectWhole(look({}));
+        fs::remove(rotated);
+    }
 }
 
 TEST_F(DeviceLogTest, TheJournalComesFirst) {
     plain("syslog", kFirst);
     plain("lines", kFirst + kSecond);
-    plain("journalctl", "#!/bin/sh\nexec /bin/cat " + path("lines") + "\n");
-    chmod(path("journalctl").c_str(), 0700);
+    journal("exec /bin/cat " + path("lines"));
     expectWhole(look({}));
+}
+
+TEST_F(DeviceLogTest, AJournalThatCannotBeReadIsSaid) {
+    plain("syslog", kFirst + kSecond);
+    const std::pair<std::string, std::string> rows[]{
+        {"echo 'No permission.\nMore.' >&2; exit 1", "journal: No permission."},
+        {"exit 3", "journal: journalctl ended with status 3"},
+        {"exec /bin/sleep 60", "journal: no line for 1 s"}};
+    for (const auto& [script, problem] : rows) {
+        journal(script);
+        const Evidence evidence = look({});
+        EXPECT_EQ(evidence.checks.front().verdict, Check::Verdict::NOT_SEEN);
+        EXPECT_EQ(evidence.checks.front().text, problem);
+        expectWhole(evidence);
+    }
+}
+
+TEST_F(DeviceLogTest, AJournalMayBeSlowerThanItsLinesAre) {
+    plain("first", kFirst);
+    plain("second", kSecond);
+    const std::string cat = "/bin/cat " + path("first") + "; /bin/sleep 0.6; echo other; ";
+    journal(cat + "/bin/sleep 0.6; exec /bin/cat " + path("second"));
+    const Evidence evidence = look({});
+    EXPECT_EQ(evidence.checks.front().verdict, Check::Verdict::OK);
+    expectWhole(evidence);
 }
 
 TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {

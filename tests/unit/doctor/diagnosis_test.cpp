@@ -120,6 +120,12 @@ const std::vector<Seen> kSeen{
      Reach::DIRECT,
      "back-end-silent",
      0},
+    {"back end that does not take the ports",
+     "failed",
+     {S::DAEMON_RUNS, S::LOGGED_PUBLISHING_FAILED, S::LOGGED_BACK_END_SILENT},
+     Reach::NOT_REACHED,
+     "back-end-silent",
+     2},
     {"no openvpn",
      "failed",
      {S::DAEMON_RUNS, S::RELAY_CLIENT_MISSING, S::NO_GATEWAY_ANSWERS},
@@ -233,6 +239,44 @@ TEST(Diagnosis, NamesTheCauseThatTheSignsCarry) {
         EXPECT_EQ(first, seen.cause) << seen.name;
         EXPECT_EQ(exitStatus(diagnosis), seen.status) << seen.name;
     }
+}
+
+// The log begins at 100, now is 500.
+TEST(Diagnosis, SaysSinceWhenAtLeast) {
+    const auto at = [](int seconds) { return Time{std::chrono::seconds{seconds}}; };
+    const Period first{Reach::RELAYED, at(100), "", ""};
+    const Period later{Reach::RELAYED, at(200), "", "the tunnel came up"};
+    const struct {
+        const char* name;
+        std::vector<Period> history;
+        std::optional<Time> tunnelSince, since;
+        bool isAtLeast;
+    } rows[]{{"the log tells", {{Reach::DIRECT, at(100), "", ""}, later}, at(50), at(200), false},
+             {"the log begins in the middle", {first}, {}, at(100), true},
+             {"the tunnel is older", {first}, at(50), at(50), true},
+             {"the tunnel is younger", {later}, at(300), at(200), false},
+             {"the log is silent", {}, at(300), at(300), true},
+             {"the clock was set back", {}, at(501), {}, false},
+             {"nothing tells", {}, {}, {}, false}};
+    for (const auto& row : rows) {
+        Evidence evidence;
+        evidence.now = at(500);
+        evidence.logBegin = at(100);
+        evidence.add(Sign::TUNNEL_RUNS, Source::NOW, "tunnel client up");
+        evidence.history = row.history;
+        evidence.tunnelSince = row.tunnelSince;
+        const Diagnosis diagnosis = diagnose(evidence);
+        EXPECT_EQ(diagnosis.since, row.since) << row.name;
+        EXPECT_EQ(diagnosis.isSinceAtLeast, row.isAtLeast) << row.name;
+    }
+}
+
+TEST(Diagnosis, WithoutALogThereIsNoEndOfIt) {
+    Evidence evidence;
+    evidence.fromElsewhere = true;
+    EXPECT_FALSE(diagnose(evidence).fromElsewhere);
+    evidence.hasLog = true;
+    EXPECT_TRUE(diagnose(evidence).fromElsewhere);
 }
 
 }  // namespace

@@ -1,7 +1,9 @@
 #include "doctor/doctor_options.h"
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <fstream>
 #include <sstream>
 
 namespace pelorus::doctor {
@@ -23,7 +25,14 @@ TEST(DoctorOptions, AreReadOrRefusedInOneLine) {
     struct Row {
         const char *arguments, *wanted, *complaint;
     };
+    // Two names of one file: a log must not be overwritten by the picture of it.
+    const std::string log = testing::TempDir() + "pelorus-doctor-options.log", link = log + ".svg";
+    std::ofstream{log} << "a line";
+    unlink(link.c_str());
+    ASSERT_EQ(symlink(log.c_str(), link.c_str()), 0);
+    const std::string overwrites = "--log a --log " + log + " --svg " + link;
     const Row rows[]{{"", "", ""},
+                     {overwrites.c_str(), "", "--svg would overwrite a log"},
                      {"--log a --log - --no-probes --json --svg b --share",
                       "log=a log=- files json share svg=b ", ""},
                      {"--ask-service --log=c", "log=c ask ", ""},

@@ -22,7 +22,7 @@ TEST(JsonReport, HasEverything) {
     EXPECT_EQ(report, json::parse(R"json({
         "schema": 1, "now": "2026-11-22T15:27:00+00:00", "from_elsewhere": false,
         "reach": "relayed", "address": null, "ports": [9091, 9444],
-        "since": "2026-11-22T12:07:00+00:00",
+        "since": "2026-11-22T12:07:00+00:00", "since_at_least": false,
         "before": {"reach": "direct", "since": "2026-11-10T12:07:00+00:00",
                    "until": "2026-11-22T12:07:00+00:00", "address": "203.0.113.7",
                    "cause": "ports forwarded"},

@@ -36,6 +36,8 @@ TEST_F(LogLineTest, StampsOfEveryLogger) {
         {"2026-11-22T02:40:00+0100 nas Pelorus[7]: x", kNow - 4800},
         {"2026-11-22T01:40:00Z nas Pelorus[7]: x", kNow - 4800},
         {"2026-11-22T02:40:00 nas Pelorus: x", kNow - 4800},
+        {"2026-11-23T03:00:00Z nas Pelorus: x", kNow + 86400},  // a clock or zone of another device
+        {"2026-11-23T03:00:01Z nas Pelorus: x", -1},
         {"Nov 31 12:00:00 nas Pelorus: x", -1},
         {"Foo 22 03:00:00 nas Pelorus: x", -1},
         {"Nov 22 24:00:00 nas Pelorus: x", -1},

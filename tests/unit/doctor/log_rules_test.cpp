@@ -57,6 +57,10 @@ TEST(LogRules, EachWordKnowsItsValue) {
             EXPECT_TRUE(number || keptNamed(name) != Kept::NOTHING) << rule.words;
         }
         EXPECT_EQ(rule.set.empty(), rule.words.empty()) << rule.text;
+        // What was not logged leaves no gap.
+        const std::string_view last = rule.words.substr(rule.words.rfind('|') + 1);
+        const std::size_t open = last.find('{');
+        EXPECT_TRUE(open == std::string_view::npos || std::isdigit(last[open + 1])) << rule.words;
     }
 }
 

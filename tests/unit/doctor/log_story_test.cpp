@@ -8,40 +8,38 @@
 namespace pelorus::doctor {
 namespace {
 
-constexpr const char* kStart =
-    "main - pelorus daemon starting up, Version: [1.7.0], PID: [64], SID: [64]";
-constexpr const char* kNoUpnp =
-    "Router::upnp_discover - UPnP Discover failed to return any response.";
-constexpr const char* kNoNatpmp = "Router::natpmp_discover - failed to get External IP address";
-constexpr const char* kTunnelStarts =
-    "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.";
-constexpr const char* kTunnelUp =
-    "VPNManager::openVPNConnection() - openVPN has started successfully";
-constexpr const char* kPause = "DaemonControl::run - retry connection after 120 secs.";
-constexpr const char* kPassed =
-    "TavikClient::testPort[1] - httpGet got <port_test><status>Success</status>"
-    "<external_ip>203.0.113.7</external_ip></port_test>, 90 bytes from central server.";
-constexpr const char* kSecondNatAnswer =
-    "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status><remote_external_ip>"
-    "203.0.113.7</remote_external_ip><external_ip>100.64.3.9</external_ip></port_test>, 90 bytes "
-    "from central server.";
-constexpr const char* kSecondNat =
-    "TavikClient::testPort - Enforce connection as RELAY (double-NAT detected: Server-returned "
-    "external IP != router's external IP).";
-constexpr const char* kPublished =
-    "TavikClient::updateServerMapping - httpGet got <status>Success</status>, 24 bytes.";
-constexpr const char* kStatusDirect =
-    "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [portforwarded].";
-constexpr const char* kStatusFailed =
-    "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [failed].";
-constexpr const char* kTestFailed = "TavikClient::testPort - port map check failed.";
-constexpr const char* kRelayFailed =
-    "ConnectionManager::createRelayConnection() - failed to create VPN connection.";
-constexpr const char* kStaleTunnel =
-    "VPNManager::isVPNRunning() - unlink stale openVPN pid file /run/openvpn.pid";
-constexpr const char* kSigterm = "sigTrap - Received SIGTERM signal.";
-constexpr const char* kOff = "DaemonControl::disableRemoteAccess - remote access is disabled.";
-constexpr const char* kSecondNatFact = "the gateway says 100.64.3.9, the service sees 203.0.113.7";
+constexpr const char *
+    kStart = "main - pelorus daemon starting up, Version: [1.7.0], PID: [64], SID: [64]",
+   *kNoUpnp = "Router::upnp_discover - UPnP Discover failed to return any response.",
+   *kNoNatpmp = "Router::natpmp_discover - failed to get External IP address",
+   *kTunnelStarts =
+       "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.",
+   *kTunnelUp = "VPNManager::openVPNConnection() - openVPN has started successfully",
+   *kPause = "DaemonControl::run - retry connection after 120 secs.",
+   *kPassed =
+       "TavikClient::testPort[1] - httpGet got <port_test><status>Success</status>"
+       "<external_ip>203.0.113.7</external_ip></port_test>, 90 bytes from central server.",
+   *kFailedAnswer =
+       "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status></port_test>, 52 "
+       "bytes from central server.",
+   *kSecondNatAnswer =
+       "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status><remote_external_ip>"
+       "203.0.113.7</remote_external_ip><external_ip>100.64.3.9</external_ip></port_test>, 90 bytes "
+       "from central server.",
+   *kSecondNat =
+       "TavikClient::testPort - Enforce connection as RELAY (double-NAT detected: Server-returned "
+       "external IP != router's external IP).",
+   *kPublished =
+       "TavikClient::updateServerMapping - httpGet got <status>Success</status>, 24 bytes.",
+   *kStatusDirect =
+       "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [portforwarded].",
+   *kStatusFailed = "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [failed].",
+   *kTestFailed = "TavikClient::testPort - port map check failed.",
+   *kRelayFailed = "ConnectionManager::createRelayConnection() - failed to create VPN connection.",
+   *kStaleTunnel = "VPNManager::isVPNRunning() - unlink stale openVPN pid file /run/openvpn.pid",
+   *kSigterm = "sigTrap - Received SIGTERM signal.",
+   *kOff = "DaemonControl::disableRemoteAccess - remote access is disabled.",
+   *kSecondNatFact = "the gateway says 100.64.3.9, the service sees 203.0.113.7";
 
 using Lines = std::vector<std::pair<int, const char*>>;  // seconds, and what is logged then
 
@@ -240,6 +238,29 @@ TEST(LogStory, HistoryAndSigns) {
           {130, kNoUpnp}},
          "4 direct: the ports passed their test and were published|",
          {}},
+        {"NAT-PMP only, of which nothing is logged, and a filter",
+         {{0, kStart}, {2, kNoUpnp}, {9, kFailedAnswer}, {9, kTestFailed}, {130, kNoUpnp}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_TEST_FAILED}},
+        {"a gateway that is gone, and its ports with it",
+         {{0, kStart},
+          {4, kPassed},
+          {4, kPublished},
+          {130, kNoUpnp},
+          {139, kFailedAnswer},
+          {139, kTestFailed}},
+         "4 " + direct + "139 not reached: no gateway answers UPnP|",
+         {Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_TEST_FAILED}},
+        {"an answer that is too long",
+         {{0, kStart},
+          {5,
+           "TavikClient curlRcvData - Buffer overrun detected, read buffer too small, transfer "
+           "aborted"},
+          {5, "TavikClient::httpGet  Error: [Failed writing received data to disk/application]"},
+          {5,
+           "TavikClient::testPort[1] - httpGet for https://x, no response from central server."}},
+         "0 not reached: the daemon started|",
+         {Sign::LOGGED_ATTEMPT, Sign::LOGGED_SERVICE_NONSENSE}},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
@@ -267,6 +288,32 @@ TEST(LogStory, TellsValuesAndTimes) {
     EXPECT_EQ(evidence.daemon.since, at(0));
     EXPECT_EQ(evidence.daemon.nextCycle, at(140));
     EXPECT_TRUE(evidence.hasProgressLines);
+}
+
+TEST(LogStory, WordsWhatWasNotLogged) {
+    const Evidence evidence = told({{0, kSecondNat}}, 30);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_SECOND_NAT).text,
+              "the service sees another address than the gateway's");
+}
+
+TEST(LogStory, SaysWhoDidNotTakeThePorts) {
+    const char* const unsaid =
+        "TavikClient::updateServerMapping - failed to get response from localhost for url: [x].";
+    const char* const failed =
+        "ConnectionManager::createDirectConnection() - failed to update mapping info for x";
+    const Evidence evidence = told({{0, kStart}, {9, kPublished}, {9, unsaid}, {9, failed}}, 30);
+    EXPECT_EQ(evidence.signs.at(Sign::LOGGED_PUBLISHING_FAILED).text,
+              "the ports that passed their test could not be published: the local back end does "
+              "not answer");
+}
+
+// Before a clock that was set back, in the pause, and after it.
+TEST(LogStory, TheNextCycleIsToldDuringThePauseBeforeIt) {
+    const std::pair<int, bool> rows[]{{99, false}, {100, true}, {220, true}, {221, false}};
+    for (const auto& [now, isTold] : rows) {
+        EXPECT_EQ(told({{0, kStart}, {100, kPause}}, now).daemon.nextCycle.has_value(), isTold)
+            << now;
+    }
 }
 
 TEST(LogStory, KeepsTheLast2000Periods) {

@@ -42,6 +42,7 @@ TEST(TextReport, ItsHeadlineSaysWhatIsKnown) {
         std::optional<minutes> age;
         bool isElsewhere;
         std::string wanted;
+        bool isAtLeast = false;
     };
     const std::string direct = "REACHED DIRECTLY on 203.0.113.7, ports 9091 and 9444";
     const Row rows[]{
@@ -54,6 +55,7 @@ TEST(TextReport, ItsHeadlineSaysWhatIsKnown) {
         {Reach::UNKNOWN, std::nullopt, false, "IT COULD NOT BE TOLD how the device is reached."},
         {Reach::RELAYED, minutes{5}, true,
          "RELAYED as of 15:27 yesterday, where the log ends; since 15:22 yesterday (5 min)."},
+        {Reach::RELAYED, hours{24}, false, "RELAYED since at least 15:27 yesterday (1 day).", true},
         {Reach::RELAYED, -minutes{5}, false, "RELAYED since 15:32 today (0 s)."}};
     for (const Row& row : rows) {
         Diagnosis diagnosis;
@@ -62,6 +64,7 @@ TEST(TextReport, ItsHeadlineSaysWhatIsKnown) {
         diagnosis.fromElsewhere = row.isElsewhere;
         diagnosis.address = "203.0.113.7";
         diagnosis.ports = "9091 and 9444";
+        diagnosis.isSinceAtLeast = row.isAtLeast;
         if (row.age) diagnosis.since = diagnosis.now - *row.age;
         Layout layout;
         if (row.isElsewhere) layout.today = diagnosis.now + hours{24};

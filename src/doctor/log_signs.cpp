@@ -1,0 +1,218 @@
+#include "doctor/log_signs.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "doctor/shown_text.h"
+
+namespace pelorus::doctor {
+
+namespace {
+
+constexpr std::string_view kNoGateway = "no gateway answers UPnP or NAT-PMP";
+constexpr std::string_view kMissing = "(not logged)";
+// libcurl's words for an answer that was not taken: the line before says why.
+constexpr std::string_view kDropped = "Failed writing received data";
+
+// What is no reason why the device is not reached.
+constexpr std::array<Sign, 3> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_TWO_TUNNELS,
+                                         Sign::LOGGED_END};
+const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
+                                      Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
+                                      Sign::LOGGED_SERVICE_CERTIFICATE};
+const std::vector<Sign> kRelaySolves{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
+                                     Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
+                                     Sign::LOGGED_SECOND_NAT};
+
+bool startsWith(std::string_view text, std::string_view beginning) {
+    return text.compare(0, beginning.size(), beginning) == 0;
+}
+
+bool contains(std::string_view text, std::string_view part) {
+    return text.find(part) != std::string_view::npos;
+}
+
+std::string_view tagged(std::string_view answer, std::string_view tag) {
+    const std::string opening = "<" + std::string{tag} + ">";
+    const std::string closing = "</" + std::string{tag} + ">";
+    const std::size_t begin = answer.find(opening);
+    if (begin == std::string_view::npos) return {};
+    const std::string_view rest = answer.substr(begin + opening.size());
+    const std::size_t end = rest.find(closing);
+    return end == std::string_view::npos ? std::string_view{} : rest.substr(0, end);
+}
+
+// The number after "port=" in a URL; how the URL is built is a setting.
+std::string_view portOf(std::string_view url) {
+    const std::size_t begin = url.find("&port=");
+    if (begin == std::string_view::npos) return {};
+    url.remove_prefix(begin + std::string_view{"&port="}.size());
+    return url.substr(0, std::min(url.find_first_not_of("0123456789"), url.size()));
+}
+
+}  // namespace
+
+void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
+    if (rule.kept != Kept::NOTHING) {
+        const std::string_view text = values[rule.keptValue - 1];
+        value(rule.kept) = shownText(rule.kept == Kept::PORT ? portOf(text) : text);
+    }
+    clear(rule.cleared);
+    if (rule.exception && has(*rule.exception)) return;
+    for (const Sign sign : rule.set) set(sign, when, filled(rule.words, values));
+}
+
+void LogSigns::set(Sign sign, Time when, const std::string& text) {
+    if (reason == sign && has(sign)) return;  // the first of several tells most
+    signs[sign] = {Source::LOG, text, when};
+    const bool explains = std::count(kNoReasons.begin(), kNoReasons.end(), sign) == 0;
+    if (!reason && explains) reason = sign;
+}
+
+void LogSigns::clear(const std::vector<Sign>& cleared) {
+    for (const Sign sign : cleared) {
+        signs.erase(sign);
+        if (reason == sign) reason.reset();
+    }
+}
+
+void LogSigns::forget() {
+    signs.clear();
+    reason.reset();
+}
+
+bool LogSigns::takeTestAnswer(std::string_view answer, Time when) {
+    clear(kServiceSigns);
+    clear({Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,
+           Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_CREDENTIALS_MISSING,
+           Sign::LOGGED_MANUAL_PORT_INVALID});
+    const std::string asked = shownText(tagged(answer, "external_ip"));
+    const std::string seen = shownText(tagged(answer, "remote_external_ip"));
+    if (!asked.empty()) value(Kept::TESTED) = asked;
+    if (!seen.empty()) value(Kept::SERVICE) = seen;
+    if (contains(answer, "Success")) {
+        clear({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE});
+        return true;
+    }
+    if (!contains(answer, "<status>") && asked.empty() && seen.empty()) {
+        set(Sign::LOGGED_SERVICE_NONSENSE, when,
+            "the service's answer to a port test is not understood: " + shownText(answer));
+        return false;
+    }
+    if (!asked.empty()) value(Kept::GATEWAY) = asked;
+    if (!asked.empty() && asked == seen) clear({Sign::LOGGED_SECOND_NAT});
+    return false;
+}
+
+// An answer that stops in the middle was cut off by time.
+void LogSigns::takeRefusal(std::string_view answer, Time when) {
+    if (!has(Sign::LOGGED_BACK_END_REFUSES)) return;
+    if (startsWith(answer, "[")) answer.remove_prefix(1);
+    const bool isCut =
+        startsWith(answer, "<") && !contains(answer, "</") && !contains(answer, "/>");
+    if (!isCut) return;
+    set(Sign::LOGGED_BACK_END_REFUSES, when,
+        "an answer of the local back end stopped in the middle");
+}
+
+void LogSigns::failTest(Time when) {
+    if (!serviceFails() && !has(Sign::LOGGED_SERVICE_NONSENSE) &&
+        !has(Sign::LOGGED_TEST_UNANSWERED)) {
+        const std::string& port = value(Kept::PORT);
+        set(Sign::LOGGED_TEST_FAILED, when,
+            "the service could not reach " + (port.empty() ? "the port" : "port " + port));
+    }
+}
+
+void LogSigns::failService(Time when) {
+    const std::string error = std::exchange(value(Kept::ERROR), {});
+    if (contains(error, kDropped)) return;
+    if (contains(error, "resolve")) {
+        set(Sign::LOGGED_SERVICE_UNRESOLVED, when, "the service's name does not resolve");
+    } else if (contains(error, "certificate") || contains(error, "CA cert")) {
+        set(Sign::LOGGED_SERVICE_CERTIFICATE, when,
+            "the service's certificate is not accepted: " + error);
+    } else if (contains(error, "connect to")) {
+        set(Sign::LOGGED_SERVICE_UNREACHABLE, when, "no connection to the service: " + error);
+    } else {
+        set(Sign::LOGGED_SERVICE_SILENT, when,
+            "no answer from the service" + (error.empty() ? "" : ": " + error));
+    }
+}
+
+void LogSigns::failTestRequest(Time when) {
+    failService(when);
+    // Unlike the sign of the service as a whole, this one outlives its other answers.
+    if (has(Sign::LOGGED_SERVICE_SILENT)) {
+        set(Sign::LOGGED_TEST_UNANSWERED, when, "no answer to the port test");
+    }
+}
+
+// The service has taken the record: then it is the back end that could not be told.
+void LogSigns::failPublishing(std::optional<Time> stored) {
+    reason = Sign::LOGGED_PUBLISHING_FAILED;
+    const auto silent = signs.find(Sign::LOGGED_BACK_END_SILENT);
+    if (silent == signs.end() || !stored) return;
+    std::string& text = signs[Sign::LOGGED_PUBLISHING_FAILED].text;
+    if (silent->second.when >= *stored && !contains(text, ": ")) {
+        text += ": " + silent->second.text;
+    }
+}
+
+void LogSigns::failGateway() {
+    const auto found = signs.find(Sign::LOGGED_NO_GATEWAY);
+    if (found != signs.end()) found->second.text = kNoGateway;
+}
+
+void LogSigns::blameRelay() {
+    if (!reason || std::count(kRelaySolves.begin(), kRelaySolves.end(), *reason) == 0) return;
+    for (const Sign sign : {Sign::LOGGED_RELAY_DOES_NOT_COME_UP, Sign::LOGGED_TUNNEL_NO_OUTPUT}) {
+        if (has(sign)) reason = sign;
+    }
+}
+
+std::string LogSigns::reasonText() const {
+    if (!reason) return {};
+    const auto found = signs.find(*reason);
+    if (found == signs.end()) return {};
+    // Two addresses alone would be a riddle.
+    if (*reason == Sign::LOGGED_SECOND_NAT) return "a second router: " + found->second.text;
+    return found->second.text;
+}
+
+std::string LogSigns::address() const {
+    return value(value(Kept::TESTED).empty() ? Kept::GATEWAY : Kept::TESTED);
+}
+
+bool LogSigns::serviceFails() const {
+    return std::any_of(kServiceSigns.begin(), kServiceSigns.end(),
+                       [this](Sign sign) { return has(sign); });
+}
+
+std::string LogSigns::filled(std::string_view words, const LogValues& values) const {
+    for (;;) {
+        const std::size_t end = words.find('|');
+        std::string text = filledWording(words.substr(0, end), values);
+        if (end == std::string_view::npos || !contains(text, kMissing)) return text;
+        words.remove_prefix(end + 1);
+    }
+}
+
+std::string LogSigns::filledWording(std::string_view words, const LogValues& values) const {
+    std::string text;
+    for (std::size_t open = words.find('{'); open != std::string_view::npos;
+         open = words.find('{')) {
+        const std::size_t close = words.find('}', open);
+        const std::string_view name = words.substr(open + 1, close - open - 1);
+        text.append(words.substr(0, open));
+        words.remove_prefix(close + 1);
+        const Kept known = keptNamed(name);
+        const std::string value =
+            known == Kept::NOTHING ? shownText(values[static_cast<std::size_t>(name.front() - '1')])
+                                   : kept[static_cast<std::size_t>(known)];
+        text.append(value.empty() ? kMissing : value);
+    }
+    return text.append(words);
+}
+
+}  // namespace pelorus::doctor

@@ -1,0 +1,90 @@
+// What a log last said about each matter that causes are concluded from.
+#ifndef PELORUS_DOCTOR_LOG_SIGNS_H
+#define PELORUS_DOCTOR_LOG_SIGNS_H
+
+#include <array>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "doctor/evidence.h"
+#include "doctor/log_rules.h"
+
+namespace pelorus::doctor {
+
+/// The signs of the LOGGED_... kind, the values that later lines need, and the reason: the first
+/// thing that went wrong in the current cycle.
+class LogSigns {
+public:
+    /// Keeps, clears and sets what @p rule says of a line with these @p values.
+    void take(const LogRule& rule, Time when, const LogValues& values);
+
+    /// Sets @p sign. Becomes the reason if there is none yet and it explains anything.
+    void set(Sign sign, Time when, const std::string& text);
+
+    /// Takes them away; one that was the reason is none any more.
+    void clear(const std::vector<Sign>& cleared);
+
+    /// A new run of the daemon: no sign and no reason is left.
+    void forget();
+
+    /// A new cycle.
+    void forgetReason() { reason.reset(); }
+
+    /// The service's answer to a port test. True if the port passed.
+    bool takeTestAnswer(std::string_view answer, Time when);
+
+    /// The port test as a whole failed.
+    void failTest(Time when);
+
+    /// A request to the service got no answer.
+    void failService(Time when);
+
+    /// No answer to a port test.
+    void failTestRequest(Time when);
+
+    /// The answer with which the back end refused what it was told.
+    void takeRefusal(std::string_view answer, Time when);
+
+    /// The ports could not be published. @p stored: when the service had taken their record; unset
+    /// if it had not.
+    void failPublishing(std::optional<Time> stored);
+
+    /// NAT-PMP, the last thing tried, does not answer either.
+    void failGateway();
+
+    /// @p sign is the reason from now on, whatever was it before.
+    void blame(Sign sign) { reason = sign; }
+
+    /// The relay failed too. It is the reason where a relay would have been the way out.
+    void blameRelay();
+
+    [[nodiscard]] bool has(Sign sign) const { return signs.count(sign) != 0; }
+
+    /// The reason's text; empty if there is none.
+    [[nodiscard]] std::string reasonText() const;
+
+    /// The address that was tested last, else the gateway's; empty if neither was logged.
+    [[nodiscard]] std::string address() const;
+
+    [[nodiscard]] const std::map<Sign, Fact>& all() const { return signs; }
+
+private:
+    [[nodiscard]] std::string& value(Kept what) { return kept[static_cast<std::size_t>(what)]; }
+    [[nodiscard]] const std::string& value(Kept what) const {
+        return kept[static_cast<std::size_t>(what)];
+    }
+    [[nodiscard]] bool serviceFails() const;
+    [[nodiscard]] std::string filled(std::string_view words, const LogValues& values) const;
+    [[nodiscard]] std::string filledWording(std::string_view words, const LogValues& values) const;
+
+    std::map<Sign, Fact> signs;
+    std::array<std::string, static_cast<std::size_t>(Kept::COUNT)> kept{};
+    std::optional<Sign> reason;
+};
+
+}  // namespace pelorus::doctor
+
+#endif

@@ -136,8 +136,7 @@ void lookAtFiles(const DevicePaths& paths, Evidence& evidence) {
     const ProcessTable processes{paths.processes};
     lookAtDaemon(processes, paths.pidFile, evidence);
     lookAtFilesThemselves(settings, evidence);
-    const bool isWhole = settings.obstacle == DeviceSettings::Obstacle::NONE && !settings.needsRoot;
-    if (isWhole) {
+    if (settings.isWhole()) {
         lookAtSettings(evidence);
         lookAtTunnel(processes, evidence);
     }

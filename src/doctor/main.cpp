@@ -139,7 +139,11 @@ int reportSettings(const DoctorOptions& options) {
             text += part + '\n';
         }
     };
-    add("", "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."));
+    if (report.needsRoot) {
+        add("", "Whether the daemon starts with " + file + " could not be told.");
+    } else {
+        add("", "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."));
+    }
     for (const std::string& problem : report.problems) add("PROBLEM  ", problem);
     for (const std::string& remark : report.remarks) add("remark   ", remark);
     if (report.problems.empty() && report.remarks.empty()) text += "Nothing to remark.\n";

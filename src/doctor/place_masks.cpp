@@ -134,9 +134,10 @@ bool looksLikeName(std::string_view word) {
 struct Place {
     std::string_view before, behind;  // behind it; empty: the end of the word
     const char* kind;
+    std::string_view in{};  // the text has this part somewhere
 };
 
-constexpr std::array<Place, 14> kPlaces{{{"connect to ", " port ", "host"},
+constexpr std::array<Place, 15> kPlaces{{{"connect to ", " port ", "host"},
                                          {"in connection to ", ":", "host"},
                                          {"resolve host: ", "", "host"},
                                          {"resolve host address: ", "", "host"},
@@ -149,11 +150,13 @@ constexpr std::array<Place, 14> kPlaces{{{"connect to ", " port ", "host"},
                                          {"subject name (", ")", "host"},
                                          {"CN=", "", "host"},
                                          {"/home/", "", "user"},
-                                         {"/Users/", "", "user"}}};
+                                         {"/Users/", "", "user"},
+                                         {" (", ")", "name", "gateway maps port "}}};
 
 // What is named at a place of a text: its length, 0 if nothing is.
 std::size_t namedLength(const Place& place, std::string_view text, std::size_t at) {
     if (!endsWith(text.substr(0, at), place.before)) return 0;
+    if (text.find(place.in) == text.npos) return 0;
     text.remove_prefix(at);
     const auto* const end = std::find_if_not(text.begin(), text.end(), [](char letter) {
         return isWordLetter(letter) && letter != ':';
@@ -209,7 +212,8 @@ std::string PlaceMasks::hideNamed(const std::string& kind, std::string_view name
     if (endsWith(name, kCut)) return hideNamed(kind, name.substr(0, name.size() - 3)) + "...";
     if (endsWith(name, ".")) return hideNamed(kind, name.substr(0, name.size() - 1)) + ".";
     std::string hidden = hideWord(name);
-    if (name.empty() || hidden != name) return hidden;
+    const bool isWord = name.find(' ') == name.npos;
+    if (name.empty() || (isWord && hidden != name)) return hidden;
     const bool isQuiet = name == "localhost" || ipv4Length(name, 0) == name.size();
     return isQuiet ? hidden : replacement(kind, lowerCase(name));
 }

@@ -10,11 +10,11 @@
 
 namespace pelorus::doctor {
 
-/// Replaces every IP and MAC address, host name and name of a user in a path; of the paths of logs
-/// only the file's own name is left. An address or name has the same replacement wherever this
-/// object finds it, in whatever case: "address-1", "private-address-1", "shared-address-1", "mac-1",
-/// "host-1" or "user-1". Addresses that tell nothing stay: those of the device to itself, and
-/// netmasks.
+/// Replaces every IP and MAC address, host name, name of a user in a path, and what others call
+/// their ports at the gateway; of the paths of logs only the file's own name is left. An address or
+/// name has the same replacement wherever this object finds it, in whatever case: "address-1",
+/// "private-address-1", "shared-address-1", "mac-1", "host-1", "user-1" or "name-1". Addresses that
+/// tell nothing stay: those of the device to itself, and netmasks.
 ///
 /// A host name is a known one, one that a message of libcurl or of the tunnel's client names, and
 /// every word with a dot that may be one and does not look like the name of a file.

@@ -56,21 +56,16 @@ std::string urlEncoded(const std::string& text) {
     return result;
 }
 
-// The beginning of a secret at @p end, where a text was cut off.
-void hideCut(std::string& text, std::size_t end, const std::string& secret, const char* mask) {
-    for (std::size_t size = std::min(secret.size() - 1, end); size >= kLeastOfCut; --size) {
-        const std::string_view last = std::string_view{text}.substr(end - size, size);
-        if (!std::equal(last.begin(), last.end(), secret.begin(), sameLetter)) continue;
-        text.replace(end - size, size, mask);
-        return;
-    }
-}
-
-void hideCuts(std::string& text, const std::string& secret, const char* mask) {
-    hideCut(text, text.size(), secret, mask);
+// The beginning of a secret where a text was cut off.
+void hideCut(std::string& text, const std::string& secret, const char* mask) {
     for (std::size_t dots = text.rfind(kCut); dots != text.npos && dots > 0;
          dots = text.rfind(kCut, dots - 1)) {
-        hideCut(text, dots, secret, mask);
+        for (std::size_t size = std::min(secret.size() - 1, dots); size >= kLeastOfCut; --size) {
+            const std::string_view last = std::string_view{text}.substr(dots - size, size);
+            if (!std::equal(last.begin(), last.end(), secret.begin(), sameLetter)) continue;
+            text.replace(dots - size, size, mask);
+            break;
+        }
     }
 }
 
@@ -147,7 +142,7 @@ SecretMasks::SecretMasks(const std::map<std::string, std::string>& settings) {
 
 std::string SecretMasks::hide(std::string text) const {
     for (const Secret& secret : secrets) hideSecret(text, secret.value, secret.mask);
-    for (const Secret& secret : secrets) hideCuts(text, secret.value, secret.mask);
+    for (const Secret& secret : secrets) hideCut(text, secret.value, secret.mask);
     for (const Marker& marker : kMarkers) hideMarked(text, marker);
     hideInNames(text);
     return text;

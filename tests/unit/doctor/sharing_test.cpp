@@ -24,8 +24,8 @@ TEST(Masks, HideSecretsInEveryForm) {
         {"77", "", "", "port 7711", "port 7711"},
         {" abc\r", "xabcx", "", "abc xabcx", "*ID_REMOVED* *AUTH_REMOVED*"},
         {"", "", "m\xC3\xBCller", "it is M??LLER", "it is *SUBDOMAIN_REMOVED*"},
-        {"", "s3cretword", "", "cut at s3cre... and s3cretw",
-         "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*"},
+        {"", "s3cretword", "", "cut at s3cre... and s3cretwor...",
+         "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
         {"dev7", "", "", "on 203.0.113.7 of nas", "on 203.0.113.7 of nas"}};
     for (const Row& row : rows) {
@@ -83,6 +83,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"subject name matches target host name 'cloud.kavra.exa...", "subject name matches target host name 'host-1..."},
         {"reset by peer in connection to box:443", "reset by peer in connection to host-1:443"},
         {"depth=0: CN=relay3, O=x", "depth=0: CN=host-1, O=x"},
+        {"the gateway maps port 80 to 192.168.1.5 (Alice's 10.0.0.1)", "the gateway maps port 80 to private-address-1 (name-1)"},
         {"/home/alice/x.ini and /home/bob", "/home/user-1/x.ini and /home/user-2"},
         {"log /srv/box/syslog.1.gz: need root", "log syslog.1.gz: need root"},
         {"/etc/pelorus/globalconfig.ini, messages-20261101.gz", "/etc/pelorus/globalconfig.ini, messages-20261101.gz"},

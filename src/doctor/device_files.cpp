@@ -138,9 +138,10 @@ void lookAtFiles(const DevicePaths& paths, Evidence& evidence) {
     const ProcessTable processes{paths.processes};
     lookAtDaemon(processes, paths.pidFile, evidence);
     lookAtFilesThemselves(settings, evidence);
-    if (!evidence.hasSettings()) return;
-    lookAtSettings(evidence);
-    lookAtTunnel(processes, evidence);
+    if (evidence.hasSettings()) {
+        lookAtSettings(evidence);
+        lookAtTunnel(processes, evidence);
+    }
     lookAtMinutes(paths.minutesFile, evidence);
 }
 

@@ -37,10 +37,19 @@ public:
         if (repeating && line->when <= newest && isRepeated(*line)) return;
         if (line->when > newest) repeating = false;
         remember(*line);
+        if (line->host != lastHost) meet(line->host);
         story.take(*line);
     }
 
+    [[nodiscard]] const std::set<std::string>& hosts() const { return met; }
+
 private:
+    void meet(std::string_view host) {
+        constexpr std::size_t kMostHosts = 16;
+        lastHost = host;
+        if (met.size() < kMostHosts) met.insert(lastHost);
+    }
+
     [[nodiscard]] bool isRepeated(const LogLine& line) const {
         return line.when < newest || hashes.count(std::hash<std::string_view>{}(line.text)) != 0;
     }
@@ -57,6 +66,8 @@ private:
     Time newest{};
     Time hashTime{};
     std::set<std::size_t> hashes;
+    std::string lastHost;
+    std::set<std::string> met;
     bool repeating = false;
 };
 
@@ -175,6 +186,7 @@ void lookAtLog(const LogChoice& choice, Evidence& evidence) {
     }
     if (evidence.fromElsewhere && story.end()) evidence.now = *story.end();
     story.finish(evidence);
+    evidence.logHosts = order.hosts();
     summarise(story, evidence);
 }
 

@@ -1,5 +1,6 @@
 #include "doctor/device_settings.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -81,7 +82,7 @@ private:
             return;
         } else if (!merge(found.copy, FileKind::COPY)) {
             if (found.copy.needsRoot()) {
-                found.needsRoot = true;
+                refuse(DeviceSettings::Obstacle::DYNAMIC_FILE, found.copy);
             } else {
                 checkNewCopy();
                 if (found.obstacle == DeviceSettings::Obstacle::NONE) readDynamicFile();
@@ -113,12 +114,9 @@ private:
     }
 
     DeviceSettings& refuse(DeviceSettings::Obstacle obstacle, const SettingsFile& file) {
-        if (file.needsRoot()) {
-            found.needsRoot = true;
-        } else {
-            found.obstacle = obstacle;
-            found.reason = file.trouble();
-        }
+        found.needsRoot = file.needsRoot();
+        if (!found.needsRoot) found.obstacle = obstacle;
+        found.reason = file.trouble();
         return found;
     }
 
@@ -133,9 +131,13 @@ bool SettingsFile::needsRoot() const {
 }
 
 std::string SettingsFile::trouble() const {
-    const std::string cause = content.isRefused ? "not a regular file, or a link of somebody else"
-                                                : std::strerror(content.error);
-    return shownText(path) + " cannot be read: " + cause;
+    const std::string beginning = shownText(path) + " cannot be read";
+    if (needsRoot()) return beginning + " by this user: run it as root";
+    if (!content.isRefused) return beginning + ": " + std::strerror(content.error);
+    struct stat status {};
+    const bool isFolder = stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+    return beginning +
+           (isFolder ? ": it is a folder" : ": not a regular file, or a link of somebody else");
 }
 
 const SettingsFile& DeviceSettings::file(FileKind kind) const {

@@ -18,7 +18,7 @@ struct SettingsFile {
 
     /// It is there, but this user may not read it.
     [[nodiscard]] bool needsRoot() const;
-    /// "PATH cannot be read: No such file or directory"
+    /// Why it could not be read: "PATH cannot be read: No such file or directory"
     [[nodiscard]] std::string trouble() const;
 };
 
@@ -42,9 +42,11 @@ struct DeviceSettings {
     SettingsMap merged{};
     std::vector<SettingsLine> lines{};  ///< as they were merged; the first 20,000 of each file
     Obstacle obstacle{};                ///< the daemon would not start
-    std::string reason{};               ///< why not
+    std::string reason{};               ///< why not, or which file could not be read
     bool needsRoot = false;             ///< a file that counts could not be read by this user
 
+    /// The daemon would start, and every file that counts has been read.
+    [[nodiscard]] bool isWhole() const { return obstacle == Obstacle::NONE && !needsRoot; }
     [[nodiscard]] const SettingsFile& file(FileKind kind) const;
     /// What the dynamic settings come from: the copy, or as long as there is none, the file itself.
     [[nodiscard]] FileKind dynamicSource() const;

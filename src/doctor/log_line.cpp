@@ -201,11 +201,13 @@ std::optional<Time> takeStamp(std::string_view& line, Time now) {
 std::optional<LogLine> readLogLine(std::string_view line, Time now) {
     const auto when = takeStamp(line, now);
     if (!when) return std::nullopt;
+    std::string_view host;
     for (int words = 0; words < kMostWords; ++words) {
         const std::size_t end = line.find(' ');
         const std::string_view word = line.substr(0, end);
         line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
-        if (isDaemon(word)) return LogLine{*when, withoutEnd(line)};
+        if (isDaemon(word)) return LogLine{*when, withoutEnd(line), host};
+        if (words == 0) host = word;
         if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;
         // Between host and program only "facility.severity".
         if (words == 1 && word.find('.') == std::string_view::npos) return std::nullopt;

@@ -10,12 +10,16 @@
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
+#include <map>
+#include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "common/handles.h"
 #include "doctor/device_files.h"
 #include "doctor/device_log.h"
+#include "doctor/device_settings.h"
 #include "doctor/diagnosis.h"
 #include "doctor/doctor_options.h"
 #include "doctor/history_picture.h"
@@ -26,6 +30,7 @@
 #include "doctor/sharing.h"
 #include "doctor/static_file.h"
 #include "doctor/text_report.h"
+#include "doctor/url_host.h"
 
 namespace pelorus::doctor {
 
@@ -111,29 +116,38 @@ int writePicture(const std::string& path, const std::string& picture) {
     return file ? writeAll(file.get(), picture, path.c_str()) : complain(path.c_str());
 }
 
-void addLines(std::string& text, const char* label, const std::string& line, const Layout& how) {
-    for (const std::string& part : hang(label, line, static_cast<std::size_t>(how.width))) {
-        text += part + '\n';
+Masks masksFor(const DoctorOptions& options,
+               const std::map<std::string, std::string>& settings,
+               std::vector<std::string> hosts) {
+    if (!options.share) return Masks{settings};
+    if (const auto server = settings.find("SERVER_BASE_URL"); server != settings.end()) {
+        const std::string service = serviceHost(server->second);
+        hosts.push_back(service.substr(0, service.find_first_of("/:")));
     }
+    return Masks{settings, PlaceMasks{hosts, options.logs}};
 }
 
 int reportSettings(const DoctorOptions& options) {
     const std::string file = findStaticFile();
-    DevicePaths paths;
-    paths.staticFile = file;
-    Evidence evidence;
-    lookAtFiles(paths, evidence);
     const SettingsReport report = checkSettings(file);
+    Masks masks = masksFor(options, readDeviceSettings(file).merged.values, {hostName()});
     const Layout how = layout();
     std::string text;
-    addLines(text, "",
-             "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."),
-             how);
-    for (const std::string& problem : report.problems) addLines(text, "PROBLEM  ", problem, how);
-    for (const std::string& remark : report.remarks) addLines(text, "remark   ", remark, how);
+    const auto add = [&](const char* label, const std::string& line) {
+        for (const std::string& part :
+             hang(label, masks.hide(line), static_cast<std::size_t>(how.width))) {
+            text += part + '\n';
+        }
+    };
+    if (report.needsRoot) {
+        add("", "Whether the daemon starts with " + file + " could not be told.");
+    } else {
+        add("", "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."));
+    }
+    for (const std::string& problem : report.problems) add("PROBLEM  ", problem);
+    for (const std::string& remark : report.remarks) add("remark   ", remark);
     if (report.problems.empty() && report.remarks.empty()) text += "Nothing to remark.\n";
-    Masks masks{evidence.settings, options.share, hostName()};
-    const int failure = writeAll(stdout, masks.hide(std::move(text)), "to standard output");
+    const int failure = writeAll(stdout, text, "to standard output");
     if (failure != 0) return failure;
     return report.usable ? 0 : kUnusableSettings;
 }
@@ -141,16 +155,17 @@ int reportSettings(const DoctorOptions& options) {
 int reportDiagnosis(const DoctorOptions& options) {
     const Evidence evidence = look(options);
     Diagnosis diagnosis = diagnose(evidence);
+    std::vector<std::string> hosts{evidence.logHosts.begin(), evidence.logHosts.end()};
+    if (!evidence.fromElsewhere) hosts.push_back(hostName());
     // In every text of it: masked in the finished output, a number that is a secret would spoil the
     // format where it is a coordinate or a time.
-    Masks masks{evidence.settings, options.share, evidence.fromElsewhere ? "" : hostName()};
-    masks.hideIn(diagnosis);
+    masksFor(options, evidence.settings, hosts).hideIn(diagnosis);
     int failure = 0;
     if (!options.picture.empty()) {
         failure = writePicture(options.picture, historyPicture(diagnosis));
     }
     const std::string report =
-        options.json ? jsonReport(diagnosis) : masks.hide(textReport(diagnosis, layout()));
+        options.json ? jsonReport(diagnosis) : textReport(diagnosis, layout());
     const int printing = writeAll(stdout, report, "to standard output");
     if (failure == 0) failure = printing;
     return failure != 0 ? failure : exitStatus(diagnosis);

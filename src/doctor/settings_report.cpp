@@ -6,11 +6,10 @@
 #include <string_view>
 #include <utility>
 
-#include "common/masks.h"
-#include "common/text.h"
 #include "doctor/device_settings.h"
 #include "doctor/file_safety.h"
 #include "doctor/known_settings.h"
+#include "doctor/secret_masks.h"
 #include "doctor/setting_value.h"
 #include "doctor/shown_text.h"
 
@@ -21,8 +20,7 @@ namespace {
 using LastLines = std::map<std::string, const SettingsLine*>;
 
 constexpr std::size_t kMostReported = 100;
-constexpr std::size_t kMostOfValue = 60;    // characters
-constexpr std::size_t kShortestSecret = 4;  // shorter ones would mask half of every line
+constexpr std::size_t kMostOfValue = 60;  // characters
 
 // Each key's last line that counts.
 LastLines lastLines(const std::vector<SettingsLine>& lines) {
@@ -56,7 +54,7 @@ public:
 
     SettingsReport run() {
         checkFiles();
-        if (settings.staticFile.content.text) {
+        if (!settings.merged.values.empty()) {
             checkText(FileKind::STATIC);
             checkText(settings.dynamicSource());
             checkLines();
@@ -65,7 +63,7 @@ public:
             checkSafety();
         }
         for (auto* list : {&report.problems, &report.remarks}) {
-            for (std::string& line : *list) hideSecrets(line);
+            for (std::string& line : *list) line = masks.hide(line);
             const std::size_t more = list->size() - std::min(list->size(), kMostReported);
             list->resize(list->size() - more);
             if (more > 0) list->push_back("and " + std::to_string(more) + " more");
@@ -91,9 +89,10 @@ private:
     }
 
     void checkFiles() {
-        report.usable = settings.obstacle == DeviceSettings::Obstacle::NONE && !settings.needsRoot;
-        if (settings.needsRoot) {
-            report.problems.emplace_back("the files cannot be read by this user: run it as root");
+        report.needsRoot = settings.needsRoot;
+        report.usable = settings.isWhole();
+        if (report.needsRoot) {
+            report.problems.push_back(settings.reason);
         } else if (!report.usable) {
             report.problems.push_back("the daemon would not start: " + settings.reason);
         }
@@ -140,8 +139,12 @@ private:
                 problem(place(line), "is ignored: there are " + std::to_string(kMostSettings) +
                                          " settings already");
             } else {
-                checkKey(line);
-                checkEarlier(line, std::exchange(last[line.key], &line));
+                const SettingsLine* earlier = std::exchange(last[line.key], &line);
+                if (earlier == nullptr) {
+                    checkKey(line);
+                } else {
+                    checkEarlier(line, *earlier);
+                }
             }
         }
         for (const auto& [key, line] : last) {
@@ -165,20 +168,20 @@ private:
         }
     }
 
-    void checkEarlier(const SettingsLine& line, const SettingsLine* earlier) {
+    void checkEarlier(const SettingsLine& line, const SettingsLine& earlier) {
         const bool addsUp = line.key == "STATIC_ONLY_KEYS";
-        if (earlier == nullptr || addsUp || earlier->value == line.value) return;
-        const bool isSameFile = earlier->file == line.file;
+        if (addsUp || earlier.value == line.value) return;
         std::string text = shownText(line.key);
         const KnownSetting* known = findKnownSetting(line.key);
         if (known != nullptr && isShowable(*known)) {
             text += "=" + shownText(line.value, kMostOfValue) + " replaces " +
-                    shownText(earlier->value, kMostOfValue) + " of ";
+                    shownText(earlier.value, kMostOfValue) + " of ";
         } else {
             text += " replaces the value of ";
         }
+        const bool isSameFile = earlier.file == line.file;
         remark(place(line),
-               text + (isSameFile ? "line " + std::to_string(earlier->number) : place(*earlier)));
+               text + (isSameFile ? "line " + std::to_string(earlier.number) : place(earlier)));
     }
 
     void checkValue(const KnownSetting& known, const SettingsLine& line) {
@@ -202,15 +205,21 @@ private:
             if (known.without.empty() || !settings.value(key).empty()) continue;
             const auto line = last.find(key);
             const bool isThere = line != last.end();
+            if (!isThere && isPerhapsUnread(key)) continue;
             problem(isThere ? place(*line->second) : place(FileKind::STATIC),
                     key + (isThere ? " is empty: " : " is missing: ") + std::string{known.without});
         }
         if (settings.value("MANUAL_PORT_FORWARD") != "TRUE") return;
         for (const char* key : {"MANUAL_EXTERNAL_HTTP_PORT", "MANUAL_EXTERNAL_HTTPS_PORT"}) {
-            if (!settings.value(key).empty()) continue;
+            if (!settings.value(key).empty() || isPerhapsUnread(key)) continue;
             problem(place(settings.dynamicSource()),
                     std::string{key} + " is missing: no port forwarded by hand is used");
         }
+    }
+
+    // It may be in the file that could not be read.
+    [[nodiscard]] bool isPerhapsUnread(const std::string& key) const {
+        return !settings.isWhole() && !settings.merged.isReserved(key);
     }
 
     // While there is a copy, the dynamic file has no effect.
@@ -276,18 +285,9 @@ private:
         }
     }
 
-    // A line shows keys and paths, and somebody may have written a secret there.
-    void hideSecrets(std::string& line) const {
-        const std::pair<const char*, const char*> secrets[]{{"DEVICEID", STRIPPED_DEVID_VAL},
-                                                            {"DEVICEAUTH", STRIPPED_DEVAUTH_VAL},
-                                                            {"SUBDOMAIN", STRIPPED_SUBDOMAIN_VAL}};
-        for (const auto& [key, mask] : secrets) {
-            const std::string secret = withoutReturn(settings.value(key));
-            if (secret.size() >= kShortestSecret) replaceAll(line, secret, mask);
-        }
-    }
-
     const DeviceSettings settings;
+    // A line shows keys and paths, and somebody may have written a secret there.
+    const SecretMasks masks{settings.merged.values};
     SettingsReport report;
 };
 

@@ -7,6 +7,7 @@
 #include "doctor/log_line.h"
 #include "doctor/log_source.h"
 #include "doctor/log_story.h"
+#include "doctor/sharing.h"
 #include "fuzz_world.h"
 
 namespace {
@@ -29,6 +30,12 @@ void check(const pelorus::doctor::Evidence& evidence) {
     assert(evidence.hasLog == evidence.logBegin.has_value());
 }
 
+void checkMasks(const std::string& text) {
+    const std::map<std::string, std::string> settings{{"DEVICEAUTH", "s3cret"}};
+    pelorus::doctor::Masks masks{settings, pelorus::doctor::PlaceMasks{{"nas"}}};
+    assert(masks.hide(text).find("s3cret") == std::string::npos);
+}
+
 }  // namespace
 
 void pelorus::fuzz::tryText(const std::string& text) {
@@ -48,4 +55,5 @@ void pelorus::fuzz::tryText(const std::string& text) {
     evidence.now = doctor::Time{kNow};
     story.finish(evidence);
     check(evidence);
+    checkMasks(text.substr(0, 1000));
 }

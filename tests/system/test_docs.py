@@ -58,7 +58,7 @@ NOT_RUN = {
     "bench/pattern.py NAME...": "as below",
     "bench/compare.py": "takes a quarter of an hour; --help is run here",
     "bench/growth.py": "takes minutes; --help is run here",
-    "bench/run [--quick]": "takes minutes; --help is run here",
+    "bench/run [--quick] [WHAT...]": "takes minutes; --help is run here",
     "bench/run": "takes minutes; --help is run here",
     "bench/fleet.py": "takes a minute, and rewrites a page",
     "bench/pattern.py": "takes a quarter of an hour",

@@ -74,6 +74,7 @@ protected:
         ASSERT_FALSE(evidence.checks.empty());
         EXPECT_NE(evidence.checks.back().text.find(", 1 start of the daemon"), std::string::npos);
         EXPECT_EQ(evidence.now, evidence.logEnd);
+        EXPECT_EQ(evidence.logHosts, std::set<std::string>{"nas"});
     }
 
     std::string folder;

@@ -14,6 +14,9 @@ namespace pelorus::support {
 namespace {
 
 namespace fs = std::filesystem;
+
+constexpr uid_t kNobody = 65534;
+
 using doctor::checkSettings;
 using doctor::SettingsReport;
 
@@ -130,12 +133,14 @@ TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
     writeFile("run/dynamicconfig.ini", dynamic +
                                            "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
                                            "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=here\n");
-    const auto report = check("#DEVICETYPE=1\n");
+    const auto report = check("#DEVICETYPE=1\nOTHER=1\nOTHER=1\n");
     const std::string all = ::testing::PrintToString(report.remarks);
+    EXPECT_EQ(all.find("OTHER"), all.rfind("OTHER")) << "once";
     for (const char* part :
          {"# begins no comment: this sets the key #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
           "STARTCMD is ignored: only the static", "the daemon does not know EXTRA",
-          "EXTRA is only in the copy", "DEFAULT_PORTS_ONLY=TRUE replaces FALSE of line ",
+          "EXTRA is only in the copy", "the daemon does not know OTHER",
+          "DEFAULT_PORTS_ONLY=TRUE replaces FALSE of line ",
           "SUBDOMAIN replaces the value of line ", "DEFAULT_PORTS_ONLY differs from "}) {
         EXPECT_TRUE(holds(all, part)) << part << " in " << all;
     }
@@ -144,20 +149,49 @@ TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
 }
 
 TEST_F(SettingsReportTest, AStartThatWouldFailIsForetold) {
-    EXPECT_FALSE(checkSettings(path("gone.ini")).usable);
-    EXPECT_FALSE(checkSettings(writeFile("empty.ini", "nothing here\n")).usable);
-    fixed += "DYNAMIC_CONFIG=/gone\n";
-    const auto noDynamic = check();
-    EXPECT_FALSE(noDynamic.usable);
-    EXPECT_EQ(noDynamic.problems.front(),
-              "the daemon would not start: /gone/dynamicconfig.ini cannot be read: No such file or "
-              "directory");
-    fixed += "DYNAMIC_CONFIG=" + folder + "\nDYNAMIC_CONFIG_TMP=/gone/copy.ini\n";
-    const auto noCopy = check();
-    EXPECT_FALSE(noCopy.usable);
-    EXPECT_EQ(noCopy.problems.front(),
+    fs::create_directory(path("folder"));
+    ASSERT_EQ(mkfifo(path("pipe").c_str(), 0600), 0);
+    writeFile("empty.ini", "nothing here\n");
+    const char* const others[][2]{
+        {"gone", " cannot be read: No such file or directory"},
+        {"empty.ini", " holds no setting"},
+        {"folder", " cannot be read: it is a folder"},
+        {"pipe", " cannot be read: not a regular file, or a link of somebody else"}};
+    for (const auto& [name, fault] : others) {
+        const auto report = checkSettings(path(name));
+        EXPECT_FALSE(report.usable);
+        EXPECT_EQ(withoutOwners(report.problems),
+                  Texts{"the daemon would not start: " + path(name) + fault});
+        EXPECT_EQ(report.remarks, Texts{});
+    }
+    const auto reported = [this](const std::string& more) {
+        const auto report = check(more);
+        EXPECT_FALSE(report.usable);
+        return withoutOwners(report.problems);
+    };
+    EXPECT_EQ(reported("DYNAMIC_CONFIG=/gone\n"),
+              Texts{"the daemon would not start: /gone/dynamicconfig.ini cannot be read: No such "
+                    "file or directory"})
+        << "whatever may be in it is not missing";
+    EXPECT_EQ(reported("DYNAMIC_CONFIG=/gone\nSTARTCMD=\n").size(), 2U);
+    EXPECT_EQ(reported("DYNAMIC_CONFIG_TMP=/gone/copy.ini\n").front(),
               "the daemon would not start: the copy /gone/copy.ini cannot be made: /gone does not "
               "exist");
+}
+
+TEST_F(SettingsReportTest, WhatOnlyRootCanReadIsNotJudged) {
+    EXPECT_TRUE(check().usable);
+    fs::permissions(path("run"), fs::perms::none);
+    const uid_t user = geteuid();
+    ASSERT_TRUE(user != 0 || seteuid(kNobody) == 0);
+    const auto report = checkSettings(path("static.ini"));
+    ASSERT_EQ(seteuid(user), 0);
+    fs::permissions(path("run"), fs::perms::owner_all);
+    EXPECT_FALSE(report.usable);
+    EXPECT_TRUE(report.needsRoot);
+    EXPECT_EQ(
+        withoutOwners(report.problems),
+        Texts{path("run/dynamicconfig.ini") + " cannot be read by this user: run it as root"});
 }
 
 TEST_F(SettingsReportTest, WhatOthersCanChangeIsUnsafe) {

@@ -19,16 +19,37 @@ TEST(Masks, HideSecretsInEveryForm) {
     const Row rows[]{
         {"dev7", "a&b=", "smith", "Dev7 a&b= SMITH",
          "*ID_REMOVED* *AUTH_REMOVED* *SUBDOMAIN_REMOVED*"},
-        {"dev7", "a&b=", "", "?auth=a%26b%3d", "?auth=*AUTH_REMOVED*"},
+        {"dev7", "a&b=", "", "?key=a%26b%3d", "?key=*AUTH_REMOVED*"},
         {"dev7", "", "", "nas-devicedev7.kavra.example", "nas-device*ID_REMOVED*.kavra.example"},
         {"77", "", "", "port 7711", "port 7711"},
         {" abc\r", "xabcx", "", "abc xabcx", "*ID_REMOVED* *AUTH_REMOVED*"},
+        {"", "", "m\xC3\xBCller", "it is M??LLER", "it is *SUBDOMAIN_REMOVED*"},
+        {"", "s3cretword", "", "cut at s3cre... and s3cretwor...",
+         "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
+        {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
         {"dev7", "", "", "on 203.0.113.7 of nas", "on 203.0.113.7 of nas"}};
     for (const Row& row : rows) {
         const Settings settings{
             {"DEVICEID", row.id}, {"DEVICEAUTH", row.auth}, {"SUBDOMAIN", row.subdomain}};
-        EXPECT_EQ((Masks{settings, false, "nas"}.hide(row.text)), row.masked);
+        EXPECT_EQ(Masks{settings}.hide(row.text), row.masked);
     }
+}
+
+TEST(Masks, HideTheSecretsOfAnotherDevice) {
+    // clang-format off
+    const char* const rows[][2]{
+        {"GET /rest/port_test/dev9?port=1&auth=s3cret&x=1", "GET /rest/port_test/*ID_REMOVED*?port=1&auth=*AUTH_REMOVED*&x=1"},
+        {"/comm_status/dev9?auth=s3c...", "/comm_status/*ID_REMOVED*?auth=*AUTH_REMOVED*"},
+        {"/local/port_forward?http_port=9091", "/local/port_forward?http_port=9091"},
+        {"<resp_device_id>dev9</resp_device_id><status>", "<resp_device_id>*ID_REMOVED*</resp_device_id><status>"},
+        {"Device ID 'dev9' is different than the Device ID of this unit 'dev8'.", "Device ID '*ID_REMOVED*' is different than the Device ID of this unit '*ID_REMOVED*'."},
+        {"nas.devicedev9.kavra.example", "nas.device*ID_REMOVED*.kavra.example"},
+        {"DEVICEAUTH=s3cret SUBDOMAIN=smith.kavra.example", "DEVICEAUTH=*AUTH_REMOVED* SUBDOMAIN=*SUBDOMAIN_REMOVED*"},
+        {"auth=*AUTH_REMOVED* device*ID_REMOVED*.x", "auth=*AUTH_REMOVED* device*ID_REMOVED*.x"},
+        {"AUTH: Received control message: AUTH_FAILED", "AUTH: Received control message: AUTH_FAILED"},
+        {"the device is itself the router. This device.", "the device is itself the router. This device."}};
+    // clang-format on
+    for (const auto& [text, masked] : rows) EXPECT_EQ(Masks{Settings{}}.hide(text), masked);
 }
 
 TEST(Masks, HidePlacesForSharing) {
@@ -44,23 +65,41 @@ TEST(Masks, HidePlacesForSharing) {
         {"::ffff:1.2.3.4 Router::map 12:07:31", "address-1 Router::map 12:07:31"},
         {"52:54:00:aB:cd:ef 52-54-00-AB-CD-EF", "mac-1 mac-1"},
         {"ip=203.0.113.7&x http://203.0.113.7/", "ip=address-1&x http://address-1/"},
-        {"NAS nas.local nasty", "host-1 host-2 nasty"},
-        {"https://cloud.tavik.example:443/x", "https://host-1:443/x"},
-        {"cloud.tavik.example. relay3.tavik.example nas-devicedev7.tavik.example", "host-1. host-2 host-3"},
-        {"7.113.0.203.in-addr.arpa", "address-1.in-addr.arpa"},
-        {"LOCAL_... URLs: . :", "LOCAL_... URLs: . :"},
+        {"cut at 203.0.1... cut at cloud.kavra.ex... cut...", "cut at ... cut at ... cut..."},
+        {"NAS NAS.Local nasty", "host-1 host-2 nasty"},
+        {"https://cloud.kavra.example:443/x", "https://host-1:443/x"},
+        {"cloud.kavra.example. *.kavra.example .kavra.example", "host-1. host-2 .host-3"},
+        {"nas-device*ID_REMOVED*.kavra.example", "host-1"},
+        {"7.113.0.203.in-addr.arpa", "host-1"},
+        {"Failed to connect to cloud.kavra.example port 443 after 3 ms", "Failed to connect to host-1 port 443 after 3 ms"},
+        {"connect to box port 443 failed", "connect to host-1 port 443 failed"},
+        {"connect to 203.0.113.7 port 443, connect to ::1 port 443", "connect to address-1 port 443, connect to ::1 port 443"},
+        {"Couldn't connect to server", "Couldn't connect to server"},
+        {"Failed to connect to longb...", "Failed to connect to host-1..."},
+        {"Could not resolve host: box", "Could not resolve host: host-1"},
+        {"RESOLVE: Cannot resolve host address: relay3:1194 (Name", "RESOLVE: Cannot resolve host address: host-1:1194 (Name"},
+        {"SSL: certificate subject name 'My box' does not match target host name 'cloud'", "SSL: certificate subject name 'host-1' does not match target host name 'host-2'"},
+        {"SSL: certificate subject name (box) does not match target hostname 'Box'", "SSL: certificate subject name (host-1) does not match target hostname 'host-1'"},
+        {"subject name matches target host name 'cloud.kavra.exa...", "subject name matches target host name 'host-1..."},
+        {"reset by peer in connection to box:443", "reset by peer in connection to host-1:443"},
+        {"depth=0: CN=relay3, O=x", "depth=0: CN=host-1, O=x"},
+        {"the gateway maps port 80 to 192.168.1.5 (Alice's 10.0.0.1)", "the gateway maps port 80 to private-address-1 (name-1)"},
+        {"/home/alice/x.ini and /home/bob", "/home/user-1/x.ini and /home/user-2"},
+        {"log /srv/box/syslog.1.gz: need root", "log syslog.1.gz: need root"},
+        {"/etc/pelorus/globalconfig.ini, messages-20261101.gz", "/etc/pelorus/globalconfig.ini, messages-20261101.gz"},
+        {"nas.kavra.example.log user.log", "host-1 user.log"},
+        {"LOCAL_... URLs: e.g. 2.5 s . :", "LOCAL_... URLs: e.g. 2.5 s . :"},
         {"", ""}};
     // clang-format on
-    const Settings settings{{"DEVICEID", "dev7"},
-                            {"SERVER_BASE_URL", "https://cloud.tavik.example:443/x"}};
     for (const auto& [text, masked] : rows) {
-        EXPECT_EQ((Masks{settings, true, "nas"}.hide(text)), masked);
+        const PlaceMasks places{{"nas", "localhost", ""}, {"/srv/box/syslog.1.gz", "-"}};
+        EXPECT_EQ((Masks{Settings{}, places}.hide(text)), masked);
     }
 }
 
 TEST(Masks, NothingIsLeftInAnyOutput) {
     const std::string secret = "q\"<&z";
-    const std::string text = "x" + secret + " on 203.0.113.9";
+    const std::string text = "x" + secret + " on 203.0.113.9 at cloud.kavra.example";
     Diagnosis diagnosis = relayed();
     diagnosis.reach = Reach::DIRECT;
     diagnosis.address = diagnosis.ports = diagnosis.daemon.options = text;
@@ -69,10 +108,10 @@ TEST(Masks, NothingIsLeftInAnyOutput) {
     diagnosis.checks.front().text = diagnosis.history.front().cause = text;
     diagnosis.history.front().address = text;
     diagnosis.untold = {text};
-    Masks{{{"DEVICEAUTH", secret}}, true, ""}.hideIn(diagnosis);
+    Masks{{{"DEVICEAUTH", secret}}, PlaceMasks{{}}}.hideIn(diagnosis);
     for (const std::string& output :
          {textReport(diagnosis, {}), jsonReport(diagnosis), historyPicture(diagnosis)}) {
-        for (const char* part : {"q\"", "q\\\"", "&z", "&amp;z", "203.0.113"}) {
+        for (const char* part : {"q\"", "q\\\"", "&z", "&amp;z", "203.0.113", "kavra"}) {
             EXPECT_EQ(output.find(part), std::string::npos) << part << " in " << output;
         }
         EXPECT_NE(output.find("*AUTH_REMOVED*"), std::string::npos);

@@ -1,0 +1,34 @@
+// Keeping the device's secrets out of the doctor's words.
+#ifndef PELORUS_DOCTOR_SECRET_MASKS_H
+#define PELORUS_DOCTOR_SECRET_MASKS_H
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace pelorus::doctor {
+
+/// Replaces device ids, authorisations and subdomains by their masks: the values of DEVICEID,
+/// DEVICEAUTH and SUBDOMAIN in every form, even cut off by three dots, and those of other devices
+/// where URLs, answers and public names show them. A value of less than three characters stays: it
+/// is part of too many words.
+class SecretMasks {
+public:
+    /// With @p settings as the daemon merges them.
+    explicit SecretMasks(const std::map<std::string, std::string>& settings);
+
+    /// @p text without any of them.
+    [[nodiscard]] std::string hide(std::string text) const;
+
+private:
+    struct Secret {
+        std::string value;
+        const char* mask;
+    };
+
+    std::vector<Secret> secrets;  // the longest first
+};
+
+}  // namespace pelorus::doctor
+
+#endif

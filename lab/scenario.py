@@ -15,7 +15,7 @@ from lab.account import Account
 from lab.central import CentralService
 from lab.certificates import Authority
 from lab.daemon import Daemon
-from lab.device import Device
+from lab.device import STATIC_FILE, Device
 from lab.gateway import Gateway, GatewaySetup
 from lab.names import Names
 from lab.neighbour import Neighbour
@@ -161,9 +161,16 @@ class Lab:
         with self._held():
             return self._examine(options, ahead)
 
+    def default_log_says(self) -> doctor.Diagnosis:
+        """What the doctor concludes elsewhere, from no more than the log of a default daemon."""
+        return self._examine(("--no-probes",), 0, self.device.messages.default_syslog,
+                             static_file=Path("/nonexistent"))
+
     def _examine(self, options: Sequence[str], ahead: float,
-                 log: Path | None = None) -> doctor.Diagnosis:
-        diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log)
+                 log: Path | None = None,
+                 static_file: Path = STATIC_FILE) -> doctor.Diagnosis:
+        diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log,
+                                   static_file=static_file)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis

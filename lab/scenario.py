@@ -153,13 +153,14 @@ class Lab:
             usual = pool.submit(self._examine, (), ahead, self.device.messages.default_syslog)
             return self._examine((), ahead), usual.result()
 
-    def diagnosis(self, *options: str, ahead: float = 0) -> doctor.Diagnosis:
-        """What the doctor concludes now. The daemon is held meanwhile.
+    def diagnosis(self, *options: str, ahead: float = 0,
+                  through: Sequence[str] = ()) -> doctor.Diagnosis:
+        """What the doctor, started by the command `through` if any, concludes now.
 
-        No secret of the device may be in it.
+        The daemon is held meanwhile. No secret of the device may be in it.
         """
         with self._held():
-            return self._examine(options, ahead)
+            return self._examine(options, ahead, through=through)
 
     def default_log_says(self) -> doctor.Diagnosis:
         """What the doctor concludes elsewhere, from no more than the log of a default daemon."""
@@ -168,9 +169,10 @@ class Lab:
 
     def _examine(self, options: Sequence[str], ahead: float,
                  log: Path | None = None,
-                 static_file: Path = STATIC_FILE) -> doctor.Diagnosis:
+                 static_file: Path = STATIC_FILE,
+                 through: Sequence[str] = ()) -> doctor.Diagnosis:
         diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log,
-                                   static_file=static_file)
+                                   static_file=static_file, through=through)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis

@@ -125,6 +125,11 @@ class Lab:
         """
         self._visitor, self._visits_first_stop = visitor, first_stop
 
+    def visit(self, what: str, ahead: float = 0) -> None:
+        """Like `moment`, where the story has no time for the doctor."""
+        if self._visitor:
+            self._visitor(what, ahead)
+
     def moment(self, what: str, cause: str = "", ahead: float = 0, default: str = "") -> None:
         """Tell what is special now, at a moment of the story that is worth a visit.
 
@@ -133,8 +138,7 @@ class Lab:
         same or nothing, or else the cause `default`.
         """
         self._told = True
-        if self._visitor:
-            self._visitor(what, ahead)
+        self.visit(what, ahead)
         if not self.asks_doctor:
             return
         whole, usual = self._diagnoses(ahead)
@@ -144,7 +148,9 @@ class Lab:
         self.moments.append(Moment(what, cause, whole.fact))
 
     def moment_follows(self) -> None:
-        """The moment before the daemon is first stopped tells nothing: a later one does."""
+        """The doctor is not asked before the daemon is first stopped, but at a later moment."""
+        if self._visits_first_stop and not self._told:
+            self.visit("")
         self._told = True
 
     def _diagnoses(self, ahead: float) -> tuple[doctor.Diagnosis, doctor.Diagnosis]:

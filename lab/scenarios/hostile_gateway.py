@@ -194,11 +194,13 @@ def hostile_flood(lab: Lab) -> None:
     idle = _most_memory(lab)
     lab.step("SIGTERM during the flood")
     time.sleep(0.5)
+    lab.moment_follows()
     _assert_stops_in_time(lab)
     lab.step("left alone, the daemon makes the device reachable")
     start(lab, "portforwarded")
     assert _most_memory(lab) - idle <= _MOST_GROWTH
     assert_published(lab)
+    lab.moment("the gateway has been found amid the flood")
     assert_stops_clean(lab)
 
 

@@ -267,6 +267,7 @@ def http_forwarding_lost(lab: Lab) -> None:
     assert ports_tested(lab)[tests:] == [9091] * 4
     assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 4, PORT_FORWARD]
     _assert_reached(lab)
+    lab.moment("the port is mapped again")
     assert_stops_clean(lab)
 
 

@@ -340,6 +340,7 @@ def names_disagree(lab: Lab) -> None:
     wait_for_next_cycle(lab)
     assert _addresses_sent(lab) == ["NULL", _HERE] * 3
     assert_published(lab)
+    lab.moment("all public names are right again")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", *["portforwarded", "failed"] * 2,
                                           "portforwarded", "disabled"]

@@ -178,6 +178,7 @@ def internal_ports_change(lab: Lab) -> None:
     assert ports_tested(lab) == [9091, 9091, 9091, 9091, 9092]
     assert lab.central.record and lab.central.record.http_port == 9092
     assert pages_from_outside(9092, 9444) == PAGES
+    lab.moment("the gateway forwards to the new ports")
     assert_stops_clean(lab)
 
 

@@ -50,14 +50,9 @@ class Diagnosis:
 
 def examine(messages: Messages, *options: str, ahead: float = 0, log: Path | None = None,
             static_file: Path = device.STATIC_FILE, through: Sequence[str] = ()) -> Diagnosis:
-    """Let the doctor conclude from everything it may look at.
-
-    Its clock begins with the machine's, or `ahead` seconds ahead of it, and runs so fast that it
-    waits less for what does not answer. It reads the whole log, or the file `log`. It is started by
-    the command `through`, if any.
-    """
+    """Let the doctor conclude from everything it may look at; see `run`."""
     done = run(messages, "--json", *options, ahead=ahead, log=log, static_file=static_file,
-               through=through, clock_factor=_HASTE)
+               through=through)
     try:
         return Diagnosis(json.loads(done.stdout), done.returncode)
     except ValueError as error:
@@ -66,12 +61,17 @@ def examine(messages: Messages, *options: str, ahead: float = 0, log: Path | Non
 
 
 def run(messages: Messages, *options: str, ahead: float = 0, log: Path | None = None,
-        static_file: Path = device.STATIC_FILE, through: Sequence[str] = (),
-        clock_factor: int = 1) -> subprocess.CompletedProcess[str]:
-    """Run it on the device with these options, over the log so far."""
+        static_file: Path = device.STATIC_FILE,
+        through: Sequence[str] = ()) -> subprocess.CompletedProcess[str]:
+    """Run it on the device with these options, over the log so far.
+
+    Its clock begins with the machine's, or `ahead` seconds ahead of it, and runs so fast that it
+    waits less for what does not answer. It reads the whole log, or the file `log`. It is started by
+    the command `through`, if any.
+    """
     messages.take_waiting()
     environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={static_file}",
-                   *(clock.at(ahead, clock_factor) if ahead or clock_factor != 1 else ())]
+                   *clock.at(ahead, _HASTE)]
     return subprocess.run(
         network.command(network.DEVICE, "env", "-i", *environment, *through,
                         str(sandbox.doctor()), "--log", str(log or messages.syslog), *options),

@@ -223,8 +223,9 @@ class CentralService:
         passed = test.passed(self._account)
         self.port_tests.append(test)
         self._timeline.add("central", f"connects back to {address}:{port} ({protocol}): "
-                           + ("the device answers" if passed else "the device does not answer"))
-        return (f"<port_test><status>{'Success' if passed else 'failure'}</status>"
+                           + ("the device answers" if passed else "another device answers"
+                              if test.found else "the device does not answer"))
+        return (f"<port_test><status>{'Success' if test.found else 'failure'}</status>"
                 f"<remote_external_ip>{request.peer}</remote_external_ip>"
                 f"<external_ip>{address}</external_ip>"
                 f"<req_device_id>{self._account.device_id}</req_device_id>"

@@ -36,9 +36,12 @@ def fast_pauses(factor: int, hasty: bool, divisor: int = 1) -> list[str]:
             f"FAKETIME_DONT_FAKE_MONOTONIC={0 if hasty else 1}", f"SHORT_PAUSES={divisor}"]
 
 
-def at(ahead: float) -> list[str]:
-    """Environment in which a program's time is `ahead` seconds ahead, or behind if negative."""
-    return _faketime(1, ahead)
+def at(ahead: float, factor: int = 1) -> list[str]:
+    """Environment in which a program's time is `ahead` seconds ahead, or behind if negative.
+
+    It runs `factor` times as fast from there.
+    """
+    return _faketime(factor, ahead)
 
 
 def refuse_signal(number: int) -> None:

@@ -145,6 +145,12 @@ class Device:
         self._pause = pause
         self._timeline.add("device", f"the back end sends a byte in {pause:g} s")
 
+    def keep_silent(self, silent: bool = True) -> None:
+        """Accept connections to the web server, and with it the back end, and say nothing."""
+        for server in self._servers:
+            server.silent = silent
+        self._timeline.add("device", f"the web server {'hangs' if silent else 'answers again'}")
+
     def limit_lookups(self, seconds: int = 0) -> None:
         """Give up a name lookup after this real time; by default the C library decides."""
         options = f"options timeout:{seconds} attempts:1\n" if seconds else ""

@@ -6,6 +6,7 @@ import json
 import os
 import subprocess
 import sys
+from collections.abc import Sequence
 from dataclasses import dataclass
 from pathlib import Path
 from typing import Any
@@ -15,6 +16,7 @@ from lab.messages import Messages
 from lab.support import LabError
 
 _PATIENCE = 30
+_HASTE = 2
 _ANSWERS = range(4)
 
 
@@ -37,18 +39,20 @@ class Diagnosis:
         causes = self.everything["causes"]
         return str(causes[0]["facts"][0]["text"]) if causes else ""
 
+    def checks(self, verdict: str) -> list[str]:
+        """The lines about what was checked, with this verdict ("ok", "problem", "not-seen")."""
+        return [str(check["text"]) for check in self.everything["checks"]
+                if check["verdict"] == verdict]
+
     def __str__(self) -> str:
         return json.dumps(self.everything, indent=1)
 
 
-def examine(messages: Messages, *options: str, ahead: float = 0,
-            log: Path | None = None) -> Diagnosis:
-    """Let the doctor conclude from everything it may look at.
-
-    Its clock is that of the machine, or `ahead` seconds ahead of it. It reads the whole log, or
-    the file `log`.
-    """
-    done = run(messages, "--json", *options, ahead=ahead, log=log)
+def examine(messages: Messages, *options: str, ahead: float = 0, log: Path | None = None,
+            static_file: Path = device.STATIC_FILE, through: Sequence[str] = ()) -> Diagnosis:
+    """Let the doctor conclude from everything it may look at; see `run`."""
+    done = run(messages, "--json", *options, ahead=ahead, log=log, static_file=static_file,
+               through=through)
     try:
         return Diagnosis(json.loads(done.stdout), done.returncode)
     except ValueError as error:
@@ -56,15 +60,21 @@ def examine(messages: Messages, *options: str, ahead: float = 0,
                        f"{done.stderr!r}") from error
 
 
-def run(messages: Messages, *options: str, ahead: float = 0,
-        log: Path | None = None) -> subprocess.CompletedProcess[str]:
-    """Run it on the device with these options, over the log so far."""
+def run(messages: Messages, *options: str, ahead: float = 0, log: Path | None = None,
+        static_file: Path = device.STATIC_FILE,
+        through: Sequence[str] = ()) -> subprocess.CompletedProcess[str]:
+    """Run it on the device with these options, over the log so far.
+
+    Its clock begins with the machine's, or `ahead` seconds ahead of it, and runs so fast that it
+    waits less for what does not answer. It reads the whole log, or the file `log`. It is started by
+    the command `through`, if any.
+    """
     messages.take_waiting()
-    environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={device.STATIC_FILE}",
-                   *(clock.at(ahead) if ahead else ())]
+    environment = [f"PATH={device.PATH}", f"TAVIK_STATIC_CONFIG={static_file}",
+                   *clock.at(ahead, _HASTE)]
     return subprocess.run(
-        network.command(network.DEVICE, "env", "-i", *environment, str(sandbox.doctor()),
-                        "--log", str(log or messages.syslog), *options),
+        network.command(network.DEVICE, "env", "-i", *environment, *through,
+                        str(sandbox.doctor()), "--log", str(log or messages.syslog), *options),
         stdin=subprocess.DEVNULL, capture_output=True, text=True, timeout=_PATIENCE, check=False)
 
 

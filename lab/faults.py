@@ -7,6 +7,7 @@ whether the daemon has met the fault so far.
 from __future__ import annotations
 
 import itertools
+import shutil
 import signal
 import socket
 import subprocess
@@ -19,6 +20,7 @@ from lab.account import SERVICE_HOST
 from lab.central import COMM_STATUS, PORT_FORWARD, PORT_TEST, WAIT, Fault
 from lab.certificates import Authority
 from lab.checks import PAUSE
+from lab.relay import TUNNEL_DEVICE
 from lab.scenario import Lab
 from lab.support import run_tool, wait_until
 
@@ -277,6 +279,29 @@ def foreign_locale() -> tuple[str, ...]:
     command = ("env", f"LOCPATH={_LOCALES}", f"LC_ALL={_LOCALE}")
     run_tool(*command, "/usr/bin/printf", "%.1f", "1,5")
     return command
+
+
+@contextmanager
+def openvpn_missing(lab: Lab) -> Iterator[None]:
+    """Programs that start from now on find no openvpn."""
+    lab.timeline.add("fault", "openvpn is not installed")
+    with _covered(shutil.which("openvpn") or "", "--bind", "/dev/null"):
+        yield
+
+
+@contextmanager
+def tunnel_device_missing(lab: Lab) -> Iterator[None]:
+    """Programs that start from now on find no tunnel device."""
+    lab.timeline.add("fault", f"there is no {TUNNEL_DEVICE}")
+    with _covered(str(TUNNEL_DEVICE.parent), "-t", "tmpfs", "lab-empty"):
+        yield
+
+
+@contextmanager
+def _covered(path: str, *mounted: str) -> Iterator[None]:
+    run_tool("mount", *mounted, path)
+    yield
+    run_tool("umount", path)
 
 
 @contextmanager

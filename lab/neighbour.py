@@ -6,6 +6,7 @@ from lab import network
 from lab.gateway import Gateway
 from lab.support import LabError
 from lab.timeline import Timeline
+from lab.web import Reply, WebServer
 
 _LEASE = 604800
 
@@ -28,6 +29,12 @@ class Neighbour:
                       "-g", self._gateway.lan_address, "-a", str(external_port),
                       str(internal_port), "tcp", str(_LEASE))
         self._timeline.add("neighbour", f"holds the gateway's TCP port {external_port}")
+
+    def pretend(self, device_id: str) -> None:
+        """Answer on port 80 as another device of the same make does."""
+        identity = f"<device_id>{device_id}</device_id>".encode()
+        WebServer(network.NEIGHBOUR, network.NEIGHBOUR_ADDRESS, 80, lambda _: Reply(identity))
+        self._timeline.add("neighbour", "is another device of the same make")
 
     def delete(self, external_port: int) -> None:
         """Remove a mapping, whoever made it; LabError unless the router obeys."""

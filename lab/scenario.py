@@ -15,7 +15,7 @@ from lab.account import Account
 from lab.central import CentralService
 from lab.certificates import Authority
 from lab.daemon import Daemon
-from lab.device import Device
+from lab.device import STATIC_FILE, Device
 from lab.gateway import Gateway, GatewaySetup
 from lab.names import Names
 from lab.neighbour import Neighbour
@@ -125,6 +125,11 @@ class Lab:
         """
         self._visitor, self._visits_first_stop = visitor, first_stop
 
+    def visit(self, what: str, ahead: float = 0) -> None:
+        """Like `moment`, where the story has no time for the doctor."""
+        if self._visitor:
+            self._visitor(what, ahead)
+
     def moment(self, what: str, cause: str = "", ahead: float = 0, default: str = "") -> None:
         """Tell what is special now, at a moment of the story that is worth a visit.
 
@@ -133,8 +138,7 @@ class Lab:
         same or nothing, or else the cause `default`.
         """
         self._told = True
-        if self._visitor:
-            self._visitor(what, ahead)
+        self.visit(what, ahead)
         if not self.asks_doctor:
             return
         whole, usual = self._diagnoses(ahead)
@@ -144,7 +148,9 @@ class Lab:
         self.moments.append(Moment(what, cause, whole.fact))
 
     def moment_follows(self) -> None:
-        """The moment before the daemon is first stopped tells nothing: a later one does."""
+        """The doctor is not asked before the daemon is first stopped, but at a later moment."""
+        if self._visits_first_stop and not self._told:
+            self.visit("")
         self._told = True
 
     def _diagnoses(self, ahead: float) -> tuple[doctor.Diagnosis, doctor.Diagnosis]:
@@ -153,17 +159,26 @@ class Lab:
             usual = pool.submit(self._examine, (), ahead, self.device.messages.default_syslog)
             return self._examine((), ahead), usual.result()
 
-    def diagnosis(self, *options: str, ahead: float = 0) -> doctor.Diagnosis:
-        """What the doctor concludes now. The daemon is held meanwhile.
+    def diagnosis(self, *options: str, ahead: float = 0,
+                  through: Sequence[str] = ()) -> doctor.Diagnosis:
+        """What the doctor, started by the command `through` if any, concludes now.
 
-        No secret of the device may be in it.
+        The daemon is held meanwhile. No secret of the device may be in it.
         """
         with self._held():
-            return self._examine(options, ahead)
+            return self._examine(options, ahead, through=through)
+
+    def default_log_says(self) -> doctor.Diagnosis:
+        """What the doctor concludes elsewhere, from no more than the log of a default daemon."""
+        return self._examine(("--no-probes",), 0, self.device.messages.default_syslog,
+                             static_file=Path("/nonexistent"))
 
     def _examine(self, options: Sequence[str], ahead: float,
-                 log: Path | None = None) -> doctor.Diagnosis:
-        diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log)
+                 log: Path | None = None,
+                 static_file: Path = STATIC_FILE,
+                 through: Sequence[str] = ()) -> doctor.Diagnosis:
+        diagnosis = doctor.examine(self.device.messages, *options, ahead=ahead, log=log,
+                                   static_file=static_file, through=through)
         for secret in self.account.secrets:
             assert secret not in str(diagnosis), diagnosis
         return diagnosis

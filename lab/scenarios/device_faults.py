@@ -9,8 +9,8 @@ from pathlib import Path
 
 from lab import daemon, faults
 from lab.central import PORT_TEST
-from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, MANUAL_PORTS, NO_TUNNEL, OPTIONS, PAGES,
-                        PAUSE, RELAYED, SILENT, TUNNEL_PID_FILE, assert_log_is_proper,
+from lab.checks import (BOTH_MAPPED, FAST, IMPATIENT, MANUAL_PORTS, NOT_RELAYED, NO_TUNNEL, OPTIONS,
+                        PAGES, PAUSE, RELAYED, SILENT, TUNNEL_PID_FILE, assert_log_is_proper,
                         assert_published, assert_stops_clean, forward_by_hand,
                         page_through_the_tunnel, pages_from_outside, start, start_direct,
                         tunnel_client, wait_for_client_end, wait_for_log, wait_for_next_cycle,
@@ -112,6 +112,25 @@ def tunnel_files_cannot_be_written(lab: Lab) -> None:
     assert (folder / "auth.txt").stat().st_mode & 0o777 == 0o600
     assert_stops_clean(lab)
     wait_for_client_end(client)
+
+
+@scenario(Situation(gateway=SILENT, relay=True, clock=FAST))
+def relay_cannot_be_used(lab: Lab) -> None:
+    """No openvpn, then no tunnel device: no tunnel comes up, the status is failed."""
+    for fault, what, cause in (
+            (faults.openvpn_missing, "openvpn is not installed", "relay-client-missing"),
+            (faults.tunnel_device_missing, "there is no tunnel device", "tunnel-device-missing")):
+        lab.step(what)
+        failures = lab.device.messages.count(NOT_RELAYED)
+        with fault(lab):
+            lab.start_daemon(*OPTIONS)
+            wait_for_log(lab, NOT_RELAYED, failures + 1)
+            wait_until(lambda: len(daemon.running("openvpn")) == 1, "only the relay's own process",
+                       20)
+            assert lab.device.status == "failed"
+            lab.moment(f"{what}: the status is failed", cause)
+            assert_stops_clean(lab)
+    assert lab.device.statuses_sent() == ["connecting", "failed", "disabled"] * 2
 
 
 @scenario(_NO_RELAY)

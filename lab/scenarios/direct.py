@@ -16,11 +16,13 @@ from lab.gateway import STOCK_PERMISSIONS, GatewaySetup
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
+from lab.scripted_gateway import Personality
 
 _TAKEN = "is already mapped to another IP: 192.168.77.20"
 _REFUSED = "Router::mapPort() - fail - failed to map external port: "
 _MAPPED_ANEW = "Resetting HTTP allocated ports due to external or local IP change: [9091]"
 _PASSED = "TavikClient::testPort - port map check success."
+_FAILED = "TavikClient::testPort - port map check failed."
 
 # Requests to a UPnP gateway. A discovery asks for its description, its state and twice for its
 # address. Mappings left by an earlier run, under two names, take two passes each through its list.
@@ -63,6 +65,11 @@ def natpmp(lab: Lab) -> None:
     assert_reported_in_order(lab)
     _assert_reached(lab)
     assert lab.device.messages.count("Router::upnp_discover - UPnP Discover failed") > 0
+    wait_for_cycle(lab, 1)
+    if lab.asks_doctor:
+        # The log says that no gateway speaks UPnP. Direct counts once nothing has failed for long.
+        from_log = lab.default_log_says()
+        assert from_log.cause in {"", "settling"}, from_log
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "disabled"]
 
@@ -163,8 +170,42 @@ def default_ports_only(lab: Lab) -> None:
     assert ports_tested(lab) == []
     lab.moment("another computer holds the only port that is allowed, so the device is relayed",
                "ports-taken")
-    assert_stops_clean(lab, left=others)
-    assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]
+
+    lab.step("the port is free, but nothing from the internet comes through it")
+    with lab.daemon.held():
+        lab.gateway.lose(9091)
+        lab.gateway.block(9091)
+        failures = lab.device.messages.count(_FAILED)
+    wait_for_log(lab, _FAILED, failures + 1)
+    wait_for_next_cycle(lab)
+    assert set(ports_tested(lab)) == {9091}
+    lab.moment("a filter drops what comes to the port, so the device stays relayed",
+               "port-filtered")
+
+    lab.step("the provider replaces the router, and its internet address by a shared one")
+    with lab.daemon.held():
+        lab.gateway.become(GatewaySetup(personality=Personality()))
+        lab.provider.insert("100.64.3.9")
+        lab.moment("the gateway has got a shared address, and no test has noticed yet",
+                   "shared-address")
+    assert_stops_clean(lab)
+    assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "relayed", "disabled"]
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), relay=True,
+                    dynamic={"DEFAULT_PORTS_ONLY": "TRUE"}, clock=IMPATIENT))
+def natpmp_port_filtered(lab: Lab) -> None:
+    """Nothing comes through the only port that a NAT-PMP gateway may open: relayed."""
+    lab.gateway.block(9091)
+    start(lab, "relayed")
+    wait_for_cycle(lab, 1)
+    assert lab.gateway.mappings() == []
+    lab.moment("a filter drops what comes to the port, so the device is relayed", "port-filtered")
+    if lab.asks_doctor:
+        # The log says that no gateway speaks UPnP, and not that one speaks NAT-PMP.
+        from_log = lab.default_log_says()
+        assert from_log.cause == "port-filtered", from_log
+    assert_stops_clean(lab)
 
 
 @scenario(Situation(clock=FAST))
@@ -219,12 +260,14 @@ def http_forwarding_lost(lab: Lab) -> None:
     with lab.daemon.held():
         lab.gateway.lose(9091)
         assert pages_from_outside() == [None, PAGES[1]]
+        lab.moment("the gateway has dropped a port, and no test has noticed yet", "mapping-lost")
     _wait_for_sent(lab, "connecting", "portforwarded", "failed", "portforwarded")
     # Cycles are two minutes apart, tests four.
     assert lab.device.messages.count(NOT_DUE) - ignored <= 2
     assert ports_tested(lab)[tests:] == [9091] * 4
     assert asked(lab, requests) == [WAIT, *[PORT_TEST] * 4, PORT_FORWARD]
     _assert_reached(lab)
+    lab.moment("the port is mapped again")
     assert_stops_clean(lab)
 
 

@@ -194,11 +194,13 @@ def hostile_flood(lab: Lab) -> None:
     idle = _most_memory(lab)
     lab.step("SIGTERM during the flood")
     time.sleep(0.5)
+    lab.moment_follows()
     _assert_stops_in_time(lab)
     lab.step("left alone, the daemon makes the device reachable")
     start(lab, "portforwarded")
     assert _most_memory(lab) - idle <= _MOST_GROWTH
     assert_published(lab)
+    lab.moment("the gateway has been found amid the flood")
     assert_stops_clean(lab)
 
 
@@ -230,6 +232,10 @@ def hostile_back_end(lab: Lab) -> None:
     wait_for_log(lab, _ATTACKED)
     assert (time.monotonic() - began) * _TENFOLD < 30 + _SEARCH_SECONDS
     lab.moment("the back end answers at a byte in four seconds", "back-end-refuses")
+    with lab.daemon.held():
+        lab.device.keep_silent()
+        lab.moment("the back end hangs", "back-end-silent")
+        lab.device.keep_silent(False)
     lab.device.answer_slowly(0)
     _assert_stops_in_time(lab)
 

@@ -56,6 +56,12 @@ def unmap_all(lab: Lab) -> None:
         "/local/port_forward_delete?internal_port=80"]
     lab.moment("pelorus -u has removed everything", "not-running")
 
+    lab.step("the user switches remote access off: the daemon ends at once")
+    lab.device.change(ENABLEREMOTEACCESS="0")
+    lab.start_daemon(*OPTIONS)
+    assert wait_until(lab.daemon.ended, "the daemon to end", 60) == "exit 0"
+    lab.moment("remote access is switched off", "switched-off")
+
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def unmap_all_while_relayed(lab: Lab) -> None:

@@ -2,12 +2,14 @@
 
 from __future__ import annotations
 
+from collections.abc import Sequence
+
 from lab import network, provider
 from lab.central import MY_IP, PORT_FORWARD, PORT_TEST, PortTest, Record
 from lab.checks import (BOTH_MAPPED, FAST, MANUAL_PORTS, NOT_DUE, NOT_RELAYED, NO_TUNNEL, OPTIONS,
                         PAGES, PUBLISHED, SILENT, assert_logged_by_next_cycle, assert_published,
                         assert_stops_clean, forward_by_hand, pages_from_outside, ports_tested,
-                        start, wait_for_log, wait_for_status)
+                        start, wait_for_log, wait_for_next_cycle, wait_for_status)
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
@@ -18,6 +20,7 @@ _BY_HAND = [Mapping("TCP", 8081, network.DEVICE_ADDRESS, 80),
 
 _BEGIN, _END = "manualPortForward - allocatedHttpPort", "manualPortForward - localConnectionType"
 _DOUBLE_NAT = "Enforce connection as RELAY"
+_OTHER_DEVICE = "is different than the Device ID of this unit"
 
 _CLOCK, _INTERVAL = 100, 500
 
@@ -50,16 +53,26 @@ def manual_ports(lab: Lab) -> None:
     lab.moment("the settings name a port that nobody forwards: every cycle tests it, and fails",
                "manual-ports-closed")
 
+    lab.step("the user forwards that port, but to another device")
+    with lab.daemon.held():
+        lab.neighbour.pretend("0815")
+        elsewhere = Mapping("TCP", 8082, network.NEIGHBOUR_ADDRESS, 80)
+        lab.gateway.forward_by_hand(8082, 80, network.NEIGHBOUR_ADDRESS)
+        answers = lab.device.messages.count(_OTHER_DEVICE)
+    wait_for_log(lab, _OTHER_DEVICE, answers + 1)
+    wait_for_next_cycle(lab)
+    lab.moment("the port leads to another device of this kind", "another-device-answers")
+
     lab.step("the settings are correct again")
     lab.device.change(MANUAL_EXTERNAL_HTTP_PORT="8081")
     wait_for_status(lab, "portforwarded")
-    _assert_published_by_hand(lab)
+    _assert_published_by_hand(lab, [elsewhere])
     assert lab.device.messages.count(_DOUBLE_NAT) == 0
     lab.moment("the settings name the right ports again, and the device is reached on them")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "portforwarded", "failed",
                                           "portforwarded", "disabled"]
-    assert lab.gateway.by_hand() == _BY_HAND
+    assert lab.gateway.by_hand() == sorted([*_BY_HAND, elsewhere])
 
 
 @scenario(Situation(static=NO_TUNNEL, clock=FAST))
@@ -120,6 +133,8 @@ def manual_and_back(lab: Lab) -> None:
     with lab.daemon.held():
         assert lab.gateway.mappings() == others
         _assert_published_by_hand(lab)
+        # While the doctor looks, a port test would fall due.
+        lab.visit("ports forwarded by hand are in use, and the daemon has removed its own two")
 
         lab.step("back to automatic, and nothing changes")
         lab.device.change(MANUAL_PORT_FORWARD="FALSE")
@@ -238,13 +253,13 @@ def _wait_for_port(lab: Lab, http_port: int) -> None:
                  f"the device to be published on port {http_port}", 60)
 
 
-def _assert_published_by_hand(lab: Lab) -> None:
-    """The user's ports are published, lead to the device, and are unchanged."""
+def _assert_published_by_hand(lab: Lab, others: Sequence[Mapping] = ()) -> None:
+    """The user's ports are published and lead to the device; beside them there are `others`."""
     assert lab.central.record == Record(_HERE, network.DEVICE_ADDRESS, 8081, 8444)
     assert lab.device.setting("EXTERNAL_IP") == _HERE
     assert lab.device.setting("EXTERNAL_HTTP_PORT") == "8081"
     assert lab.device.setting("EXTERNAL_HTTPS_PORT") == "8444"
-    assert lab.gateway.by_hand() == _BY_HAND
+    assert lab.gateway.by_hand() == sorted([*_BY_HAND, *others])
     assert pages_from_outside(8081, 8444) == PAGES
 
 

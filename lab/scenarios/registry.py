@@ -22,8 +22,9 @@ class Scenario:
 
     @property
     def tells_moment(self) -> bool:
-        """True when the story itself calls `Lab.moment`."""
-        return isinstance(self.play, FunctionType) and "moment" in self.play.__code__.co_names
+        """True when the story itself calls `Lab.moment` or `Lab.visit`."""
+        return (isinstance(self.play, FunctionType)
+                and not {"moment", "visit"}.isdisjoint(self.play.__code__.co_names))
 
 
 SCENARIOS: dict[str, Scenario] = {}

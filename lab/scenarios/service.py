@@ -312,8 +312,9 @@ def names_disagree(lab: Lab) -> None:
 
     lab.step("a name is missing: looked up three times")
     with lab.daemon.held():
-        before = _lookups(lab)
         lab.names.pin(four_level, None)
+        lab.moment("one of the public names is gone", "names-unresolved")
+        before = _lookups(lab)
     wait_for_log(lab, _TORN_DOWN)
     assert [after - earlier for earlier, after in zip(before, _lookups(lab))] == [3, 1, 1]
     lab.names.unpin(four_level)
@@ -339,6 +340,7 @@ def names_disagree(lab: Lab) -> None:
     wait_for_next_cycle(lab)
     assert _addresses_sent(lab) == ["NULL", _HERE] * 3
     assert_published(lab)
+    lab.moment("all public names are right again")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", *["portforwarded", "failed"] * 2,
                                           "portforwarded", "disabled"]

@@ -160,8 +160,10 @@ def internal_ports_change(lab: Lab) -> None:
     lab.step("the web server moves from ports 80 and 443 to 8080 and 8443")
     with lab.daemon.held():
         lab.device.serve_on(8080, 8443)
-        lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
         assert pages_from_outside() == [None, None]
+        lab.moment("the web server has moved to other ports than the settings say",
+                   "web-server-silent")
+        lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
 
     lab.step("the port test notices; port 9091 is still held by the old mapping, so 9092 is used")
     lab.wait_for(lambda: lab.device.setting("EXTERNAL_HTTP_PORT") == "9092", "the new port", 60)
@@ -176,6 +178,7 @@ def internal_ports_change(lab: Lab) -> None:
     assert ports_tested(lab) == [9091, 9091, 9091, 9091, 9092]
     assert lab.central.record and lab.central.record.http_port == 9092
     assert pages_from_outside(9092, 9444) == PAGES
+    lab.moment("the gateway forwards to the new ports")
     assert_stops_clean(lab)
 
 

@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 
 #include <fstream>
+#include <set>
+#include <string>
 
 #include "doctor/causes.h"
 
@@ -18,6 +20,26 @@ std::string documentedCauses() {
         rows += line.substr(0, line.rfind(" | ") + 2) + "\n";
     }
     return rows;
+}
+
+// The cause in each row of the table that scripts/diagnoses writes.
+std::set<std::string> shownCauses() {
+    std::ifstream file{PELORUS_SOURCES "/../docs/doctor.md"};
+    std::string line;
+    std::set<std::string> names;
+    while (std::getline(file, line) && line != "<!-- diagnoses -->") continue;
+    while (std::getline(file, line) && line != "<!-- end -->") {
+        const std::size_t begin = line.find("| `");
+        if (begin == line.npos) continue;
+        names.insert(line.substr(begin + 3, line.find('`', begin + 3) - begin - 3));
+    }
+    return names;
+}
+
+TEST(CausesDocument, SaysForEachCauseWhichScenarioShowsIt) {
+    const std::set<std::string> shown = shownCauses();
+    for (const Cause& cause : allCauses())
+        EXPECT_EQ(shown.count(std::string{cause.name}), 1U) << cause.name;
 }
 
 TEST(CausesDocument, HasEachCauseWithItsWordsInTheOrderOfWeight) {

@@ -11,8 +11,8 @@ void receiveInPieces(std::string text) {
     constexpr std::size_t kLargest = 10238;  // bytes
     pelorus::CurlRcvBuffer buffer;
     for (std::size_t at = 0, piece = 1; at < text.size() && piece != 0; at += piece) {
-        const std::size_t wanted =
-            std::min<std::size_t>(static_cast<unsigned char>(text[at]) * 8 + 1, text.size() - at);
+        const std::size_t first = static_cast<unsigned char>(text[at]);
+        const std::size_t wanted = std::min(first * 8 + 1, text.size() - at);
         piece = pelorus::curlRcvData(&text[at], 1, wanted, &buffer);
         assert(piece == (at + wanted <= kLargest ? wanted : 0));
     }

@@ -78,7 +78,9 @@ inline void begin(const char* deviceType) {
 
 }  // namespace pelorus::fuzz
 
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);
+
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     pelorus::fuzz::tryText({data, data + size});
     return 0;
 }

@@ -124,7 +124,14 @@ void tellOurs(const GatewayTable& table, Findings& findings) {
 // gateways name the other device instead of telling its address.
 std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
     if (!port.told) return {};
-    if (!port.entry) return "the gateway does not map it";
+    if (!port.entry) {
+        // One that knows no single entries may list it all the same.
+        const bool isListed =
+            std::any_of(table.entries.begin(), table.entries.end(), [&](const TableEntry& entry) {
+                return entry.externalPort == port.externalPort && isOwn(table, entry);
+            });
+        return isListed ? "" : "the gateway does not map it";
+    }
     const TableEntry& entry = *port.entry;
     if (classOf(entry.client) == AddressClass::NONE) return {};
     if (isOwn(table, entry) && entry.internalPort == port.internalPort) return {};

@@ -50,10 +50,12 @@ int openToRead(const std::string& path, bool orPipe, std::string& problem) {
 // What follows the name of a log that was rotated: ".1", "-20261101", both also with ".gz".
 bool isRotated(std::string_view end) {
     constexpr std::size_t kDate = 8;
-    if (end.empty() || (end.front() != '.' && end.front() != '-')) return false;
-    const std::size_t digits = std::min(end.find_first_not_of("0123456789", 1), end.size()) - 1;
-    if (digits < (end.front() == '-' ? kDate : 1)) return false;
-    end.remove_prefix(digits + 1);
+    const std::string_view mark = end.substr(0, 1);
+    if (mark != "." && mark != "-") return false;
+    end.remove_prefix(mark.size());
+    const std::size_t digits = std::min(end.find_first_not_of("0123456789"), end.size());
+    if (digits < (mark == "-" ? kDate : 1)) return false;
+    end.remove_prefix(digits);
     return end.empty() || end == ".gz";
 }
 

@@ -140,7 +140,8 @@ TEST_P(Mappings, AreJudged) {
 const Table kTables[] = {
     {"NothingMappedNothingPublished", {}, {}, {}},
     {"Ours", {kOurs}, {http(kOurs), {9444, 443, true, kOursForHttps}}, {}},
-    {"Lost", {kOurs}, {http({})}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"Lost", {kOursForHttps}, {http({})}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"ListedOnly", {kOurs}, {http({})}, {}},
     {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
     {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, {Sign::OUR_MAPPINGS_MISSING}},
     {"NotToldAndNotInTheTable", {}, {{9091, 80, false, {}}}, {}},

@@ -13,6 +13,7 @@ import os
 import re
 import sys
 import traceback
+from collections.abc import Iterable
 from concurrent.futures import ThreadPoolExecutor
 from dataclasses import astuple
 
@@ -63,6 +64,16 @@ def table(found: dict[str, list[Moment]]) -> list[str]:
     """The lines of the table, a row for each moment that differs from the others."""
     return [*_HEAD, *dict.fromkeys(_row(name, *astuple(moment))
                                    for name, moments in found.items() for moment in moments)]
+
+
+def without_facts(lines: Iterable[str]) -> list[str]:
+    """The first cells of a table's rows: which cause is named when."""
+    return list(dict.fromkeys(" | ".join(line.split(" | ")[:3]) for line in lines))
+
+
+def documented(name: str) -> list[str]:
+    """The rows about a scenario in docs/doctor.md."""
+    return [line for line in PAGE.read_text().splitlines() if line.startswith(f"| {name} |")]
 
 
 def _row(name: str, what: str, cause: str, fact: str) -> str:

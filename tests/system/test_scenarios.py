@@ -4,6 +4,7 @@ from __future__ import annotations
 
 import pytest
 
+from lab import diagnoses
 from lab.relay import TUNNEL_DEVICE
 from lab.scenario import Lab
 from lab.scenarios import SCENARIOS
@@ -31,3 +32,7 @@ def test_scenario(name: str) -> None:
     except Exception:
         print(lab.report())
         raise
+    if lab.asks_doctor:
+        rows = diagnoses.table({name: lab.moments})[2:]
+        assert diagnoses.without_facts(rows) == diagnoses.without_facts(
+            diagnoses.documented(name)), "docs/doctor.md is not up to date: scripts/diagnoses"

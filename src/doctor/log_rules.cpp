@@ -226,7 +226,7 @@ Rules serviceRules() {
     error("TavikClient::updateServerMapping - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
     notice("TavikClient::updateServerMapping - httpGet got %s, %d bytes.").happens(LogEvent::PUBLISHED).clears(kService),
     error("TavikClient::deleteServerMapping - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
-    notice("TavikClient::deleteServerMapping - httpGet got %s, %d bytes.").clears(kService),
+    notice("TavikClient::deleteServerMapping - httpGet got %s, %d bytes.").happens(LogEvent::WITHDRAWN).clears(kService),
     error("TavikClient::updateRemoteCommStatus - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
     notice("TavikClient::updateRemoteCommStatus - httpGet got %s. %d bytes").clears(kService),
     error("ConnectionManager::createDirectConnection() - failed to update mapping info").happens(LogEvent::PUBLISHING_FAILED)

@@ -49,6 +49,10 @@ bool isAmong(const std::vector<Sign>& signs, Sign sign) {
     return std::find(signs.begin(), signs.end(), sign) != signs.end();
 }
 
+bool explains(Sign sign) {
+    return std::count(kNoReasons.begin(), kNoReasons.end(), sign) == 0;
+}
+
 bool isStale(Sign sign, Time when, Time now) {
     return (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
            (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
@@ -111,14 +115,18 @@ void LogSigns::set(Sign sign, Time when, const std::string& text) {
         return;
     }
     signs[sign] = {Source::LOG, text, when};
-    const bool explains = std::count(kNoReasons.begin(), kNoReasons.end(), sign) == 0;
-    if (!reason && explains) reason = Reason{sign, when};
+    if (!reason && explains(sign)) reason = Reason{sign, when};
 }
 
 void LogSigns::clear(const std::vector<Sign>& cleared) {
-    for (const Sign sign : cleared) {
-        signs.erase(sign);
-        if (reason && reason->sign == sign && reason->text.empty()) reason.reset();
+    for (const Sign sign : cleared) signs.erase(sign);
+    if (!reason || has(reason->sign) || !reason->text.empty()) return;
+    const Time begin = reason->when;
+    reason.reset();
+    for (const auto& [sign, fact] : signs) {
+        const bool isOfAttempt = cycle > 0 ? cycles.at(sign) == cycle : *fact.when >= begin;
+        if (!isOfAttempt || !explains(sign)) continue;
+        if (!reason || *fact.when < reason->when) reason = Reason{sign, *fact.when};
     }
 }
 

@@ -25,7 +25,8 @@ public:
     /// Sets @p sign. Becomes the reason if there is none yet and it explains anything.
     void set(Sign sign, Time when, const std::string& text);
 
-    /// Takes them away; one that was the reason is none any more, unless a test failed by it.
+    /// Takes them away. Unless a test failed by it, one that was the reason leaves that to the next
+    /// thing that went wrong.
     void clear(const std::vector<Sign>& cleared);
 
     /// A new run of the daemon: no sign and no reason is left.

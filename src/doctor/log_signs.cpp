@@ -27,6 +27,7 @@ const std::vector<Sign> kRelaySolves{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEW
                                      Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
                                      Sign::LOGGED_SECOND_NAT};
 
+const std::vector<Sign> kRefusals{Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER};
 const std::vector<Sign> kBackEndSigns{Sign::LOGGED_BACK_END_SILENT, Sign::LOGGED_BACK_END_REFUSES};
 
 // How the attempts at the direct way end: what a later one ends with holds instead.
@@ -141,10 +142,10 @@ void LogSigns::forget() {
 bool LogSigns::takeTestAnswer(std::string_view answer, Time when) {
     if (reason && !reason->text.empty()) reason.reset();
     clear(kServiceSigns);
-    clear({Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
-           Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,
-           Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_CREDENTIALS_MISSING,
-           Sign::LOGGED_MANUAL_PORT_INVALID});
+    clear(kRefusals);
+    clear({Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE,
+           Sign::LOGGED_SERVICE_WAIT, Sign::LOGGED_TEST_SKIPPED_DISK,
+           Sign::LOGGED_CREDENTIALS_MISSING, Sign::LOGGED_MANUAL_PORT_INVALID});
     const std::string asked = shownText(tagged(answer, "external_ip"));
     const std::string seen = shownText(tagged(answer, "remote_external_ip"));
     if (!asked.empty()) value(Kept::TESTED) = asked;
@@ -202,6 +203,7 @@ void LogSigns::failService(Time when) {
 }
 
 void LogSigns::failTestRequest(Time when) {
+    clear(kRefusals);
     failService(when);
     // Unlike the sign of the service as a whole, this one outlives its other answers.
     if (has(Sign::LOGGED_SERVICE_SILENT)) {

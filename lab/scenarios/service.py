@@ -379,10 +379,8 @@ def _play_fault(lab: Lab, fault: Fault, error: str, count: int, *operations: str
     for operation in operations:
         lab.central.misbehave(operation, fault)
     _assert_fails(lab, error, count)
-    # Which answer it was is logged at severity 6.
     lab.moment("the service misbehaves in each port test: the status is failed",
-               "service-answers-nonsense" if fault.body else "service-silent",
-               default="tunnel-client-does-not-start" if fault.body else "")
+               "service-answers-nonsense" if fault.body else "service-silent")
     lab.step("the service answers properly")
     for operation in operations:
         lab.central.misbehave(operation, None)

@@ -1,7 +1,6 @@
 #include "doctor/log_rules.h"
 
 #include <algorithm>
-#include <cctype>
 #include <unordered_map>
 
 namespace pelorus::doctor {
@@ -41,6 +40,8 @@ LogRule& LogRule::onlyIf(std::size_t value, std::string_view is) {
 namespace {
 
 constexpr std::string_view kConversionEnds = "dsu";
+// Some system loggers cut a line at 256 bytes, stamp and name included.
+constexpr std::size_t kShortestCut = 200;
 
 LogRule ruleFor(int severity, std::string_view text) {
     LogRule rule;
@@ -142,8 +143,8 @@ Rules gatewayRules() {
     error("Router::upnp_discover - UPnP Discover failed to return any response.").happens(LogEvent::UPNP_SILENT),
     info("Router::natpmp_discover - failed to get External IP address").happens(LogEvent::NATPMP_SILENT).unless(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS)
         .sets(Sign::LOGGED_NO_GATEWAY, "no gateway answers UPnP or NAT-PMP"),
-    info("Router::upnp_discover - Router's external IP address: %s ").keeps(Kept::GATEWAY).clears(kGateway),
-    info("Router::natpmp_discover - Router's external IP address: %s ").keeps(Kept::GATEWAY).clears(kGateway)
+    info("Router::upnp_discover - Router's external IP address: %s").keeps(Kept::GATEWAY).clears(kGateway),
+    info("Router::natpmp_discover - Router's external IP address: %s").keeps(Kept::GATEWAY).clears(kGateway)
         .happens(LogEvent::NATPMP_FOUND),
     notice("Router::upnp_discover - Router's external IP address has changed!").clears(kGateway),
     notice("Router::natpmp_discover - Router's external IP address has changed!").clears(kGateway).happens(LogEvent::NATPMP_FOUND),
@@ -151,7 +152,7 @@ Rules gatewayRules() {
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the router has no internet address"),
     info("ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.")
         .clears(kGateway),
-    info("ConnectionManager::forwardPort - forwarding internal port: %d ").clears(kRefusals),
+    info("ConnectionManager::forwardPort - forwarding internal port: %d").clears(kRefusals),
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
         .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),
@@ -225,7 +226,7 @@ Rules serviceRules() {
     error("TavikClient::updateServerMapping - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
     notice("TavikClient::updateServerMapping - httpGet got %s, %d bytes.").happens(LogEvent::PUBLISHED).clears(kService),
     error("TavikClient::deleteServerMapping - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
-    notice("TavikClient::deleteServerMapping - httpGet got %s, %d bytes.").clears(kService),
+    notice("TavikClient::deleteServerMapping - httpGet got %s, %d bytes.").happens(LogEvent::WITHDRAWN).clears(kService),
     error("TavikClient::updateRemoteCommStatus - httpGet failed to get response from central server").happens(LogEvent::SERVICE_FAILED),
     notice("TavikClient::updateRemoteCommStatus - httpGet got %s. %d bytes").clears(kService),
     error("ConnectionManager::createDirectConnection() - failed to update mapping info").happens(LogEvent::PUBLISHING_FAILED)
@@ -298,24 +299,11 @@ Rules nameRules() {
 }
 // clang-format on
 
-// Takes the value of a conversion off the front of @p text; @p next is what follows in the pattern.
-bool takeValue(std::string_view& text, char kind, std::string_view next, std::string_view& value) {
-    std::size_t length = 0;
-    if (kind == 's') {
-        length = next.empty() ? text.size() : text.find(next);
-        if (length == std::string_view::npos) return false;
-    } else {
-        if (!text.empty() && text.front() == '-') length = 1;
-        const std::size_t sign = length;
-        while (length < text.size() &&
-               std::isdigit(static_cast<unsigned char>(text[length])) != 0) {
-            ++length;
-        }
-        if (length == sign) return false;
-    }
-    value = text.substr(0, length);
-    text.remove_prefix(length);
-    return true;
+// The length of the number that @p text begins with; 0 if there is none.
+std::size_t numberLength(std::string_view text) {
+    const std::size_t sign = !text.empty() && text.front() == '-' ? 1 : 0;
+    const std::size_t end = std::min(text.find_first_not_of("0123456789", sign), text.size());
+    return end == sign ? 0 : end;
 }
 
 // Both begin with the same letters as far as the first conversion. Most rules go by this alone.
@@ -340,22 +328,32 @@ const RulesBySubject& rulesBySubject() {
     return sorted;
 }
 
-bool fits(std::string_view text, std::string_view pattern, LogValues& values) {
-    std::size_t count = 0;
-    for (;;) {
-        const std::size_t conversion = pattern.find('%');
-        const std::string_view plain = pattern.substr(0, conversion);
-        if (text.compare(0, plain.size(), plain) != 0) return false;
-        if (conversion == std::string_view::npos) return true;
-        text.remove_prefix(plain.size());
-        const std::size_t end = pattern.find_first_of(kConversionEnds, conversion);
-        if (end == std::string_view::npos || count == values.size()) return false;
-        const char kind = pattern[end];
-        pattern.remove_prefix(end + 1);
-        if (!takeValue(text, kind, pattern.substr(0, pattern.find('%')), values[count++])) {
-            return false;
-        }
+// Fills @p values from number @p count on. A text may have in it what stands behind it in the
+// pattern, and is all that is left of a line that was cut.
+bool fits(std::string_view text,
+          std::string_view pattern,
+          LogValues& values,
+          bool mayBeCut,
+          std::size_t count = 0) {
+    const std::size_t conversion = pattern.find('%');
+    const std::string_view plain = pattern.substr(0, conversion);
+    if (text.compare(0, plain.size(), plain) != 0) return false;
+    if (conversion == std::string_view::npos) return true;
+    text.remove_prefix(plain.size());
+    const std::size_t end = pattern.find_first_of(kConversionEnds, conversion);
+    if (end == std::string_view::npos || count == values.size()) return false;
+    const bool isText = pattern[end] == 's';
+    pattern.remove_prefix(end + 1);
+    std::size_t length = numberLength(text);
+    if (!isText && length == 0) return false;
+    const std::string_view next = pattern.substr(0, pattern.find('%'));
+    if (isText) length = next.empty() ? text.size() : text.rfind(next);
+    if (length != std::string_view::npos) {
+        values[count] = text.substr(0, length);
+        if (fits(text.substr(length), pattern, values, mayBeCut, count + 1)) return true;
     }
+    values[count] = text;
+    return isText && mayBeCut;
 }
 
 }  // namespace
@@ -393,7 +391,7 @@ const LogRule* findLogRule(std::string_view text, LogValues& values) {
     for (const LogRule* const rule : rules->second) {
         if (!begin(text, *rule)) continue;
         values = {};
-        if (!fits(text, rule->text, values)) continue;
+        if (!fits(text, rule->text, values, text.size() >= kShortestCut)) continue;
         const auto& [value, wanted] = rule->condition;
         if (value == 0 || values[value - 1] == wanted) return rule;
     }

@@ -34,6 +34,7 @@ enum class LogEvent {
     SERVICE_FAILED,  ///< a request to the service got no answer
     PUBLISHED,       ///< the service has the record; the back end is told next
     PUBLISHING_FAILED,
+    WITHDRAWN,      ///< the service has dropped the record; the back end is told next
     BACK_END_SAID,  ///< value 1: the answer with which it refused something
     UPNP_SILENT,
     NATPMP_FOUND,

@@ -3,11 +3,14 @@
 #include <algorithm>
 #include <utility>
 
+#include "doctor/reach_history.h"
 #include "doctor/shown_text.h"
 
 namespace pelorus::doctor {
 
 namespace {
+
+using namespace std::chrono_literals;
 
 constexpr std::string_view kNoGateway = "no gateway answers UPnP or NAT-PMP";
 constexpr std::string_view kMissing = "(not logged)";
@@ -23,6 +26,38 @@ const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
 const std::vector<Sign> kRelaySolves{Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
                                      Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER,
                                      Sign::LOGGED_SECOND_NAT};
+
+const std::vector<Sign> kRefusals{Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER};
+const std::vector<Sign> kBackEndSigns{Sign::LOGGED_BACK_END_SILENT, Sign::LOGGED_BACK_END_REFUSES};
+
+// How the attempts at the direct way end: what a later one ends with holds instead.
+const std::vector<Sign> kGatewayOutcomes{
+    Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS,
+    Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER};
+const std::vector<Sign> kTestOutcomes{
+    Sign::LOGGED_SECOND_NAT,          Sign::LOGGED_TEST_FAILED,       Sign::LOGGED_TEST_UNANSWERED,
+    Sign::LOGGED_OTHER_DEVICE,        Sign::LOGGED_PUBLISHING_FAILED, Sign::LOGGED_SERVICE_NONSENSE,
+    Sign::LOGGED_MANUAL_PORT_INVALID, Sign::LOGGED_MANUAL_RULED_OUT};
+
+// What is logged anew in every cycle, or in every daily look at the names.
+constexpr auto kLongestCycle = 2h;
+constexpr auto kLongestUntilNames = 25h;
+const std::vector<Sign> kEachCycle{Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_NO_GATEWAY,
+                                   Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS};
+const std::vector<Sign> kEachDay{Sign::LOGGED_NAMES_LEAD_ELSEWHERE, Sign::LOGGED_NAMES_UNRESOLVED};
+
+bool isAmong(const std::vector<Sign>& signs, Sign sign) {
+    return std::find(signs.begin(), signs.end(), sign) != signs.end();
+}
+
+bool explains(Sign sign) {
+    return std::count(kNoReasons.begin(), kNoReasons.end(), sign) == 0;
+}
+
+bool isStale(Sign sign, Time when, Time now) {
+    return (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
+           (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
+}
 
 bool startsWith(std::string_view text, std::string_view beginning) {
     return text.compare(0, beginning.size(), beginning) == 0;
@@ -53,6 +88,9 @@ std::string_view portOf(std::string_view url) {
 }  // namespace
 
 void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
+    if (rule.event == LogEvent::CYCLE) ++cycle;
+    if (cycle == 0 && reason && when - reason->when > kAttemptTime) reason.reset();
+    concludeBackEnd(rule);
     if (rule.kept != Kept::NOTHING) {
         const std::string_view text = values[rule.keptValue - 1];
         value(rule.kept) = shownText(rule.kept == Kept::PORT ? portOf(text) : text);
@@ -62,36 +100,59 @@ void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
     for (const Sign sign : rule.set) set(sign, when, filled(rule.words, values));
 }
 
+// Success is not logged at every severity.
+void LogSigns::concludeBackEnd(const LogRule& rule) {
+    if (backEndTold && rule.kept == Kept::ERROR) return;
+    const bool fails = std::any_of(rule.set.begin(), rule.set.end(),
+                                   [](Sign sign) { return isAmong(kBackEndSigns, sign); });
+    if (backEndTold && !fails) clear(kBackEndSigns);
+    backEndTold = rule.event == LogEvent::PUBLISHED || rule.event == LogEvent::WITHDRAWN;
+}
+
 void LogSigns::set(Sign sign, Time when, const std::string& text) {
-    if (reason == sign && has(sign)) return;  // the first of several tells most
+    cycles[sign] = cycle;
+    if (reason && reason->sign == sign && has(sign)) {
+        signs[sign].when = when;  // the first of several tells most
+        return;
+    }
     signs[sign] = {Source::LOG, text, when};
-    const bool explains = std::count(kNoReasons.begin(), kNoReasons.end(), sign) == 0;
-    if (!reason && explains) reason = sign;
+    if (!reason && explains(sign)) reason = Reason{sign, when};
 }
 
 void LogSigns::clear(const std::vector<Sign>& cleared) {
-    for (const Sign sign : cleared) {
-        signs.erase(sign);
-        if (reason == sign) reason.reset();
+    for (const Sign sign : cleared) signs.erase(sign);
+    if (!reason || has(reason->sign) || !reason->text.empty()) return;
+    const Time begin = reason->when;
+    reason.reset();
+    for (const auto& [sign, fact] : signs) {
+        const bool isOfAttempt = cycle > 0 ? cycles.at(sign) == cycle : *fact.when >= begin;
+        if (!isOfAttempt || !explains(sign)) continue;
+        if (!reason || *fact.when < reason->when) reason = Reason{sign, *fact.when};
     }
 }
 
 void LogSigns::forget() {
     signs.clear();
     reason.reset();
+    cycle = 0;
+    backEndTold = false;
 }
 
+// What is tested has been mapped, and the way to the service was there.
 bool LogSigns::takeTestAnswer(std::string_view answer, Time when) {
+    if (reason && !reason->text.empty()) reason.reset();
     clear(kServiceSigns);
-    clear({Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,
-           Sign::LOGGED_TEST_SKIPPED_DISK, Sign::LOGGED_CREDENTIALS_MISSING,
-           Sign::LOGGED_MANUAL_PORT_INVALID});
+    clear(kRefusals);
+    clear({Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE,
+           Sign::LOGGED_SERVICE_WAIT, Sign::LOGGED_TEST_SKIPPED_DISK,
+           Sign::LOGGED_CREDENTIALS_MISSING, Sign::LOGGED_MANUAL_PORT_INVALID});
     const std::string asked = shownText(tagged(answer, "external_ip"));
     const std::string seen = shownText(tagged(answer, "remote_external_ip"));
     if (!asked.empty()) value(Kept::TESTED) = asked;
     if (!seen.empty()) value(Kept::SERVICE) = seen;
     if (contains(answer, "Success")) {
-        clear({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE});
+        clear({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE,
+               Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS});
         return true;
     }
     if (!contains(answer, "<status>") && asked.empty() && seen.empty()) {
@@ -116,6 +177,7 @@ void LogSigns::takeRefusal(std::string_view answer, Time when) {
 }
 
 void LogSigns::failTest(Time when) {
+    if (reason && isAmong(kServiceSigns, reason->sign)) reason->text = reasonText();
     if (!serviceFails() && !has(Sign::LOGGED_SERVICE_NONSENSE) &&
         !has(Sign::LOGGED_TEST_UNANSWERED)) {
         const std::string& port = value(Kept::PORT);
@@ -141,6 +203,7 @@ void LogSigns::failService(Time when) {
 }
 
 void LogSigns::failTestRequest(Time when) {
+    clear(kRefusals);
     failService(when);
     // Unlike the sign of the service as a whole, this one outlives its other answers.
     if (has(Sign::LOGGED_SERVICE_SILENT)) {
@@ -150,7 +213,7 @@ void LogSigns::failTestRequest(Time when) {
 
 // The service has taken the record: then it is the back end that could not be told.
 void LogSigns::failPublishing(std::optional<Time> stored) {
-    reason = Sign::LOGGED_PUBLISHING_FAILED;
+    blame(Sign::LOGGED_PUBLISHING_FAILED);
     const auto silent = signs.find(Sign::LOGGED_BACK_END_SILENT);
     if (silent == signs.end() || !stored) return;
     std::string& text = signs[Sign::LOGGED_PUBLISHING_FAILED].text;
@@ -164,20 +227,48 @@ void LogSigns::failGateway() {
     if (found != signs.end()) found->second.text = kNoGateway;
 }
 
+void LogSigns::blame(Sign sign) {
+    const auto found = signs.find(sign);
+    if (found != signs.end()) reason = Reason{sign, *found->second.when};
+}
+
 void LogSigns::blameRelay() {
-    if (!reason || std::count(kRelaySolves.begin(), kRelaySolves.end(), *reason) == 0) return;
+    if (!reason || !isAmong(kRelaySolves, reason->sign)) return;
     for (const Sign sign : {Sign::LOGGED_RELAY_DOES_NOT_COME_UP, Sign::LOGGED_TUNNEL_NO_OUTPUT}) {
-        if (has(sign)) reason = sign;
+        blame(sign);
     }
 }
 
 std::string LogSigns::reasonText() const {
     if (!reason) return {};
-    const auto found = signs.find(*reason);
-    if (found == signs.end()) return {};
+    const auto found = signs.find(reason->sign);
+    if (found == signs.end()) return reason->text;
     // Two addresses alone would be a riddle.
-    if (*reason == Sign::LOGGED_SECOND_NAT) return "a second router: " + found->second.text;
+    if (reason->sign == Sign::LOGGED_SECOND_NAT) return "a second router: " + found->second.text;
     return found->second.text;
+}
+
+std::map<Sign, Fact> LogSigns::lasting(Time now, bool byHand) const {
+    std::map<Sign, Fact> left;
+    for (const auto& [sign, fact] : signs) {
+        if (!isReplaced(sign, byHand) && !isStale(sign, *fact.when, now)) left[sign] = fact;
+    }
+    return left;
+}
+
+bool LogSigns::isReplaced(Sign sign, bool byHand) const {
+    const auto isLater = [&](Sign other) { return has(other) && isEarlier(sign, other); };
+    const bool isOutcome = isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign) ||
+                           isAmong(kServiceSigns, sign) || sign == Sign::LOGGED_TEST_SKIPPED_DISK;
+    if (!isOutcome) return false;
+    return std::any_of(kTestOutcomes.begin(), kTestOutcomes.end(), isLater) ||
+           (!byHand && std::any_of(kGatewayOutcomes.begin(), kGatewayOutcomes.end(), isLater));
+}
+
+// Both are there. Without cycles in the log, attempts are told apart by the time.
+bool LogSigns::isEarlier(Sign sign, Sign later) const {
+    if (cycle > 0) return cycles.at(sign) < cycles.at(later);
+    return *signs.at(later).when - *signs.at(sign).when > kAttemptTime;
 }
 
 std::string LogSigns::address() const {

@@ -14,8 +14,9 @@
 
 namespace pelorus::doctor {
 
-/// The signs of the LOGGED_... kind, the values that later lines need, and the reason: the first
-/// thing that went wrong in the current cycle.
+/// The signs of the LOGGED_... kind, each with the time of the last line that showed it, the values
+/// that later lines need, and the reason: the first thing that went wrong in the current cycle, or,
+/// where cycles are not logged, in the last minutes.
 class LogSigns {
 public:
     /// Keeps, clears and sets what @p rule says of a line with these @p values.
@@ -24,7 +25,8 @@ public:
     /// Sets @p sign. Becomes the reason if there is none yet and it explains anything.
     void set(Sign sign, Time when, const std::string& text);
 
-    /// Takes them away; one that was the reason is none any more.
+    /// Takes them away. Unless a test failed by it, one that was the reason leaves that to the next
+    /// thing that went wrong.
     void clear(const std::vector<Sign>& cleared);
 
     /// A new run of the daemon: no sign and no reason is left.
@@ -56,7 +58,7 @@ public:
     void failGateway();
 
     /// @p sign is the reason from now on, whatever was it before.
-    void blame(Sign sign) { reason = sign; }
+    void blame(Sign sign);
 
     /// The relay failed too. It is the reason where a relay would have been the way out.
     void blameRelay();
@@ -69,20 +71,35 @@ public:
     /// The address that was tested last, else the gateway's; empty if neither was logged.
     [[nodiscard]] std::string address() const;
 
-    [[nodiscard]] const std::map<Sign, Fact>& all() const { return signs; }
+    /// What still holds at @p now: without what a later attempt has replaced, and what a daemon that
+    /// still runs would have logged again. @p byHand: ports are forwarded by hand, so that the
+    /// gateway's signs replace nothing.
+    [[nodiscard]] std::map<Sign, Fact> lasting(Time now, bool byHand) const;
 
 private:
+    struct Reason {
+        Sign sign{};
+        Time when{};
+        std::string text{};  // set when a test failed by it: then it outlives its sign
+    };
+
     [[nodiscard]] std::string& value(Kept what) { return kept[static_cast<std::size_t>(what)]; }
     [[nodiscard]] const std::string& value(Kept what) const {
         return kept[static_cast<std::size_t>(what)];
     }
     [[nodiscard]] bool serviceFails() const;
+    [[nodiscard]] bool isReplaced(Sign sign, bool byHand) const;
+    [[nodiscard]] bool isEarlier(Sign sign, Sign later) const;
+    void concludeBackEnd(const LogRule& rule);
     [[nodiscard]] std::string filled(std::string_view words, const LogValues& values) const;
     [[nodiscard]] std::string filledWording(std::string_view words, const LogValues& values) const;
 
     std::map<Sign, Fact> signs;
+    std::map<Sign, int> cycles;  // in which each was last shown
     std::array<std::string, static_cast<std::size_t>(Kept::COUNT)> kept{};
-    std::optional<Sign> reason;
+    std::optional<Reason> reason;
+    int cycle = 0;             // of this run; 0 as long as none was logged
+    bool backEndTold = false;  // a failure to do so would be the next thing logged
 };
 
 }  // namespace pelorus::doctor

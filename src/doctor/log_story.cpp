@@ -372,7 +372,10 @@ void LogStory::finish(Evidence& evidence) {
     // A clock that was set makes nonsense of it.
     const bool pauses = nextCycle && *pauseBegin <= evidence.now && evidence.now <= *nextCycle;
     if (pauses && !evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
-    for (const auto& [sign, fact] : signs.all()) evidence.signs[sign] = fact;
+    const bool byHand = ports == Ports::MANUAL;
+    for (const auto& [sign, fact] : signs.lasting(evidence.now, byHand)) {
+        evidence.signs[sign] = fact;
+    }
     evidence.history.assign(history.periods().begin(), history.periods().end());
 }
 

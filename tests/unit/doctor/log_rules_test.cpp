@@ -64,9 +64,10 @@ TEST(LogRules, EachWordKnowsItsValue) {
     }
 }
 
-TEST(LogRules, NoneHasAValueInTheNameItIsFoundBy) {
+TEST(LogRules, EachIsFoundByItsName) {
     for (const LogRule& rule : logRules()) {
         EXPECT_LT(rule.text.find_first_of(" (["), rule.beginning) << rule.text;
+        EXPECT_NE(rule.text.back(), ' ') << "which is taken off a line's end: " << rule.text;
     }
 }
 
@@ -87,6 +88,18 @@ TEST(LogRules, FindsValues) {
     EXPECT_EQ(values[1], "203.0.113.7");
     EXPECT_EQ(findLogRule("DaemonControl::run - sleep x secs.", values), nullptr);
     EXPECT_EQ(findLogRule("", values), nullptr);
+}
+
+TEST(LogRules, FindsAnAnswerThatHoldsWhatStandsBehindItOrWasCut) {
+    const std::string begin = "TavikClient::testPort[1] - httpGet got ";
+    const std::string answer = "<p>Sorry, 3 bytes, or so</p>" + std::string(200, 'x');
+    for (const char* const end : {", 90 bytes from central server.", ", 90 by", ", 9", ",", ""}) {
+        LogValues values;
+        ASSERT_NE(findLogRule(begin + answer + end, values), nullptr) << end;
+        EXPECT_EQ(values[1].substr(0, answer.size()), answer) << end;
+    }
+    LogValues values;
+    EXPECT_EQ(findLogRule(begin + "<p>Sorry, no</p>", values), nullptr);
 }
 
 }  // namespace

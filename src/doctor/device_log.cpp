@@ -163,6 +163,12 @@ void summarise(const LogStory& story, Evidence& evidence) {
     evidence.checks.push_back({Check::Verdict::OK, Source::LOG,
                                "log from " + shownTime(*story.begin()) + " to " +
                                    shownTime(*story.end()) + ", " + startsInWords(story.starts())});
+    if (story.isQuiet()) {
+        evidence.untold.push_back("how it is reached: the daemon logs up to severity " +
+                                  std::to_string(story.severity()) + " only, and no results; " +
+                                  more);
+        return;
+    }
     if (evidence.hasProgressLines) return;
     evidence.untold.push_back(
         "whether a tunnel came up or was kept, and when the next cycle comes: the log has errors "

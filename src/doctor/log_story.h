@@ -30,16 +30,23 @@ public:
     void finish(Evidence& evidence);
 
     [[nodiscard]] int starts() const { return startCount; }
+    /// Too few lines are logged to follow what happens: no results, by what the last start said.
+    [[nodiscard]] bool isQuiet() const { return level < kLeastLevel; }
+    /// The severity up to which the daemon logs.
+    [[nodiscard]] int severity() const { return level; }
     [[nodiscard]] std::optional<Time> begin() const { return firstLine; }
     [[nodiscard]] std::optional<Time> end() const { return lastLine; }
 
 private:
+    static constexpr int kLeastLevel = 5;  // the daemon's default
+
     // A change that becomes true unless the next lines speak of a failure.
     struct Pending {
         Reach reach{};
         Time since{};
     };
 
+    void settleTest(Time when);
     void settlePending(std::string_view text, Time when);
     void becomePending();
     [[nodiscard]] bool isPending(Reach reach) const { return pending && pending->reach == reach; }
@@ -50,12 +57,14 @@ private:
     void happenInRelay(LogEvent event, Time when);
     void concludeGateway();
     void start(Time when);
+    void endSuddenly(Time when);
     void switchOff(Time when);
     void end(Time when);
     void endCycle(Time when, std::string_view seconds);
     void takeStatus(std::string_view word, Time when);
     void takeTestAnswer(std::string_view answer, Time when);
     void lose(Time when);
+    void giveUp(Time when);
     void failRelay(Time when);
     void assumeFrom(std::string_view status);
     void assume(Reach status);
@@ -65,8 +74,11 @@ private:
     LogSigns signs;
     ReachHistory history;
     std::optional<Pending> pending;
-    const Ports ports;
+    Ports ports;
     std::optional<Time> firstLine, lastLine, since, pauseBegin, nextCycle;
+    std::optional<Time> lastOfRun;  // the last line, but for those that precede a start
+    std::optional<Time> passed;     // a port, in a log that has not told yet how it was before
+    int level = kLeastLevel;
     bool announced = false;  // the last line was a start's first one
     bool signalled = false;  // told to end
     bool ended = true;       // no daemon is there, or it is on its way out

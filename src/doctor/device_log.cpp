@@ -31,6 +31,11 @@ public:
         newest = std::min(story.end().value_or(Time{}), now);
     }
 
+    void endFile(const LogStream& stream) {
+        const auto stamp = stream.lastStamp(now);
+        if (stamp && (!last || *stamp > *last)) last = stamp;
+    }
+
     void take(std::string_view text) {
         const auto line = readLogLine(text, now);
         if (!line) return;
@@ -40,6 +45,9 @@ public:
         if (line->host != lastHost) meet(line->host);
         story.take(*line);
     }
+
+    // The last stamp of any program.
+    [[nodiscard]] std::optional<Time> end() const { return last; }
 
     [[nodiscard]] const std::set<std::string>& hosts() const { return met; }
 
@@ -63,6 +71,7 @@ private:
 
     LogStory& story;
     Time now;
+    std::optional<Time> last;
     Time newest{};
     Time hashTime{};
     std::set<std::size_t> hashes;
@@ -118,6 +127,7 @@ std::string readFile(LogStream& stream, const std::string& path, LineOrder& orde
     order.beginFile();
     const bool whole =
         stream.isOpen() && stream.read([&order](std::string_view line) { order.take(line); });
+    order.endFile(stream);
     return whole ? std::string{} : "log " + shownPath(path) + ": " + stream.problem;
 }
 
@@ -190,7 +200,9 @@ void lookAtLog(const LogChoice& choice, Evidence& evidence) {
         if (!problem.empty()) cannotSee("journal: " + problem, evidence);
         if (!story.end()) readSystemLogs(choice.folder, story, order, evidence);
     }
-    if (evidence.fromElsewhere && story.end()) evidence.now = *story.end();
+    if (evidence.fromElsewhere && story.end()) {
+        evidence.now = std::max(*story.end(), order.end().value_or(*story.end()));
+    }
     story.finish(evidence);
     evidence.logHosts = order.hosts();
     summarise(story, evidence);

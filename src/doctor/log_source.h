@@ -15,8 +15,8 @@
 
 namespace pelorus::doctor {
 
-/// Cuts a stream into lines and passes on those that mention the daemon. A line longer than 8 KiB
-/// is cut there.
+/// Cuts a stream into lines and passes on those that mention the daemon. Lines that begin with a
+/// blank continue the one before, as the journal shows them. A line longer than 8 KiB is cut there.
 class LineFilter {
 public:
     using Taker = std::function<void(std::string_view line)>;
@@ -31,9 +31,12 @@ public:
 
 private:
     void takeWholeLines(std::string_view lines);
-    void pass(std::string_view line);
+    [[nodiscard]] std::size_t takeContinuation(std::string_view lines);
+    void endOpenLine();
+    void pass();
 
     Taker taker;
+    std::string held;  // a line that the next one may continue
     std::string open;  // the beginning of a line that has not ended yet
 };
 
@@ -53,6 +56,9 @@ public:
     /// The first stamp of any program's lines among the first 64 KiB, which are read again later.
     std::optional<Time> firstStamp(Time now);
 
+    /// The last stamp of any program's lines, once all was read.
+    [[nodiscard]] std::optional<Time> lastStamp(Time now) const;
+
     /// Reads to the end. False, and `problem` set, when it cannot be read to its end; what came
     /// before has been passed on.
     bool read(const LineFilter::Taker& taker);
@@ -62,6 +68,7 @@ public:
 private:
     std::unique_ptr<gzFile_s, Releaser<gzclose>> file;
     std::string head;  // read by firstStamp()
+    std::string tail;  // the last lines
     bool pipe = false;
 };
 

@@ -90,6 +90,12 @@ TEST_F(DeviceLogTest, FilesInAnyOrderPlainOrZippedAndRepeated) {
     }
 }
 
+TEST_F(DeviceLogTest, EndsWithTheLastLineOfAnyProgram) {
+    const Evidence evidence =
+        look({plain("a", kFirst + "2026-11-20T12:00:00Z nas cron[1]: other\nno stamp")});
+    EXPECT_EQ(evidence.now - *evidence.logEnd, std::chrono::seconds{7191});
+}
+
 TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
     plain("messages", kFirst + kSecond);  // the same lines once more
     plain("syslog", kSecond);
@@ -159,10 +165,11 @@ TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
 }
 
 TEST(LineFilter, CutsWhereverThePiecesEnd) {
-    const std::string text = "other\nelorus 1\nx elorus 2\n" + std::string(9000, 'y') +
-                             "elorus\nelorus " + std::string(9000, 'z') + "\nelorus 3";
-    const std::vector<std::string> wanted{"elorus 1", "x elorus 2",
-                                          "elorus " + std::string(8185, 'z'), "elorus 3"};
+    const std::string text =
+        "other\n elorus 0\nelorus 1\n  a elorus\n\tb\nother\n c\nx elorus 2\n" +
+        std::string(9000, 'y') + "elorus\nelorus " + std::string(9000, 'z') + "\nelorus 3\n d";
+    const std::vector<std::string> wanted{" elorus 0", "elorus 1 a elorus b", "x elorus 2",
+                                          "elorus " + std::string(8185, 'z'), "elorus 3 d"};
     for (const std::size_t size : {1U, 2U, 7U, 8192U, 100000U}) {
         std::vector<std::string> lines;
         LineFilter filter{[&lines](std::string_view line) {

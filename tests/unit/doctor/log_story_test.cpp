@@ -282,10 +282,11 @@ TEST(LogStory, HistoryAndSigns) {
           {300, kPassed},
           {90000, kCopyMissing},
           {90000, kStart},
-          {90009, kPublished}},
+          {90009, kPublished},
+          {90020, kPause}},
          "9 direct: the ports passed their test and were published|"
-         "300 ?: nothing was logged until the daemon started again|90009 direct: the ports passed "
-         "their test and were published|",
+         "300 ?: nothing was logged until the daemon started again|90009 " +
+             direct,
          {}},
         {"errors only, and an end",
          {{0, "main - syslog severity level set to 3."},

@@ -81,6 +81,12 @@ void LogSigns::forget() {
     reason.reset();
 }
 
+void LogSigns::correct(Time from, Time to) {
+    for (auto& [sign, fact] : signs) {
+        if (fact.when && *fact.when >= from) fact.when = to;
+    }
+}
+
 bool LogSigns::takeTestAnswer(std::string_view answer, Time when) {
     clear(kServiceSigns);
     clear({Sign::LOGGED_TEST_UNANSWERED, Sign::LOGGED_SERVICE_NONSENSE, Sign::LOGGED_SERVICE_WAIT,

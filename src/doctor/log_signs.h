@@ -30,6 +30,9 @@ public:
     /// A new run of the daemon: no sign and no reason is left.
     void forget();
 
+    /// The clock was wrong: what was seen at @p from or later was seen at @p to.
+    void correct(Time from, Time to);
+
     /// A new cycle.
     void forgetReason() { reason.reset(); }
 

@@ -7,11 +7,13 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <cstring>
 #include <filesystem>
 #include <system_error>
 #include <utility>
 
+#include "doctor/log_clock.h"
 #include "doctor/log_line.h"
 
 namespace pelorus::doctor {
@@ -148,14 +150,17 @@ std::optional<Time> LogStream::firstStamp(Time now) {
     head.resize(kHead);
     const int length = gzread(file.get(), head.data(), kHead);
     head.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
+    std::optional<Time> first, previous;
     std::string_view rest = head;
     while (!rest.empty()) {
         const std::size_t end = std::min(rest.find('\n'), rest.size() - 1);
         std::string_view line = rest.substr(0, end + 1);
-        if (const auto stamp = takeStamp(line, now)) return stamp;
+        const auto stamp = takeStamp(line, now);
+        if (stamp && (!first || *stamp - *previous > kUnsetClock)) first = stamp;
+        if (stamp) previous = stamp;
         rest.remove_prefix(end + 1);
     }
-    return std::nullopt;
+    return first;
 }
 
 std::optional<Time> LogStream::lastStamp(Time now) const {
@@ -192,6 +197,20 @@ bool LogStream::read(const LineFilter::Taker& taker) {
               : code == Z_ERRNO   ? std::string{"it cannot be read"}
                                   : std::string{"it is damaged: "} + message;
     return false;
+}
+
+RotatedName rotationOf(const std::string& path) {
+    constexpr std::string_view kZipped = ".gz";
+    std::string_view name = path;
+    const std::size_t zipped = name.size() - std::min(name.size(), kZipped.size());
+    if (name.substr(zipped) == kZipped) name = name.substr(0, zipped);
+    const std::size_t digits = name.find_last_not_of("0123456789") + 1;
+    int number = 0;
+    const bool isNumbered = digits > 1 && name[digits - 1] == '.';
+    if (isNumbered) std::from_chars(name.data() + digits, name.data() + name.size(), number);
+    constexpr int kMostRotations = 1000;  // more is a date
+    if (number == 0 || number > kMostRotations) return {std::string{name}, 0};
+    return {std::string{name.substr(0, digits - 1)}, number};
 }
 
 std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name) {

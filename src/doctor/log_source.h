@@ -54,6 +54,7 @@ public:
     [[nodiscard]] bool isPipe() const { return pipe; }  ///< it cannot be read twice
 
     /// The first stamp of any program's lines among the first 64 KiB, which are read again later.
+    /// Ignores stamps before a jump ahead of months: the clock was not set yet.
     std::optional<Time> firstStamp(Time now);
 
     /// The last stamp of any program's lines, once all was read.
@@ -71,6 +72,15 @@ private:
     std::string tail;  // the last lines
     bool pipe = false;
 };
+
+/// A log's name, taken apart.
+struct RotatedName {
+    std::string log;  ///< without the number
+    int number{};     ///< the higher, the older; 0 for the newest one
+};
+
+/// Takes apart the name of a log in @p path: "/x/syslog.2.gz" is number 2 of "/x/syslog".
+RotatedName rotationOf(const std::string& path);
 
 /// The files in which system loggers of Debian and its relatives keep @p name under @p folder, with
 /// the rotated ones (numbered or dated), oldest first.

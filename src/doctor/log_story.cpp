@@ -67,27 +67,44 @@ bool startsWith(std::string_view text, std::string_view beginning) {
 }  // namespace
 
 void LogStory::take(const LogLine& line) {
-    settleTest(line.when);
-    settlePending(line.text, line.when);
+    const Time when = timeOf(line);
+    settleTest(when);
+    settlePending(line.text, when);
     if (!firstLine) {
-        firstLine = line.when;
+        firstLine = when;
         ended = false;
     }
+    takeText(line.text, when);
+    lastLine = when;
+}
+
+void LogStory::takeText(std::string_view text, Time when) {
     LogValues values;
-    const LogRule* const rule = findLogRule(line.text, values);
-    const bool wasAnnounced = std::exchange(announced, false);
-    if (rule != nullptr) {
-        if (rule->event == LogEvent::STARTED && wasAnnounced) {
-            lastLine = line.when;
-            return;
-        }
-        apply(*rule, line.when, values);
-    } else if (wasAnnounced) {
-        announced = startsWith(line.text, "===");
-    }
-    lastLine = line.when;
+    const LogRule* const rule = findLogRule(text, values);
     const bool isOfNextRun = rule != nullptr && rule->event == LogEvent::COPY_MISSING;
-    if (!isOfNextRun) lastOfRun = line.when;
+    const bool wasAnnounced = std::exchange(announced, false);
+    if (rule == nullptr) {
+        announced = wasAnnounced && startsWith(text, "===");
+    } else if (rule->event != LogEvent::STARTED || !wasAnnounced) {
+        apply(*rule, when, values);
+    }
+    if (!isOfNextRun) lastOfRun = when;
+}
+
+Time LogStory::timeOf(const LogLine& line) {
+    const Time when = clock.take(line.when, since);
+    if (clock.correction) correct(clock.correction->from, clock.correction->to);
+    return when;
+}
+
+void LogStory::correct(Time from, Time to) {
+    for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
+        if (*time && **time >= from) *time = to;
+    }
+    if (pending && pending->since >= from) pending->since = to;
+    nextCycle.reset();
+    history.correct(from, to);
+    signs.correct(from, to);
 }
 
 // What passes a test without being published then was published before.

@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "doctor/evidence.h"
+#include "doctor/log_clock.h"
 #include "doctor/log_line.h"
 #include "doctor/log_rules.h"
 #include "doctor/log_signs.h"
@@ -29,6 +30,7 @@ public:
     /// told only if `now` lies in the pause before it.
     void finish(Evidence& evidence);
 
+    [[nodiscard]] int clockJumps() const { return clock.jumps; }
     [[nodiscard]] int starts() const { return startCount; }
     /// Too few lines are logged to follow what happens: no results, by what the last start said.
     [[nodiscard]] bool isQuiet() const { return level < kLeastLevel; }
@@ -46,6 +48,9 @@ private:
         Time since{};
     };
 
+    [[nodiscard]] Time timeOf(const LogLine& line);
+    void correct(Time from, Time to);
+    void takeText(std::string_view text, Time when);
     void settleTest(Time when);
     void settlePending(std::string_view text, Time when);
     void becomePending();
@@ -71,6 +76,7 @@ private:
     void become(Reach next, Time when, const std::string& cause);
     [[nodiscard]] std::string addressOf(Reach reach) const;
 
+    LogClock clock;
     LogSigns signs;
     ReachHistory history;
     std::optional<Pending> pending;

@@ -35,6 +35,12 @@ void ReachHistory::assume(Period first) {
     passing = false;
 }
 
+void ReachHistory::correct(Time from, Time to) {
+    for (auto period = all.rbegin(); period != all.rend() && period->since >= from; ++period) {
+        period->since = to;
+    }
+}
+
 void ReachHistory::explainLoss(const std::string& reason) {
     const bool isOpen = passing && reach() == Reach::NOT_REACHED && all.back().cause.empty();
     if (isOpen) all.back().cause = reason;

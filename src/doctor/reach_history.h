@@ -25,6 +25,9 @@ public:
     /// How it was when the log began, unless something is known already.
     void assume(Period first);
 
+    /// The clock was wrong: what began at @p from or later began at @p to.
+    void correct(Time from, Time to);
+
     /// The cycle, or the attempt, is over: what its last period says lasts.
     void settle() { passing = false; }
 

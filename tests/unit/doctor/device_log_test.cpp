@@ -96,6 +96,31 @@ TEST_F(DeviceLogTest, EndsWithTheLastLineOfAnyProgram) {
     EXPECT_EQ(evidence.now - *evidence.logEnd, std::chrono::seconds{7191});
 }
 
+TEST_F(DeviceLogTest, AClockThatWasWrongHidesNoFile) {
+    const std::string said = "T10:30:00Z nas Pelorus: main - x\n";
+    const struct {
+        const char* name;
+        std::string first, second;  // the files' names
+        std::string before, after;  // lines around those of the first file
+        std::string unset;          // line before those of the second file
+    } rows[]{{"ahead at the end", "b", "a", "", "2026-11-21" + said, ""},
+             {"not set at the start", "b", "a", "", "", "2026-01-01" + said},
+             {"ahead at the start of a rotated file", "log.1", "log", "2026-11-22" + said, "", ""}};
+    for (const auto& row : rows) {
+        const std::string first = plain(row.first, row.before + kFirst + row.after);
+        const std::string second = plain(row.second, row.unset + kSecond);
+        const Evidence evidence = look({second, first});
+        EXPECT_EQ(evidence.history.back().reach, Reach::DIRECT) << row.name;
+    }
+}
+
+TEST_F(DeviceLogTest, SaysThatTheLinesMayBeOfSeveralDevices) {
+    std::string other = kSecond;
+    other.replace(other.find("nas"), 3, "box");
+    const Evidence evidence = look({plain("a", kFirst + other)});
+    EXPECT_NE(evidence.untold.front().find("box, nas"), std::string::npos);
+}
+
 TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
     plain("messages", kFirst + kSecond);  // the same lines once more
     plain("syslog", kSecond);

@@ -386,6 +386,47 @@ TEST(LogStory, TheNextCycleIsToldDuringThePauseBeforeIt) {
     }
 }
 
+TEST(LogStory, AClockThatJumpsMakesNoDurations) {
+    constexpr int kDay = 86400, kFar = 300 * kDay;
+    const std::string fact = "the ports passed their test and were published|";
+    const struct {
+        const char* name;
+        Lines lines;
+        std::string history;
+    } rows[]{
+        {"not set at the first start",
+         {{0, kStart}, {kFar, kPublished}, {kFar + 9, kPause}},
+         "25920000 direct: " + fact},
+        {"set back",
+         {{40000, kStart}, {40009, kPublished}, {40010, kPause}, {20000, kPause}, {20140, kStart}},
+         "20000 direct: " + fact +
+             "20000 not running: the daemon ended suddenly|20140 not reached: the daemon started|"},
+        {"lost by a restart, and set again",
+         {{kFar, kStart},
+          {kFar + 9, kPublished},
+          {kFar + 10, kPause},
+          {9, kStart},
+          {kFar + kDay, kPublished},
+          {kFar + kDay + 1, kPause}},
+         "25920009 direct: " + fact +
+             "25920010 not running: the daemon ended suddenly|26006400 "
+             "direct: " +
+             fact},
+        {"far ahead, and set right",
+         {{kFar, kStart},
+          {kFar + 9, kPublished},
+          {kFar + 10, kPause},
+          {0, kPause},
+          {4 * kDay, kPause},
+          {8 * kDay, kStatusFailed}},
+         "0 direct: " + fact + "691200 not reached: |"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        EXPECT_EQ(historyOf(told(row.lines, row.lines.back().first + 60)), row.history);
+    }
+}
+
 TEST(LogStory, KeepsTheLast2000Periods) {
     LogStory story;
     for (int cycle = 0; cycle < 3000; ++cycle) {

@@ -15,8 +15,7 @@ constexpr std::string_view kMissing = "(not logged)";
 constexpr std::string_view kDropped = "Failed writing received data";
 
 // What is no reason why the device is not reached.
-constexpr std::array<Sign, 3> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_TWO_TUNNELS,
-                                         Sign::LOGGED_END};
+constexpr std::array<Sign, 2> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END};
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
                                       Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
                                       Sign::LOGGED_SERVICE_CERTIFICATE};

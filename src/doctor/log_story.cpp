@@ -285,10 +285,6 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
             // No tunnel stands, or none is started.
             if (history.reach() != Reach::RELAYED) giveUp(when);
             tornDown = false;
-            if (orphan) {
-                signs.set(Sign::LOGGED_TWO_TUNNELS, when,
-                          "an earlier daemon ended suddenly and left its tunnel running");
-            }
             tested = false;
             pending = {Reach::RELAYED, when};
             break;
@@ -442,6 +438,13 @@ void LogStory::finish(Evidence& evidence) {
     const bool isDone = evidence.fromElsewhere && isPending(Reach::DIRECT);
     if (pending && (isDone || evidence.now - pending->since > kAttemptTime)) becomePending();
     if (history.isOverdue(evidence.now)) history.explainStart(signs.reasonText());
+    const bool isCounted =
+        evidence.has(Sign::SECOND_TUNNEL_CLIENT) || evidence.has(Sign::TUNNEL_CLIENT_ALONE);
+    if (orphan && history.reach() == Reach::RELAYED && !isCounted) {
+        evidence.untold.emplace_back(
+            "whether the tunnel of a daemon that ended suddenly still runs beside the new one, "
+            "unless the device was restarted: run pelorus-doctor on it, as root");
+    }
     evidence.hasLog = firstLine.has_value();
     evidence.hasProgressLines = progress;
     evidence.logBegin = firstLine;

@@ -91,7 +91,7 @@ private:
     bool progress = false;   // since the last start there was a line of severity 6
     bool natpmp = false;     // the gateway speaks it, as far as the log tells
     bool tested = false;     // a port passed, and the relay was not used since
-    bool orphan = false;     // an earlier daemon ended suddenly and left its tunnel
+    bool orphan = false;     // an earlier daemon ended suddenly and may have left its tunnel
     bool tornDown = false;   // no connection of this cycle's beginning is left
     int startCount = 0;
 };

@@ -134,6 +134,11 @@ void LogStory::becomePending() {
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
     if (rule.severity >= 6) progress = true;
     signs.take(rule, when, values);
+    // Without a log option nothing announces the start, and the default holds.
+    if (rule.event == LogEvent::STARTED) level = kLeastLevel;
+    if (rule.event == LogEvent::ANNOUNCED) {
+        std::from_chars(values[0].data(), values[0].data() + values[0].size(), level);
+    }
     happen(rule.event, when, values);
 }
 
@@ -142,12 +147,6 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
         case LogEvent::IDLE:
             assume(Reach::NOT_REACHED);
             lose(when);
-            break;
-        case LogEvent::ANNOUNCED:
-            level = kLeastLevel;
-            std::from_chars(values[0].data(), values[0].data() + values[0].size(), level);
-            start(when);
-            announced = true;
             break;
         case LogEvent::CYCLE:
             nextCycle.reset();
@@ -229,8 +228,10 @@ void LogStory::concludeGateway() {
 
 void LogStory::happenInLife(LogEvent event, Time when) {
     switch (event) {
+        case LogEvent::ANNOUNCED:
+            announced = true;
+            [[fallthrough]];
         case LogEvent::STARTED:
-            level = kLeastLevel;
             start(when);
             break;
         case LogEvent::START_FAILED:

@@ -69,7 +69,8 @@ bool isContinuation(std::string_view line) {
 void addTo(std::string& line, std::string_view continuation) {
     const std::size_t begin = std::min(continuation.find_first_not_of(" \t"), continuation.size());
     continuation.remove_prefix(begin);
-    if (line.size() < kLongestLine) line.append(" ").append(continuation.substr(0, kLongestLine));
+    line.append(" ").append(continuation);
+    line.resize(std::min(line.size(), kLongestLine));
 }
 
 }  // namespace

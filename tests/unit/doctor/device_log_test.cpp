@@ -192,7 +192,7 @@ TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
 TEST(LineFilter, CutsWhereverThePiecesEnd) {
     const std::string text =
         "other\n elorus 0\nelorus 1\n  a elorus\n\tb\nother\n c\nx elorus 2\n" +
-        std::string(9000, 'y') + "elorus\nelorus " + std::string(9000, 'z') + "\nelorus 3\n d";
+        std::string(9000, 'y') + "elorus\nelorus " + std::string(9000, 'z') + "\n y\nelorus 3\n d";
     const std::vector<std::string> wanted{" elorus 0", "elorus 1 a elorus b", "x elorus 2",
                                           "elorus " + std::string(8185, 'z'), "elorus 3 d"};
     for (const std::size_t size : {1U, 2U, 7U, 8192U, 100000U}) {

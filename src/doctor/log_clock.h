@@ -4,7 +4,7 @@
 
 #include <optional>
 
-#include "doctor/evidence.h"
+#include "doctor/log_line.h"
 
 namespace pelorus::doctor {
 
@@ -14,20 +14,23 @@ inline constexpr std::chrono::hours kUnsetClock{24 * 90};
 /// Turns stamps into times that only go back where the clock was set right.
 class LogClock {
 public:
-    /// What was told to have begun at `from` or later began at `to`.
+    /// What was told to have been at `from` or later was at `to`; all else was `back` earlier.
     struct Correction {
         Time from{}, to{};
+        std::chrono::seconds back{};
+
+        [[nodiscard]] Time of(Time when) const { return when >= from ? to : when - back; }
     };
 
-    /// The time of the next line, stamped @p stamp. @p start is when the daemon's current run
-    /// began, if that was logged. `correction` is set if earlier times were wrong.
-    Time take(Time stamp, std::optional<Time> start);
+    /// The time of @p line. @p start is when the daemon's current run began, if that was logged.
+    /// `correction` is set if earlier times were wrong.
+    Time take(const LogLine& line, std::optional<Time> start);
 
     std::optional<Correction> correction;  ///< of the last take()
     int jumps = 0;                         ///< how often the clock was set, or lost
 
 private:
-    void jumpBack(Time stamp);
+    void jumpBack(const LogLine& line);
     void goOnLost(Time stamp);
 
     std::optional<Time> last;         // as stamped

@@ -80,9 +80,9 @@ void LogSigns::forget() {
     reason.reset();
 }
 
-void LogSigns::correct(Time from, Time to) {
+void LogSigns::correct(const LogClock::Correction& correction) {
     for (auto& [sign, fact] : signs) {
-        if (fact.when && *fact.when >= from) fact.when = to;
+        if (fact.when) fact.when = correction.of(*fact.when);
     }
 }
 

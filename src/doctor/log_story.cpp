@@ -92,19 +92,19 @@ void LogStory::takeText(std::string_view text, Time when) {
 }
 
 Time LogStory::timeOf(const LogLine& line) {
-    const Time when = clock.take(line.when, since);
-    if (clock.correction) correct(clock.correction->from, clock.correction->to);
+    const Time when = clock.take(line, since);
+    if (clock.correction) correct(*clock.correction);
     return when;
 }
 
-void LogStory::correct(Time from, Time to) {
+void LogStory::correct(const LogClock::Correction& correction) {
     for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
-        if (*time && **time >= from) *time = to;
+        if (*time) *time = correction.of(**time);
     }
-    if (pending && pending->since >= from) pending->since = to;
+    if (pending) pending->since = correction.of(pending->since);
     nextCycle.reset();
-    history.correct(from, to);
-    signs.correct(from, to);
+    history.correct(correction);
+    signs.correct(correction);
 }
 
 // What passes a test without being published then was published before.

@@ -49,7 +49,7 @@ private:
     };
 
     [[nodiscard]] Time timeOf(const LogLine& line);
-    void correct(Time from, Time to);
+    void correct(const LogClock::Correction& correction);
     void takeText(std::string_view text, Time when);
     void settleTest(Time when);
     void settlePending(std::string_view text, Time when);

@@ -35,10 +35,8 @@ void ReachHistory::assume(Period first) {
     passing = false;
 }
 
-void ReachHistory::correct(Time from, Time to) {
-    for (auto period = all.rbegin(); period != all.rend() && period->since >= from; ++period) {
-        period->since = to;
-    }
+void ReachHistory::correct(const LogClock::Correction& correction) {
+    for (Period& period : all) period.since = correction.of(period.since);
 }
 
 void ReachHistory::explainLoss(const std::string& reason) {

@@ -114,6 +114,17 @@ TEST_F(DeviceLogTest, AClockThatWasWrongHidesNoFile) {
     }
 }
 
+TEST_F(DeviceLogTest, StampsWithoutYearsReachFurtherBackThanOne) {
+    std::string log =
+        "Oct  1 12:00:00 nas Pelorus: main - pelorus daemon starting up, Version: [1]\n";
+    for (const char* const day : {"Nov 22", "Nov 26", "Dec 30", "Jan  2", "Nov 20"}) {
+        log += std::string{day} + " 12:00:00 nas Pelorus: x\n";
+    }
+    const Evidence evidence = look({plain("a", log)});
+    EXPECT_EQ((*evidence.logEnd - *evidence.logBegin).count(), 415 * 86400);
+    EXPECT_EQ(evidence.daemon.since, evidence.logBegin);
+}
+
 TEST_F(DeviceLogTest, SaysThatTheLinesMayBeOfSeveralDevices) {
     std::string other = kSecond;
     other.replace(other.find("nas"), 3, "box");

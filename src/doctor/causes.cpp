@@ -230,7 +230,7 @@ std::vector<Cause> relayCauses() {
          "client's output."},
         {"two-tunnels",
          {Reach::RELAYED},
-         {{S::SECOND_TUNNEL_CLIENT}, {S::LOGGED_TWO_TUNNELS}},
+         {{S::SECOND_TUNNEL_CLIENT}},
          {},
          "Two tunnel clients run, and may disconnect each other.",
          "Stop the older one with kill -9, or restart the device."},

@@ -3,12 +3,12 @@
 #include <algorithm>
 #include <array>
 #include <ctime>
-#include <functional>
 #include <memory>
 #include <set>
+#include <utility>
 
 #include "doctor/journal.h"
-#include "doctor/log_line.h"
+#include "doctor/line_order.h"
 #include "doctor/log_source.h"
 #include "doctor/log_story.h"
 #include "doctor/shown_text.h"
@@ -18,58 +18,6 @@ namespace pelorus::doctor {
 namespace {
 
 constexpr std::array<const char*, 3> kSystemLogs{"syslog", "messages", "user.log"};
-constexpr std::size_t kMostHashes = 4096;
-
-// Passes on the lines of several files, without what a file repeats of the ones before.
-class LineOrder {
-public:
-    LineOrder(LogStory& listener, Time today) : story{listener}, now{today} {}
-
-    void beginFile() {
-        repeating = story.end().has_value();
-        // A clock that once ran ahead must not hide what came later.
-        newest = std::min(story.end().value_or(Time{}), now);
-    }
-
-    void take(std::string_view text) {
-        const auto line = readLogLine(text, now);
-        if (!line) return;
-        if (repeating && line->when <= newest && isRepeated(*line)) return;
-        if (line->when > newest) repeating = false;
-        remember(*line);
-        if (line->host != lastHost) meet(line->host);
-        story.take(*line);
-    }
-
-    [[nodiscard]] const std::set<std::string>& hosts() const { return met; }
-
-private:
-    void meet(std::string_view host) {
-        constexpr std::size_t kMostHosts = 16;
-        lastHost = host;
-        if (met.size() < kMostHosts) met.insert(lastHost);
-    }
-
-    [[nodiscard]] bool isRepeated(const LogLine& line) const {
-        return line.when < newest || hashes.count(std::hash<std::string_view>{}(line.text)) != 0;
-    }
-
-    // The lines of the newest second.
-    void remember(const LogLine& line) {
-        if (line.when != hashTime) hashes.clear();
-        hashTime = line.when;
-        if (hashes.size() < kMostHashes) hashes.insert(std::hash<std::string_view>{}(line.text));
-    }
-
-    LogStory& story;
-    Time now;
-    Time newest{};
-    Time hashTime{};
-    std::set<std::size_t> hashes;
-    std::string lastHost;
-    std::set<std::string> met;
-    bool repeating = false;
-};
 
 std::string shownTime(Time when) {
     const auto seconds = static_cast<std::time_t>(when.time_since_epoch().count());
@@ -91,9 +39,19 @@ void cannotSee(const std::string& text, Evidence& evidence) {
 
 struct Entry {
     std::string path;
+    RotatedName name;
     Time begin{};
     std::unique_ptr<LogStream> stream;  // only of what cannot be read twice
 };
+
+bool areRotated(const std::vector<Entry>& entries) {
+    std::set<int> numbers;
+    for (const Entry& entry : entries) {
+        if (entry.name.log != entries.front().name.log) return false;
+        numbers.insert(entry.name.number);
+    }
+    return numbers.size() == entries.size();
+}
 
 // Files are closed in between: there may be many.
 std::vector<Entry> inOrder(const std::vector<std::string>& files, Evidence& evidence) {
@@ -106,25 +64,28 @@ std::vector<Entry> inOrder(const std::vector<std::string>& files, Evidence& evid
         }
         const Time begin = stream->firstStamp(evidence.now).value_or(Time::max());
         if (!stream->isPipe()) stream.reset();
-        entries.push_back({path, begin, std::move(stream)});
+        entries.push_back({path, rotationOf(path), begin, std::move(stream)});
     }
-    std::stable_sort(entries.begin(), entries.end(),
-                     [](const Entry& a, const Entry& b) { return a.begin < b.begin; });
+    const bool isRotation = areRotated(entries);
+    std::stable_sort(entries.begin(), entries.end(), [&](const Entry& a, const Entry& b) {
+        return isRotation ? a.name.number > b.name.number : a.begin < b.begin;
+    });
     return entries;
 }
 
 // Empty when it was read to its end.
-std::string readFile(LogStream& stream, const std::string& path, LineOrder& order) {
+std::string readFile(LogStream& stream, const std::string& path, LineOrder& order, Time now) {
     order.beginFile();
     const bool whole =
         stream.isOpen() && stream.read([&order](std::string_view line) { order.take(line); });
+    order.endFile(stream.lastStamp(now));
     return whole ? std::string{} : "log " + shownPath(path) + ": " + stream.problem;
 }
 
 void readChosen(const LogChoice& choice, LineOrder& order, Evidence& evidence) {
     for (Entry& entry : inOrder(choice.files, evidence)) {
         if (!entry.stream) entry.stream = std::make_unique<LogStream>(entry.path, true);
-        const std::string problem = readFile(*entry.stream, entry.path, order);
+        const std::string problem = readFile(*entry.stream, entry.path, order, evidence.now);
         if (!problem.empty()) cannotSee(problem, evidence);
         entry.stream.reset();
     }
@@ -139,7 +100,7 @@ void readSystemLogs(const std::string& folder,
         std::string problem;
         for (const std::string& path : rotatedLogs(folder, name)) {
             LogStream stream{path, false};
-            const std::string found = readFile(stream, path, order);
+            const std::string found = readFile(stream, path, order, evidence.now);
             if (!found.empty()) problem = found;
         }
         // The rotated ones mostly have the newest one's fault.
@@ -153,6 +114,21 @@ std::string startsInWords(int starts) {
     return std::to_string(starts) + (starts == 1 ? " start" : " starts") + " of the daemon";
 }
 
+std::string jumpsInWords(int jumps) {
+    if (jumps == 0) return "";
+    return ", the clock jumped " + (jumps == 1 ? "once" : std::to_string(jumps) + " times");
+}
+
+void tellHosts(Evidence& evidence) {
+    if (evidence.logHosts.size() < 2) return;
+    std::string names;
+    for (const std::string& host : evidence.logHosts) {
+        names += (names.empty() ? "" : ", ") + shownText(host);
+    }
+    evidence.untold.push_back("whether this is one device: the log has lines of " + names +
+                              "; if they are several, read the lines of one only");
+}
+
 void summarise(const LogStory& story, Evidence& evidence) {
     const std::string more = "run the daemon with -l 6";
     if (!story.end()) {
@@ -162,7 +138,15 @@ void summarise(const LogStory& story, Evidence& evidence) {
     }
     evidence.checks.push_back({Check::Verdict::OK, Source::LOG,
                                "log from " + shownTime(*story.begin()) + " to " +
-                                   shownTime(*story.end()) + ", " + startsInWords(story.starts())});
+                                   shownTime(*story.end()) + ", " + startsInWords(story.starts()) +
+                                   jumpsInWords(story.clockJumps())});
+    tellHosts(evidence);
+    if (story.isQuiet()) {
+        evidence.untold.push_back("how it is reached: the daemon logs up to severity " +
+                                  std::to_string(story.severity()) + " only, and no results; " +
+                                  more);
+        return;
+    }
     if (evidence.hasProgressLines) return;
     evidence.untold.push_back(
         "whether a tunnel came up or was kept, and when the next cycle comes: the log has errors "
@@ -184,7 +168,9 @@ void lookAtLog(const LogChoice& choice, Evidence& evidence) {
         if (!problem.empty()) cannotSee("journal: " + problem, evidence);
         if (!story.end()) readSystemLogs(choice.folder, story, order, evidence);
     }
-    if (evidence.fromElsewhere && story.end()) evidence.now = *story.end();
+    if (evidence.fromElsewhere && story.end()) {
+        evidence.now = std::max(*story.end(), order.end().value_or(*story.end()));
+    }
     story.finish(evidence);
     evidence.logHosts = order.hosts();
     summarise(story, evidence);

@@ -9,7 +9,7 @@ namespace pelorus::doctor {
 namespace {
 
 // What the log says is over when the other has been seen by now.
-constexpr std::array<std::pair<Sign, Sign>, 16> kOver{{
+constexpr std::array<std::pair<Sign, Sign>, 15> kOver{{
     {Sign::LOGGED_NO_ADDRESS, Sign::HAS_ADDRESS},
     {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
@@ -25,7 +25,6 @@ constexpr std::array<std::pair<Sign, Sign>, 16> kOver{{
     {Sign::LOGGED_NAMES_UNRESOLVED, Sign::NAMES_RIGHT},
     {Sign::LOGGED_BACK_END_SILENT, Sign::BACK_END_ANSWERS},
     {Sign::LOGGED_TUNNEL_DIED, Sign::TUNNEL_RUNS},
-    {Sign::LOGGED_TWO_TUNNELS, Sign::TUNNEL_CLIENT_ALONE},
 }};
 
 // Live evidence beats the log, and the reader is told so.

@@ -199,6 +199,8 @@ std::optional<Time> takeStamp(std::string_view& line, Time now) {
 }
 
 std::optional<LogLine> readLogLine(std::string_view line, Time now) {
+    skipPriority(line);
+    const bool isYearKnown = !line.empty() && isDigit(line.front());
     const auto when = takeStamp(line, now);
     if (!when) return std::nullopt;
     std::string_view host;
@@ -206,7 +208,7 @@ std::optional<LogLine> readLogLine(std::string_view line, Time now) {
         const std::size_t end = line.find(' ');
         const std::string_view word = line.substr(0, end);
         line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
-        if (isDaemon(word)) return LogLine{*when, withoutEnd(line), host};
+        if (isDaemon(word)) return LogLine{*when, withoutEnd(line), host, isYearKnown};
         if (words == 0) host = word;
         if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;
         // Between host and program only "facility.severity".

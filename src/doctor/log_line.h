@@ -14,6 +14,7 @@ struct LogLine {
     Time when{};
     std::string_view text;    ///< without trailing blanks; part of the line that was read
     std::string_view host{};  ///< that logged it; empty if the line does not tell
+    bool isYearKnown = true;  ///< false: the stamp has none, see takeStamp()
 };
 
 /// Reads the time stamp at the start of @p line: classic ("Nov  2 12:07:01", local time, in the

@@ -152,7 +152,7 @@ Rules gatewayRules() {
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the router has no internet address"),
     info("ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.")
         .clears(kGateway),
-    info("ConnectionManager::forwardPort - forwarding internal port: %d").clears(kRefusals),
+    info("ConnectionManager::forwardPort - forwarding internal port: %d ").happens(LogEvent::AUTOMATIC).clears(kRefusals),
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
         .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),
@@ -197,7 +197,7 @@ Rules testRules() {
         .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTP port is not a port number"),
     error("ConnectionManager::manualPortForward - bad value for manually configured HTTPS Port.")
         .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTPS port is not a port number"),
-    info("ConnectionManager::manualPortForward - allocatedHttpPort %d").clears({Sign::LOGGED_MANUAL_PORT_INVALID}),
+    info("ConnectionManager::manualPortForward - allocatedHttpPort %d").happens(LogEvent::MANUAL).clears({Sign::LOGGED_MANUAL_PORT_INVALID}),
     info("ConnectionManager::manualPortForward - relay mode is enforced, therefore don't manual forward ports.")
         .sets(Sign::LOGGED_MANUAL_RULED_OUT, "manual ports are not tested since a second router was found"),
     info("ConnectionManager::manualPortForward - Running port test for manually forwarded ports.")

@@ -16,7 +16,7 @@ namespace pelorus::doctor {
 /// What a line does to the story beyond setting and clearing signs.
 enum class LogEvent {
     NOTHING,
-    ANNOUNCED,     ///< the first line of a start; not there without a log option
+    ANNOUNCED,     ///< the first line of a start; value 1: the severity up to which it logs
     STARTED,       ///< the daemon's process is there
     START_FAILED,  ///< and ends
     SIGNALLED,     ///< told to end by a signal
@@ -28,6 +28,8 @@ enum class LogEvent {
     STATUS,        ///< value 1: the status word that is reported
     STATUS_THERE,  ///< value 1: the status word that was reported earlier
     TYPE,          ///< value 1: number of the connection type that a cycle ended with
+    MANUAL,        ///< the ports are forwarded by hand
+    AUTOMATIC,     ///< the ports are mapped by the daemon
     TEST_ANSWER,   ///< value 2: the service's answer to a port test
     TEST_FAILED,   ///< the port test as a whole
     TEST_UNANSWERED,

@@ -18,8 +18,7 @@ constexpr std::string_view kMissing = "(not logged)";
 constexpr std::string_view kDropped = "Failed writing received data";
 
 // What is no reason why the device is not reached.
-constexpr std::array<Sign, 3> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_TWO_TUNNELS,
-                                         Sign::LOGGED_END};
+constexpr std::array<Sign, 2> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END};
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
                                       Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
                                       Sign::LOGGED_SERVICE_CERTIFICATE};
@@ -136,6 +135,13 @@ void LogSigns::forget() {
     reason.reset();
     cycle = 0;
     backEndTold = false;
+}
+
+void LogSigns::correct(const LogClock::Correction& correction) {
+    for (auto& [sign, fact] : signs) {
+        if (fact.when) fact.when = correction.of(*fact.when);
+    }
+    if (reason) reason->when = correction.of(reason->when);
 }
 
 // What is tested has been mapped, and the way to the service was there.

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "doctor/evidence.h"
+#include "doctor/log_clock.h"
 #include "doctor/log_rules.h"
 
 namespace pelorus::doctor {
@@ -31,6 +32,9 @@ public:
 
     /// A new run of the daemon: no sign and no reason is left.
     void forget();
+
+    /// The clock was wrong.
+    void correct(const LogClock::Correction& correction);
 
     /// A new cycle.
     void forgetReason() { reason.reset(); }

@@ -7,11 +7,13 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <cstring>
 #include <filesystem>
 #include <system_error>
 #include <utility>
 
+#include "doctor/log_clock.h"
 #include "doctor/log_line.h"
 
 namespace pelorus::doctor {
@@ -20,6 +22,7 @@ namespace {
 
 constexpr std::size_t kChunk = std::size_t{256} * 1024;
 constexpr std::size_t kHead = std::size_t{64} * 1024;
+constexpr std::size_t kTail = std::size_t{16} * 1024;
 constexpr std::size_t kLongestLine = std::size_t{8} * 1024;
 constexpr std::string_view kMark = "elorus";  // however the name begins
 
@@ -59,50 +62,76 @@ bool isRotated(std::string_view end) {
     return end.empty() || end == ".gz";
 }
 
+bool isContinuation(std::string_view line) {
+    return !line.empty() && (line.front() == ' ' || line.front() == '\t');
+}
+
+void addTo(std::string& line, std::string_view continuation) {
+    const std::size_t begin = std::min(continuation.find_first_not_of(" \t"), continuation.size());
+    continuation.remove_prefix(begin);
+    line.append(" ").append(continuation);
+    line.resize(std::min(line.size(), kLongestLine));
+}
+
 }  // namespace
 
 void LineFilter::take(std::string_view piece) {
-    const void* const last = memrchr(piece.data(), '\n', piece.size());
-    if (last == nullptr) {
-        open.append(piece.substr(0, kLongestLine - std::min(open.size(), kLongestLine)));
-        return;
-    }
-    const std::size_t whole =
-        static_cast<std::size_t>(static_cast<const char*>(last) - piece.data());
-    if (!open.empty()) {
-        const std::size_t first = piece.find('\n');
-        open.append(
-            piece.substr(0, std::min(first, kLongestLine - std::min(open.size(), kLongestLine))));
-        finish();
-        piece.remove_prefix(first + 1);
-        takeWholeLines(piece.substr(0, whole < first + 1 ? 0 : whole - first));
-        piece.remove_prefix(whole < first + 1 ? 0 : whole - first);
-    } else {
-        takeWholeLines(piece.substr(0, whole + 1));
-        piece.remove_prefix(whole + 1);
-    }
-    open.assign(piece.substr(0, kLongestLine));
+    const std::size_t first = piece.find('\n');
+    const std::string_view rest = piece.substr(0, first);
+    open.append(rest.substr(0, kLongestLine - std::min(open.size(), kLongestLine)));
+    if (first == std::string_view::npos) return;
+    endOpenLine();
+    piece.remove_prefix(first + 1);
+    const std::size_t last = piece.rfind('\n');
+    const std::size_t whole = last == std::string_view::npos ? 0 : last + 1;
+    takeWholeLines(piece.substr(0, whole));
+    open.assign(piece.substr(whole, kLongestLine));
 }
 
 void LineFilter::finish() {
-    if (find(open, kMark) != nullptr) pass(open);
+    endOpenLine();
+    pass();
+}
+
+void LineFilter::endOpenLine() {
+    if (held.empty() || !isContinuation(open)) {
+        pass();
+        if (find(open, kMark) != nullptr) held = open;
+    } else {
+        addTo(held, open);
+    }
     open.clear();
 }
 
 // Every line ends in a newline.
 void LineFilter::takeWholeLines(std::string_view lines) {
+    if (!held.empty()) lines.remove_prefix(takeContinuation(lines));
     while (const char* const hit = find(lines, kMark)) {
         const auto at = static_cast<std::size_t>(hit - lines.data());
         const std::size_t before = lines.rfind('\n', at);
         const std::size_t begin = before == std::string_view::npos ? 0 : before + 1;
         const std::size_t end = lines.find('\n', at);
-        pass(lines.substr(begin, end - begin));
+        held.assign(lines.substr(begin, std::min(end - begin, kLongestLine)));
         lines.remove_prefix(end + 1);
+        lines.remove_prefix(takeContinuation(lines));
     }
 }
 
-void LineFilter::pass(std::string_view line) {
-    taker(line.substr(0, kLongestLine));
+// How much of @p lines continues the line that is held. It is passed on unless all does.
+std::size_t LineFilter::takeContinuation(std::string_view lines) {
+    std::size_t begin = 0;
+    while (begin < lines.size() && isContinuation(lines.substr(begin))) {
+        const std::size_t end = lines.find('\n', begin);
+        addTo(held, lines.substr(begin, end - begin));
+        begin = end + 1;
+    }
+    if (begin < lines.size()) pass();
+    return begin;
+}
+
+void LineFilter::pass() {
+    if (!held.empty()) taker(held);
+    held.clear();
 }
 
 LogStream::LogStream(const std::string& path, bool orPipe) {
@@ -122,23 +151,44 @@ std::optional<Time> LogStream::firstStamp(Time now) {
     head.resize(kHead);
     const int length = gzread(file.get(), head.data(), kHead);
     head.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
+    std::optional<Time> first, previous;
     std::string_view rest = head;
     while (!rest.empty()) {
         const std::size_t end = std::min(rest.find('\n'), rest.size() - 1);
         std::string_view line = rest.substr(0, end + 1);
-        if (const auto stamp = takeStamp(line, now)) return stamp;
+        const auto stamp = takeStamp(line, now);
+        if (stamp && (!first || *stamp - *previous > kUnsetClock)) first = stamp;
+        if (stamp) previous = stamp;
         rest.remove_prefix(end + 1);
+    }
+    return first;
+}
+
+std::optional<Time> LogStream::lastStamp(Time now) const {
+    std::string_view rest = tail;
+    while (!rest.empty()) {
+        if (rest.back() == '\n') rest.remove_suffix(1);
+        const std::size_t end = rest.rfind('\n');
+        const std::size_t begin = end == std::string_view::npos ? 0 : end + 1;
+        std::string_view line = rest.substr(begin);
+        if (const auto stamp = takeStamp(line, now)) return stamp;
+        rest = rest.substr(0, begin);
     }
     return std::nullopt;
 }
 
 bool LogStream::read(const LineFilter::Taker& taker) {
     LineFilter filter{taker};
-    filter.take(std::exchange(head, {}));
+    const auto take = [&](std::string_view piece) {
+        filter.take(piece);
+        tail.append(piece.substr(piece.size() - std::min(piece.size(), kTail)));
+        tail.erase(0, tail.size() - std::min(tail.size(), kTail));
+    };
+    take(std::exchange(head, {}));
     std::vector<char> chunk(kChunk);
     int length = 0;
     while ((length = gzread(file.get(), chunk.data(), kChunk)) > 0) {
-        filter.take({chunk.data(), static_cast<std::size_t>(length)});
+        take({chunk.data(), static_cast<std::size_t>(length)});
     }
     filter.finish();
     int code = Z_OK;
@@ -148,6 +198,20 @@ bool LogStream::read(const LineFilter::Taker& taker) {
               : code == Z_ERRNO   ? std::string{"it cannot be read"}
                                   : std::string{"it is damaged: "} + message;
     return false;
+}
+
+RotatedName rotationOf(const std::string& path) {
+    constexpr std::string_view kZipped = ".gz";
+    std::string_view name = path;
+    const std::size_t zipped = name.size() - std::min(name.size(), kZipped.size());
+    if (name.substr(zipped) == kZipped) name = name.substr(0, zipped);
+    const std::size_t digits = name.find_last_not_of("0123456789") + 1;
+    int number = 0;
+    const bool isNumbered = digits > 1 && name[digits - 1] == '.';
+    if (isNumbered) std::from_chars(name.data() + digits, name.data() + name.size(), number);
+    constexpr int kMostRotations = 1000;  // more is a date
+    if (number == 0 || number > kMostRotations) return {std::string{name}, 0};
+    return {std::string{name.substr(0, digits - 1)}, number};
 }
 
 std::vector<std::string> rotatedLogs(const std::string& folder, const std::string& name) {

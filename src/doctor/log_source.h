@@ -15,8 +15,8 @@
 
 namespace pelorus::doctor {
 
-/// Cuts a stream into lines and passes on those that mention the daemon. A line longer than 8 KiB
-/// is cut there.
+/// Cuts a stream into lines and passes on those that mention the daemon. Lines that begin with a
+/// blank continue the one before, as the journal shows them. A line longer than 8 KiB is cut there.
 class LineFilter {
 public:
     using Taker = std::function<void(std::string_view line)>;
@@ -31,9 +31,12 @@ public:
 
 private:
     void takeWholeLines(std::string_view lines);
-    void pass(std::string_view line);
+    [[nodiscard]] std::size_t takeContinuation(std::string_view lines);
+    void endOpenLine();
+    void pass();
 
     Taker taker;
+    std::string held;  // a line that the next one may continue
     std::string open;  // the beginning of a line that has not ended yet
 };
 
@@ -51,7 +54,11 @@ public:
     [[nodiscard]] bool isPipe() const { return pipe; }  ///< it cannot be read twice
 
     /// The first stamp of any program's lines among the first 64 KiB, which are read again later.
+    /// Ignores stamps before a jump ahead of months: the clock was not set yet.
     std::optional<Time> firstStamp(Time now);
+
+    /// The last stamp of any program's lines, once all was read.
+    [[nodiscard]] std::optional<Time> lastStamp(Time now) const;
 
     /// Reads to the end. False, and `problem` set, when it cannot be read to its end; what came
     /// before has been passed on.
@@ -62,8 +69,18 @@ public:
 private:
     std::unique_ptr<gzFile_s, Releaser<gzclose>> file;
     std::string head;  // read by firstStamp()
+    std::string tail;  // the last lines
     bool pipe = false;
 };
+
+/// A log's name, taken apart.
+struct RotatedName {
+    std::string log;  ///< without the number
+    int number{};     ///< the higher, the older; 0 for the newest one
+};
+
+/// Takes apart the name of a log in @p path: "/x/syslog.2.gz" is number 2 of "/x/syslog".
+RotatedName rotationOf(const std::string& path);
 
 /// The files in which system loggers of Debian and its relatives keep @p name under @p folder, with
 /// the rotated ones (numbered or dated), oldest first.

@@ -10,6 +10,15 @@ namespace {
 
 constexpr std::string_view kPassed = "the ports passed their test and were published";
 constexpr std::string_view kTunnelUp = "the tunnel came up";
+constexpr std::string_view kToldToEnd = "the daemon was told to end by a signal";
+constexpr std::string_view kSilent = "nothing was logged until the daemon started again";
+
+using namespace std::chrono_literals;
+
+// From the first port that passes its test to the record of both.
+constexpr auto kPublishTime = 2min;
+// A device that is reached directly logs its tests, unless its disk sleeps.
+constexpr auto kSilence = 1h;
 
 // What a published port disproves.
 const std::vector<Sign> kDirectSigns{Sign::LOGGED_ATTEMPT,
@@ -26,9 +35,13 @@ const std::vector<Sign> kDirectSigns{Sign::LOGGED_ATTEMPT,
 const std::vector<Sign> kRelayedSigns{Sign::LOGGED_ATTEMPT, Sign::LOGGED_RELAY_DOES_NOT_COME_UP,
                                       Sign::LOGGED_TUNNEL_NO_OUTPUT, Sign::LOGGED_TUNNEL_DIED};
 
+// What counts even if no result is logged.
+constexpr std::array<Sign, 3> kSignsOfTheEnd{Sign::LOGGED_START_FAILED, Sign::LOGGED_END,
+                                             Sign::LOGGED_REMOTE_ACCESS_OFF};
+
 // Lines that may still come before the one that says that a change failed.
-constexpr std::array<std::string_view, 18> kUndecided{
-    "VPNManager::",
+constexpr std::string_view kTunnel = "VPNManager::";  // of a relay only: direct, it is closed
+constexpr std::array<std::string_view, 17> kUndecided{
     "TavikClient::updateLocalCommStatus",
     "TavikClient::updateServerMapping",
     "TavikClient::sendAnalytics",
@@ -54,29 +67,57 @@ bool startsWith(std::string_view text, std::string_view beginning) {
 }  // namespace
 
 void LogStory::take(const LogLine& line) {
-    settlePending(line.text, line.when);
+    const Time when = timeOf(line);
+    settleTest(when);
+    settlePending(line.text, when);
     if (!firstLine) {
-        firstLine = line.when;
+        firstLine = when;
         ended = false;
     }
+    takeText(line.text, when);
+    lastLine = when;
+}
+
+void LogStory::takeText(std::string_view text, Time when) {
     LogValues values;
-    const LogRule* const rule = findLogRule(line.text, values);
+    const LogRule* const rule = findLogRule(text, values);
+    const bool isOfNextRun = rule != nullptr && rule->event == LogEvent::COPY_MISSING;
     const bool wasAnnounced = std::exchange(announced, false);
-    if (rule != nullptr) {
-        if (rule->event == LogEvent::STARTED && wasAnnounced) {
-            lastLine = line.when;
-            return;
-        }
-        apply(*rule, line.when, values);
-    } else if (wasAnnounced) {
-        announced = startsWith(line.text, "===");
+    if (rule == nullptr) {
+        announced = wasAnnounced && startsWith(text, "===");
+    } else if (rule->event != LogEvent::STARTED || !wasAnnounced) {
+        apply(*rule, when, values);
     }
-    lastLine = line.when;
+    if (!isOfNextRun) lastOfRun = when;
+}
+
+Time LogStory::timeOf(const LogLine& line) {
+    const Time when = clock.take(line, since);
+    if (clock.correction) correct(*clock.correction);
+    return when;
+}
+
+void LogStory::correct(const LogClock::Correction& correction) {
+    for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
+        if (*time) *time = correction.of(**time);
+    }
+    if (pending) pending->since = correction.of(pending->since);
+    nextCycle.reset();
+    history.correct(correction);
+    signs.correct(correction);
+}
+
+// What passes a test without being published then was published before.
+void LogStory::settleTest(Time when) {
+    if (!passed || when - *passed <= kPublishTime) return;
+    passed.reset();
+    assume(Reach::DIRECT);
 }
 
 void LogStory::settlePending(std::string_view text, Time when) {
     if (!pending) return;
     const bool undecided =
+        (pending->reach == Reach::RELAYED && startsWith(text, kTunnel)) ||
         std::any_of(kUndecided.begin(), kUndecided.end(),
                     [text](std::string_view beginning) { return startsWith(text, beginning); });
     const bool starts = startsWith(text, "main -") || startsWith(text, "===");
@@ -93,12 +134,18 @@ void LogStory::becomePending() {
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
     if (rule.severity >= 6) progress = true;
     signs.take(rule, when, values);
+    // Without a log option nothing announces the start, and the default holds.
+    if (rule.event == LogEvent::STARTED) level = kLeastLevel;
+    if (rule.event == LogEvent::ANNOUNCED) {
+        std::from_chars(values[0].data(), values[0].data() + values[0].size(), level);
+    }
     happen(rule.event, when, values);
 }
 
 void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
     switch (event) {
         case LogEvent::IDLE:
+            assume(Reach::NOT_REACHED);
             lose(when);
             break;
         case LogEvent::CYCLE:
@@ -131,6 +178,7 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             signs.failService(when);
             break;
         case LogEvent::PUBLISHED:
+            passed.reset();
             pending = {Reach::DIRECT, when};
             break;
         case LogEvent::BACK_END_SAID:
@@ -150,6 +198,12 @@ void LogStory::happenAtGateway(LogEvent event, Time when) {
             if (!natpmp && !signs.has(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS)) {
                 signs.set(Sign::LOGGED_NO_GATEWAY, when, "no gateway answers UPnP");
             }
+            break;
+        case LogEvent::MANUAL:
+            ports = Ports::MANUAL;
+            break;
+        case LogEvent::AUTOMATIC:
+            ports = Ports::AUTOMATIC;
             break;
         case LogEvent::NATPMP_FOUND:
             natpmp = true;
@@ -175,9 +229,8 @@ void LogStory::concludeGateway() {
 void LogStory::happenInLife(LogEvent event, Time when) {
     switch (event) {
         case LogEvent::ANNOUNCED:
-            start(when);
             announced = true;
-            break;
+            [[fallthrough]];
         case LogEvent::STARTED:
             start(when);
             break;
@@ -189,6 +242,9 @@ void LogStory::happenInLife(LogEvent event, Time when) {
             signalled = true;
             // A failure to publish would have come before.
             if (isPending(Reach::DIRECT)) becomePending();
+            if (!isQuiet()) break;
+            become(Reach::NOT_RUNNING, when, std::string{kToldToEnd});
+            end(when);
             break;
         case LogEvent::SWITCHED_OFF:
             switchOff(when);
@@ -227,11 +283,9 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
             lose(when);
             break;
         case LogEvent::RELAY_STARTS:
-            if (history.reach() == Reach::DIRECT) lose(when);
-            if (orphan) {
-                signs.set(Sign::LOGGED_TWO_TUNNELS, when,
-                          "an earlier daemon ended suddenly and left its tunnel running");
-            }
+            // No tunnel stands, or none is started.
+            if (history.reach() != Reach::RELAYED) giveUp(when);
+            tornDown = false;
             tested = false;
             pending = {Reach::RELAYED, when};
             break;
@@ -254,24 +308,35 @@ void LogStory::start(Time when) {
     const bool hadClient = isPending(Reach::RELAYED);
     if (isPending(Reach::DIRECT)) becomePending();
     pending.reset();
-    if (!ended && lastLine) {
+    if (!ended && lastOfRun) {
         orphan = orphan || hadClient || history.reach() == Reach::RELAYED;
-        // Without progress it is silent for days.
-        become(Reach::NOT_RUNNING, progress ? *lastLine : when, "the daemon ended suddenly");
+        endSuddenly(when);
     }
+    passed.reset();
     signs.forget();
     nextCycle.reset();
     signalled = ended = progress = natpmp = tested = tornDown = false;
     ++startCount;
     since = when;
     become(Reach::NOT_REACHED, when, std::string{kDaemonStarted});
+    if (isQuiet()) return;
     signs.set(Sign::LOGGED_ATTEMPT, when, "the daemon started, with no result yet");
+}
+
+// Without progress a relayed run is silent for days.
+void LogStory::endSuddenly(Time when) {
+    const bool isDirect = history.reach() == Reach::DIRECT;
+    if (isDirect && !progress && when - *lastOfRun > kSilence) {
+        history.add({Reach::UNKNOWN, *lastOfRun, "", std::string{kSilent}});
+    } else {
+        become(Reach::NOT_RUNNING, progress ? *lastOfRun : when, "the daemon ended suddenly");
+    }
 }
 
 void LogStory::switchOff(Time when) {
     pending.reset();
     if (signalled) {
-        become(Reach::NOT_RUNNING, when, "the daemon was told to end by a signal");
+        become(Reach::NOT_RUNNING, when, std::string{kToldToEnd});
     } else {
         signs.set(Sign::LOGGED_REMOTE_ACCESS_OFF, when,
                   "the daemon said so as it ended; so does a run with -u");
@@ -318,12 +383,17 @@ void LogStory::takeStatus(std::string_view word, Time when) {
 void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     if (!signs.takeTestAnswer(answer, when)) return;
     tested = true;
-    assume(Reach::DIRECT);
+    if (!passed) passed = when;
 }
 
-// The direct path does not work. A tunnel that stands is not touched by that.
+// The direct path does not work. A tunnel that stands, or may stand, is not touched by that.
 void LogStory::lose(Time when) {
-    if (history.reach() == Reach::RELAYED && !tornDown) return;
+    passed.reset();
+    const bool hasTunnel = history.reach() == Reach::RELAYED || history.reach() == Reach::UNKNOWN;
+    if (!hasTunnel || tornDown) giveUp(when);
+}
+
+void LogStory::giveUp(Time when) {
     history.explainLoss(signs.reasonText());
     become(Reach::NOT_REACHED, when, signs.reasonText());
 }
@@ -348,7 +418,9 @@ void LogStory::assume(Reach status) {
 
 void LogStory::become(Reach next, Time when, const std::string& cause) {
     // On its way out it finishes what it had begun.
-    if (ended && next != Reach::NOT_RUNNING && next != Reach::SWITCHED_OFF) return;
+    const bool isEnd = next == Reach::NOT_RUNNING || next == Reach::SWITCHED_OFF;
+    if (ended && !isEnd) return;
+    if (isQuiet() && !isEnd) next = Reach::UNKNOWN;
     Period period{next, when, addressOf(next), cause};
     if (next == Reach::RELAYED) {
         const std::string reason = signs.reasonText();
@@ -362,8 +434,18 @@ std::string LogStory::addressOf(Reach reach) const {
 }
 
 void LogStory::finish(Evidence& evidence) {
-    if (pending && evidence.now - pending->since > kAttemptTime) becomePending();
+    if (passed) assume(Reach::DIRECT);
+    // A log from elsewhere ends with the record if all went well.
+    const bool isDone = evidence.fromElsewhere && isPending(Reach::DIRECT);
+    if (pending && (isDone || evidence.now - pending->since > kAttemptTime)) becomePending();
     if (history.isOverdue(evidence.now)) history.explainStart(signs.reasonText());
+    const bool isCounted =
+        evidence.has(Sign::SECOND_TUNNEL_CLIENT) || evidence.has(Sign::TUNNEL_CLIENT_ALONE);
+    if (orphan && history.reach() == Reach::RELAYED && !isCounted) {
+        evidence.untold.emplace_back(
+            "whether the tunnel of a daemon that ended suddenly still runs beside the new one, "
+            "unless the device was restarted: run pelorus-doctor on it, as root");
+    }
     evidence.hasLog = firstLine.has_value();
     evidence.hasProgressLines = progress;
     evidence.logBegin = firstLine;
@@ -374,7 +456,12 @@ void LogStory::finish(Evidence& evidence) {
     if (pauses && !evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
     const bool byHand = ports == Ports::MANUAL;
     for (const auto& [sign, fact] : signs.lasting(evidence.now, byHand)) {
-        evidence.signs[sign] = fact;
+        const bool isOfEnd = std::count(kSignsOfTheEnd.begin(), kSignsOfTheEnd.end(), sign) != 0;
+        if (isOfEnd || !isQuiet()) evidence.signs[sign] = fact;
+    }
+    const bool isUnset = evidence.fromElsewhere || !evidence.hasSettings();
+    if (byHand && isUnset) {
+        evidence.add(Sign::MANUAL_MODE, Source::LOG, "the ports are forwarded by hand");
     }
     evidence.history.assign(history.periods().begin(), history.periods().end());
 }

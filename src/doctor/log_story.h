@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "doctor/evidence.h"
+#include "doctor/log_clock.h"
 #include "doctor/log_line.h"
 #include "doctor/log_rules.h"
 #include "doctor/log_signs.h"
@@ -29,17 +30,28 @@ public:
     /// told only if `now` lies in the pause before it.
     void finish(Evidence& evidence);
 
+    [[nodiscard]] int clockJumps() const { return clock.jumps; }
     [[nodiscard]] int starts() const { return startCount; }
+    /// Too few lines are logged to follow what happens: no results, by what the last start said.
+    [[nodiscard]] bool isQuiet() const { return level < kLeastLevel; }
+    /// The severity up to which the daemon logs.
+    [[nodiscard]] int severity() const { return level; }
     [[nodiscard]] std::optional<Time> begin() const { return firstLine; }
     [[nodiscard]] std::optional<Time> end() const { return lastLine; }
 
 private:
+    static constexpr int kLeastLevel = 5;  // the daemon's default
+
     // A change that becomes true unless the next lines speak of a failure.
     struct Pending {
         Reach reach{};
         Time since{};
     };
 
+    [[nodiscard]] Time timeOf(const LogLine& line);
+    void correct(const LogClock::Correction& correction);
+    void takeText(std::string_view text, Time when);
+    void settleTest(Time when);
     void settlePending(std::string_view text, Time when);
     void becomePending();
     [[nodiscard]] bool isPending(Reach reach) const { return pending && pending->reach == reach; }
@@ -50,30 +62,36 @@ private:
     void happenInRelay(LogEvent event, Time when);
     void concludeGateway();
     void start(Time when);
+    void endSuddenly(Time when);
     void switchOff(Time when);
     void end(Time when);
     void endCycle(Time when, std::string_view seconds);
     void takeStatus(std::string_view word, Time when);
     void takeTestAnswer(std::string_view answer, Time when);
     void lose(Time when);
+    void giveUp(Time when);
     void failRelay(Time when);
     void assumeFrom(std::string_view status);
     void assume(Reach status);
     void become(Reach next, Time when, const std::string& cause);
     [[nodiscard]] std::string addressOf(Reach reach) const;
 
+    LogClock clock;
     LogSigns signs;
     ReachHistory history;
     std::optional<Pending> pending;
-    const Ports ports;
+    Ports ports;
     std::optional<Time> firstLine, lastLine, since, pauseBegin, nextCycle;
+    std::optional<Time> lastOfRun;  // the last line, but for those that precede a start
+    std::optional<Time> passed;     // a port, in a log that has not told yet how it was before
+    int level = kLeastLevel;
     bool announced = false;  // the last line was a start's first one
     bool signalled = false;  // told to end
     bool ended = true;       // no daemon is there, or it is on its way out
     bool progress = false;   // since the last start there was a line of severity 6
     bool natpmp = false;     // the gateway speaks it, as far as the log tells
     bool tested = false;     // a port passed, and the relay was not used since
-    bool orphan = false;     // an earlier daemon ended suddenly and left its tunnel
+    bool orphan = false;     // an earlier daemon ended suddenly and may have left its tunnel
     bool tornDown = false;   // no connection of this cycle's beginning is left
     int startCount = 0;
 };

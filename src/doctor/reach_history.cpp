@@ -35,6 +35,10 @@ void ReachHistory::assume(Period first) {
     passing = false;
 }
 
+void ReachHistory::correct(const LogClock::Correction& correction) {
+    for (Period& period : all) period.since = correction.of(period.since);
+}
+
 void ReachHistory::explainLoss(const std::string& reason) {
     const bool isOpen = passing && reach() == Reach::NOT_REACHED && all.back().cause.empty();
     if (isOpen) all.back().cause = reason;

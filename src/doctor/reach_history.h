@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "doctor/evidence.h"
+#include "doctor/log_clock.h"
 
 namespace pelorus::doctor {
 
@@ -24,6 +25,9 @@ public:
 
     /// How it was when the log began, unless something is known already.
     void assume(Period first);
+
+    /// The clock was wrong.
+    void correct(const LogClock::Correction& correction);
 
     /// The cycle, or the attempt, is over: what its last period says lasts.
     void settle() { passing = false; }

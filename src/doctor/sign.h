@@ -92,7 +92,6 @@ enum class Sign {
     LOGGED_RELAY_DOES_NOT_COME_UP,
     LOGGED_TUNNEL_NO_OUTPUT,  ///< the start command did not run, or could not write
     LOGGED_TUNNEL_DIED,
-    LOGGED_TWO_TUNNELS,
 
     CHANGED_SINCE,  ///< what the log says is over, by what is seen now
 };

@@ -119,7 +119,7 @@ std::string TextReport::sinceWhen() const {
     if (diagnosis.fromElsewhere) {
         text += " as of " + momentInWords(diagnosis.now, today) + ", where the log ends";
     }
-    if (diagnosis.since) {
+    if (diagnosis.since && diagnosis.reach != Reach::UNKNOWN) {
         if (!text.empty()) text += diagnosis.fromElsewhere ? ";" : ",";
         text += diagnosis.isSinceAtLeast ? " since at least " : " since ";
         text += momentInWords(*diagnosis.since, today) + " (" +

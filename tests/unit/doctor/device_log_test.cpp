@@ -90,6 +90,48 @@ TEST_F(DeviceLogTest, FilesInAnyOrderPlainOrZippedAndRepeated) {
     }
 }
 
+TEST_F(DeviceLogTest, EndsWithTheLastLineOfAnyProgram) {
+    const Evidence evidence =
+        look({plain("a", kFirst + "2026-11-20T12:00:00Z nas cron[1]: other\nno stamp")});
+    EXPECT_EQ(evidence.now - *evidence.logEnd, std::chrono::seconds{7191});
+}
+
+TEST_F(DeviceLogTest, AClockThatWasWrongHidesNoFile) {
+    const std::string said = "T10:30:00Z nas Pelorus: main - x\n";
+    const struct {
+        const char* name;
+        std::string first, second;  // the files' names
+        std::string before, after;  // lines around those of the first file
+        std::string unset;          // line before those of the second file
+    } rows[]{{"ahead at the end", "b", "a", "", "2026-11-21" + said, ""},
+             {"not set at the start", "b", "a", "", "", "2026-01-01" + said},
+             {"ahead at the start of a rotated file", "log.1", "log", "2026-11-22" + said, "", ""}};
+    for (const auto& row : rows) {
+        const std::string first = plain(row.first, row.before + kFirst + row.after);
+        const std::string second = plain(row.second, row.unset + kSecond);
+        const Evidence evidence = look({second, first});
+        EXPECT_EQ(evidence.history.back().reach, Reach::DIRECT) << row.name;
+    }
+}
+
+TEST_F(DeviceLogTest, StampsWithoutYearsReachFurtherBackThanOne) {
+    std::string log =
+        "Oct  1 12:00:00 nas Pelorus: main - pelorus daemon starting up, Version: [1]\n";
+    for (const char* const day : {"Nov 22", "Nov 26", "Dec 30", "Jan  2", "Nov 20"}) {
+        log += std::string{day} + " 12:00:00 nas Pelorus: x\n";
+    }
+    const Evidence evidence = look({plain("a", log)});
+    EXPECT_EQ((*evidence.logEnd - *evidence.logBegin).count(), 415 * 86400);
+    EXPECT_EQ(evidence.daemon.since, evidence.logBegin);
+}
+
+TEST_F(DeviceLogTest, SaysThatTheLinesMayBeOfSeveralDevices) {
+    std::string other = kSecond;
+    other.replace(other.find("nas"), 3, "box");
+    const Evidence evidence = look({plain("a", kFirst + other)});
+    EXPECT_NE(evidence.untold.front().find("box, nas"), std::string::npos);
+}
+
 TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
     plain("messages", kFirst + kSecond);  // the same lines once more
     plain("syslog", kSecond);
@@ -159,10 +201,11 @@ TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
 }
 
 TEST(LineFilter, CutsWhereverThePiecesEnd) {
-    const std::string text = "other\nelorus 1\nx elorus 2\n" + std::string(9000, 'y') +
-                             "elorus\nelorus " + std::string(9000, 'z') + "\nelorus 3";
-    const std::vector<std::string> wanted{"elorus 1", "x elorus 2",
-                                          "elorus " + std::string(8185, 'z'), "elorus 3"};
+    const std::string text =
+        "other\n elorus 0\nelorus 1\n  a elorus\n\tb\nother\n c\nx elorus 2\n" +
+        std::string(9000, 'y') + "elorus\nelorus " + std::string(9000, 'z') + "\n y\nelorus 3\n d";
+    const std::vector<std::string> wanted{" elorus 0", "elorus 1 a elorus b", "x elorus 2",
+                                          "elorus " + std::string(8185, 'z'), "elorus 3 d"};
     for (const std::size_t size : {1U, 2U, 7U, 8192U, 100000U}) {
         std::vector<std::string> lines;
         LineFilter filter{[&lines](std::string_view line) {

@@ -37,6 +37,7 @@ constexpr const char *
    *kTestFailed = "TavikClient::testPort - port map check failed.",
    *kRelayFailed = "ConnectionManager::createRelayConnection() - failed to create VPN connection.",
    *kStaleTunnel = "VPNManager::isVPNRunning() - unlink stale openVPN pid file /run/openvpn.pid",
+   *kCopyMissing = "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [x]",
    *kSigterm = "sigTrap - Received SIGTERM signal.",
    *kOff = "DaemonControl::disableRemoteAccess - remote access is disabled.",
    *kSecondNatFact = "the gateway says 100.64.3.9, the service sees 203.0.113.7";
@@ -47,10 +48,11 @@ Time at(int seconds) {
     return Time{std::chrono::seconds{seconds}};
 }
 
-Evidence told(const Lines& lines, int now) {
+Evidence told(const Lines& lines, int now, bool fromElsewhere = false) {
     LogStory story;
     for (const auto& [second, text] : lines) story.take({at(second), text});
     Evidence evidence;
+    evidence.fromElsewhere = fromElsewhere;
     evidence.now = at(now);
     story.finish(evidence);
     return evidence;
@@ -150,7 +152,7 @@ TEST(LogStory, HistoryAndSigns) {
           {116, kTunnelUp}},
          "16 relayed: the tunnel came up|16 not running: the daemon ended suddenly|"
          "116 relayed: the tunnel came up|",
-         {Sign::LOGGED_TWO_TUNNELS}},
+         {}},
         {"a sudden end soon after the client's start, without progress",
          {{0, kStart},
           {6, kTunnelStarts},
@@ -161,7 +163,7 @@ TEST(LogStory, HistoryAndSigns) {
           {1500, kSigterm}},
          "0 not reached: the daemon started|100 not running: the daemon ended suddenly|106 relayed: the tunnel came up|"
          "900 not running: the daemon ended suddenly|906 relayed: the tunnel came up|",
-         {Sign::LOGGED_TWO_TUNNELS}},
+         {}},
         {"power cuts soon after publishing, and in every start after that",
          {{0, kStart},
           {9, kPublished},
@@ -251,6 +253,63 @@ TEST(LogStory, HistoryAndSigns) {
           {139, kTestFailed}},
          "4 " + direct + "139 not reached: no gateway answers UPnP|",
          {Sign::LOGGED_NO_GATEWAY, Sign::LOGGED_TEST_FAILED}},
+        {"begins while relayed, as far as it tells",
+         {{0, kSecondNatAnswer}, {0, kSecondNat}, {240, kSecondNatAnswer}, {240, kSecondNat}},
+         "",
+         {Sign::LOGGED_SECOND_NAT}},
+        {"begins before a search that passes",
+         {{0, kNoUpnp}, {900, kPassed}, {960, kPassed}, {961, kPublished}, {1300, kPassed}},
+         "961 " + direct,
+         {}},
+        {"begins before a relay's start",
+         {{0, kNoUpnp}, {900, kTunnelStarts}, {910, kRelayFailed}},
+         "900 not reached: no gateway answers UPnP|",
+         {Sign::LOGGED_NO_GATEWAY}},
+        {"a relay that fails once, without progress",
+         {{0, kStart},
+          {4, kTestFailed},
+          {5, kTunnelStarts},
+          {290, kRelayFailed},
+          {410, kTestFailed},
+          {411, kTunnelStarts},
+          {800, kTestFailed}},
+         "0 not reached: the service could not reach the port|"
+         "411 relayed: the service could not reach the port|",
+         {Sign::LOGGED_TEST_FAILED}},
+        {"a power cut of which nothing tells the length",
+         {{0, kStart},
+          {9, kPublished},
+          {300, kPassed},
+          {90000, kCopyMissing},
+          {90000, kStart},
+          {90009, kPublished},
+          {90020, kPause}},
+         "9 direct: the ports passed their test and were published|"
+         "300 ?: nothing was logged until the daemon started again|90009 " +
+             direct,
+         {}},
+        {"errors only, and an end",
+         {{0, "main - syslog severity level set to 3."},
+          {9, kTestFailed},
+          {9, kRelayFailed},
+          {99, "main - syslog severity level set to 3."},
+          {999, kSigterm},
+          {1999, "main - syslog severity level set to 5."},
+          {1999, kStart},
+          {2000, kPublished},
+          {2999, "main - syslog severity level set to 3."},
+          {3000, kTestFailed}},
+         "0 ?: the daemon started|99 not running: the daemon ended suddenly|99 ?: the daemon "
+         "started|999 not running: the daemon was told to end by a signal|2000 direct: the ports "
+         "passed their test and were published|2999 not running: the daemon ended suddenly|2999 "
+         "?: the daemon started|",
+         {}},
+        {"the record, and the tunnel's end",
+         {{0, kStart},
+          {9, kPublished},
+          {9, "VPNManager::closeVPNConnection() - open vpn is not running."}},
+         "9 direct: the ports passed their test and were published|",
+         {}},
         {"an answer that is too long",
          {{0, kStart},
           {5,
@@ -290,6 +349,17 @@ TEST(LogStory, TellsValuesAndTimes) {
     EXPECT_TRUE(evidence.hasProgressLines);
 }
 
+TEST(LogStory, TellsPortsThatAreForwardedByHandFromElsewhere) {
+    const char* const manual = "ConnectionManager::manualPortForward - allocatedHttpPort 0, x";
+    const char* const automatic = "ConnectionManager::forwardPort - forwarding internal port: 80 x";
+    const std::pair<Lines, bool> rows[]{{{{0, manual}}, true},
+                                        {{{0, manual}, {9, automatic}}, false}};
+    for (const auto& [lines, isManual] : rows) {
+        EXPECT_EQ(told(lines, 30, true).has(Sign::MANUAL_MODE), isManual);
+        EXPECT_FALSE(told(lines, 30).has(Sign::MANUAL_MODE));
+    }
+}
+
 TEST(LogStory, WordsWhatWasNotLogged) {
     const Evidence evidence = told({{0, kSecondNat}}, 30);
     EXPECT_EQ(evidence.signs.at(Sign::LOGGED_SECOND_NAT).text,
@@ -313,6 +383,47 @@ TEST(LogStory, TheNextCycleIsToldDuringThePauseBeforeIt) {
     for (const auto& [now, isTold] : rows) {
         EXPECT_EQ(told({{0, kStart}, {100, kPause}}, now).daemon.nextCycle.has_value(), isTold)
             << now;
+    }
+}
+
+TEST(LogStory, AClockThatJumpsMakesNoDurations) {
+    constexpr int kDay = 86400, kFar = 300 * kDay;
+    const std::string fact = "the ports passed their test and were published|";
+    const struct {
+        const char* name;
+        Lines lines;
+        std::string history;
+    } rows[]{
+        {"not set at the first start",
+         {{0, kStart}, {kFar, kPublished}, {kFar + 9, kPause}},
+         "25920000 direct: " + fact},
+        {"set back",
+         {{40000, kStart}, {40009, kPublished}, {40010, kPause}, {20000, kPause}, {20140, kStart}},
+         "20000 direct: " + fact +
+             "20000 not running: the daemon ended suddenly|20140 not reached: the daemon started|"},
+        {"lost by a restart, and set again",
+         {{kFar, kStart},
+          {kFar + 9, kPublished},
+          {kFar + 10, kPause},
+          {9, kStart},
+          {kFar + kDay, kPublished},
+          {kFar + kDay + 1, kPause}},
+         "25920009 direct: " + fact +
+             "25920010 not running: the daemon ended suddenly|26006400 "
+             "direct: " +
+             fact},
+        {"far ahead, and set right",
+         {{kFar, kStart},
+          {kFar + 9, kPublished},
+          {kFar + 10, kPause},
+          {0, kPause},
+          {4 * kDay, kPause},
+          {8 * kDay, kStatusFailed}},
+         "0 direct: " + fact + "691200 not reached: |"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        EXPECT_EQ(historyOf(told(row.lines, row.lines.back().first + 60)), row.history);
     }
 }
 

@@ -8,8 +8,8 @@
 #include "doctor/disk_probe.h"
 #include "doctor/interfaces.h"
 #include "doctor/names_probe.h"
-#include "doctor/program.h"
 #include "doctor/question_probe.h"
+#include "doctor/start_command.h"
 #include "doctor/url_host.h"
 
 namespace pelorus::doctor {
@@ -204,15 +204,30 @@ TEST(RelayInOutput, IsTheLastOne) {
 
 TEST(RelayClient, IsNamedByTheStartCommand) {
     const std::pair<const char*, const char*> rows[] = {
-        {"", "openvpn"},
         {"env -u X openvpn --config client.conf --writepid openvpn.pid > openvpn.out 2>&1 &",
          "openvpn"},
         {"/opt/bin/openvpn --config c", "/opt/bin/openvpn"},
         {"bin/openvpn --config c", "/etc/vpn/bin/openvpn"},
-        {"sh /opt/start-relay", "/opt/start-relay"},
+        {"/opt/start-relay -d", "/opt/start-relay"},
+        {"cd /etc/openvpn && openvpn --config \"a; b\" &>out", "openvpn"},
+        {"mkdir -p /run/openvpn; exec /sbin/openvpn2.4 c", "/sbin/openvpn2.4"},
+        {"LD_LIBRARY_PATH=/usr/lib/openvpn /usr/sbin/openvpn", "/usr/sbin/openvpn"},
+        {"echo start >> starts; env A=1 nohup openvpn", "openvpn"},
+        {"pidof openvpn||openvpn", "openvpn"},
+        // Not clear.
+        {"", ""},
+        {"cd /opt/vpn && ./sbin/openvpn", ""},
+        {"PATH=/opt/bin:$PATH openvpn", ""},
+        {"sh ./start_relay openvpn", ""},
+        {"sh /opt/start-relay", ""},
+        {"start-relay", ""},
+        {"$DIR/openvpn", ""},
+        {"env -C /opt bin/openvpn", ""},
+        {"test -x /a/openvpn && /a/openvpn || openvpn", ""},
+        {"/bin/mkdir /run/x; /opt/relay", ""},
     };
     for (const auto& [command, client] : rows) {
-        EXPECT_EQ(relayClientOf(command, "/etc/vpn"), client) << command;
+        EXPECT_EQ(relayClientOf(command, "/etc/vpn").value_or(""), client) << command;
     }
 }
 

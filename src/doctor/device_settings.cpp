@@ -131,6 +131,7 @@ bool SettingsFile::needsRoot() const {
 }
 
 std::string SettingsFile::trouble() const {
+    if (path.empty()) return "no file is named";
     const std::string beginning = shownText(path) + " cannot be read";
     if (needsRoot()) return beginning + " by this user: run it as root";
     if (!content.isRefused) return beginning + ": " + std::strerror(content.error);

@@ -17,7 +17,7 @@ namespace pelorus::doctor {
 
 namespace {
 
-constexpr long kConnectPatience = 5000;  // milliseconds
+constexpr long kConnectPatience = 7000;  // milliseconds
 constexpr long kTimePatience = 2000;     // milliseconds
 
 using CurlHandle = std::unique_ptr<CURL, Releaser<curl_easy_cleanup>>;
@@ -99,6 +99,18 @@ void judgeCertificate(const std::string& url, const std::string& message, Findin
     findings.problem("clock: " + *clock);
 }
 
+// The daemon waits longer for the handshake; a host that takes no connection all that time is not
+// there.
+void judgeSilence(CURL* handle, Findings& findings) {
+    double connected = 0;  // seconds; 0 while there is no connection
+    static_cast<void>(curl_easy_getinfo(handle, CURLINFO_CONNECT_TIME, &connected));
+    if (connected > 0) {
+        findings.notSeen("central service: takes connections, but no TLS handshake in 7 s");
+    } else {
+        unreachable(findings, "does not answer in time");
+    }
+}
+
 void connectToService(const std::string& url, const std::string& host, Findings& findings) {
     const CurlHandle handle = connectionTo(url, kConnectPatience);
     if (!handle) return;
@@ -124,7 +136,7 @@ void connectToService(const std::string& url, const std::string& host, Findings&
             unresolved(findings, "the name of the central service is not resolved");
             return;
         case CURLE_OPERATION_TIMEDOUT:
-            unreachable(findings, "does not answer in time");
+            judgeSilence(handle.get(), findings);
             return;
         case CURLE_COULDNT_CONNECT:
             unreachable(findings, "cannot be connected to");
@@ -161,7 +173,7 @@ void lookAtService(const Evidence& evidence, Findings& findings) {
 
 void judgeUnfinishedService(const Findings& sofar, Findings& findings) {
     const std::string host = sofar.value("resolving");
-    if (!host.empty()) unresolved(findings, "name " + host + ": the name server does not answer");
+    if (!host.empty()) unresolved(findings, "name " + host + ": " + kSilentNameServer);
 }
 
 }  // namespace pelorus::doctor

@@ -98,7 +98,9 @@ private:
         }
         for (const FileKind file : {FileKind::STATIC, settings.dynamicSource()}) {
             if (settings.file(file).content.isCut) {
-                problem(place(file), "is longer than 1 MiB; only its beginning is read");
+                const bool isStatic = file == FileKind::STATIC;
+                problem(place(file), std::string{"is longer than "} + (isStatic ? "16" : "1") +
+                                         " MiB; only its beginning is read");
             }
         }
     }

@@ -211,6 +211,15 @@ TEST_F(SettingsReportTest, WhatOthersCanChangeIsUnsafe) {
         << ::testing::PrintToString(report.problems);
 }
 
+TEST_F(SettingsReportTest, OnlyTheStaticFileIsReadWhole) {
+    const std::string filler(2'000'000, '\n');
+    fixed.insert(0, filler);
+    EXPECT_TRUE(check().usable);
+    EXPECT_EQ(problem(""), "");
+    EXPECT_EQ(problem("", filler),
+              "dynamicconfig.ini: is longer than 1 MiB; only its beginning is read");
+}
+
 TEST_F(SettingsReportTest, RubbishGivesABoundedReport) {
     std::string rubbish;
     for (int line = 0; line < 30'000; ++line) {

@@ -264,6 +264,10 @@ TEST_F(DeviceFilesTest, ADiskIsUnusedByTheDaemonsRule) {
         writeFile("minutes", minutes);
         EXPECT_TRUE(look().has(Sign::DISK_UNUSED)) << minutes;
     }
+    for (const char* nothing : {"", "\n", "x"}) {
+        writeFile("minutes", nothing);
+        EXPECT_FALSE(look().has(Sign::DISK_UNUSED) || look().has(Sign::DISK_IN_USE)) << nothing;
+    }
     fs::remove(path("minutes"));
     EXPECT_TRUE(look().has(Sign::DISK_UNUSED));
     EXPECT_FALSE(look({{"DEVICETYPE", "5"}}).has(Sign::DISK_UNUSED));

@@ -57,7 +57,8 @@ std::optional<RouteLine> readRouteLine(const std::string& text) {
     unsigned mask = 0;
     line >> read.route.interface >> std::hex >> destination >> gateway >> flags >> std::dec >>
         ignored >> ignored >> read.metric >> std::hex >> mask;
-    const bool isDefault = line && destination == 0 && mask == 0 && (flags & RTF_UP) != 0;
+    const bool isUsed = (flags & RTF_UP) != 0 && (flags & RTF_REJECT) == 0;
+    const bool isDefault = line && destination == 0 && mask == 0 && isUsed;
     if (!isDefault) return std::nullopt;
     if ((flags & RTF_GATEWAY) != 0) read.route.gateway = addressText(in_addr{gateway});
     return read;

@@ -74,7 +74,8 @@ TEST(DefaultRoute, IsTheOneOfLeastMetric) {
     const std::string fast = "eth0\t00000000\t014DA8C0\t0003\t0\t0\t100\t00000000\t0\t0\t0\n";
     const std::string down = "eth1\t00000000\t014DA8C0\t0002\t0\t0\t0\t00000000\t0\t0\t0\n";
     const std::string half = "tun0\t00000000\t014DA8C0\t0003\t0\t0\t0\t00000080\t0\t0\t0\n";
-    EXPECT_FALSE(readDefaultRoute(head + lan + down + half + "rubbish\n"));
+    const std::string refused = "*\t00000000\t00000000\t0201\t0\t0\t0\t00000000\t0\t0\t0\n";
+    EXPECT_FALSE(readDefaultRoute(head + lan + down + half + refused + "rubbish\n"));
     const auto best = readDefaultRoute(head + lan + slow + fast);
     ASSERT_TRUE(best);
     EXPECT_EQ(best->interface, "eth0");
@@ -141,6 +142,11 @@ TEST(ClockFault, NeedsEvidence) {
               "this device says 2025-11-22, the service says 2025-11-20");
     EXPECT_EQ(clockFault(kNow, {{}, kNow + kDay}),
               "this device says 2025-11-22, the service's certificate is of 2025-11-23");
+    constexpr std::time_t kHour = 3600;
+    EXPECT_FALSE(clockFault(kNow, {kNow + 6 * kHour, kNow + 7 * kHour, {}}));
+    EXPECT_EQ(clockFault(kNow, {kNow + 6 * kHour, kNow + kHour, {}}),
+              "this device says 2025-11-22 00:00 UTC, the service says 2025-11-22 06:00 UTC");
+    EXPECT_TRUE(clockFault(kNow, {kNow - 6 * kHour, kNow - kDay, kNow - kHour}));
 }
 
 TEST(DiskState, IsWhatHdparmSays) {

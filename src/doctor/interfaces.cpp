@@ -5,6 +5,7 @@
 #include <net/if.h>
 #include <net/route.h>
 #include <netinet/in.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -40,6 +41,10 @@ Interface& named(std::vector<Interface>& all, const std::string& name) {
     if (found != all.end()) return *found;
     all.push_back({name, false, false, {}});
     return all.back();
+}
+
+bool isTunOrTap(const std::string& name) {
+    return access(("/sys/class/net/" + name + "/tun_flags").c_str(), F_OK) == 0;
 }
 
 struct RouteLine {
@@ -105,7 +110,7 @@ std::vector<Interface> interfaces() {
         Interface& known = named(all, name);
         constexpr unsigned kInUse = IFF_UP | IFF_RUNNING;
         known.up = (entry->ifa_flags & kInUse) == kInUse;
-        known.tunnel = (entry->ifa_flags & (IFF_POINTOPOINT | IFF_NOARP)) != 0;
+        known.tunnel = (entry->ifa_flags & (IFF_POINTOPOINT | IFF_NOARP)) != 0 || isTunOrTap(name);
         const std::string address = addressText(entry->ifa_addr);
         if (!address.empty()) known.addresses.push_back(address);
     }
@@ -172,6 +177,12 @@ void judgeNetwork(const std::vector<Interface>& all,
         judgeRoute(*addressed, route, findings);
     }
     judgeTunnels(all, findings);
+}
+
+void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings) {
+    const auto isUp = [](const Interface& entry) { return entry.up && entry.tunnel; };
+    if (std::any_of(all.begin(), all.end(), isUp)) return;
+    findings.problem("tunnel interface: none is up, although the tunnel client says that it is");
 }
 
 }  // namespace pelorus::doctor

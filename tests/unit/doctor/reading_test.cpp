@@ -114,6 +114,19 @@ TEST(Network, IsJudgedByItsFirstLack) {
     }
 }
 
+TEST(Tunnel, IsMissedWhileItsClientIsUp) {
+    const Interface lan{"eth0", true, false, {}};
+    const Interface down{"tun0", false, true, {}};
+    const Interface up{"tap0", true, true, {}};
+    const std::pair<std::vector<Interface>, bool> rows[] = {
+        {{lan, down}, true}, {{down, up}, false}, {{}, true}};
+    for (const auto& [all, isMissed] : rows) {
+        Findings findings;
+        judgeMissingTunnel(all, findings);
+        EXPECT_EQ(!findings.checks().empty(), isMissed);
+    }
+}
+
 TEST(CertificateFault, IsNamedInPlainWords) {
     const std::pair<const char*, const char*> rows[] = {
         {"SSL certificate problem: certificate has expired", "has expired"},

@@ -37,12 +37,18 @@ constexpr std::array<Row, 14> kRows{{
     {"revoked", "has been revoked"},
 }};
 
-std::string day(std::time_t when) {
+std::string day(std::time_t when, bool withTime = false) {
     std::tm parts{};
     if (gmtime_r(&when, &parts) == nullptr) return "?";
     std::array<char, 32> text{};
-    const std::size_t size = std::strftime(text.data(), text.size(), "%Y-%m-%d", &parts);
+    const std::size_t size = std::strftime(text.data(), text.size(),
+                                           withTime ? "%Y-%m-%d %H:%M UTC" : "%Y-%m-%d", &parts);
     return {text.data(), size};
+}
+
+bool isValidAt(std::time_t when, const ServiceTimes& times) {
+    return (!times.notBefore || when >= *times.notBefore) &&
+           (!times.notAfter || when <= *times.notAfter);
 }
 
 }  // namespace
@@ -59,12 +65,14 @@ bool mayBeTheClock(const std::string& fault) {
 }
 
 std::optional<std::string> clockFault(std::time_t now, const ServiceTimes& times) {
-    const std::string here = "this device says " + day(now) + ", the service";
     if (times.date) {
-        const bool agrees = now - *times.date <= kOneDay && *times.date - now <= kOneDay;
-        if (agrees) return std::nullopt;
-        return here + " says " + day(*times.date);
+        const bool isNear = now - *times.date <= kOneDay && *times.date - now <= kOneDay;
+        const bool isDecisive = !isValidAt(now, times) && isValidAt(*times.date, times);
+        if (isNear && !isDecisive) return std::nullopt;
+        return "this device says " + day(now, isNear) + ", the service says " +
+               day(*times.date, isNear);
     }
+    const std::string here = "this device says " + day(now) + ", the service";
     if (!times.notBefore || now >= *times.notBefore) return std::nullopt;
     return here + "'s certificate is of " + day(*times.notBefore);
 }

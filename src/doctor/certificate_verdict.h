@@ -16,8 +16,9 @@ namespace pelorus::doctor {
 
 /// What the service's own answers say about the time.
 struct ServiceTimes {
-    std::optional<std::time_t> date;       ///< the time it says it is
-    std::optional<std::time_t> notBefore;  ///< the certificate's first moment
+    std::optional<std::time_t> date;        ///< the time it says it is
+    std::optional<std::time_t> notBefore;   ///< the certificate's first moment
+    std::optional<std::time_t> notAfter{};  ///< its last one
 };
 
 /// Why a clock that says @p now is wrong; nothing when there is no evidence. A certificate that has

@@ -113,8 +113,14 @@ void lookAtMinutes(const std::string& path, Evidence& evidence) {
         check(evidence, Verdict::NOT_SEEN, Source::NOW, "how long the disk is unused: needs root");
         return;
     }
-    const int minutes =
-        leadingInt(file.text.value_or("").substr(0, file.text.value_or("").find('\n')));
+    const std::string content = file.text.value_or("");
+    const std::string firstLine = content.substr(0, content.find('\n'));
+    const int minutes = leadingInt(firstLine);
+    if (file.text && !scanInt(firstLine.c_str())) {
+        check(evidence, Verdict::NOT_SEEN, Source::NOW,
+              "how long the disk is unused: " + shownText(path) + " holds no number");
+        return;
+    }
     if (file.text && minutes <= kMostIdleMinutes) {
         evidence.add(Sign::DISK_IN_USE, Source::NOW, "disk in use");
         check(evidence, Verdict::OK, Source::NOW, "disk in use");

@@ -7,6 +7,7 @@
 #include <climits>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
 
 #include "common/handles.h"
 #include "doctor/shown_text.h"
@@ -17,18 +18,28 @@ namespace pelorus::doctor {
 namespace {
 
 constexpr std::size_t kMostLines = 20'000;
+constexpr std::size_t kMostStaticBytes = 16UL * 1024 * 1024;
 
 bool namesACopy(const std::string& path) {
     return !path.empty() && path != "empty";
 }
 
-// Root puts the file there: any link is followed.
+// Root puts the file there: any link is followed, and all of it is read.
 ForeignText readStaticFile(const std::string& path) {
     const MallocHandle<char> target{realpath(path.c_str(), nullptr)};
-    if (target) return readForeignFile(target.get());
-    ForeignText none;
-    none.error = errno;
-    return none;
+    if (!target) {
+        ForeignText none;
+        none.error = errno;
+        return none;
+    }
+    ForeignText found = readForeignFile(target.get());
+    if (!found.text || !found.isCut) return found;
+    std::ifstream file{target.get()};
+    found.text->resize(kMostStaticBytes);
+    file.read(found.text->data(), static_cast<std::streamsize>(kMostStaticBytes));
+    found.text->resize(static_cast<std::size_t>(file.gcount()));
+    found.isCut = file.good();
+    return found;
 }
 
 void mergeLines(SettingsMap& map,
@@ -131,6 +142,7 @@ bool SettingsFile::needsRoot() const {
 }
 
 std::string SettingsFile::trouble() const {
+    if (path.empty()) return "no file is named";
     const std::string beginning = shownText(path) + " cannot be read";
     if (needsRoot()) return beginning + " by this user: run it as root";
     if (!content.isRefused) return beginning + ": " + std::strerror(content.error);

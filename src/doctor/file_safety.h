@@ -14,7 +14,8 @@ enum class Writers {
     UNKNOWN,  ///< it is not there, or cannot be looked at
 };
 
-/// Looks at the file and at the folder it is in; a folder that others cannot enter protects it.
+/// Looks at the file and at every folder and link on the way to it; a folder that others cannot
+/// enter protects what is in it.
 [[nodiscard]] Writers writersOf(const std::string& path);
 
 /// The same for a file that may not be there yet: whoever can write the folder can take its name.

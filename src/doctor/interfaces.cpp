@@ -5,6 +5,7 @@
 #include <net/if.h>
 #include <net/route.h>
 #include <netinet/in.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -42,6 +43,10 @@ Interface& named(std::vector<Interface>& all, const std::string& name) {
     return all.back();
 }
 
+bool isTunOrTap(const std::string& name) {
+    return access(("/sys/class/net/" + name + "/tun_flags").c_str(), F_OK) == 0;
+}
+
 struct RouteLine {
     DefaultRoute route;
     unsigned metric = 0;
@@ -57,7 +62,8 @@ std::optional<RouteLine> readRouteLine(const std::string& text) {
     unsigned mask = 0;
     line >> read.route.interface >> std::hex >> destination >> gateway >> flags >> std::dec >>
         ignored >> ignored >> read.metric >> std::hex >> mask;
-    const bool isDefault = line && destination == 0 && mask == 0 && (flags & RTF_UP) != 0;
+    const bool isUsed = (flags & RTF_UP) != 0 && (flags & RTF_REJECT) == 0;
+    const bool isDefault = line && destination == 0 && mask == 0 && isUsed;
     if (!isDefault) return std::nullopt;
     if ((flags & RTF_GATEWAY) != 0) read.route.gateway = addressText(in_addr{gateway});
     return read;
@@ -104,7 +110,7 @@ std::vector<Interface> interfaces() {
         Interface& known = named(all, name);
         constexpr unsigned kInUse = IFF_UP | IFF_RUNNING;
         known.up = (entry->ifa_flags & kInUse) == kInUse;
-        known.tunnel = (entry->ifa_flags & (IFF_POINTOPOINT | IFF_NOARP)) != 0;
+        known.tunnel = (entry->ifa_flags & (IFF_POINTOPOINT | IFF_NOARP)) != 0 || isTunOrTap(name);
         const std::string address = addressText(entry->ifa_addr);
         if (!address.empty()) known.addresses.push_back(address);
     }
@@ -171,6 +177,12 @@ void judgeNetwork(const std::vector<Interface>& all,
         judgeRoute(*addressed, route, findings);
     }
     judgeTunnels(all, findings);
+}
+
+void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings) {
+    const auto isUp = [](const Interface& entry) { return entry.up && entry.tunnel; };
+    if (std::any_of(all.begin(), all.end(), isUp)) return;
+    findings.problem("tunnel interface: none is up, although the tunnel client says that it is");
 }
 
 }  // namespace pelorus::doctor

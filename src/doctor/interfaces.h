@@ -13,7 +13,7 @@ namespace pelorus::doctor {
 struct Interface {
     std::string name;
     bool up = false;                     ///< and its cable plugged in
-    bool tunnel = false;                 ///< point to point; else it leads to a LAN
+    bool tunnel = false;                 ///< point to point or TAP; else it leads to a LAN
     std::vector<std::string> addresses;  ///< IPv4, dotted
 };
 
@@ -40,6 +40,9 @@ struct DefaultRoute {
 void judgeNetwork(const std::vector<Interface>& all,
                   const std::optional<DefaultRoute>& route,
                   Findings& findings);
+
+/// Says so when no tunnel is up, although the tunnel client says that it is.
+void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings);
 
 }  // namespace pelorus::doctor
 

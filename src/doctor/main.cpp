@@ -39,10 +39,6 @@ namespace {
 constexpr int kNotWritten = 73;
 constexpr int kUnusableSettings = 2;
 
-bool exists(const std::string& path) {
-    return access(path.c_str(), F_OK) == 0;
-}
-
 Time now() {
     return std::chrono::time_point_cast<std::chrono::seconds>(std::chrono::system_clock::now());
 }
@@ -78,11 +74,14 @@ void probeWithProgress(const ProbeChoice& choice, Evidence& evidence) {
 Evidence look(const DoctorOptions& options) {
     Evidence evidence;
     evidence.now = now();
-    const std::string file = findStaticFile();
-    evidence.fromElsewhere = !options.logs.empty() && !options.probes && !exists(file);
+    const StaticFile file = findStaticFile();
+    evidence.fromElsewhere = !options.logs.empty() && !options.probes && isAbsent(file.path);
     if (!evidence.fromElsewhere) {
+        if (!file.remark.empty()) {
+            evidence.checks.push_back({Check::Verdict::OK, Source::SETTINGS, file.remark});
+        }
         DevicePaths paths;
-        paths.staticFile = file;
+        paths.staticFile = file.path;
         lookAtFiles(paths, evidence);
     }
     LogChoice choice;
@@ -128,8 +127,10 @@ Masks masksFor(const DoctorOptions& options,
 }
 
 int reportSettings(const DoctorOptions& options) {
-    const std::string file = findStaticFile();
-    const SettingsReport report = checkSettings(file);
+    const StaticFile found = findStaticFile();
+    const std::string file = found.path;
+    SettingsReport report = checkSettings(file);
+    if (!found.remark.empty()) report.remarks.insert(report.remarks.begin(), found.remark);
     Masks masks = masksFor(options, readDeviceSettings(file).merged.values, {hostName()});
     const Layout how = layout();
     std::string text;
@@ -139,10 +140,11 @@ int reportSettings(const DoctorOptions& options) {
             text += part + '\n';
         }
     };
+    const std::string name = file.empty() ? "an empty TAVIK_STATIC_CONFIG" : file;
     if (report.needsRoot) {
-        add("", "Whether the daemon starts with " + file + " could not be told.");
+        add("", "Whether the daemon starts with " + name + " could not be told.");
     } else {
-        add("", "With " + file + " the daemon " + (report.usable ? "starts." : "does not start."));
+        add("", "With " + name + " the daemon " + (report.usable ? "starts." : "does not start."));
     }
     for (const std::string& problem : report.problems) add("PROBLEM  ", problem);
     for (const std::string& remark : report.remarks) add("remark   ", remark);

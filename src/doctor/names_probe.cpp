@@ -90,7 +90,7 @@ void lookAtNames(const Evidence& evidence, Findings& findings) {
     for (const std::string& name : names) {
         const Lookup found = lookUp(name);
         if (found.noServer) {
-            unresolved(findings, "the name server does not answer");
+            unresolved(findings, found.obstacle);
             return;
         }
         addresses.push_back(found.addresses.empty() ? "" : found.addresses.front());

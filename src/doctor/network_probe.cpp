@@ -4,6 +4,7 @@
 
 #include "doctor/interfaces.h"
 #include "doctor/program.h"
+#include "doctor/start_command.h"
 
 namespace pelorus::doctor {
 
@@ -23,15 +24,19 @@ void lookAtNetwork(Findings& findings) {
 }
 
 void lookAtRelayNeeds(const Evidence& evidence, Findings& findings) {
-    const std::string client =
-        relayClientOf(evidence.setting("STARTCMD"), evidence.setting("OPENVPN_CONFIG_PATH"));
-    const bool hasClient = !findProgram(client).empty();
+    const auto client =
+        evidence.hasSettings()
+            ? relayClientOf(evidence.setting("STARTCMD"), evidence.setting("OPENVPN_CONFIG_PATH"))
+            : std::optional<std::string>{"openvpn"};
+    const bool hasClient = client && !findProgram(*client).empty();
     const bool hasDevice = hasTunnelDevice();
-    if (!hasClient && !evidence.hasSettings()) {
+    if (!client) {
+        findings.notSeen("relay client: STARTCMD does not tell clearly which program it runs");
+    } else if (!hasClient && !evidence.hasSettings()) {
         findings.notSeen("relay client: no openvpn here, and STARTCMD is not known: " +
                          evidence.unreadSettings);
     } else if (!hasClient) {
-        const std::string text = "there is no program " + plainText(client, 80);
+        const std::string text = "there is no program " + plainText(*client, 80);
         findings.add(Sign::RELAY_CLIENT_MISSING, text);
         findings.problem("relay client: " + text);
     }
@@ -40,6 +45,8 @@ void lookAtRelayNeeds(const Evidence& evidence, Findings& findings) {
         findings.problem("relay client: there is no device /dev/net/tun");
     }
     if (hasClient && hasDevice) findings.ok("relay client and /dev/net/tun are there");
+    const bool saysUp = evidence.has(Sign::TUNNEL_RUNS) && evidence.has(Sign::TUNNEL_SAYS_UP);
+    if (saysUp && evidence.statusWord == "relayed") judgeMissingTunnel(interfaces(), findings);
 }
 
 }  // namespace pelorus::doctor

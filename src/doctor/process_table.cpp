@@ -93,10 +93,11 @@ std::string ProcessTable::read(pid_t pid, const std::string& file) const {
 std::optional<Process> ProcessTable::find(pid_t pid) const {
     const auto status = readStatusLine(read(pid, "stat"));
     if (!status || status->state == 'Z' || status->state == 'X') return std::nullopt;
-    Process process{pid, status->parent, read(pid, "comm"), "", "", "", std::nullopt};
+    Process process{pid, status->parent, read(pid, "comm"), "", "", "", "", std::nullopt};
     while (!process.name.empty() && process.name.back() == '\n') process.name.pop_back();
     const std::string ownFolder = folder + "/" + std::to_string(pid);
-    process.program = fileName(linkTarget(ownFolder + "/exe"));
+    process.path = linkTarget(ownFolder + "/exe");
+    process.program = fileName(process.path);
     process.workingFolder = linkTarget(ownFolder + "/cwd");
     process.arguments = argumentsOf(read(pid, "cmdline"));
     const long ticks = sysconf(_SC_CLK_TCK);

@@ -16,7 +16,8 @@ struct Process {
     pid_t pid{};
     pid_t parent{};
     std::string name;             ///< as the kernel knows it, at most 15 characters
-    std::string program;          ///< file name without its folder; empty if only root may know it
+    std::string path;             ///< of its program; empty if only root may know it
+    std::string program;          ///< the file name in it
     std::string arguments;        ///< separated by blanks
     std::string workingFolder;    ///< empty if only root may know it
     std::optional<Time> since{};  ///< its start

@@ -77,20 +77,6 @@ std::string findProgram(const std::string& name) {
     return {};
 }
 
-std::string relayClientOf(const std::string& startCommand, const std::string& folder) {
-    std::istringstream words{startCommand};
-    std::string absolute;
-    for (std::string word; words >> word;) {
-        const std::string name = word.substr(word.rfind('/') + 1);
-        if (name.rfind("openvpn", 0) == 0 && name.find_first_of(".=>") == std::string::npos) {
-            const bool relative = contains(word, "/") && word.front() != '/';
-            return relative ? word.insert(0, folder + "/") : word;
-        }
-        if (absolute.empty() && word.front() == '/') absolute = word;
-    }
-    return absolute.empty() ? "openvpn" : absolute;
-}
-
 std::optional<std::string> outputOf(const std::vector<std::string>& words,
                                     std::chrono::milliseconds limit) {
     const std::string program = findProgram(words.front());

@@ -13,11 +13,6 @@ namespace pelorus::doctor {
 /// administrators. Empty when there is no such executable file.
 [[nodiscard]] std::string findProgram(const std::string& name);
 
-/// The program that a start command of the relay client runs: the first word that names openvpn in
-/// some way, else its first word that is an absolute path, else "openvpn". A path relative to the
-/// commands' working folder @p folder is made absolute.
-[[nodiscard]] std::string relayClientOf(const std::string& startCommand, const std::string& folder);
-
 /// Runs @p words without a shell and returns the beginning of its output. Nothing when it could not
 /// be run or took longer than @p limit; it is then killed. Only for a process without other threads.
 [[nodiscard]] std::optional<std::string> outputOf(const std::vector<std::string>& words,

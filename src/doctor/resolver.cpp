@@ -6,6 +6,7 @@
 #include <sys/socket.h>
 
 #include <array>
+#include <chrono>
 #include <cstdlib>
 #include <memory>
 
@@ -15,6 +16,8 @@
 namespace pelorus::doctor {
 
 namespace {
+
+constexpr std::chrono::seconds kPatience{2};  // for one question
 
 std::string textOf(const addrinfo& entry) {
     const void* const raw = entry.ai_addr;
@@ -33,18 +36,25 @@ std::string textOf(const addrinfo& entry) {
 
 void hurryResolver() {
     // One thread; the C library reads it at its first lookup.
-    static_cast<void>(setenv("RES_OPTIONS", "timeout:2 attempts:1", 1));
+    // A few lost packets must not count as silence.
+    static_cast<void>(setenv("RES_OPTIONS", "timeout:2 attempts:3", 1));
 }
 
 Lookup lookUp(const std::string& host) {
     addrinfo hints{};
     hints.ai_socktype = SOCK_STREAM;
     addrinfo* list = nullptr;
+    const auto begin = std::chrono::steady_clock::now();
     const int error = getaddrinfo(host.c_str(), nullptr, &hints, &list);
     Lookup result;
+    if (error == EAI_AGAIN) {
+        const bool wasSilent = std::chrono::steady_clock::now() - begin >= kPatience;
+        result.noServer = true;
+        result.obstacle = wasSilent ? kSilentNameServer : "the name server cannot tell now";
+        return result;
+    }
     if (error != 0) {
-        result.noServer = error == EAI_AGAIN;
-        result.obstacle = result.noServer ? "the name server does not answer" : "no such name";
+        result.obstacle = "no such name";
         return result;
     }
     const std::unique_ptr<addrinfo, Releaser<freeaddrinfo>> owned(list);

@@ -7,10 +7,12 @@
 
 namespace pelorus::doctor {
 
+inline constexpr const char* kSilentNameServer = "the name server does not answer";
+
 struct Lookup {
     std::vector<std::string> addresses;  ///< as the resolver sorts them
     std::string obstacle;                ///< why there is none, in a few words
-    bool noServer = false;               ///< no name server answers; other names will not do better
+    bool noServer = false;               ///< no name server helps; other names will not do better
 };
 
 /// Shortens the resolver's patience for this process: a silent name server would take all the time

@@ -2,6 +2,8 @@
 
 #include <curl/curl.h>
 #include <strings.h>
+#include <sys/socket.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -17,7 +19,7 @@ namespace pelorus::doctor {
 
 namespace {
 
-constexpr long kConnectPatience = 5000;  // milliseconds
+constexpr long kConnectPatience = 7000;  // milliseconds
 constexpr long kTimePatience = 2000;     // milliseconds
 
 using CurlHandle = std::unique_ptr<CURL, Releaser<curl_easy_cleanup>>;
@@ -60,14 +62,16 @@ std::size_t takeHeader(char* data, std::size_t size, std::size_t count, void* co
 }
 
 void takeCertificateTimes(CURL* handle, ServiceTimes& times) {
-    constexpr std::string_view kName = "Start date:";
+    constexpr std::string_view kFirst = "Start date:";
+    constexpr std::string_view kLast = "Expire date:";
     curl_certinfo* chain = nullptr;
     if (curl_easy_getinfo(handle, CURLINFO_CERTINFO, &chain) != CURLE_OK || chain == nullptr)
         return;
     if (chain->num_of_certs < 1) return;
     for (const curl_slist* entry = chain->certinfo[0]; entry != nullptr; entry = entry->next) {
         const std::string line = entry->data;
-        if (line.rfind(kName, 0) == 0) times.notBefore = parsedTime(line.c_str() + kName.size());
+        if (line.rfind(kFirst, 0) == 0) times.notBefore = parsedTime(line.c_str() + kFirst.size());
+        if (line.rfind(kLast, 0) == 0) times.notAfter = parsedTime(line.c_str() + kLast.size());
     }
 }
 
@@ -99,14 +103,41 @@ void judgeCertificate(const std::string& url, const std::string& message, Findin
     findings.problem("clock: " + *clock);
 }
 
-void connectToService(const std::string& url, const std::string& host, Findings& findings) {
-    const CurlHandle handle = connectionTo(url, kConnectPatience);
-    if (!handle) return;
+// curl_easy_getinfo() tells the time of a connection only once the handshake is over.
+int closeSocket(void* context, curl_socket_t number) {
+    sockaddr_storage peer{};
+    socklen_t size = sizeof peer;
+    void* const raw = &peer;
+    const bool wasConnected = getpeername(number, static_cast<sockaddr*>(raw), &size) == 0;
+    if (wasConnected) *static_cast<bool*>(context) = true;
+    return close(number);
+}
+
+// The daemon waits longer: a slow handshake explains nothing while the device is reached. A host
+// that takes no connection in all that time is not there.
+void judgeSilence(bool wasConnected, bool isFailed, Findings& findings) {
+    if (wasConnected && !isFailed) {
+        findings.notSeen("central service: takes connections, but no TLS handshake in 7 s");
+    } else {
+        unreachable(findings, "does not answer in time");
+    }
+}
+
+void connectToService(const std::string& url,
+                      const std::string& host,
+                      bool isFailed,
+                      Findings& findings) {
+    bool wasConnected = false;
     ErrorText message{};
+    CurlHandle handle = connectionTo(url, kConnectPatience);
+    if (!handle) return;
+    curl_easy_setopt(handle.get(), CURLOPT_CLOSESOCKETFUNCTION, closeSocket);
+    curl_easy_setopt(handle.get(), CURLOPT_CLOSESOCKETDATA, &wasConnected);
     curl_easy_setopt(handle.get(), CURLOPT_SSL_VERIFYPEER, 1L);
     curl_easy_setopt(handle.get(), CURLOPT_CONNECT_ONLY, 1L);
     curl_easy_setopt(handle.get(), CURLOPT_ERRORBUFFER, message.data());
     const CURLcode result = curl_easy_perform(handle.get());
+    handle.reset();  // closes
     switch (result) {
         case CURLE_OK:
             findings.add(Sign::SERVICE_REACHED, "the central service " + host + " is reached");
@@ -124,7 +155,7 @@ void connectToService(const std::string& url, const std::string& host, Findings&
             unresolved(findings, "the name of the central service is not resolved");
             return;
         case CURLE_OPERATION_TIMEDOUT:
-            unreachable(findings, "does not answer in time");
+            judgeSilence(wasConnected, isFailed, findings);
             return;
         case CURLE_COULDNT_CONNECT:
             unreachable(findings, "cannot be connected to");
@@ -155,13 +186,13 @@ void lookAtService(const Evidence& evidence, Findings& findings) {
     } else if (std::any_of(found.addresses.begin(), found.addresses.end(), isThisDevice)) {
         unresolved(findings, "name " + target->host + " leads to this device");
     } else {
-        connectToService(url, target->host, findings);
+        connectToService(url, target->host, evidence.statusWord == "failed", findings);
     }
 }
 
 void judgeUnfinishedService(const Findings& sofar, Findings& findings) {
     const std::string host = sofar.value("resolving");
-    if (!host.empty()) unresolved(findings, "name " + host + ": the name server does not answer");
+    if (!host.empty()) unresolved(findings, "name " + host + ": " + kSilentNameServer);
 }
 
 }  // namespace pelorus::doctor

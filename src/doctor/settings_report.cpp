@@ -98,7 +98,9 @@ private:
         }
         for (const FileKind file : {FileKind::STATIC, settings.dynamicSource()}) {
             if (settings.file(file).content.isCut) {
-                problem(place(file), "is longer than 1 MiB; only its beginning is read");
+                const bool isStatic = file == FileKind::STATIC;
+                problem(place(file), std::string{"is longer than "} + (isStatic ? "16" : "1") +
+                                         " MiB; only its beginning is read");
             }
         }
     }
@@ -252,12 +254,14 @@ private:
     void checkSafety() {
         const Writers staticWriters = writersOf(settings.staticFile.path);
         if (staticWriters == Writers::SOME || staticWriters == Writers::EVERYBODY) {
-            problem(place(FileKind::STATIC),
-                    "others than root can change it or its folder, and its commands run as root");
+            problem(
+                place(FileKind::STATIC),
+                "others than root can change it or a folder on the way to it, and its commands run as root");
         }
         const FileKind source = settings.dynamicSource();
         Writers writers = writersOf(settings.file(source).path);
-        if (writers == Writers::EVERYBODY) problem(place(source), "everybody can write it");
+        if (writers == Writers::EVERYBODY)
+            problem(place(source), "everybody can write or replace it");
         if (!settings.copy.path.empty() && creatorsOf(settings.copy.path) == Writers::EVERYBODY) {
             problem(
                 place(FileKind::COPY),

@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdlib>
 #include <optional>
 #include <sstream>
@@ -15,10 +16,6 @@ namespace pelorus::doctor {
 namespace {
 
 constexpr const char* kVariable = "TAVIK_STATIC_CONFIG";
-
-bool exists(const std::string& path) {
-    return access(path.c_str(), F_OK) == 0;
-}
 
 // The last value that is given to the variable, if any is. The assignments end with @p separator.
 std::optional<std::string> assignedIn(const std::string& text, char separator) {
@@ -52,11 +49,19 @@ std::optional<std::string> daemonsValue(const StaticFilePlaces& places) {
 
 }  // namespace
 
-std::string findStaticFile(const StaticFilePlaces& places) {
+StaticFile findStaticFile(const StaticFilePlaces& places) {
     const char* own = std::getenv(kVariable);
     const auto named = own != nullptr ? std::optional<std::string>{own} : daemonsValue(places);
-    const std::string path = named.value_or(places.builtIn);
-    return !exists(path) && exists(places.packaged) ? places.packaged : path;
+    if (named) return {*named};
+    if (!isAbsent(places.builtIn) || isAbsent(places.packaged)) return {places.builtIn};
+    return {places.packaged, std::string{kVariable} + " is not set and " + places.builtIn +
+                                 " does not exist, so the packaged file is looked at"};
+}
+
+bool isAbsent(const std::string& path) {
+    if (access(path.c_str(), F_OK) == 0) return false;
+    const int error = errno;
+    return error == ENOENT || error == ENOTDIR;
 }
 
 }  // namespace pelorus::doctor

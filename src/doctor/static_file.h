@@ -14,10 +14,18 @@ struct StaticFilePlaces {
     std::string packaged = "/etc/pelorus/globalconfig.ini";
 };
 
+struct StaticFile {
+    std::string path{};    ///< empty when the variable is
+    std::string remark{};  ///< why the daemon by itself would read another one; usually empty
+};
+
 /// The path in TAVIK_STATIC_CONFIG: of this process, else of the running daemon, else of its
-/// service. Without any the daemon's built-in one. The packaged one when that does not exist but
-/// the packaged one does.
-[[nodiscard]] std::string findStaticFile(const StaticFilePlaces& places = {});
+/// service. Without any the daemon's built-in one, for which the packaged one stands in when it
+/// does not exist.
+[[nodiscard]] StaticFile findStaticFile(const StaticFilePlaces& places = {});
+
+/// There is no such file. False when this user may not know.
+[[nodiscard]] bool isAbsent(const std::string& path);
 
 }  // namespace pelorus::doctor
 

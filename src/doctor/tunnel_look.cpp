@@ -22,8 +22,9 @@ namespace {
 
 using Verdict = Check::Verdict;
 
-constexpr std::size_t kOutputTail = 64UL * 1024;  // bytes
-constexpr std::size_t kMostOfLine = 100;          // characters
+constexpr std::size_t kOutputTail = 64UL * 1024;     // bytes
+constexpr std::chrono::minutes kLongestAttempt{10};  // of the daemon to bring up the tunnel
+constexpr std::size_t kMostOfLine = 100;             // characters
 constexpr std::size_t kTimeStamp = std::string_view{"2026-01-31 23:59:59 "}.size();
 
 constexpr const char* kAsks = "link remote: ";
@@ -104,6 +105,8 @@ private:
             conclude(Sign::TUNNEL_RUNS, Verdict::OK, "tunnel client up" + described(*client));
             evidence.tunnelSince = client->since;
             lookForSecond(*client);
+        } else if (client && client->path.empty() && geteuid() != 0) {
+            check(Verdict::NOT_SEEN, "tunnel client: needs root");
         } else {
             reportNoClient(pidFile, file, pid);
         }
@@ -124,8 +127,9 @@ private:
         evidence.add(Sign::TUNNEL_CLIENT_ALONE, Source::NOW, "there is one tunnel client");
     }
 
+    // As the daemon tells it: by any part of the path.
     static bool isTunnelClient(const Process& process) {
-        const std::string& name = process.program.empty() ? process.name : process.program;
+        const std::string& name = process.path.empty() ? process.name : process.path;
         return strcasestr(name.c_str(), "openvpn") != nullptr;
     }
 
@@ -141,18 +145,18 @@ private:
     void reportNoClient(const std::string& pidFile,
                         const ForeignText& file,
                         std::optional<pid_t> pid) {
-        const bool isRelayed = evidence.statusWord == "relayed";
-        const Verdict verdict = isMissed() ? Verdict::PROBLEM : Verdict::OK;
-        if (file.text) {
+        if (!isMissed()) {
+            check(Verdict::OK, "no tunnel client, none is needed");
+        } else if (file.text) {
             const std::string whose =
                 pid ? "names " + std::to_string(*pid) + ", which is not one" : "holds no pid";
-            conclude(Sign::TUNNEL_GONE, verdict,
+            conclude(Sign::TUNNEL_GONE, Verdict::PROBLEM,
                      "no tunnel client: " + shownText(pidFile) + " " + whose);
-        } else if (isRelayed) {
-            conclude(Sign::TUNNEL_GONE, verdict,
+        } else if (evidence.statusWord == "relayed") {
+            conclude(Sign::TUNNEL_GONE, Verdict::PROBLEM,
                      "no tunnel client, although the status is relayed");
         } else {
-            check(verdict, isMissed() ? "no tunnel client" : "no tunnel client, none is needed");
+            check(Verdict::PROBLEM, "no tunnel client");
         }
     }
 
@@ -165,10 +169,13 @@ private:
         const std::size_t skipped = file.text->size() - std::min(file.text->size(), kOutputTail);
         const TunnelOutput said =
             readTunnelOutput(file.text->substr(skipped), evidence.setting("LOG_SUCCESS_TEXT"));
-        const std::string written = writtenWhen(output);
+        const auto age = ageOf(output);
+        const std::string written = age ? " (" + ageInWords(*age) + " ago)" : "";
         if (said.isUp) {
             evidence.add(Sign::TUNNEL_SAYS_UP, Source::NOW, "the tunnel client says that it is up");
             if (evidence.has(Sign::TUNNEL_RUNS)) check(Verdict::OK, "tunnel client says: up");
+        } else if (age && isOutdated(*age)) {
+            return;
         } else if (said.isRefused) {
             blame(Sign::TUNNEL_REFUSED, "the relay refuses the device's credentials" + written);
         } else if (!said.failure.empty()) {
@@ -183,11 +190,19 @@ private:
         if (evidence.statusWord != "portforwarded") check(Verdict::PROBLEM, text);
     }
 
-    [[nodiscard]] std::string writtenWhen(const std::string& file) const {
+    // What an earlier client wrote: the daemon starts another whenever it needs the relay.
+    [[nodiscard]] bool isOutdated(std::chrono::seconds age) const {
+        if (evidence.daemon.since && evidence.now - age < *evidence.daemon.since) return true;
+        return !isMissed() && age > kLongestAttempt;
+    }
+
+    // Nothing without the file, or when it is newer than now.
+    [[nodiscard]] std::optional<std::chrono::seconds> ageOf(const std::string& file) const {
         struct stat status {};
-        if (stat(file.c_str(), &status) != 0) return {};
+        if (stat(file.c_str(), &status) != 0) return std::nullopt;
         const auto age = evidence.now - Time{std::chrono::seconds{status.st_mtime}};
-        return age.count() < 0 ? "" : " (" + ageInWords(age) + " ago)";
+        if (age.count() < 0) return std::nullopt;
+        return age;
     }
 
     void lookAtFolders() {

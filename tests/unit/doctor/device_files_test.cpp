@@ -1,5 +1,6 @@
 #include "doctor/device_files.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 
 #include <filesystem>
@@ -192,10 +193,28 @@ TEST_F(DeviceFilesTest, TheTunnelIsJudgedByItsProcessAndItsFiles) {
     EXPECT_TRUE(up.has(Sign::TUNNEL_CLIENT_ALONE));
     process(78, "openvpn", "/usr/sbin/openvpn");
     EXPECT_TRUE(look({}, relayed).has(Sign::SECOND_TUNNEL_CLIENT));
+    process(77, "relayd", "/opt/openvpn/bin/relayd");
+    EXPECT_TRUE(look({}, relayed).has(Sign::TUNNEL_RUNS)) << "the whole path counts";
     process(77, "bash", "/bin/bash");
     EXPECT_TRUE(look({}, relayed).has(Sign::TUNNEL_GONE));
+    const Evidence starting = look({}, {{"COMMUNICATION_STATUS", "connecting"}});
+    EXPECT_FALSE(starting.has(Sign::TUNNEL_GONE)) << "a pid file from before";
     writeFile("vpn/out", "AUTH: Received control message: AUTH_FAILED\nprocess exiting\n");
     EXPECT_TRUE(look({}, relayed).has(Sign::TUNNEL_REFUSED));
+    const struct {
+        const char* status;
+        int age;  // seconds
+        bool counts;
+    } refusals[]{{"failed", 11'999, true},
+                 {"failed", 12'001, false},  // older than the daemon
+                 {"connecting", 601, false},
+                 {"connecting", 599, true}};
+    for (const auto& [status, age, counts] : refusals) {
+        const timespec written[2]{{kNow - age, 0}, {kNow - age, 0}};
+        utimensat(AT_FDCWD, path("vpn/out").c_str(), written, 0);
+        const Evidence evidence = look({}, {{"COMMUNICATION_STATUS", status}});
+        EXPECT_EQ(evidence.has(Sign::TUNNEL_REFUSED), counts) << status << " " << age;
+    }
     writeFile("vpn/auth.txt", "");
     EXPECT_TRUE(holds(problems(look({}, relayed)), "vpn/auth.txt is empty\n"));
     EXPECT_EQ(doctor::tunnelFile(up, "STARTCMD_OUTFILE"), path("vpn/out"));
@@ -244,6 +263,10 @@ TEST_F(DeviceFilesTest, ADiskIsUnusedByTheDaemonsRule) {
     for (const char* minutes : {"2\n", "300"}) {
         writeFile("minutes", minutes);
         EXPECT_TRUE(look().has(Sign::DISK_UNUSED)) << minutes;
+    }
+    for (const char* nothing : {"", "\n", "x"}) {
+        writeFile("minutes", nothing);
+        EXPECT_FALSE(look().has(Sign::DISK_UNUSED) || look().has(Sign::DISK_IN_USE)) << nothing;
     }
     fs::remove(path("minutes"));
     EXPECT_TRUE(look().has(Sign::DISK_UNUSED));

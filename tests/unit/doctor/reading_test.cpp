@@ -8,8 +8,8 @@
 #include "doctor/disk_probe.h"
 #include "doctor/interfaces.h"
 #include "doctor/names_probe.h"
-#include "doctor/program.h"
 #include "doctor/question_probe.h"
+#include "doctor/start_command.h"
 #include "doctor/url_host.h"
 
 namespace pelorus::doctor {
@@ -74,7 +74,8 @@ TEST(DefaultRoute, IsTheOneOfLeastMetric) {
     const std::string fast = "eth0\t00000000\t014DA8C0\t0003\t0\t0\t100\t00000000\t0\t0\t0\n";
     const std::string down = "eth1\t00000000\t014DA8C0\t0002\t0\t0\t0\t00000000\t0\t0\t0\n";
     const std::string half = "tun0\t00000000\t014DA8C0\t0003\t0\t0\t0\t00000080\t0\t0\t0\n";
-    EXPECT_FALSE(readDefaultRoute(head + lan + down + half + "rubbish\n"));
+    const std::string refused = "*\t00000000\t00000000\t0201\t0\t0\t0\t00000000\t0\t0\t0\n";
+    EXPECT_FALSE(readDefaultRoute(head + lan + down + half + refused + "rubbish\n"));
     const auto best = readDefaultRoute(head + lan + slow + fast);
     ASSERT_TRUE(best);
     EXPECT_EQ(best->interface, "eth0");
@@ -113,6 +114,19 @@ TEST(Network, IsJudgedByItsFirstLack) {
     }
 }
 
+TEST(Tunnel, IsMissedWhileItsClientIsUp) {
+    const Interface lan{"eth0", true, false, {}};
+    const Interface down{"tun0", false, true, {}};
+    const Interface up{"tap0", true, true, {}};
+    const std::pair<std::vector<Interface>, bool> rows[] = {
+        {{lan, down}, true}, {{down, up}, false}, {{}, true}};
+    for (const auto& [all, isMissed] : rows) {
+        Findings findings;
+        judgeMissingTunnel(all, findings);
+        EXPECT_EQ(!findings.checks().empty(), isMissed);
+    }
+}
+
 TEST(CertificateFault, IsNamedInPlainWords) {
     const std::pair<const char*, const char*> rows[] = {
         {"SSL certificate problem: certificate has expired", "has expired"},
@@ -141,6 +155,11 @@ TEST(ClockFault, NeedsEvidence) {
               "this device says 2025-11-22, the service says 2025-11-20");
     EXPECT_EQ(clockFault(kNow, {{}, kNow + kDay}),
               "this device says 2025-11-22, the service's certificate is of 2025-11-23");
+    constexpr std::time_t kHour = 3600;
+    EXPECT_FALSE(clockFault(kNow, {kNow + 6 * kHour, kNow + 7 * kHour, {}}));
+    EXPECT_EQ(clockFault(kNow, {kNow + 6 * kHour, kNow + kHour, {}}),
+              "this device says 2025-11-22 00:00 UTC, the service says 2025-11-22 06:00 UTC");
+    EXPECT_TRUE(clockFault(kNow, {kNow - 6 * kHour, kNow - kDay, kNow - kHour}));
 }
 
 TEST(DiskState, IsWhatHdparmSays) {
@@ -204,15 +223,30 @@ TEST(RelayInOutput, IsTheLastOne) {
 
 TEST(RelayClient, IsNamedByTheStartCommand) {
     const std::pair<const char*, const char*> rows[] = {
-        {"", "openvpn"},
         {"env -u X openvpn --config client.conf --writepid openvpn.pid > openvpn.out 2>&1 &",
          "openvpn"},
         {"/opt/bin/openvpn --config c", "/opt/bin/openvpn"},
         {"bin/openvpn --config c", "/etc/vpn/bin/openvpn"},
-        {"sh /opt/start-relay", "/opt/start-relay"},
+        {"/opt/start-relay -d", "/opt/start-relay"},
+        {"cd /etc/openvpn && openvpn --config \"a; b\" &>out", "openvpn"},
+        {"mkdir -p /run/openvpn; exec /sbin/openvpn2.4 c", "/sbin/openvpn2.4"},
+        {"LD_LIBRARY_PATH=/usr/lib/openvpn /usr/sbin/openvpn", "/usr/sbin/openvpn"},
+        {"echo start >> starts; env A=1 nohup openvpn", "openvpn"},
+        {"pidof openvpn||openvpn", "openvpn"},
+        // Not clear.
+        {"", ""},
+        {"cd /opt/vpn && ./sbin/openvpn", ""},
+        {"PATH=/opt/bin:$PATH openvpn", ""},
+        {"sh ./start_relay openvpn", ""},
+        {"sh /opt/start-relay", ""},
+        {"start-relay", ""},
+        {"$DIR/openvpn", ""},
+        {"env -C /opt bin/openvpn", ""},
+        {"test -x /a/openvpn && /a/openvpn || openvpn", ""},
+        {"/bin/mkdir /run/x; /opt/relay", ""},
     };
     for (const auto& [command, client] : rows) {
-        EXPECT_EQ(relayClientOf(command, "/etc/vpn"), client) << command;
+        EXPECT_EQ(relayClientOf(command, "/etc/vpn").value_or(""), client) << command;
     }
 }
 

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <regex>
 
+#include "doctor/file_safety.h"
 #include "doctor/known_settings.h"
 #include "doctor/setting_value.h"
 #include "support/fixture.h"
@@ -19,6 +20,7 @@ constexpr uid_t kNobody = 65534;
 
 using doctor::checkSettings;
 using doctor::SettingsReport;
+using doctor::Writers;
 
 // The samples of the package, with a copy in a closed folder.
 class SettingsReportTest : public PelorusTest {
@@ -200,7 +202,7 @@ TEST_F(SettingsReportTest, WhatOthersCanChangeIsUnsafe) {
     chmod(file.c_str(), 0666);
     EXPECT_EQ(problem(""), "") << "nobody else can enter the folder";
     fs::permissions(path("run"), fs::perms{0755});
-    EXPECT_EQ(problem(""), "run/dynamicconfig.ini: everybody can write it");
+    EXPECT_EQ(problem(""), "run/dynamicconfig.ini: everybody can write or replace it");
     chmod(file.c_str(), 0600);
     fs::permissions(path("run"), fs::perms{01777});
     EXPECT_TRUE(holds(problem(""), ": everybody can take its name before the daemon starts"));
@@ -209,6 +211,40 @@ TEST_F(SettingsReportTest, WhatOthersCanChangeIsUnsafe) {
     EXPECT_TRUE(holds(::testing::PrintToString(report.problems),
                       "STATIC_ONLY_KEYS lacks UPDATE_CONF_WITH_SERVER_CMD STARTCMD"))
         << ::testing::PrintToString(report.problems);
+}
+
+TEST_F(SettingsReportTest, EveryFolderAndLinkOnTheWayCounts) {
+    if (geteuid() != 0) GTEST_SKIP() << "only root's files are safe";
+    const auto make = [this](const std::string& name, unsigned mode) {
+        fs::create_directories(path(name));
+        fs::permissions(path(name), fs::perms{mode});
+    };
+    for (const char* name : {"open/conf", "safe/conf"}) make(name, 0755);
+    make("closed/open", 0777);
+    make("closed", 0700);
+    make("open", 0777);
+    for (const char* name : {"open/conf/f", "safe/conf/f", "closed/open/f"}) writeFile(name, "");
+    fs::create_symlink("../open/conf", path("safe/link"));
+    fs::create_symlink(path("safe"), path("open/link"));
+    fs::create_symlink(path("safe/link"), path("closed/link"));
+    const std::pair<const char*, Writers> rows[]{
+        {"safe/conf/f", Writers::ROOT},           {"open/conf/f", Writers::EVERYBODY},
+        {"safe/link/f", Writers::EVERYBODY},      {"open/link/conf/f", Writers::EVERYBODY},
+        {"closed/open/f", Writers::ROOT},         {"closed/link/f", Writers::EVERYBODY},
+        {"closed/../safe/conf/f", Writers::ROOT}, {"safe/gone", Writers::UNKNOWN},
+    };
+    for (const auto& [name, writers] : rows)
+        EXPECT_EQ(doctor::writersOf(path(name)), writers) << name;
+    EXPECT_EQ(doctor::creatorsOf(path("open/conf/new")), Writers::EVERYBODY);
+}
+
+TEST_F(SettingsReportTest, OnlyTheStaticFileIsReadWhole) {
+    const std::string filler(2'000'000, '\n');
+    fixed.insert(0, filler);
+    EXPECT_TRUE(check().usable);
+    EXPECT_EQ(problem(""), "");
+    EXPECT_EQ(problem("", filler),
+              "dynamicconfig.ini: is longer than 1 MiB; only its beginning is read");
 }
 
 TEST_F(SettingsReportTest, RubbishGivesABoundedReport) {

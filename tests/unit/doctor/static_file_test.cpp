@@ -1,5 +1,7 @@
 #include "doctor/static_file.h"
 
+#include <unistd.h>
+
 #include <cstdlib>
 #include <filesystem>
 
@@ -28,9 +30,12 @@ protected:
         writeFile("pid", "812");
     }
 
-    [[nodiscard]] std::string found() const {
-        const std::string file = doctor::findStaticFile(
+    [[nodiscard]] doctor::StaticFile find() const {
+        return doctor::findStaticFile(
             {path("proc"), path("pid"), path("defaults"), path("built-in"), path("packaged")});
+    }
+    [[nodiscard]] std::string found() const {
+        const std::string file = find().path;
         return file.rfind(path(""), 0) == 0 ? file.substr(path("").size()) : file;
     }
 };
@@ -38,7 +43,7 @@ protected:
 TEST_F(StaticFileTest, TheNearestToTheDaemonCounts) {
     EXPECT_EQ(found(), "built-in");
     writeFile("defaults", "#TAVIK_STATIC_CONFIG=/no\nTAVIK_STATIC_CONFIG=\"/of the/service\" \n");
-    EXPECT_EQ(found(), "packaged");  // there is no such file
+    EXPECT_EQ(found(), "/of the/service") << "the daemon knows no other, even if it is missing";
     writeFile("named", "");
     writeFile("defaults", "TAVIK_STATIC_CONFIG=" + path("named") + "\n");
     EXPECT_EQ(found(), "named");
@@ -54,14 +59,32 @@ TEST_F(StaticFileTest, TheNearestToTheDaemonCounts) {
 
     setenv("TAVIK_STATIC_CONFIG", path("packaged").c_str(), 1);
     EXPECT_EQ(found(), "packaged");
+    setenv("TAVIK_STATIC_CONFIG", "", 1);
+    EXPECT_EQ(found(), "");
     unsetenv("TAVIK_STATIC_CONFIG");
 }
 
 TEST_F(StaticFileTest, ThePackagedOneStandsInForAMissingOne) {
+    EXPECT_EQ(find().remark, "");
     fs::remove(path("built-in"));
     EXPECT_EQ(found(), "packaged");
+    EXPECT_TRUE(holds(find().remark, "TAVIK_STATIC_CONFIG is not set and " + path("built-in")));
     fs::remove(path("packaged"));
     EXPECT_EQ(found(), "built-in");
+}
+
+TEST_F(StaticFileTest, OneThatMayNotBeLookedAtIsNotMissing) {
+    constexpr uid_t kNobody = 65534;
+    fs::permissions(folder, fs::perms{0711});
+    fs::create_directory(path("closed"));
+    fs::permissions(path("closed"), fs::perms::none);
+    const uid_t user = getuid();
+    ASSERT_TRUE(user != 0 || setresuid(kNobody, kNobody, 0) == 0);
+    const auto file = doctor::findStaticFile(
+        {path("proc"), path("pid"), path("defaults"), path("closed/built-in"), path("packaged")});
+    ASSERT_EQ(setresuid(user, user, user), 0);
+    EXPECT_EQ(file.path, path("closed/built-in"));
+    fs::permissions(path("closed"), fs::perms::owner_all);
 }
 
 }  // namespace

@@ -9,15 +9,21 @@ namespace pelorus::doctor {
 namespace {
 
 // What the log says is over when the other has been seen by now.
-constexpr std::array<std::pair<Sign, Sign>, 16> kOver{{
+constexpr std::array<std::pair<Sign, Sign>, 21> kOver{{
+    {Sign::LOGGED_CREDENTIALS_MISSING, Sign::HAS_CREDENTIALS},
+
     {Sign::LOGGED_NO_ADDRESS, Sign::HAS_ADDRESS},
     {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_CERTIFICATE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_NO_GATEWAY, Sign::GATEWAY_FOUND},
     {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+    {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_SHARED},
+    {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PRIVATE},
+    {Sign::LOGGED_SECOND_NAT, Sign::SERVICE_SEES_SAME_ADDRESS},
     {Sign::LOGGED_SECOND_NAT, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_OTHER_DEVICE, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_TEST_SKIPPED_DISK, Sign::DISK_IN_USE},
     {Sign::LOGGED_TEST_FAILED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_FAILS},
@@ -28,15 +34,31 @@ constexpr std::array<std::pair<Sign, Sign>, 16> kOver{{
     {Sign::LOGGED_TWO_TUNNELS, Sign::TUNNEL_CLIENT_ALONE},
 }};
 
+void drop(Sign logged, Sign now, Evidence& evidence) {
+    const std::string over = "over since the log: " + evidence.signs.at(logged).text +
+                             "; now: " + evidence.signs.at(now).text;
+    evidence.signs.erase(logged);
+    evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
+    evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+}
+
+// The gateway now has the address that the service saw when it was another one.
+bool isSecondNatOver(const Evidence& evidence) {
+    if (!evidence.has(Sign::LOGGED_SECOND_NAT) || !evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC)) {
+        return false;
+    }
+    const std::string& text = evidence.signs.at(Sign::LOGGED_SECOND_NAT).text;
+    const std::string end = "the service sees " + evidence.gatewayAddress;
+    return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
+}
+
 // Live evidence beats the log, and the reader is told so.
 void dropWhatIsOver(Evidence& evidence) {
     for (const auto& [logged, now] : kOver) {
-        if (!evidence.has(logged) || !evidence.has(now)) continue;
-        const std::string over = "over since the log: " + evidence.signs.at(logged).text +
-                                 "; now: " + evidence.signs.at(now).text;
-        evidence.signs.erase(logged);
-        evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
-        evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+        if (evidence.has(logged) && evidence.has(now)) drop(logged, now, evidence);
+    }
+    if (isSecondNatOver(evidence)) {
+        drop(Sign::LOGGED_SECOND_NAT, Sign::GATEWAY_ADDRESS_PUBLIC, evidence);
     }
     // A run with -u logs the same as a daemon that is switched off.
     if (evidence.setting("ENABLEREMOTEACCESS") == "1") {
@@ -54,19 +76,27 @@ Reach reachOfWord(const std::string& word) {
 // What the daemon last said, by the settings or by the log.
 Reach lastSaid(const Evidence& evidence) {
     const Reach logged = evidence.history.empty() ? Reach::UNKNOWN : evidence.history.back().reach;
-    // Without the back end the word in the settings is not kept up to date.
-    const bool isOutdated =
-        evidence.has(Sign::LOGGED_BACK_END_SILENT) || evidence.has(Sign::LOGGED_BACK_END_REFUSES);
     const Reach word = reachOfWord(evidence.statusWord);
+    const bool isTrue = word == Reach::RELAYED && evidence.has(Sign::TUNNEL_RUNS) &&
+                        evidence.has(Sign::TUNNEL_SAYS_UP);
+    // Without the back end the word in the settings is not kept up to date.
+    const bool isOutdated = !isTrue && (evidence.has(Sign::LOGGED_BACK_END_SILENT) ||
+                                        evidence.has(Sign::LOGGED_BACK_END_REFUSES));
     return word == Reach::UNKNOWN || (isOutdated && logged != Reach::UNKNOWN) ? logged : word;
 }
 
-// The service's view of a device that says that it is reached directly. Ports forwarded by hand may
+// What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
 // lead through a second router, too.
 bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
-    return evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
-           (evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) && !evidence.has(Sign::MANUAL_MODE));
+    if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS)) {
+        return true;
+    }
+    if (evidence.has(Sign::MANUAL_MODE) || evidence.has(Sign::OWN_ROUTER)) return false;
+    const bool isBehindAnother =
+        evidence.has(Sign::GATEWAY_ADDRESS_SHARED) || evidence.has(Sign::GATEWAY_ADDRESS_PRIVATE);
+    return evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
+           (isBehindAnother && !evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC));
 }
 
 Reach reachOf(const Evidence& evidence) {

@@ -86,13 +86,16 @@ class Conclusions {
 public:
     explicit Conclusions(const std::vector<Subject>& all) : subjects{all} {}
 
+    [[nodiscard]] std::string gatewayAddress() const {
+        return externalAddress(answer("UPnP"), answer("NAT-PMP"));
+    }
+
     // What is shown in front of the lines of this subject.
     void add(const Subject& subject, Findings& findings) const {
         const std::string name = subject.name;
         if (name == "UPnP") judgeGateway(answer("UPnP"), answer("NAT-PMP"), findings);
         if (name == "public address") {
-            judgeSeenAddress(subject.found, externalAddress(answer("UPnP"), answer("NAT-PMP")),
-                             findings);
+            judgeSeenAddress(subject.found, gatewayAddress(), findings);
         }
         if (subject.found.finished() || name == "UPnP" || name == "NAT-PMP") return;
         if (name == "central service") judgeUnfinishedService(subject.found, findings);
@@ -117,6 +120,7 @@ void probe(const ProbeChoice& choice, Evidence& evidence) {
     leaveOut(subjects, evidence);
     run(subjects);
     const Conclusions conclusions{subjects};
+    evidence.gatewayAddress = conclusions.gatewayAddress();
     for (const Subject& subject : subjects) {
         Findings concluded;
         conclusions.add(subject, concluded);

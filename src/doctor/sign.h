@@ -10,6 +10,7 @@ enum class Sign {
     // From files and the process table.
     STATIC_FILE_UNREADABLE,
     DYNAMIC_FILE_UNREADABLE,
+    HAS_CREDENTIALS,
     CREDENTIALS_MISSING,
     REMOTE_ACCESS_OFF,
     MANUAL_MODE,
@@ -55,6 +56,7 @@ enum class Sign {
     NAMES_UNRESOLVED,
     RELAY_CLIENT_MISSING,  ///< no openvpn program
     TUNNEL_DEVICE_MISSING,
+    SERVICE_SEES_SAME_ADDRESS,  ///< as the gateway says
     SERVICE_SEES_OTHER_ADDRESS,
     PORT_TEST_PASSES,
     OTHER_DEVICE_ANSWERS,  ///< to the port test

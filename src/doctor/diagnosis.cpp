@@ -66,6 +66,21 @@ void dropWhatIsOver(Evidence& evidence) {
     }
 }
 
+// The daemon notices a new address when it asks the gateway again. What another device tells that
+// answers as a gateway need not matter.
+void compareAddresses(Evidence& evidence) {
+    const std::string published = evidence.setting("EXTERNAL_IP");
+    const bool isAutomatic = !evidence.has(Sign::MANUAL_MODE) && !evidence.has(Sign::OWN_ROUTER);
+    if (evidence.statusWord != "portforwarded" || !isAutomatic || published.empty()) return;
+    if (!evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC) || evidence.has(Sign::GATEWAY_ELSEWHERE))
+        return;
+    if (published == evidence.gatewayAddress) return;
+    const std::string text =
+        "published at " + published + ", but the gateway's address is " + evidence.gatewayAddress;
+    evidence.add(Sign::GATEWAY_ADDRESS_CHANGED, Source::NOW, text);
+    evidence.checks.push_back({Check::Verdict::PROBLEM, Source::NOW, text});
+}
+
 Reach reachOfWord(const std::string& word) {
     if (word == "portforwarded") return Reach::DIRECT;
     if (word == "relayed") return Reach::RELAYED;
@@ -85,6 +100,10 @@ Reach lastSaid(const Evidence& evidence) {
     return word == Reach::UNKNOWN || (isOutdated && logged != Reach::UNKNOWN) ? logged : word;
 }
 
+bool isOffline(const Evidence& evidence) {
+    return evidence.has(Sign::SERVICE_UNRESOLVED) || evidence.has(Sign::SERVICE_UNREACHABLE);
+}
+
 // What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
 // lead through a second router, too.
 bool isDisproved(const Evidence& evidence) {
@@ -95,8 +114,10 @@ bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::MANUAL_MODE) || evidence.has(Sign::OWN_ROUTER)) return false;
     const bool isBehindAnother =
         evidence.has(Sign::GATEWAY_ADDRESS_SHARED) || evidence.has(Sign::GATEWAY_ADDRESS_PRIVATE);
-    return evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
-           (isBehindAnother && !evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC));
+    if (isBehindAnother && !evidence.has(Sign::GATEWAY_ELSEWHERE)) return true;
+    const bool isLineDown = evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS) && isOffline(evidence);
+    return isLineDown || evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
+           evidence.has(Sign::GATEWAY_ADDRESS_CHANGED);
 }
 
 Reach reachOf(const Evidence& evidence) {
@@ -121,6 +142,18 @@ Reach reachOf(const Evidence& evidence) {
         if (evidence.has(Sign::LOGGED_ATTEMPT) || isKnown) return Reach::NOT_REACHED;
     }
     return said;
+}
+
+// A gateway that leads to the internet has an address there.
+void dropWhatIsHidden(Reach reach, Evidence& evidence) {
+    const bool isOnline =
+        evidence.has(Sign::SERVICE_REACHED) || (reach == Reach::RELAYED && !isOffline(evidence));
+    if (!isOnline || evidence.has(Sign::OWN_ROUTER)) return;
+    for (const Sign sign : {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_WITHOUT_ADDRESS}) {
+        if (!evidence.has(sign)) continue;
+        evidence.signs[Sign::GATEWAY_HIDES_ADDRESS] = evidence.signs.at(sign);
+        evidence.signs.erase(sign);
+    }
 }
 
 // What is seen now explains nothing while nothing tells that the device is not reached.
@@ -173,6 +206,7 @@ void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {
 Diagnosis diagnose(const Evidence& seen) {
     Evidence evidence = seen;
     dropWhatIsOver(evidence);
+    compareAddresses(evidence);
     Diagnosis diagnosis;
     diagnosis.now = evidence.now;
     diagnosis.fromElsewhere = evidence.fromElsewhere && evidence.hasLog;
@@ -180,6 +214,7 @@ Diagnosis diagnose(const Evidence& seen) {
     tellSince(evidence, diagnosis);
     tellSinceAtLeast(evidence, diagnosis);
     tellAddress(evidence, diagnosis);
+    dropWhatIsHidden(diagnosis.reach, evidence);
     diagnosis.causes = findCauses(evidence, diagnosis.reach);
     if (diagnosis.reach == Reach::UNKNOWN) dropWhatExplainsNothing(diagnosis.causes);
     diagnosis.checks = std::move(evidence.checks);

@@ -6,6 +6,7 @@
 #include "common/text.h"
 #include "doctor/disk_probe.h"
 #include "doctor/gateway_probe.h"
+#include "doctor/interfaces.h"
 #include "doctor/names_probe.h"
 #include "doctor/network_probe.h"
 #include "doctor/question_probe.h"
@@ -81,6 +82,22 @@ void take(const Findings& findings, Evidence& evidence) {
                            findings.checks().end());
 }
 
+// The gateway of the default route, unless that leads into a tunnel; empty if there is none.
+std::string lanGateway() {
+    const auto route = defaultRoute();
+    if (!route) return {};
+    for (const Interface& one : interfaces()) {
+        if (one.name == route->interface) return one.tunnel ? std::string{} : route->gateway;
+    }
+    return {};
+}
+
+// A gateway that was found, but was too slow for all that is asked.
+void judgeUnfinishedTable(const Findings& found, Findings& findings) {
+    if (found.finished() || found.value("gateway").empty() || !found.checks().empty()) return;
+    findings.notSeen("gateway's table: it could not be read in time");
+}
+
 // Concludes from several probes, or from one that was cut short.
 class Conclusions {
 public:
@@ -93,7 +110,10 @@ public:
     // What is shown in front of the lines of this subject.
     void add(const Subject& subject, Findings& findings) const {
         const std::string name = subject.name;
-        if (name == "UPnP") judgeGateway(answer("UPnP"), answer("NAT-PMP"), findings);
+        if (name == "UPnP") {
+            judgeGateway(answer("UPnP"), answer("NAT-PMP"), lanGateway(), findings);
+            judgeUnfinishedTable(subject.found, findings);
+        }
         if (name == "public address") {
             judgeSeenAddress(subject.found, gatewayAddress(), findings);
         }

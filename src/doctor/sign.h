@@ -35,13 +35,16 @@ enum class Sign {
     NO_ADDRESS,   ///< no usable one of IPv4
     HAS_ADDRESS,  ///< a usable one of IPv4, in a LAN
     NO_DEFAULT_ROUTE,
-    GATEWAY_FOUND,  ///< through UPnP or NAT-PMP
+    GATEWAY_FOUND,      ///< through UPnP or NAT-PMP
+    GATEWAY_ELSEWHERE,  ///< the one found is not that of the default route
     NO_GATEWAY_ANSWERS,
     GATEWAY_WITHOUT_ADDRESS,
+    GATEWAY_HIDES_ADDRESS,  ///< it tells none, but leads to the internet
     GATEWAY_ADDRESS_PRIVATE,
     GATEWAY_ADDRESS_SHARED,
     GATEWAY_ADDRESS_PUBLIC,
-    OUR_MAPPINGS_MISSING,  ///< the gateway, asked for a published port, does not map it to us
+    GATEWAY_ADDRESS_CHANGED,  ///< it is not the published one
+    OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
     PORT_HELD_BY_OTHER,
     WEB_SERVER_SILENT,
     BACK_END_ANSWERS,

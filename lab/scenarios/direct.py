@@ -42,7 +42,7 @@ _NEXT_SEARCH = 3 * (99 * _MAP + 98 * _TAKE_BACK)
 def _telling(address: str) -> Callable[[Call], Answer]:
     def told(call: Call) -> Answer:
         if call.action == "GetExternalIPAddress":
-            return "", {"NewExternalIPAddress": address}
+            return 0, {"NewExternalIPAddress": address}
         return call.perform()
     return told
 

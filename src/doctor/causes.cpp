@@ -269,7 +269,7 @@ std::vector<Cause> gatewayCauses() {
           {S::LOGGED_SECOND_NAT},
           {S::GATEWAY_ADDRESS_PRIVATE},
           {S::SERVICE_SEES_OTHER_ADDRESS}},
-         {S::LOGGED_MANUAL_RULED_OUT, S::GATEWAY_ELSEWHERE},
+         {S::LOGGED_MANUAL_RULED_OUT, S::GATEWAY_ELSEWHERE, S::GATEWAY_HIDES_ADDRESS},
          "A second router stands in front of your gateway, and no port opened on the gateway can be "
          "reached.",
          "Put the provider's box into bridge mode, or ask the provider for a public IPv4 address. "

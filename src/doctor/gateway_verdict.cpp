@@ -68,12 +68,13 @@ void judgeAddress(const GatewayAnswer& answer, const std::string& line, Findings
     const ClassWords& row = wordsFor(classOf(answer.address));
     const std::string text = "address " + answer.address + row.words;
     findings.add(row.sign, text);
-    if (!answer.connected) {
-        findings.problem(line + "says that it is not connected, " + text);
-    } else if (row.kind == AddressClass::PUBLIC) {
-        findings.ok(line + text);
+    // Some say so for ever, and map all the same.
+    const std::string whole =
+        line + (answer.connected ? "" : "says that it is not connected, ") + text;
+    if (row.kind == AddressClass::PUBLIC) {
+        findings.ok(whole);
     } else {
-        findings.problem(line + text);
+        findings.problem(whole);
     }
 }
 

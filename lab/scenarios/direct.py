@@ -211,6 +211,15 @@ def default_ports_only(lab: Lab) -> None:
     assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "relayed", "disabled"]
 
 
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True, others=(
+    Personality(control=_telling(""), forwards=False),)), clock=FAST))
+def natpmp_beside_access_point(lab: Lab) -> None:
+    """An access point answers to UPnP and tells no address: the gateway is used, by NAT-PMP."""
+    start_direct(lab)
+    lab.moment("the access point maps nothing, and need not")
+    assert_stops_clean(lab)
+
+
 @scenario(Situation(gateway=GatewaySetup(others=(_ACCESS_POINT,)), relay=True, clock=FAST))
 def access_point_answers(lab: Lab) -> None:
     """An access point answers as a gateway, after the gateway, and tells an address: relayed."""

@@ -92,12 +92,6 @@ std::string lanGateway() {
     return {};
 }
 
-// A gateway that was found, but was too slow for all that is asked.
-void judgeUnfinishedTable(const Findings& found, Findings& findings) {
-    if (found.finished() || found.value("gateway").empty() || !found.checks().empty()) return;
-    findings.notSeen("gateway's table: it could not be read in time");
-}
-
 // Concludes from several probes, or from one that was cut short.
 class Conclusions {
 public:

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "doctor/address_class.h"
+#include "doctor/gateway_probe.h"
 
 namespace pelorus::doctor {
 
@@ -184,6 +185,18 @@ const Table kTables[] = {
 INSTANTIATE_TEST_SUITE_P(Tables, Mappings, ::testing::ValuesIn(kTables), [](const auto& row) {
     return row.param.name;
 });
+
+TEST(Mappings, OfAGatewayThatIsTooSlowAreNotSeen) {
+    Findings found, none, some;
+    judgeUnfinishedTable(found, none);
+    EXPECT_TRUE(none.checks().empty());
+    found.set("gateway", "192.168.1.1");
+    judgeUnfinishedTable(found, some);
+    EXPECT_EQ(some.checks().size(), 1U);
+    found.finish();
+    judgeUnfinishedTable(found, none);
+    EXPECT_TRUE(none.checks().empty());
+}
 
 TEST(Mappings, NameWhoHoldsThePort) {
     Findings findings;

@@ -51,8 +51,12 @@ def internet_address_changes(lab: Lab) -> None:
     before = len(lab.central.requests)
 
     lab.step("the provider gives the gateway another address")
-    lab.gateway.move_to(_NEW_WAN_ADDRESS)
+    with lab.daemon.held():
+        lab.gateway.move_to(_NEW_WAN_ADDRESS)
+        lab.moment("the gateway has got another address, and no test has noticed yet",
+                   "address-changed")
     _wait_for_new_internet_address(lab)
+    lab.moment("the device is published at the new address")
     assert asked(lab, before) == [WAIT, PORT_TEST, PORT_FORWARD]
 
     lab.step("the next check of the public names finds nothing wrong")

@@ -3,7 +3,8 @@
 from __future__ import annotations
 
 import signal
-from collections.abc import Sequence
+import time
+from collections.abc import Callable, Iterable, Sequence
 
 from lab import network
 from lab.central import PORT_FORWARD, PORT_TEST, WAIT
@@ -16,7 +17,7 @@ from lab.gateway import STOCK_PERMISSIONS, GatewaySetup
 from lab.packet_filter import Mapping
 from lab.scenario import Lab, Situation
 from lab.scenarios.registry import scenario
-from lab.scripted_gateway import Personality
+from lab.scripted_gateway import Answer, Call, Personality, Search
 
 _TAKEN = "is already mapped to another IP: 192.168.77.20"
 _REFUSED = "Router::mapPort() - fail - failed to map external port: "
@@ -36,6 +37,22 @@ _MAP, _TAKE_BACK = 2, 2
 # the last port counts as bad.
 _FIRST_SEARCH = 100 * _MAP + 99 * _TAKE_BACK + 2 * (99 * _MAP + 98 * _TAKE_BACK)
 _NEXT_SEARCH = 3 * (99 * _MAP + 98 * _TAKE_BACK)
+
+
+def _telling(address: str) -> Callable[[Call], Answer]:
+    def told(call: Call) -> Answer:
+        if call.action == "GetExternalIPAddress":
+            return 0, {"NewExternalIPAddress": address}
+        return call.perform()
+    return told
+
+
+def _late(search: Search) -> Iterable[bytes]:
+    time.sleep(0.1)
+    yield search.answer()
+
+
+_ACCESS_POINT = Personality(search=_late, control=_telling("44.128.0.99"), forwards=False)
 
 
 @scenario(Situation(clock=FAST))
@@ -188,8 +205,28 @@ def default_ports_only(lab: Lab) -> None:
         lab.provider.insert("100.64.3.9")
         lab.moment("the gateway has got a shared address, and no test has noticed yet",
                    "shared-address")
+        lab.gateway.behave(Personality(control=_telling("")))
+        lab.moment("the gateway does not tell its address", "gateway-hides-address")
     assert_stops_clean(lab)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "failed", "relayed", "disabled"]
+
+
+@scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True, others=(
+    Personality(control=_telling(""), forwards=False),)), clock=FAST))
+def natpmp_beside_access_point(lab: Lab) -> None:
+    """An access point answers to UPnP and tells no address: the gateway is used, by NAT-PMP."""
+    start_direct(lab)
+    lab.moment("the access point maps nothing, and need not")
+    assert_stops_clean(lab)
+
+
+@scenario(Situation(gateway=GatewaySetup(others=(_ACCESS_POINT,)), relay=True, clock=FAST))
+def access_point_answers(lab: Lab) -> None:
+    """An access point answers as a gateway, after the gateway, and tells an address: relayed."""
+    start(lab, "relayed")
+    lab.moment("the access point is taken for the gateway, so the device is relayed",
+               "wrong-gateway-answers")
+    assert_stops_clean(lab)
 
 
 @scenario(Situation(gateway=GatewaySetup(upnp=False, natpmp=True), relay=True,

@@ -127,7 +127,7 @@ def hostile_answers(lab: Lab) -> None:
 @scenario(_attack(Personality(deliver=_endless_body)))
 def hostile_body(lab: Lab) -> None:
     """The gateway's description has no end: the daemon does not fill up."""
-    _assert_endures(lab, _NO_ADDRESS, 30, "gateway-without-address")
+    _assert_endures(lab, _NO_ADDRESS, 30, "no-gateway-protocol")
 
 
 @scenario(_attack(Personality(deliver=_endless_header)))
@@ -139,7 +139,7 @@ def hostile_header(lab: Lab) -> None:
 @scenario(_attack(Personality(deliver_control=_many_values)))
 def hostile_values(lab: Lab) -> None:
     """Answers hold 700,000 empty values, for each of which the library keeps 208 bytes."""
-    _assert_endures(lab, _NO_ADDRESS, 10, "gateway-without-address")
+    _assert_endures(lab, _NO_ADDRESS, 10, "no-gateway-protocol")
 
 
 @scenario(_attack(Personality()))

@@ -17,7 +17,7 @@ struct Network {
     AddressClass kind;
 };
 
-constexpr std::array<Network, 14> kNetworks{{
+constexpr std::array<Network, 15> kNetworks{{
     {"0.0.0.0", 8, AddressClass::NONE},
     {"10.0.0.0", 8, AddressClass::HOME},
     {"172.16.0.0", 12, AddressClass::HOME},
@@ -25,6 +25,7 @@ constexpr std::array<Network, 14> kNetworks{{
     {"100.64.0.0", 10, AddressClass::SHARED},
     {"127.0.0.0", 8, AddressClass::RESERVED},
     {"169.254.0.0", 16, AddressClass::RESERVED},
+    {"192.0.0.0", 29, AddressClass::SHARED},
     {"192.0.0.0", 24, AddressClass::RESERVED},
     {"192.0.2.0", 24, AddressClass::RESERVED},
     {"198.18.0.0", 15, AddressClass::RESERVED},

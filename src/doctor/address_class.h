@@ -10,7 +10,7 @@ enum class AddressClass {
     NONE,      ///< no address at all: empty, unreadable, or in 0.0.0.0/8
     HOME,      ///< of a private network
     RESERVED,  ///< of no use in the internet for another reason: loopback, link-local, multicast
-    SHARED,    ///< 100.64.0.0/10, between a provider and its customers
+    SHARED,    ///< between a provider and its customers: 100.64.0.0/10, and 192.0.0.0/29 of DS-Lite
     PUBLIC,
 };
 

@@ -52,7 +52,8 @@ std::vector<Cause> workingCauses() {
         {"gateway-without-address",
          kNotDirect,
          {{S::GATEWAY_WITHOUT_ADDRESS}, {S::LOGGED_GATEWAY_WITHOUT_ADDRESS}},
-         {S::GATEWAY_ADDRESS_PUBLIC},
+         {S::GATEWAY_ADDRESS_PUBLIC, S::GATEWAY_ADDRESS_SHARED, S::GATEWAY_ADDRESS_PRIVATE,
+          S::GATEWAY_ELSEWHERE},
          "The gateway has no internet address.",
          "Check the gateway's connection to the provider, and restart it."},
     };
@@ -245,10 +246,21 @@ std::vector<Cause> relayCauses() {
 
 std::vector<Cause> gatewayCauses() {
     return {
+        {"wrong-gateway-answers",
+         kNotDirect,
+         {{S::GATEWAY_ELSEWHERE, S::LOGGED_SECOND_NAT},
+          {S::GATEWAY_ELSEWHERE, S::SERVICE_SEES_OTHER_ADDRESS},
+          {S::GATEWAY_ELSEWHERE, S::GATEWAY_ADDRESS_PRIVATE},
+          {S::GATEWAY_ELSEWHERE, S::GATEWAY_ADDRESS_SHARED},
+          {S::GATEWAY_ELSEWHERE, S::GATEWAY_WITHOUT_ADDRESS},
+          {S::GATEWAY_ELSEWHERE, S::GATEWAY_HIDES_ADDRESS}},
+         {S::LOGGED_MANUAL_RULED_OUT},
+         "A device that is not your gateway answers as one, and no port opened on it can be reached.",
+         "Switch UPnP off on that device, such as an access point or a second router."},
         {"shared-address",
          kNotDirect,
          {{S::GATEWAY_ADDRESS_SHARED}},
-         {S::LOGGED_SECOND_NAT},
+         {S::LOGGED_SECOND_NAT, S::GATEWAY_ELSEWHERE},
          "The provider gives your gateway a shared address, at which nothing can be reached.",
          "Ask the provider for a public IPv4 address. Until then the relay is the right way."},
         {"second-nat",
@@ -257,7 +269,7 @@ std::vector<Cause> gatewayCauses() {
           {S::LOGGED_SECOND_NAT},
           {S::GATEWAY_ADDRESS_PRIVATE},
           {S::SERVICE_SEES_OTHER_ADDRESS}},
-         {S::LOGGED_MANUAL_RULED_OUT},
+         {S::LOGGED_MANUAL_RULED_OUT, S::GATEWAY_ELSEWHERE, S::GATEWAY_HIDES_ADDRESS},
          "A second router stands in front of your gateway, and no port opened on the gateway can be "
          "reached.",
          "Put the provider's box into bridge mode, or ask the provider for a public IPv4 address. "
@@ -268,12 +280,19 @@ std::vector<Cause> gatewayCauses() {
          {S::GATEWAY_FOUND, S::OWN_ROUTER, S::NO_INTERFACE_UP, S::NO_ADDRESS},
          "The gateway lets no device open ports: it answers neither UPnP nor NAT-PMP.",
          "Switch UPnP on in the gateway's settings, or forward two ports by hand."},
+        {"gateway-hides-address",
+         kNotDirect,
+         {{S::GATEWAY_HIDES_ADDRESS}},
+         {S::NO_GATEWAY_ANSWERS, S::GATEWAY_ELSEWHERE},
+         "The gateway does not tell its internet address, so the daemon opens no ports on it.",
+         "Look for the address in the gateway's pages. If it is private or begins with 100.64 to "
+         "100.127, ask the provider for a public IPv4 address; otherwise restart the gateway."},
         {"ports-taken",
          kNotDirect,
          {{S::LOGGED_PORT_HELD_BY_OTHER}, {S::DEFAULT_PORTS_ONLY, S::PORT_HELD_BY_OTHER}},
          {S::LOGGED_GATEWAY_REFUSES},
-         "Another device at home holds the ports that this one may use.",
-         "Remove the other device's entry in the gateway, or allow other ports "
+         "The ports that this device may use lead to another address at home.",
+         "Remove that entry in the gateway, or allow other ports "
          "(DEFAULT_PORTS_ONLY)."},
         {"gateway-refuses",
          kNotDirect,
@@ -293,6 +312,13 @@ std::vector<Cause> outsideCauses() {
          {},
          "The gateway no longer forwards the published ports.",
          "Nothing needs to be done: the next port test notices, and the ports are mapped again. "
+         "Restarting the service does it at once."},
+        {"address-changed",
+         kNotReached,
+         {{S::GATEWAY_ADDRESS_CHANGED}},
+         {},
+         "The gateway has got another internet address, and the device is published at the old one.",
+         "Nothing needs to be done: the next port test notices, and the new address is published. "
          "Restarting the service does it at once."},
         {"port-filtered",
          kNotDirect,

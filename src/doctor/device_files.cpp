@@ -80,7 +80,9 @@ void lookAtCredentials(Evidence& evidence) {
             missing += (missing.empty() ? "" : " and ") + std::string{key};
     }
     if (missing.empty()) {
-        check(evidence, Verdict::OK, Source::SETTINGS, "the device has its credentials");
+        const std::string text = "the device has its credentials";
+        evidence.add(Sign::HAS_CREDENTIALS, Source::SETTINGS, text);
+        check(evidence, Verdict::OK, Source::SETTINGS, text);
     } else {
         conclude(evidence, Sign::CREDENTIALS_MISSING, "credentials missing: no " + missing);
     }

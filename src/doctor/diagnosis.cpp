@@ -9,15 +9,21 @@ namespace pelorus::doctor {
 namespace {
 
 // What the log says is over when the other has been seen by now.
-constexpr std::array<std::pair<Sign, Sign>, 15> kOver{{
+constexpr std::array<std::pair<Sign, Sign>, 20> kOver{{
+    {Sign::LOGGED_CREDENTIALS_MISSING, Sign::HAS_CREDENTIALS},
+
     {Sign::LOGGED_NO_ADDRESS, Sign::HAS_ADDRESS},
     {Sign::LOGGED_SERVICE_UNRESOLVED, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_UNREACHABLE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_SERVICE_CERTIFICATE, Sign::SERVICE_REACHED},
     {Sign::LOGGED_NO_GATEWAY, Sign::GATEWAY_FOUND},
     {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+    {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_SHARED},
+    {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PRIVATE},
+    {Sign::LOGGED_SECOND_NAT, Sign::SERVICE_SEES_SAME_ADDRESS},
     {Sign::LOGGED_SECOND_NAT, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_OTHER_DEVICE, Sign::PORT_TEST_PASSES},
+    {Sign::LOGGED_TEST_SKIPPED_DISK, Sign::DISK_IN_USE},
     {Sign::LOGGED_TEST_FAILED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_FAILS},
@@ -27,20 +33,51 @@ constexpr std::array<std::pair<Sign, Sign>, 15> kOver{{
     {Sign::LOGGED_TUNNEL_DIED, Sign::TUNNEL_RUNS},
 }};
 
+void drop(Sign logged, Sign now, Evidence& evidence) {
+    const std::string over = "over since the log: " + evidence.signs.at(logged).text +
+                             "; now: " + evidence.signs.at(now).text;
+    evidence.signs.erase(logged);
+    evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
+    evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+}
+
+// The gateway now has the address that the service saw when it was another one.
+bool isSecondNatOver(const Evidence& evidence) {
+    if (!evidence.has(Sign::LOGGED_SECOND_NAT) || !evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC)) {
+        return false;
+    }
+    const std::string& text = evidence.signs.at(Sign::LOGGED_SECOND_NAT).text;
+    const std::string end = "the service sees " + evidence.gatewayAddress;
+    return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
+}
+
 // Live evidence beats the log, and the reader is told so.
 void dropWhatIsOver(Evidence& evidence) {
     for (const auto& [logged, now] : kOver) {
-        if (!evidence.has(logged) || !evidence.has(now)) continue;
-        const std::string over = "over since the log: " + evidence.signs.at(logged).text +
-                                 "; now: " + evidence.signs.at(now).text;
-        evidence.signs.erase(logged);
-        evidence.checks.push_back({Check::Verdict::OK, Source::NOW, over});
-        evidence.add(Sign::CHANGED_SINCE, Source::NOW, over);
+        if (evidence.has(logged) && evidence.has(now)) drop(logged, now, evidence);
+    }
+    if (isSecondNatOver(evidence)) {
+        drop(Sign::LOGGED_SECOND_NAT, Sign::GATEWAY_ADDRESS_PUBLIC, evidence);
     }
     // A run with -u logs the same as a daemon that is switched off.
     if (evidence.setting("ENABLEREMOTEACCESS") == "1") {
         evidence.signs.erase(Sign::LOGGED_REMOTE_ACCESS_OFF);
     }
+}
+
+// The daemon notices a new address when it asks the gateway again. What another device tells that
+// answers as a gateway need not matter.
+void compareAddresses(Evidence& evidence) {
+    const std::string published = evidence.setting("EXTERNAL_IP");
+    const bool isAutomatic = !evidence.has(Sign::MANUAL_MODE) && !evidence.has(Sign::OWN_ROUTER);
+    if (evidence.statusWord != "portforwarded" || !isAutomatic || published.empty()) return;
+    if (!evidence.has(Sign::GATEWAY_ADDRESS_PUBLIC) || evidence.has(Sign::GATEWAY_ELSEWHERE))
+        return;
+    if (published == evidence.gatewayAddress) return;
+    const std::string text =
+        "published at " + published + ", but the gateway's address is " + evidence.gatewayAddress;
+    evidence.add(Sign::GATEWAY_ADDRESS_CHANGED, Source::NOW, text);
+    evidence.checks.push_back({Check::Verdict::PROBLEM, Source::NOW, text});
 }
 
 Reach reachOfWord(const std::string& word) {
@@ -53,19 +90,33 @@ Reach reachOfWord(const std::string& word) {
 // What the daemon last said, by the settings or by the log.
 Reach lastSaid(const Evidence& evidence) {
     const Reach logged = evidence.history.empty() ? Reach::UNKNOWN : evidence.history.back().reach;
-    // Without the back end the word in the settings is not kept up to date.
-    const bool isOutdated =
-        evidence.has(Sign::LOGGED_BACK_END_SILENT) || evidence.has(Sign::LOGGED_BACK_END_REFUSES);
     const Reach word = reachOfWord(evidence.statusWord);
+    const bool isTrue = word == Reach::RELAYED && evidence.has(Sign::TUNNEL_RUNS) &&
+                        evidence.has(Sign::TUNNEL_SAYS_UP);
+    // Without the back end the word in the settings is not kept up to date.
+    const bool isOutdated = !isTrue && (evidence.has(Sign::LOGGED_BACK_END_SILENT) ||
+                                        evidence.has(Sign::LOGGED_BACK_END_REFUSES));
     return word == Reach::UNKNOWN || (isOutdated && logged != Reach::UNKNOWN) ? logged : word;
 }
 
-// The service's view of a device that says that it is reached directly. Ports forwarded by hand may
+bool isOffline(const Evidence& evidence) {
+    return evidence.has(Sign::SERVICE_UNRESOLVED) || evidence.has(Sign::SERVICE_UNREACHABLE);
+}
+
+// What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
 // lead through a second router, too.
 bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
-    return evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
-           (evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) && !evidence.has(Sign::MANUAL_MODE));
+    if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS)) {
+        return true;
+    }
+    if (evidence.has(Sign::MANUAL_MODE) || evidence.has(Sign::OWN_ROUTER)) return false;
+    const bool isBehindAnother =
+        evidence.has(Sign::GATEWAY_ADDRESS_SHARED) || evidence.has(Sign::GATEWAY_ADDRESS_PRIVATE);
+    if (isBehindAnother && !evidence.has(Sign::GATEWAY_ELSEWHERE)) return true;
+    const bool isLineDown = evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS) && isOffline(evidence);
+    return isLineDown || evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
+           evidence.has(Sign::GATEWAY_ADDRESS_CHANGED);
 }
 
 Reach reachOf(const Evidence& evidence) {
@@ -90,6 +141,18 @@ Reach reachOf(const Evidence& evidence) {
         if (evidence.has(Sign::LOGGED_ATTEMPT) || isKnown) return Reach::NOT_REACHED;
     }
     return said;
+}
+
+// A gateway that leads to the internet has an address there.
+void dropWhatIsHidden(Reach reach, Evidence& evidence) {
+    const bool isOnline =
+        evidence.has(Sign::SERVICE_REACHED) || (reach == Reach::RELAYED && !isOffline(evidence));
+    if (!isOnline || evidence.has(Sign::OWN_ROUTER)) return;
+    for (const Sign sign : {Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_WITHOUT_ADDRESS}) {
+        if (!evidence.has(sign)) continue;
+        evidence.signs[Sign::GATEWAY_HIDES_ADDRESS] = evidence.signs.at(sign);
+        evidence.signs.erase(sign);
+    }
 }
 
 // What is seen now explains nothing while nothing tells that the device is not reached.
@@ -142,6 +205,7 @@ void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {
 Diagnosis diagnose(const Evidence& seen) {
     Evidence evidence = seen;
     dropWhatIsOver(evidence);
+    compareAddresses(evidence);
     Diagnosis diagnosis;
     diagnosis.now = evidence.now;
     diagnosis.fromElsewhere = evidence.fromElsewhere && evidence.hasLog;
@@ -149,6 +213,7 @@ Diagnosis diagnose(const Evidence& seen) {
     tellSince(evidence, diagnosis);
     tellSinceAtLeast(evidence, diagnosis);
     tellAddress(evidence, diagnosis);
+    dropWhatIsHidden(diagnosis.reach, evidence);
     diagnosis.causes = findCauses(evidence, diagnosis.reach);
     if (diagnosis.reach == Reach::UNKNOWN) dropWhatExplainsNothing(diagnosis.causes);
     diagnosis.checks = std::move(evidence.checks);

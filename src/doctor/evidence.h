@@ -79,6 +79,7 @@ struct Evidence {
     std::string statusWord{};      ///< COMMUNICATION_STATUS of the settings
     DaemonState daemon{};
     std::optional<Time> tunnelSince{};  ///< start of the tunnel client that runs
+    std::string gatewayAddress{};       ///< external, as the gateway says now; empty if not known
     std::map<Sign, Fact> signs;
     std::vector<Check> checks;
     std::vector<Period> history;      ///< oldest first

@@ -16,4 +16,9 @@ GatewayAnswer readAnswer(const Findings& findings) {
     return answer;
 }
 
+void judgeUnfinishedTable(const Findings& found, Findings& findings) {
+    if (found.finished() || found.value("gateway").empty() || !found.checks().empty()) return;
+    findings.notSeen("gateway's table: it could not be read in time");
+}
+
 }  // namespace pelorus::doctor

@@ -16,6 +16,9 @@ void askThroughNatpmp(Findings& findings);
 /// What one of these has found.
 [[nodiscard]] GatewayAnswer readAnswer(const Findings& findings);
 
+/// Says so when UPnP found a gateway that was too slow for its table to be read.
+void judgeUnfinishedTable(const Findings& found, Findings& findings);
+
 }  // namespace pelorus::doctor
 
 #endif

@@ -57,10 +57,9 @@ const ClassWords& wordsFor(AddressClass kind) {
                          [kind](const ClassWords& row) { return row.kind == kind; });
 }
 
-void judgeAddress(const GatewayAnswer& answer, const std::string& name, Findings& findings) {
-    const std::string line = "gateway " + name + ": ";
+void judgeAddress(const GatewayAnswer& answer, const std::string& line, Findings& findings) {
     if (!tellsAddress(answer)) {
-        const std::string text = answer.address.empty() ? "has no internet address"
+        const std::string text = answer.address.empty() ? "tells no internet address"
                                                         : "says its address is " + answer.address;
         findings.add(Sign::GATEWAY_WITHOUT_ADDRESS, "the gateway " + text);
         findings.problem(line + text);
@@ -69,22 +68,24 @@ void judgeAddress(const GatewayAnswer& answer, const std::string& name, Findings
     const ClassWords& row = wordsFor(classOf(answer.address));
     const std::string text = "address " + answer.address + row.words;
     findings.add(row.sign, text);
-    if (!answer.connected) {
-        findings.add(Sign::GATEWAY_WITHOUT_ADDRESS, "the gateway says that it is not connected");
-        findings.problem(line + "says that it is not connected, " + text);
-    } else if (row.kind == AddressClass::PUBLIC) {
-        findings.ok(line + text);
+    // Some say so for ever, and map all the same.
+    const std::string whole =
+        line + (answer.connected ? "" : "says that it is not connected, ") + text;
+    if (row.kind == AddressClass::PUBLIC) {
+        findings.ok(whole);
     } else {
-        findings.problem(line + text);
+        findings.problem(whole);
     }
 }
 
 void judgeSilence(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
     const std::string device = upnp.unanswered;
     if (upnp.state == State::SILENT && natpmp.state == State::SILENT) {
-        const std::string text = device.empty()
-                                     ? "no gateway answers to UPnP or NAT-PMP"
-                                     : device + " announces itself, but does not act as a gateway";
+        std::string text = "no gateway answers to UPnP or NAT-PMP";
+        if (!natpmp.unanswered.empty()) {
+            text = "no gateway answers to UPnP, and " + natpmp.unanswered + " refuses NAT-PMP";
+        }
+        if (!device.empty()) text = device + " announces itself, but does not act as a gateway";
         findings.add(Sign::NO_GATEWAY_ANSWERS, text);
         findings.problem("gateway: " + text);
         return;
@@ -120,8 +121,12 @@ void tellOurs(const GatewayTable& table, Findings& findings) {
     if (!ours.empty()) findings.ok("gateway maps " + ours + " of this device");
 }
 
-// What is wrong with the mapping of a published port; empty if nothing is, or it is not known. Some
-// gateways name the other device instead of telling its address.
+// Some gateways name the other device instead of telling its address.
+bool tellsClient(const TableEntry& entry) {
+    return classOf(entry.client) != AddressClass::NONE;
+}
+
+// What is wrong with the mapping of a published port; empty if nothing is, or it is not known.
 std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
     if (!port.told) return {};
     if (!port.entry) {
@@ -133,7 +138,7 @@ std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
         return isListed ? "" : "the gateway does not map it";
     }
     const TableEntry& entry = *port.entry;
-    if (classOf(entry.client) == AddressClass::NONE) return {};
+    if (!tellsClient(entry)) return {};
     if (isOwn(table, entry) && entry.internalPort == port.internalPort) return {};
     return "the gateway maps it to port " + std::to_string(entry.internalPort) + " of " +
            entry.client;
@@ -162,7 +167,7 @@ void judgeOthers(const GatewayTable& table, Findings& findings) {
     std::string held;
     bool inTheWay = published.empty();
     for (const TableEntry& entry : entries) {
-        if (entry.protocol != "TCP" || isOwn(table, entry)) continue;
+        if (entry.protocol != "TCP" || isOwn(table, entry) || !tellsClient(entry)) continue;
         if (wanted.erase(entry.externalPort) == 0) continue;
         inTheWay = inTheWay || published.count(entry.externalPort) != 0;
         const std::string name =
@@ -171,7 +176,7 @@ void judgeOthers(const GatewayTable& table, Findings& findings) {
     }
     if (held.empty()) return;
     findings.add(Sign::PORT_HELD_BY_OTHER, "the gateway maps port " + held);
-    const std::string line = "gateway maps port " + held + ", another device";
+    const std::string line = "gateway maps port " + held + ", not this device's address";
     if (inTheWay) {
         findings.problem(line);
     } else {
@@ -186,7 +191,10 @@ std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natp
     return tellsAddress(answer) ? answer.address : std::string{};
 }
 
-void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
+void judgeGateway(const GatewayAnswer& upnp,
+                  const GatewayAnswer& natpmp,
+                  const std::string& route,
+                  Findings& findings) {
     if (!isFound(upnp) && !isFound(natpmp)) {
         judgeSilence(upnp, natpmp, findings);
         return;
@@ -194,7 +202,12 @@ void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findin
     const GatewayAnswer& answer = chosen(upnp, natpmp);
     const std::string name = answer.gateway + protocols(upnp, natpmp);
     findings.add(Sign::GATEWAY_FOUND, "gateway " + name);
-    judgeAddress(answer, name, findings);
+    judgeAddress(answer, "gateway " + name + ": ", findings);
+    if (route.empty() || route == answer.gateway) return;
+    const std::string text =
+        answer.gateway + " answers as a gateway, the default route leads to " + route;
+    findings.add(Sign::GATEWAY_ELSEWHERE, text);
+    findings.ok("gateway: " + text);
 }
 
 void judgeTable(const GatewayTable& table, Findings& findings) {

@@ -21,11 +21,15 @@ struct GatewayAnswer {
     std::string gateway;     ///< its own address
     std::string address;     ///< the external address it tells; empty if it tells none
     bool connected = true;   ///< false: it says that it is not
-    std::string unanswered;  ///< a device that announces itself and then says nothing useful
+    std::string unanswered;  ///< a device that announces itself or refuses, and cannot be used
 };
 
-/// Concludes from both protocols together.
-void judgeGateway(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings);
+/// Concludes from both protocols together. @p route is the gateway of the default route, empty if
+/// it is not known.
+void judgeGateway(const GatewayAnswer& upnp,
+                  const GatewayAnswer& natpmp,
+                  const std::string& route,
+                  Findings& findings);
 
 /// The external address that the answers tell, of whichever class; empty if there is none.
 [[nodiscard]] std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natpmp);

@@ -57,10 +57,9 @@ std::string textOf(in_addr address) {
     return text.data();
 }
 
-// A gateway that refuses the question still speaks the protocol.
+// It speaks the protocol, but opens no ports.
 bool isRefusal(int status) {
-    return status == NATPMP_ERR_NOTAUTHORIZED || status == NATPMP_ERR_NETWORKFAILURE ||
-           status == NATPMP_ERR_OUTOFRESOURCES;
+    return status == NATPMP_ERR_NOTAUTHORIZED || status == NATPMP_ERR_OUTOFRESOURCES;
 }
 
 }  // namespace
@@ -79,9 +78,10 @@ void askThroughNatpmp(Findings& findings) {
     if (status == 0 && response.type == NATPMP_RESPTYPE_PUBLICADDRESS) {
         findings.set("gateway", route->gateway);
         findings.set("address", textOf(response.pnu.publicaddress.addr));
-    } else if (isRefusal(status)) {
+    } else if (status == NATPMP_ERR_NETWORKFAILURE) {
         findings.set("gateway", route->gateway);
     } else {
+        if (isRefusal(status)) findings.set("announced", route->gateway);
         findings.set("silent", std::to_string(status));
     }
 }

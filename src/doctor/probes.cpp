@@ -6,6 +6,7 @@
 #include "common/text.h"
 #include "doctor/disk_probe.h"
 #include "doctor/gateway_probe.h"
+#include "doctor/interfaces.h"
 #include "doctor/names_probe.h"
 #include "doctor/network_probe.h"
 #include "doctor/question_probe.h"
@@ -81,18 +82,34 @@ void take(const Findings& findings, Evidence& evidence) {
                            findings.checks().end());
 }
 
+// The gateway of the default route, unless that leads into a tunnel; empty if there is none.
+std::string lanGateway() {
+    const auto route = defaultRoute();
+    if (!route) return {};
+    for (const Interface& one : interfaces()) {
+        if (one.name == route->interface) return one.tunnel ? std::string{} : route->gateway;
+    }
+    return {};
+}
+
 // Concludes from several probes, or from one that was cut short.
 class Conclusions {
 public:
     explicit Conclusions(const std::vector<Subject>& all) : subjects{all} {}
 
+    [[nodiscard]] std::string gatewayAddress() const {
+        return externalAddress(answer("UPnP"), answer("NAT-PMP"));
+    }
+
     // What is shown in front of the lines of this subject.
     void add(const Subject& subject, Findings& findings) const {
         const std::string name = subject.name;
-        if (name == "UPnP") judgeGateway(answer("UPnP"), answer("NAT-PMP"), findings);
+        if (name == "UPnP") {
+            judgeGateway(answer("UPnP"), answer("NAT-PMP"), lanGateway(), findings);
+            judgeUnfinishedTable(subject.found, findings);
+        }
         if (name == "public address") {
-            judgeSeenAddress(subject.found, externalAddress(answer("UPnP"), answer("NAT-PMP")),
-                             findings);
+            judgeSeenAddress(subject.found, gatewayAddress(), findings);
         }
         if (subject.found.finished() || name == "UPnP" || name == "NAT-PMP") return;
         if (name == "central service") judgeUnfinishedService(subject.found, findings);
@@ -117,6 +134,7 @@ void probe(const ProbeChoice& choice, Evidence& evidence) {
     leaveOut(subjects, evidence);
     run(subjects);
     const Conclusions conclusions{subjects};
+    evidence.gatewayAddress = conclusions.gatewayAddress();
     for (const Subject& subject : subjects) {
         Findings concluded;
         conclusions.add(subject, concluded);

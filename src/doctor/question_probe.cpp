@@ -114,6 +114,9 @@ void judgeSeenAddress(const Findings& answer,
                       Findings& findings) {
     const std::string seen = answer.value("seen");
     if (seen.empty()) return;
+    if (seen == gatewayAddress) {
+        findings.add(Sign::SERVICE_SEES_SAME_ADDRESS, "the service sees " + seen);
+    }
     if (gatewayAddress.empty() || seen == gatewayAddress) {
         findings.ok("public address: the service sees " + seen);
         return;

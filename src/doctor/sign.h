@@ -10,6 +10,7 @@ enum class Sign {
     // From files and the process table.
     STATIC_FILE_UNREADABLE,
     DYNAMIC_FILE_UNREADABLE,
+    HAS_CREDENTIALS,
     CREDENTIALS_MISSING,
     REMOTE_ACCESS_OFF,
     MANUAL_MODE,
@@ -34,13 +35,16 @@ enum class Sign {
     NO_ADDRESS,   ///< no usable one of IPv4
     HAS_ADDRESS,  ///< a usable one of IPv4, in a LAN
     NO_DEFAULT_ROUTE,
-    GATEWAY_FOUND,  ///< through UPnP or NAT-PMP
+    GATEWAY_FOUND,      ///< through UPnP or NAT-PMP
+    GATEWAY_ELSEWHERE,  ///< the one found is not that of the default route
     NO_GATEWAY_ANSWERS,
     GATEWAY_WITHOUT_ADDRESS,
+    GATEWAY_HIDES_ADDRESS,  ///< it tells none, but leads to the internet
     GATEWAY_ADDRESS_PRIVATE,
     GATEWAY_ADDRESS_SHARED,
     GATEWAY_ADDRESS_PUBLIC,
-    OUR_MAPPINGS_MISSING,  ///< the gateway, asked for a published port, does not map it to us
+    GATEWAY_ADDRESS_CHANGED,  ///< it is not the published one
+    OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
     PORT_HELD_BY_OTHER,
     WEB_SERVER_SILENT,
     BACK_END_ANSWERS,
@@ -55,6 +59,7 @@ enum class Sign {
     NAMES_UNRESOLVED,
     RELAY_CLIENT_MISSING,  ///< no openvpn program
     TUNNEL_DEVICE_MISSING,
+    SERVICE_SEES_SAME_ADDRESS,  ///< as the gateway says
     SERVICE_SEES_OTHER_ADDRESS,
     PORT_TEST_PASSES,
     OTHER_DEVICE_ANSWERS,  ///< to the port test

@@ -1,8 +1,8 @@
-#include <algorithm>
 #include <array>
 #include <chrono>
 #include <cstring>
 #include <memory>
+#include <optional>
 #include <utility>
 
 #include "common/handles.h"
@@ -12,6 +12,7 @@
 #include "doctor/gateway_probe.h"
 #include "doctor/interfaces.h"
 #include "doctor/url_host.h"
+#include "router/gateway_url.h"
 
 namespace pelorus::doctor {
 
@@ -32,28 +33,28 @@ std::string textOf(const char* text) {
     return text == nullptr ? std::string{} : text;
 }
 
-// The address behind a URL, if it can be a gateway's: another host in the home. Else empty.
+// The address behind a URL that the daemon would ask. Else empty.
 std::string gatewayBehind(const char* url) {
+    if (!leadsToAnotherHost(textOf(url))) return {};
     const auto found = hostOfUrl(textOf(url));
-    if (!found || !isAtHome(found->host)) return {};
-    const auto own = ownAddresses();
-    const bool isOwn = std::find(own.begin(), own.end(), found->host) != own.end();
-    return isOwn ? std::string{} : found->host;
+    return found ? found->host : std::string{};
 }
 
+// By the daemon's rule: what it does not take for a gateway helps nobody.
 bool isGateway(const UPNPDev& device) {
     const std::string target = textOf(device.st);
-    return contains(target, ":InternetGatewayDevice:") || contains(target, ":WANIPConnection:") ||
-           contains(target, ":WANPPPConnection:");
+    const bool wanted = target == "urn:schemas-upnp-org:device:InternetGatewayDevice:1" ||
+                        target == "urn:schemas-upnp-org:service:WANIPConnection:1" ||
+                        target == "urn:schemas-upnp-org:service:WANPPPConnection:1";
+    return wanted && !contains(textOf(device.descURL), "udhisapi.dll");
 }
 
 // The gateways of a list, as a list of their own. The strings still belong to the first one.
 std::vector<UPNPDev> gatewaysOf(const UPNPDev* device) {
     std::vector<UPNPDev> gateways;
     for (int count = 0; device != nullptr && count < kMostDevices; ++count) {
-        if (isGateway(*device) && !gatewayBehind(device->descURL).empty()) {
-            gateways.push_back(*device);
-        }
+        const bool isFit = isGateway(*device) && !gatewayBehind(device->descURL).empty();
+        if (isFit) gateways.push_back(*device);
         if (gateways.size() == kMostGateways) break;
         device = device->pNext;
     }
@@ -69,11 +70,13 @@ struct Service {
     std::string type;
 };
 
-std::string addressOf(const Service& service) {
+// Nothing when the gateway does not answer the question; empty when it has no address.
+std::optional<std::string> addressOf(const Service& service) {
     std::array<char, 64> address{};
     const int status = miniupnpc::call(UPNP_GetExternalIPAddress, service.controlUrl.c_str(),
                                        service.type.c_str(), address.data());
-    return status == UPNPCOMMAND_SUCCESS ? address.data() : std::string{};
+    if (status != UPNPCOMMAND_SUCCESS) return std::nullopt;
+    return address.data();
 }
 
 // The library calls a gateway with a private address unconnected, too; so the gateway is asked.
@@ -155,13 +158,19 @@ std::vector<PublishedPort> publishedPorts(const Evidence& evidence, const Gatewa
     return ports;
 }
 
-// What the user forwards by hand need not be in the table.
-bool isMappedByDaemon(const Evidence& evidence) {
+// What the user forwards by hand need not be in the table, nor what another gateway maps.
+bool isMappedByDaemon(const Evidence& evidence, const std::string& address) {
+    const std::string published = evidence.setting("EXTERNAL_IP");
     return evidence.statusWord == "portforwarded" &&
-           evidence.setting("MANUAL_PORT_FORWARD") != "TRUE";
+           evidence.setting("MANUAL_PORT_FORWARD") != "TRUE" &&
+           (published.empty() || published == address);
 }
 
-void lookAtTable(const Service& service, const Evidence& evidence, Findings& findings) {
+// Of the gateway with this external address.
+void lookAtTable(const Service& service,
+                 const std::string& address,
+                 const Evidence& evidence,
+                 Findings& findings) {
     if (!evidence.hasSettings()) {
         findings.notSeen("gateway's table: " + evidence.unreadSettings);
         return;
@@ -173,7 +182,7 @@ void lookAtTable(const Service& service, const Evidence& evidence, Findings& fin
     table.internalHttpsPort = portSetting(evidence, "INTERNAL_HTTPS_PORT", 443);
     table.published = publishedPorts(evidence, table);
     for (PublishedPort& port : table.published) {
-        if (isMappedByDaemon(evidence) && Clock::now() < end) askFor(service, port);
+        if (isMappedByDaemon(evidence, address) && Clock::now() < end) askFor(service, port);
     }
     const bool isComplete = readEntries(service, end, table.entries);
     judgeTable(table, findings);
@@ -192,13 +201,17 @@ void lookAtGateway(UPNPDev& gateways, const Evidence& evidence, Findings& findin
     const char* const type = data.first.servicetype;
     const Service service{textOf(urls.controlURL),
                           std::string{type, strnlen(type, sizeof data.first.servicetype)}};
-    const std::string address = addressOf(service);
+    findings.set("announced", gateway);
+    const auto told = addressOf(service);
+    const bool unconnected = state == miniupnpc::UNCONNECTED_IGD && saysUnconnected(service);
+    const std::string address = told.value_or("");
+    const bool isIgd = state != miniupnpc::OTHER_UPNP_DEVICE;
+    if (address.empty() && !(isIgd && (told || unconnected))) return;
     findings.set("address", address);
-    if (state == miniupnpc::UNCONNECTED_IGD && saysUnconnected(service)) {
-        findings.set("unconnected", "yes");
-    }
+    if (unconnected) findings.set("unconnected", "yes");
     findings.set("gateway", gateway);
-    lookAtTable(service, evidence, findings);
+    // Without an address it need not be the gateway that the daemon uses.
+    if (classOf(address) != AddressClass::NONE) lookAtTable(service, address, evidence, findings);
 }
 
 }  // namespace

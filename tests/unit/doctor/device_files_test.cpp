@@ -102,7 +102,8 @@ protected:
 TEST_F(DeviceFilesTest, AHealthyDeviceHasNoProblem) {
     const Evidence evidence = look({}, {{"COMMUNICATION_STATUS", "portforwarded"}});
     EXPECT_EQ(problems(evidence), "");
-    EXPECT_EQ(evidence.signs.size(), 2U) << shown(evidence);
+    EXPECT_EQ(evidence.signs.size(), 3U) << shown(evidence);
+    EXPECT_TRUE(evidence.has(Sign::HAS_CREDENTIALS));
     EXPECT_TRUE(evidence.has(Sign::DISK_IN_USE));
     EXPECT_EQ(evidence.signs.at(Sign::DAEMON_RUNS).text,
               "daemon up 3 h 20 min (pid 812, -l 6 -f 120)");

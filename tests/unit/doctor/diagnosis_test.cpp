@@ -32,6 +32,10 @@ Evidence evidenceOf(const Seen& seen) {
     return evidence;
 }
 
+std::string_view firstCause(const Diagnosis& diagnosis) {
+    return diagnosis.causes.empty() ? "" : diagnosis.causes.front().cause->name;
+}
+
 // What the lab's scenarios do not show, or only together with other things.
 const std::vector<Seen> kSeen{
     {"healthy",
@@ -180,6 +184,90 @@ const std::vector<Seen> kSeen{
      Reach::NOT_REACHED,
      "port-filtered",
      2},
+    {"direct, but the gateway's address is shared by now",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::GATEWAY_ADDRESS_SHARED},
+     Reach::NOT_REACHED,
+     "shared-address",
+     2},
+    {"direct, and an access point says that its address is private",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::GATEWAY_ADDRESS_PRIVATE, S::GATEWAY_ELSEWHERE},
+     Reach::DIRECT,
+     "",
+     0},
+    {"direct, and the gateway forgets its address",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::SERVICE_REACHED},
+     Reach::DIRECT,
+     "",
+     0},
+    {"direct, but the line is down",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::SERVICE_UNRESOLVED},
+     Reach::NOT_REACHED,
+     "gateway-without-address",
+     2},
+    {"no address told, but the internet is there",
+     "relayed",
+     {S::TUNNEL_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::SERVICE_REACHED},
+     Reach::RELAYED,
+     "gateway-hides-address",
+     1},
+    {"no address in the log, and relayed since",
+     "relayed",
+     {S::TUNNEL_RUNS, S::LOGGED_GATEWAY_WITHOUT_ADDRESS},
+     Reach::RELAYED,
+     "gateway-hides-address",
+     1},
+    {"an address refused, and nothing else answers",
+     "relayed",
+     {S::TUNNEL_RUNS, S::LOGGED_GATEWAY_WITHOUT_ADDRESS, S::NO_GATEWAY_ANSWERS},
+     Reach::RELAYED,
+     "no-gateway-protocol",
+     1},
+    {"not connected, with a private address",
+     "failed",
+     {S::DAEMON_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::GATEWAY_ADDRESS_PRIVATE},
+     Reach::NOT_REACHED,
+     "second-nat",
+     2},
+    {"an access point that answers as a gateway",
+     "relayed",
+     {S::TUNNEL_RUNS, S::GATEWAY_ELSEWHERE, S::GATEWAY_ADDRESS_PUBLIC, S::LOGGED_SECOND_NAT},
+     Reach::RELAYED,
+     "wrong-gateway-answers",
+     1},
+    {"direct by hand behind a shared address",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::MANUAL_MODE, S::GATEWAY_ADDRESS_SHARED},
+     Reach::DIRECT,
+     "",
+     0},
+    {"no address in the log, a private one now",
+     "relayed",
+     {S::TUNNEL_RUNS, S::LOGGED_GATEWAY_WITHOUT_ADDRESS, S::GATEWAY_ADDRESS_PRIVATE},
+     Reach::RELAYED,
+     "second-nat",
+     1},
+    {"credentials since the log",
+     "",
+     {S::DAEMON_RUNS, S::LOGGED_CREDENTIALS_MISSING, S::HAS_CREDENTIALS},
+     Reach::NOT_REACHED,
+     "settling",
+     2},
+    {"a disk that is in use again",
+     "failed",
+     {S::DAEMON_RUNS, S::LOGGED_TEST_SKIPPED_DISK, S::DISK_IN_USE},
+     Reach::NOT_REACHED,
+     "settling",
+     2},
+    {"a tunnel that the log does not know",
+     "relayed",
+     {S::TUNNEL_RUNS, S::TUNNEL_SAYS_UP, S::LOGGED_BACK_END_REFUSES},
+     Reach::RELAYED,
+     "back-end-refuses",
+     1},
     {"over by now",
      "failed",
      {S::DAEMON_RUNS, S::LOGGED_SERVICE_UNREACHABLE, S::SERVICE_REACHED},
@@ -192,10 +280,40 @@ TEST(Diagnosis, NamesTheCauseThatTheSignsCarry) {
     for (const Seen& seen : kSeen) {
         const Diagnosis diagnosis = diagnose(evidenceOf(seen));
         EXPECT_EQ(diagnosis.reach, seen.reach) << seen.name;
-        const std::string first =
-            diagnosis.causes.empty() ? "" : std::string{diagnosis.causes.front().cause->name};
-        EXPECT_EQ(first, seen.cause) << seen.name;
+        EXPECT_EQ(firstCause(diagnosis), seen.cause) << seen.name;
         EXPECT_EQ(exitStatus(diagnosis), seen.status) << seen.name;
+    }
+}
+
+TEST(Diagnosis, BelievesTheGatewayThatHasTheAddressTheServiceSaw) {
+    for (const auto& [address, cause] :
+         {std::pair{"203.0.113.7", ""}, std::pair{"203.0.113.70", "second-nat"}}) {
+        Evidence evidence;
+        evidence.statusWord = "relayed";
+        evidence.gatewayAddress = address;
+        evidence.add(S::GATEWAY_ADDRESS_PUBLIC, Source::NOW, "address is public");
+        evidence.add(S::LOGGED_SECOND_NAT, Source::LOG,
+                     "the gateway says 10.0.0.2, the service sees 203.0.113.7");
+        EXPECT_EQ(firstCause(diagnose(evidence)), cause) << address;
+    }
+}
+
+TEST(Diagnosis, NoticesThatTheGatewayHasAnotherAddress) {
+    const struct {
+        const char* address;
+        std::vector<Sign> signs;
+        const char* cause;
+    } rows[]{{"44.128.0.20", {}, ""},
+             {"44.128.0.30", {}, "address-changed"},
+             {"44.128.0.30", {S::PORT_TEST_PASSES}, ""},
+             {"44.128.0.30", {S::MANUAL_MODE}, ""},
+             {"44.128.0.30", {S::GATEWAY_ELSEWHERE}, ""}};
+    for (const auto& row : rows) {
+        Evidence evidence = evidenceOf({"", "portforwarded", row.signs, {}, "", 0});
+        evidence.settings["EXTERNAL_IP"] = "44.128.0.20";
+        evidence.gatewayAddress = row.address;
+        evidence.add(S::GATEWAY_ADDRESS_PUBLIC, Source::NOW, "address is public");
+        EXPECT_EQ(firstCause(diagnose(evidence)), row.cause) << row.address;
     }
 }
 

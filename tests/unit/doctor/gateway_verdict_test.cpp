@@ -6,6 +6,7 @@
 #include <string>
 
 #include "doctor/address_class.h"
+#include "doctor/gateway_probe.h"
 
 namespace pelorus::doctor {
 
@@ -38,6 +39,8 @@ TEST(AddressClass, FollowsTheRegistry) {
         {"100.128.0.0", AddressClass::PUBLIC},
         {"127.0.0.1", AddressClass::RESERVED},
         {"169.254.7.1", AddressClass::RESERVED},
+        {"192.0.0.2", AddressClass::SHARED},
+        {"192.0.0.8", AddressClass::RESERVED},
         {"255.255.255.255", AddressClass::RESERVED},
         {"44.128.0.20", AddressClass::PUBLIC},
     };
@@ -55,14 +58,18 @@ GatewayAnswer found(const std::string& address, bool connected = true) {
     return {State::FOUND, "192.168.1.1", address, connected, ""};
 }
 
-const GatewayAnswer kSilent{State::SILENT, "", "", true, ""};
+GatewayAnswer unusable(const std::string& device) {
+    return {State::SILENT, "", "", true, device};
+}
+
+const GatewayAnswer kSilent = unusable("");
 const GatewayAnswer kUnknown{};
 
 class Gateway : public ::testing::TestWithParam<Answers> {};
 
 TEST_P(Gateway, IsJudged) {
     Findings findings;
-    judgeGateway(GetParam().upnp, GetParam().natpmp, findings);
+    judgeGateway(GetParam().upnp, GetParam().natpmp, "192.168.1.1", findings);
     EXPECT_EQ(signsOf(findings), GetParam().signs);
     ASSERT_EQ(findings.checks().size(), 1U);
     EXPECT_EQ(findings.checks()[0].text, GetParam().check);
@@ -97,8 +104,23 @@ const Answers kAnswers[] = {
     {"Unconnected",
      found("44.128.0.20", false),
      kSilent,
-     {Sign::GATEWAY_FOUND, Sign::GATEWAY_WITHOUT_ADDRESS, Sign::GATEWAY_ADDRESS_PUBLIC},
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_ADDRESS_PUBLIC},
      "gateway 192.168.1.1 (UPnP): says that it is not connected, address 44.128.0.20 is public"},
+    {"NoAddress",
+     found(""),
+     kSilent,
+     {Sign::GATEWAY_FOUND, Sign::GATEWAY_WITHOUT_ADDRESS},
+     "gateway 192.168.1.1 (UPnP): tells no internet address"},
+    {"NoGatewayAtAll",
+     unusable("192.168.1.2"),
+     kSilent,
+     {Sign::NO_GATEWAY_ANSWERS},
+     "gateway: 192.168.1.2 announces itself, but does not act as a gateway"},
+    {"NatpmpRefused",
+     kSilent,
+     unusable("192.168.1.1"),
+     {Sign::NO_GATEWAY_ANSWERS},
+     "gateway: no gateway answers to UPnP, and 192.168.1.1 refuses NAT-PMP"},
     {"BothSilent",
      kSilent,
      kSilent,
@@ -110,6 +132,15 @@ const Answers kAnswers[] = {
 INSTANTIATE_TEST_SUITE_P(Answers, Gateway, ::testing::ValuesIn(kAnswers), [](const auto& row) {
     return row.param.name;
 });
+
+TEST(Gateway, IsTheOneOfTheDefaultRoute) {
+    for (const auto& [route, isElsewhere] :
+         {std::pair{"192.168.1.1", false}, std::pair{"", false}, std::pair{"192.168.1.9", true}}) {
+        Findings findings;
+        judgeGateway(found("44.128.0.20"), kSilent, route, findings);
+        EXPECT_EQ(findings.has(Sign::GATEWAY_ELSEWHERE), isElsewhere) << route;
+    }
+}
 
 struct Table {
     std::string name;
@@ -145,7 +176,7 @@ const Table kTables[] = {
     {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
     {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, {Sign::OUR_MAPPINGS_MISSING}},
     {"NotToldAndNotInTheTable", {}, {{9091, 80, false, {}}}, {}},
-    {"ToAHostByName", {}, {http(kByName)}, {Sign::PORT_HELD_BY_OTHER}},
+    {"ToAHostByName", {kByName}, {http(kByName)}, {}},
     {"HeldByAnother", {kNeighbour}, {}, {Sign::PORT_HELD_BY_OTHER}},
     {"TakenAway", {}, {http(kNeighbour)}, {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
     {"OfAnotherProtocol", {{9091, "UDP", "192.168.1.9", 80, ""}}, {}, {}},
@@ -154,6 +185,18 @@ const Table kTables[] = {
 INSTANTIATE_TEST_SUITE_P(Tables, Mappings, ::testing::ValuesIn(kTables), [](const auto& row) {
     return row.param.name;
 });
+
+TEST(Mappings, OfAGatewayThatIsTooSlowAreNotSeen) {
+    Findings found, none, some;
+    judgeUnfinishedTable(found, none);
+    EXPECT_TRUE(none.checks().empty());
+    found.set("gateway", "192.168.1.1");
+    judgeUnfinishedTable(found, some);
+    EXPECT_EQ(some.checks().size(), 1U);
+    found.finish();
+    judgeUnfinishedTable(found, none);
+    EXPECT_TRUE(none.checks().empty());
+}
 
 TEST(Mappings, NameWhoHoldsThePort) {
     Findings findings;

@@ -45,7 +45,7 @@ public:
 
 private:
     void meet(std::string_view host) {
-        constexpr std::size_t kMostHosts = 16;
+        constexpr std::size_t kMostHosts = 1000;
         lastHost = host;
         if (met.size() < kMostHosts) met.insert(lastHost);
     }

@@ -374,6 +374,11 @@ void LogStory::finish(Evidence& evidence) {
     if (pauses && !evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
     for (const auto& [sign, fact] : signs.all()) evidence.signs[sign] = fact;
     evidence.history.assign(history.periods().begin(), history.periods().end());
+    if (history.dropped() > 0) {
+        evidence.untold.push_back(
+            "the history before its last " + std::to_string(evidence.history.size()) +
+            " periods: " + std::to_string(history.dropped()) + " more are not kept");
+    }
 }
 
 }  // namespace pelorus::doctor

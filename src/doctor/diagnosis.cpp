@@ -200,6 +200,18 @@ void tellAddress(const Evidence& evidence, Diagnosis& diagnosis) {
     if (!http.empty() && !https.empty()) diagnosis.ports = http + " and " + https;
 }
 
+// What the log says last is over, too, where the daemon is gone and did not log its end.
+void endHistory(const Evidence& evidence, Diagnosis& diagnosis) {
+    const bool isGone = evidence.has(Sign::DAEMON_GONE) && !evidence.fromElsewhere;
+    if (isGone || diagnosis.reach == Reach::NOT_RUNNING) diagnosis.daemon.since.reset();
+    auto& history = diagnosis.history;
+    if (!isGone || history.empty() || !evidence.logEnd) return;
+    const Period& last = history.back();
+    if (last.reach == Reach::NOT_RUNNING || last.reach == Reach::SWITCHED_OFF) return;
+    history.push_back({diagnosis.reach, std::max(*evidence.logEnd, last.since), "",
+                       "the log has nothing of the daemon since, and it is gone"});
+}
+
 }  // namespace
 
 Diagnosis diagnose(const Evidence& seen) {
@@ -220,6 +232,7 @@ Diagnosis diagnose(const Evidence& seen) {
     diagnosis.history = std::move(evidence.history);
     diagnosis.daemon = std::move(evidence.daemon);
     diagnosis.untold = std::move(evidence.untold);
+    endHistory(evidence, diagnosis);
     return diagnosis;
 }
 

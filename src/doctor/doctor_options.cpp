@@ -4,8 +4,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cstdio>
+#include <iterator>
+#include <string_view>
 
+#include "common/handles.h"
 #include "common/version.h"
 
 namespace pelorus::doctor {
@@ -52,6 +57,23 @@ int complain(const std::string& what) {
     return kWrongUsage;
 }
 
+int print(const std::string& text) {
+    const bool isWritten = std::fputs(text.c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
+    if (isWritten) return 0;
+    std::perror("pelorus-doctor: cannot write to standard output");
+    return kNotWritten;
+}
+
+// Of a shortened option: the beginning of several.
+bool isAmbiguous(const std::string& argument) {
+    if (argument.compare(0, 2, "--") != 0) return false;
+    const std::string name = argument.substr(2, argument.find('=') - 2);
+    const auto fits = [&](const option& known) {
+        return known.name != nullptr && std::string_view{known.name}.substr(0, name.size()) == name;
+    };
+    return std::count_if(std::begin(kOptions), std::end(kOptions), fits) > 1;
+}
+
 // What an option without an argument does.
 struct Switch {
     bool DoctorOptions::*field;
@@ -79,11 +101,9 @@ std::optional<int> readOption(int found, char** argv, DoctorOptions& options) {
     }
     switch (found) {
         case 'h':
-            static_cast<void>(std::fputs(kHelp, stdout));
-            return 0;
+            return print(kHelp);
         case VERSION:
-            std::printf("pelorus-doctor %s\n", GetPelorusVersion());
-            return 0;
+            return print(std::string{"pelorus-doctor "} + GetPelorusVersion() + '\n');
         case LOG:
             options.logs.emplace_back(optarg);
             return std::nullopt;
@@ -93,7 +113,9 @@ std::optional<int> readOption(int found, char** argv, DoctorOptions& options) {
         case ':':
             return complain(std::string{argv[optind - 1]} + " needs a file");
         default:
-            return complain("no such option: " + badArgument(argv));
+            return complain(
+                (isAmbiguous(badArgument(argv)) ? "ambiguous option: " : "no such option: ") +
+                badArgument(argv));
     }
 }
 
@@ -106,6 +128,17 @@ bool isSameFile(const std::string& log, const std::string& picture) {
            left.st_dev == right.st_dev && left.st_ino == right.st_ino;
 }
 
+// Nothing but an older picture may be overwritten.
+bool isForeignFile(const std::string& picture) {
+    struct stat status {};
+    if (stat(picture.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
+    const FileHandle file = openFile(picture, "re");
+    std::array<char, 5> begin{};
+    const std::size_t size = file ? std::fread(begin.data(), 1, begin.size(), file.get()) : 0;
+    const std::string_view text{begin.data(), size};
+    return status.st_size > 0 && text.substr(0, 4) != "<svg" && text != "<?xml";
+}
+
 std::optional<int> contradiction(const DoctorOptions& options) {
     const bool hasOthers = !options.logs.empty() || !options.probes || options.askService ||
                            options.json || !options.picture.empty();
@@ -115,6 +148,9 @@ std::optional<int> contradiction(const DoctorOptions& options) {
     }
     for (const std::string& log : options.logs) {
         if (isSameFile(log, options.picture)) return complain("--svg would overwrite a log");
+    }
+    if (isForeignFile(options.picture)) {
+        return complain("--svg would overwrite a file that is no picture");
     }
     return std::nullopt;
 }

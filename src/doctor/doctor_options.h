@@ -9,6 +9,7 @@
 namespace pelorus::doctor {
 
 inline constexpr int kWrongUsage = 64;
+inline constexpr int kNotWritten = 73;
 
 struct DoctorOptions {
     std::vector<std::string> logs;  ///< "-" is standard input

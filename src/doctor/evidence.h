@@ -73,7 +73,7 @@ struct Evidence {
     bool hasLog = false;                          ///< at least one line of the daemon was read
     bool hasProgressLines = false;                ///< the log includes severity 6
     std::optional<Time> logBegin{}, logEnd{};     ///< first and last line of the daemon
-    std::set<std::string> logHosts{};             ///< that logged the daemon's lines; a few at most
+    std::set<std::string> logHosts{};             ///< that logged the daemon's lines; 1000 at most
     std::map<std::string, std::string> settings;  ///< as the daemon merges them; has secrets
     std::string unreadSettings{};  ///< why a file was not read: "the settings need root"
     std::string statusWord{};      ///< COMMUNICATION_STATUS of the settings

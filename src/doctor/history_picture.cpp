@@ -26,6 +26,7 @@ constexpr double kLeastSliver = 1.5;  // a period of seconds can be seen
 constexpr double kLine = 20, kEntryGap = 8, kColumn = 585, kTextAt = 40;
 constexpr std::size_t kListLetters = 64, kSmallListLetters = 76;
 constexpr std::size_t kMostTicks = 12;
+constexpr std::size_t kMostListed = 40;
 
 const char* colourOf(Reach reach) {
     switch (reach) {
@@ -102,6 +103,20 @@ std::string share(seconds part, seconds whole) {
     return std::to_string(std::min<seconds::rep>(percent, 99)) + " %";
 }
 
+// Texts of causes differ in how long something took: "after 239 ms".
+std::string withoutDurations(const std::string& text) {
+    constexpr std::string_view kUnit = " ms";
+    std::string result;
+    for (std::size_t at = 0; at < text.size();) {
+        const std::size_t end = std::min(text.find_first_not_of("0123456789", at), text.size());
+        const bool isDuration = end > at && text.compare(end, kUnit.size(), kUnit) == 0;
+        const std::size_t next = std::max(end, at + 1);
+        result += isDuration ? "some" : text.substr(at, next - at);
+        at = next;
+    }
+    return result;
+}
+
 class HistoryPicture {
 public:
     explicit HistoryPicture(const Diagnosis& subject) : diagnosis{subject} { collect(); }
@@ -165,11 +180,12 @@ void HistoryPicture::collect() {
 
 std::size_t HistoryPicture::numberOf(const Period& period) {
     if (period.cause.empty()) return 0;
+    const std::string text = withoutDurations(period.cause);
     const auto found = std::find_if(entries.begin(), entries.end(), [&](const Entry& entry) {
-        return entry.reach == period.reach && entry.text == period.cause;
+        return entry.reach == period.reach && entry.text == text;
     });
     const auto index = static_cast<std::size_t>(found - entries.begin());
-    if (found == entries.end()) entries.push_back({period.reach, period.cause, {}});
+    if (found == entries.end()) entries.push_back({period.reach, text, {}});
     entries[index].stretches.push_back(stretches.size());
     return index + 1;
 }
@@ -332,12 +348,13 @@ double HistoryPicture::drawEntry(std::size_t number, double x, double y) {
 // In two columns of about the same height.
 double HistoryPicture::drawList() {
     if (entries.empty()) return axisTop + 30;
+    const std::size_t most = std::min(entries.size(), kMostListed);
     std::size_t lines = 0;
-    for (const Entry& entry : entries) lines += linesOf(entry).size() + 1;
+    for (std::size_t index = 0; index < most; ++index) lines += linesOf(entries[index]).size() + 1;
     double bottom = axisTop + kAxisHeight, y = axisTop + kAxisHeight;
     std::size_t drawn = 0;
     double column = kLeft;
-    for (std::size_t number = 1; number <= entries.size(); ++number) {
+    for (std::size_t number = 1; number <= most; ++number) {
         if (column == kLeft && 2 * drawn >= lines) {
             column += kColumn;
             y = axisTop + kAxisHeight;
@@ -345,6 +362,11 @@ double HistoryPicture::drawList() {
         y = drawEntry(number, column, y);
         drawn += linesOf(entries[number - 1]).size() + 1;
         bottom = std::max(bottom, y);
+    }
+    if (entries.size() > most) {
+        const std::string more = std::to_string(entries.size() - most) + " more: see --json";
+        sheet.write("and " + more, {kLeft, bottom + 14, 12, kQuiet});
+        bottom += kLine;
     }
     return bottom;
 }

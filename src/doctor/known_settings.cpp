@@ -70,4 +70,8 @@ bool isDangerous(const KnownSetting& setting) {
     }
 }
 
+bool isOfBackEnd(std::string_view key) {
+    return key == "EXTERNAL_IP" || key == "EXTERNAL_HTTP_PORT" || key == "EXTERNAL_HTTPS_PORT";
+}
+
 }  // namespace pelorus::doctor

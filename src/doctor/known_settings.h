@@ -40,6 +40,9 @@ const std::vector<KnownSetting>& knownSettings();
 /// STATIC_ONLY_KEYS.
 [[nodiscard]] bool isDangerous(const KnownSetting& setting);
 
+/// True for what the local back end keeps in the settings for itself.
+[[nodiscard]] bool isOfBackEnd(std::string_view key);
+
 }  // namespace pelorus::doctor
 
 #endif

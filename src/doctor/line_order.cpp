@@ -49,7 +49,7 @@ void LineOrder::take(std::string_view text) {
 }
 
 void LineOrder::meet(std::string_view host) {
-    constexpr std::size_t kMostHosts = 16;
+    constexpr std::size_t kMostHosts = 1000;
     lastHost = host;
     if (met.size() < kMostHosts) met.insert(lastHost);
 }

@@ -464,6 +464,11 @@ void LogStory::finish(Evidence& evidence) {
         evidence.add(Sign::MANUAL_MODE, Source::LOG, "the ports are forwarded by hand");
     }
     evidence.history.assign(history.periods().begin(), history.periods().end());
+    if (history.dropped() > 0) {
+        evidence.untold.push_back(
+            "the history before its last " + std::to_string(evidence.history.size()) +
+            " periods: " + std::to_string(history.dropped()) + " more are not kept");
+    }
 }
 
 }  // namespace pelorus::doctor

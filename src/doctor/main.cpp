@@ -36,7 +36,6 @@ namespace pelorus::doctor {
 
 namespace {
 
-constexpr int kNotWritten = 73;
 constexpr int kUnusableSettings = 2;
 
 Time now() {
@@ -55,6 +54,8 @@ Layout layout() {
     winsize size{};
     if (isTerminal && ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) {
         result.width = size.ws_col;
+        // One is left for the prompt.
+        if (size.ws_row > 0) result.height = size.ws_row - 1;
     }
     const char* noColour = std::getenv("NO_COLOR");
     const char* terminal = std::getenv("TERM");
@@ -120,8 +121,7 @@ Masks masksFor(const DoctorOptions& options,
                std::vector<std::string> hosts) {
     if (!options.share) return Masks{settings};
     if (const auto server = settings.find("SERVER_BASE_URL"); server != settings.end()) {
-        const std::string service = serviceHost(server->second);
-        hosts.push_back(service.substr(0, service.find_first_of("/:")));
+        hosts.push_back(serviceName(server->second));
     }
     return Masks{settings, PlaceMasks{hosts, options.logs}};
 }

@@ -130,44 +130,117 @@ bool looksLikeName(std::string_view word) {
     return isDomain && !isFileName(word);
 }
 
+// How the end of a name is found.
+enum class Ends {
+    WITH_WORD,
+    BEFORE,   // the text behind it, which follows the word
+    AT,       // the text behind it, whatever the name holds
+    AS_USER,  // the @ of a URL
+    AS_ITEM,  // of a list: its client or what others call it
+};
+
 // Where a name stands whatever it looks like.
 struct Place {
-    std::string_view before, behind;  // behind it; empty: the end of the word
+    std::string_view before, behind;
     const char* kind;
+    Ends ends = Ends::WITH_WORD;
     std::string_view in{};  // the text has this part somewhere
 };
 
-constexpr std::array<Place, 15> kPlaces{{{"connect to ", " port ", "host"},
-                                         {"in connection to ", ":", "host"},
-                                         {"resolve host: ", "", "host"},
-                                         {"resolve host address: ", "", "host"},
-                                         {"resolve: ", " (", "host"},
-                                         {"resolve proxy: ", "", "host"},
-                                         {"host name '", "'", "host"},
-                                         {"hostname '", "'", "host"},
-                                         {"host '", "'", "host"},
-                                         {"subject name '", "'", "host"},
-                                         {"subject name (", ")", "host"},
-                                         {"CN=", "", "host"},
-                                         {"/home/", "", "user"},
-                                         {"/Users/", "", "user"},
-                                         {" (", ")", "name", "gateway maps port "}}};
+constexpr std::string_view kTable = "gateway maps port ";
+
+constexpr std::array<Place, 26> kPlaces{{
+    {"connect to ", " port ", "host", Ends::BEFORE},
+    {"connect to ", ":", "host", Ends::BEFORE},
+    {" via ", ":", "host", Ends::BEFORE},
+    {"CONNECT to ", "", "host"},
+    {"proxy tunnel to ", "", "host"},
+    {"in connection to ", ":", "host", Ends::BEFORE},
+    {"resolve host: ", "", "host"},
+    {"resolve host address: ", "", "host"},
+    {"resolve: ", " (", "host", Ends::BEFORE},
+    {"resolve proxy: ", "", "host"},
+    {"host name '", "'", "host", Ends::AT},
+    {"hostname '", "'", "host", Ends::AT},
+    {"host '", "'", "host", Ends::AT},
+    {"subject name '", "'", "host", Ends::AT},
+    {"subject name (", ")", "host", Ends::AT},
+    {"[", "] Inactivity timeout", "host", Ends::BEFORE},
+    {"[", "] Peer Connection Initiated", "host", Ends::BEFORE},
+    {"CN=", "", "host"},
+    {"://", "@", "user", Ends::AS_USER},
+    {"://", "", "host"},
+    {"@", "", "host"},
+    {"/home/", "", "user"},
+    {"/Users/", "", "user"},
+    {" leads to ", "", "host", Ends::AS_ITEM, "the port wanted for internal port "},
+    {" to ", "", "host", Ends::AS_ITEM, kTable},
+    {" (", ")", "name", Ends::AS_ITEM, kTable},
+}};
+
+// What stands in a list of the gateway's entries: one is "80 to CLIENT (NAME)".
+std::size_t itemLength(const Place& place, std::string_view text) {
+    if (place.behind.empty()) {
+        std::size_t end = text.size();
+        for (const std::string_view next : {" (", ", ", "; "}) end = std::min(end, text.find(next));
+        return end;
+    }
+    for (std::size_t end = text.find(')'); end != text.npos; end = text.find(')', end + 1)) {
+        const std::string_view rest = text.substr(end + 1);
+        const bool isNext = startsWith(rest, ", ") && rest.size() > 2 &&
+                            (isDigit(rest[2]) || rest.substr(2) == "another device");
+        if (rest.empty() || isNext || startsWith(rest, "; ")) return end;
+    }
+    return endsWith(text, kCut) ? text.size() : 0;
+}
+
+std::size_t userLength(std::string_view text) {
+    const std::size_t end = text.find_first_of("@/?# \"'<>");
+    return end != text.npos && text[end] == '@' ? end : 0;
+}
 
 // What is named at a place of a text: its length, 0 if nothing is.
 std::size_t namedLength(const Place& place, std::string_view text, std::size_t at) {
     if (!endsWith(text.substr(0, at), place.before)) return 0;
     if (text.find(place.in) == text.npos) return 0;
     text.remove_prefix(at);
+    if (place.ends == Ends::AS_ITEM) return itemLength(place, text);
+    if (place.ends == Ends::AS_USER) return userLength(text);
     const auto* const end = std::find_if_not(text.begin(), text.end(), [](char letter) {
         return isWordLetter(letter) && letter != ':';
     });
     const auto length = static_cast<std::size_t>(end - text.begin());
-    if (place.behind.empty()) return length;
-    // Quoted names may hold anything.
-    const std::size_t behind = text.find(place.behind);
-    const bool isQuoted = place.behind.size() == 1 && place.behind != ":";
-    if (behind != text.npos && (isQuoted || behind == length)) return behind;
-    return endsWith(text, kCut) && (isQuoted || length == text.size()) ? text.size() : 0;
+    if (place.ends == Ends::WITH_WORD) return length;
+    const bool isQuoted = place.ends == Ends::AT;
+    const std::string_view rest = text.substr(length);
+    // Behind the colon there is a port, or it is the sentence's.
+    const bool isPort = place.behind != ":" || (rest.size() > 1 && isDigit(rest[1]));
+    if (isQuoted && text.find(place.behind) != text.npos) return text.find(place.behind);
+    if (!isQuoted && startsWith(rest, place.behind) && isPort) return length;
+    return endsWith(text, kCut) && (isQuoted || rest.empty()) ? text.size() : 0;
+}
+
+// Length of the IPv6 address at a place of a word, 0 if there is none. A port may follow.
+std::size_t ipv6Length(std::string_view word, std::size_t at) {
+    const std::string_view rest = word.substr(at);
+    const auto* const end = std::find_if_not(rest.begin(), rest.end(), [](char letter) {
+        return isOneOf(letter, ".:") || std::isxdigit(static_cast<unsigned char>(letter)) != 0;
+    });
+    constexpr std::size_t kLongest = INET6_ADDRSTRLEN;
+    auto length = std::min(static_cast<std::size_t>(end - rest.begin()), kLongest);
+    for (; length > 1; --length) {
+        const bool isWhole = length == rest.size() || !isLetterOrDigit(rest[length]);
+        if (isWhole && ipv6(rest.substr(0, length))) return length;
+    }
+    return 0;
+}
+
+// Too little for a mask, but the beginning of an address.
+bool isBeginning(std::string_view text) {
+    constexpr std::size_t kGroup = 4;
+    const auto isHex = [](unsigned char letter) { return std::isxdigit(letter) != 0; };
+    return text.size() <= kGroup && std::all_of(text.begin(), text.end(), isHex) &&
+           std::any_of(text.begin(), text.end(), isDigit);
 }
 
 }  // namespace
@@ -200,7 +273,7 @@ std::string PlaceMasks::hide(std::string text) {
         if (length == 0) {
             const auto* const end = std::find_if_not(rest.begin(), rest.end(), isWordLetter);
             length = static_cast<std::size_t>(end - rest.begin());
-            result += length == 0 ? std::string{rest.front()} : hideWord(rest.substr(0, length));
+            result += length == 0 ? std::string{rest.front()} : hideWordAt(text, at, length);
         }
         at += std::max<std::size_t>(length, 1);
     }
@@ -218,46 +291,98 @@ std::string PlaceMasks::hideNamed(const std::string& kind, std::string_view name
     return isQuiet ? hidden : replacement(kind, lowerCase(name));
 }
 
+// What stands around a word tells what it is.
+std::string PlaceMasks::hideWordAt(std::string_view text, std::size_t at, std::size_t length) {
+    const std::string_view word = text.substr(at, length);
+    if (startsWith(text.substr(at + length), "@")) return replacement("user", lowerCase(word));
+    // The tunnel's client puts the port behind it, also behind a short form.
+    const std::size_t port = word.rfind(':');
+    if (endsWith(text.substr(0, at), "[AF_INET6]") && port != word.npos &&
+        ipv6(word.substr(0, port))) {
+        return hideWord(word.substr(0, port)) + std::string{word.substr(port)};
+    }
+    return hideWord(word);
+}
+
 std::string PlaceMasks::hideWord(std::string_view word) {
     if (word.empty()) return "";
-    if (const auto address = ipv6(word)) {
-        const std::string kind = kindOf(*address);
-        return kind.empty() ? std::string{word} : replacement(kind, canonical(*address));
-    }
-    if (endsWith(word, kCut)) {
-        const std::string_view left = word.substr(0, word.size() - kCut.size());
-        // What is left of an address or a name would be told.
-        return std::any_of(left.begin(), left.end(),
-                           [](char letter) { return isOneOf(letter, ".:"); })
-                   ? std::string{kCut}
-                   : hideWord(left).append(kCut);
-    }
+    if (ipv6(word)) return hideParts(word);
+    if (endsWith(word, kCut)) return hideCut(word.substr(0, word.size() - kCut.size()));
     // A full stop or a colon around it belongs to the sentence.
     if (isOneOf(word.back(), ".:")) {
         return hideWord(word.substr(0, word.size() - 1)) + word.back();
     }
     if (isOneOf(word.front(), ".-")) return word.front() + hideWord(word.substr(1));
-    if (isMac(word)) {
-        std::string place = lowerCase(word);
-        std::replace(place.begin(), place.end(), '-', ':');
-        return replacement("mac", place);
-    }
     const std::string name = lowerCase(word.substr(0, word.find(':')));
-    if (isHost(name)) return replacement("host", name) + std::string{word.substr(name.size())};
-    return hideAddresses(word);
+    if (isHost(name)) return replacement("host", name) + hideParts(word.substr(name.size()));
+    return hideParts(word);
 }
 
-// IPv4 addresses: a port may follow, and names contain them.
-std::string PlaceMasks::hideAddresses(std::string_view word) {
+// What is left of an address or a name would be told.
+std::string PlaceMasks::hideCut(std::string_view left) {
+    constexpr std::size_t kLeastOfHost = 3;
+    const auto isLost = [](char letter) { return isOneOf(letter, ".:"); };
+    if (std::any_of(left.begin(), left.end(), isLost) || isBeginning(left)) {
+        return std::string{kCut};
+    }
+    const std::string name = lowerCase(left);
+    const auto host = known.lower_bound(name);
+    const bool isPart =
+        name.size() >= kLeastOfHost && host != known.end() && startsWith(*host, name);
+    return (isPart ? replacement("host", *host) : hideWord(left)).append(kCut);
+}
+
+// Addresses and known names: others contain them, and a port may follow.
+std::string PlaceMasks::hideParts(std::string_view word) {
     std::string result;
     for (std::size_t at = 0; at < word.size();) {
-        const std::size_t length = ipv4Length(word, at);
-        const std::string place{word.substr(at, std::max<std::size_t>(length, 1))};
-        const std::string kind = length == 0 ? "" : kindOf(place);
-        result += kind.empty() ? place : replacement(kind, place);
-        at += place.size();
+        const Part part = partAt(word, at);
+        const std::size_t length = std::max<std::size_t>(part.length, 1);
+        const bool isShown = part.length == 0 || part.kind.empty();
+        result +=
+            isShown ? std::string{word.substr(at, length)} : replacement(part.kind, part.place);
+        at += length;
     }
     return result;
+}
+
+PlaceMasks::Part PlaceMasks::partAt(std::string_view word, std::size_t at) const {
+    constexpr std::size_t kMacLength = 17;
+    if (at > 0 && isLetterOrDigit(word[at - 1])) return {};
+    const std::string_view rest = word.substr(at);
+    if (const std::size_t length = ipv6Length(word, at); length > 0) {
+        const auto address = ipv6(rest.substr(0, length));
+        return {length, kindOf(*address), canonical(*address)};
+    }
+    if (isMac(rest.substr(0, kMacLength)) &&
+        (rest.size() == kMacLength || !isLetterOrDigit(rest[kMacLength]))) {
+        std::string place = lowerCase(rest.substr(0, kMacLength));
+        std::replace(place.begin(), place.end(), '-', ':');
+        return {kMacLength, "mac", place};
+    }
+    if (const std::size_t length = ipv4Length(word, at); length > 0) {
+        const std::string place{rest.substr(0, length)};
+        return {length, kindOf(place), place};
+    }
+    Part longest;
+    for (const std::string& host : known) {
+        const bool isHere = startsWith(lowerCase(rest.substr(0, host.size())), host) &&
+                            (rest.size() == host.size() || !isLetterOrDigit(rest[host.size()]));
+        if (isHere && host.size() > longest.length) longest = {host.size(), "host", host};
+    }
+    return longest;
+}
+
+bool PlaceMasks::hidesAround(std::string_view text, std::size_t at, std::size_t length) const {
+    const std::string_view part = text.substr(at, length);
+    if (!std::all_of(part.begin(), part.end(), isWordLetter)) return false;
+    std::size_t begin = at, end = at + length;
+    while (begin > 0 && isWordLetter(text[begin - 1])) --begin;
+    while (end < text.size() && isWordLetter(text[end])) ++end;
+    if (end - begin == length) return false;
+    PlaceMasks trial = *this;
+    const std::string hidden = lowerCase(trial.hideWord(text.substr(begin, end - begin)));
+    return hidden.find(lowerCase(part)) == hidden.npos;
 }
 
 bool PlaceMasks::isHost(const std::string& name) const {

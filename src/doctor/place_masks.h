@@ -2,6 +2,7 @@
 #ifndef PELORUS_DOCTOR_PLACE_MASKS_H
 #define PELORUS_DOCTOR_PLACE_MASKS_H
 
+#include <cstddef>
 #include <map>
 #include <set>
 #include <string>
@@ -16,8 +17,9 @@ namespace pelorus::doctor {
 /// "private-address-1", "shared-address-1", "mac-1", "host-1", "user-1" or "name-1". Addresses that
 /// tell nothing stay: those of the device to itself, and netmasks.
 ///
-/// A host name is a known one, one that a message of libcurl or of the tunnel's client names, and
-/// every word with a dot that may be one and does not look like the name of a file.
+/// A host name is a known one, also within a longer word, one that a URL, a message of libcurl or
+/// of the tunnel's client or the gateway's table names, and every word with a dot that may be one
+/// and does not look like the name of a file.
 class PlaceMasks {
 public:
     /// With the names of hosts that are known, and the paths of logs as they were given.
@@ -26,9 +28,22 @@ public:
     /// @p text without any of it.
     [[nodiscard]] std::string hide(std::string text);
 
+    /// True when hide() leaves nothing of the @p length characters at @p at because they are part
+    /// of a longer name or address.
+    [[nodiscard]] bool hidesAround(std::string_view text, std::size_t at, std::size_t length) const;
+
 private:
+    // What stands at a place of a word; without a kind it tells nothing.
+    struct Part {
+        std::size_t length = 0;
+        std::string kind, place;
+    };
+
+    std::string hideWordAt(std::string_view text, std::size_t at, std::size_t length);
     std::string hideWord(std::string_view word);
-    std::string hideAddresses(std::string_view word);
+    std::string hideCut(std::string_view left);
+    std::string hideParts(std::string_view word);
+    [[nodiscard]] Part partAt(std::string_view word, std::size_t at) const;
     std::string hideNamed(const std::string& kind, std::string_view name);
     [[nodiscard]] bool isHost(const std::string& name) const;
     std::string replacement(const std::string& kind, const std::string& place);

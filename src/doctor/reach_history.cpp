@@ -25,7 +25,10 @@ void ReachHistory::add(Period next) {
     const bool goesOn =
         !all.empty() && all.back().reach == reached && all.back().address == next.address;
     if (!goesOn) all.push_back(std::move(next));
-    if (all.size() > kMostPeriods) all.pop_front();
+    if (all.size() > kMostPeriods) {
+        all.pop_front();
+        ++forgotten;
+    }
     passing = reached == Reach::NOT_REACHED;
 }
 

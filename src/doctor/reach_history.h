@@ -2,6 +2,7 @@
 #ifndef PELORUS_DOCTOR_REACH_HISTORY_H
 #define PELORUS_DOCTOR_REACH_HISTORY_H
 
+#include <cstddef>
 #include <deque>
 #include <string>
 #include <string_view>
@@ -49,11 +50,14 @@ public:
 
     /// Oldest first.
     [[nodiscard]] const std::deque<Period>& periods() const { return all; }
+    /// How many periods before these are not kept.
+    [[nodiscard]] std::size_t dropped() const { return forgotten; }
 
 private:
     [[nodiscard]] bool isInBetween(Reach next, Time when) const;
 
     std::deque<Period> all;
+    std::size_t forgotten = 0;
     bool passing = false;  // the last period began in this cycle, and may not last
 };
 

@@ -2,23 +2,30 @@
 #ifndef PELORUS_DOCTOR_SECRET_MASKS_H
 #define PELORUS_DOCTOR_SECRET_MASKS_H
 
+#include <cstddef>
+#include <functional>
 #include <map>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace pelorus::doctor {
 
 /// Replaces device ids, authorisations and subdomains by their masks: the values of DEVICEID,
-/// DEVICEAUTH and SUBDOMAIN in every form, even cut off by three dots, and those of other devices
-/// where URLs, answers and public names show them. A value of less than three characters stays: it
-/// is part of too many words.
+/// DEVICEAUTH and SUBDOMAIN, also as URLs, XML and JSON encode them and cut off by three dots, and
+/// those of other devices where URLs, answers and public names show them. A value of less than three
+/// characters stays: it is part of too many words.
 class SecretMasks {
 public:
     /// With @p settings as the daemon merges them.
     explicit SecretMasks(const std::map<std::string, std::string>& settings);
 
+    /// True for a value at a place of a text that is left for others to hide.
+    using Exception =
+        std::function<bool(std::string_view text, std::size_t at, std::size_t length)>;
+
     /// @p text without any of them.
-    [[nodiscard]] std::string hide(std::string text) const;
+    [[nodiscard]] std::string hide(std::string text, const Exception& isKept = {}) const;
 
 private:
     struct Secret {

@@ -47,6 +47,16 @@ std::string inCapitals(std::string key) {
     return key;
 }
 
+// Of what the daemon does not know, only what looks like a key: the rest may be a secret.
+std::string shownKey(const std::string& key) {
+    const std::size_t start = key.rfind('#', 0) == 0 ? 1 : 0;
+    constexpr const char* kLetters = "ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_";
+    const std::size_t end = std::min(key.find_first_not_of(kLetters, start), key.size());
+    const bool isKey = end > start && (end == key.size() ||
+                                       std::isalnum(static_cast<unsigned char>(key[end])) == 0);
+    return isKey ? key.substr(0, end) : "this key";
+}
+
 class SettingsCheck {
 public:
     explicit SettingsCheck(const std::string& staticFile)
@@ -136,7 +146,7 @@ private:
         for (const SettingsLine& line : settings.lines) {
             if (line.fate == MergedLine::Fate::RESERVED) {
                 remark(place(line),
-                       shownText(line.key) + " is ignored: only the static file sets it");
+                       shownKey(line.key) + " is ignored: only the static file sets it");
             } else if (line.fate == MergedLine::Fate::FULL) {
                 problem(place(line), "is ignored: there are " + std::to_string(kMostSettings) +
                                          " settings already");
@@ -156,24 +166,23 @@ private:
     }
 
     void checkKey(const SettingsLine& line) {
-        if (findKnownSetting(line.key) != nullptr) return;
-        const std::string shown = shownText(line.key);
+        if (findKnownSetting(line.key) != nullptr || isOfBackEnd(line.key)) return;
         const std::string plain = trimmed(line.key);
         if (plain != line.key && findKnownSetting(plain) != nullptr) {
             problem(place(line), "the blank in front of = makes another key than " + plain);
         } else if (line.key.front() == '#') {
-            remark(place(line), "# begins no comment: this sets the key " + shown);
+            remark(place(line), "# begins no comment: it sets " + shownKey(line.key));
         } else if (findKnownSetting(inCapitals(plain)) != nullptr) {
-            problem(place(line), shown + " is another key than " + inCapitals(plain));
+            problem(place(line), plain + " is another key than " + inCapitals(plain));
         } else {
-            remark(place(line), "the daemon does not know " + shown);
+            remark(place(line), "the daemon does not know " + shownKey(line.key));
         }
     }
 
     void checkEarlier(const SettingsLine& line, const SettingsLine& earlier) {
         const bool addsUp = line.key == "STATIC_ONLY_KEYS";
         if (addsUp || earlier.value == line.value) return;
-        std::string text = shownText(line.key);
+        std::string text = shownKey(line.key);
         const KnownSetting* known = findKnownSetting(line.key);
         if (known != nullptr && isShowable(*known)) {
             text += "=" + shownText(line.value, kMostOfValue) + " replaces " +
@@ -238,15 +247,15 @@ private:
         for (const auto& [key, line] : inFile) {
             const auto other = inCopy.find(key);
             if (other == inCopy.end()) {
-                remark(place(*line), shownText(key) + " is not in the copy, which counts");
+                remark(place(*line), shownKey(key) + " is not in the copy, which counts");
             } else if (other->second->value != line->value) {
-                remark(place(*line), shownText(key) + " differs from " + place(*other->second) +
-                                         ", which counts");
+                remark(place(*line),
+                       shownKey(key) + " differs from " + place(*other->second) + ", which counts");
             }
         }
         for (const auto& [key, line] : inCopy) {
             if (inFile.count(key) == 0) {
-                remark(place(*line), shownText(key) + " is only in the copy");
+                remark(place(*line), shownKey(key) + " is only in the copy");
             }
         }
     }

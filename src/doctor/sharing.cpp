@@ -1,10 +1,21 @@
 #include "doctor/sharing.h"
 
+#include <string_view>
+#include <utility>
+
 namespace pelorus::doctor {
 
 std::string Masks::hide(std::string text) {
-    text = secrets.hide(std::move(text));
-    return places ? places->hide(std::move(text)) : text;
+    if (!places) return secrets.hide(std::move(text));
+    // Masked first, what is also part of an address or a name would leave the rest of that.
+    bool isAnyKept = false;
+    const auto isKept = [&](std::string_view whole, std::size_t at, std::size_t length) {
+        const bool isPart = places->hidesAround(whole, at, length);
+        isAnyKept |= isPart;
+        return isPart;
+    };
+    text = places->hide(secrets.hide(std::move(text), isKept));
+    return isAnyKept ? secrets.hide(std::move(text)) : text;
 }
 
 void Masks::hideIn(Diagnosis& diagnosis) {

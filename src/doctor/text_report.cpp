@@ -17,9 +17,7 @@ namespace {
 using Lines = std::vector<std::string>;
 using Verdict = Check::Verdict;
 
-constexpr std::size_t kScreen = 40;  // lines
 constexpr std::size_t kMostFacts = 3;
-constexpr std::size_t kMostFurtherCauses = 3;
 constexpr std::size_t kVerdictWidth = 9;
 constexpr std::size_t kSourceWidth = 8;
 constexpr const char* kEndOfColour = "\033[0m";
@@ -35,8 +33,15 @@ const char* headlineColour(Reach reach) {
 }
 
 std::string withoutFullStop(std::string text) {
-    while (!text.empty() && (text.back() == '.' || text.back() == ' ')) text.pop_back();
+    constexpr std::string_view kCut = "...";
+    const bool isCut = text.size() >= kCut.size() &&
+                       text.compare(text.size() - kCut.size(), kCut.size(), kCut) == 0;
+    while (!isCut && !text.empty() && (text.back() == '.' || text.back() == ' ')) text.pop_back();
     return text;
+}
+
+std::string withFullStop(const std::string& text) {
+    return !text.empty() && text.back() == '.' ? text : text + ".";
 }
 
 void append(Lines& lines, const Lines& more) {
@@ -47,11 +52,14 @@ void append(Lines& lines, const Lines& more) {
 struct Compactness {
     bool joinsNeighbours;
     bool joinsAll;
-    std::size_t mostPeriods;
+    bool showsOk;
+    std::size_t mostPeriods, mostFurtherCauses;
 };
 
-constexpr Compactness kCompactness[]{
-    {false, false, 8}, {true, false, 8}, {true, true, 8}, {true, true, 3}};
+constexpr Compactness kCompactness[]{{false, false, true, 8, 3}, {true, false, true, 8, 3},
+                                     {true, true, true, 8, 3},   {true, true, true, 3, 3},
+                                     {true, true, true, 3, 1},   {true, true, true, 1, 0},
+                                     {true, true, false, 1, 0}};
 
 class TextReport {
 public:
@@ -60,13 +68,14 @@ public:
           width{
               static_cast<std::size_t>(std::clamp(layout.width, kLeastTextWidth, kMostTextWidth))},
           colours{layout.colours},
+          height{static_cast<std::size_t>(std::max(layout.height, kLeastTextHeight))},
           today{layout.today.value_or(subject.now)} {}
 
     [[nodiscard]] std::string text() const {
         Lines lines;
         for (const Compactness& compactness : kCompactness) {
             lines = report(compactness);
-            if (lines.size() <= kScreen) break;
+            if (lines.size() <= height) break;
         }
         std::string text;
         for (const std::string& line : lines) text += line + '\n';
@@ -79,7 +88,7 @@ private:
     [[nodiscard]] std::string state() const;
     [[nodiscard]] std::string sinceWhen() const;
     [[nodiscard]] std::string howBefore() const;
-    [[nodiscard]] Lines causes() const;
+    [[nodiscard]] Lines causes(std::size_t mostFurther) const;
     [[nodiscard]] std::string sentenceWithFacts(const NamedCause& named, std::size_t most) const;
     [[nodiscard]] std::string factWithSource(const Fact& fact) const;
     [[nodiscard]] std::string nextCycle() const;
@@ -94,6 +103,7 @@ private:
     const Diagnosis& diagnosis;
     std::size_t width;
     bool colours;
+    std::size_t height;
     Time today;
 };
 
@@ -173,10 +183,10 @@ std::string TextReport::sentenceWithFacts(const NamedCause& named, std::size_t m
         text += separator + fact;
         separator = "; ";
     }
-    return text + ".";
+    return withFullStop(text);
 }
 
-Lines TextReport::causes() const {
+Lines TextReport::causes(std::size_t mostFurther) const {
     const std::vector<NamedCause>& all = diagnosis.causes;
     const bool isDirect = diagnosis.reach == Reach::DIRECT;
     Lines lines;
@@ -191,7 +201,7 @@ Lines TextReport::causes() const {
     }
     std::string unnamed;
     for (std::size_t index = 1; index < all.size(); ++index) {
-        if (index <= kMostFurtherCauses) {
+        if (index <= mostFurther) {
             append(lines, hang("Also   ", sentenceWithFacts(all[index], 1), width));
         } else {
             unnamed += (unnamed.empty() ? "" : ", ") + std::string{all[index].cause->name};
@@ -237,7 +247,12 @@ std::vector<Check> TextReport::checksToShow(const Compactness& compactness) cons
     }
     if (!compactness.joinsNeighbours) return all;
     std::vector<Check> shown;
+    std::size_t hidden = 0;
     for (Check& check : all) {
+        if (!compactness.showsOk && check.verdict == Verdict::OK) {
+            ++hidden;
+            continue;
+        }
         Check* before = shown.empty() ? nullptr : &shown.back();
         if (before != nullptr && before->verdict == Verdict::OK && check.verdict == Verdict::OK &&
             before->source == check.source &&
@@ -246,6 +261,10 @@ std::vector<Check> TextReport::checksToShow(const Compactness& compactness) cons
         } else {
             shown.push_back(std::move(check));
         }
+    }
+    if (hidden > 0) {
+        const std::string text = std::to_string(hidden) + " more that are ok: see --json";
+        shown.push_back({Verdict::OK, Source::NOW, text});
     }
     return shown;
 }
@@ -273,8 +292,9 @@ Lines TextReport::checks(const Compactness& compactness) const {
 
 Lines TextReport::report(const Compactness& compactness) const {
     Lines lines;
-    for (const Lines& part : {headline(), causes(), checks(compactness),
-                              historyText(diagnosis, compactness.mostPeriods, width, today)}) {
+    for (const Lines& part :
+         {headline(), causes(compactness.mostFurtherCauses), checks(compactness),
+          historyText(diagnosis, compactness.mostPeriods, width, today)}) {
         if (part.empty()) continue;
         if (!lines.empty()) lines.emplace_back();
         append(lines, part);

@@ -52,6 +52,11 @@ std::string serviceHost(const std::string& baseUrl) {
     return baseUrl.substr(slash + 2);
 }
 
+std::string serviceName(const std::string& baseUrl) {
+    const std::string authority = authorityOf(serviceHost(baseUrl), 0);
+    return authority.substr(0, authority.find(':'));
+}
+
 std::string domainOfNames(const std::string& baseUrl) {
     const std::size_t dot = baseUrl.find('.');
     return dot == std::string::npos ? ".kavra.example" : baseUrl.substr(dot);

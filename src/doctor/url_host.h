@@ -20,6 +20,9 @@ struct HostAndPort {
 /// slash and the character after it, a port and a path included. Empty when nothing is left of use.
 [[nodiscard]] std::string serviceHost(const std::string& baseUrl);
 
+/// The name of that host, without a user, a port and a path. Empty when nothing is left of use.
+[[nodiscard]] std::string serviceName(const std::string& baseUrl);
+
 /// The domain of the device's public names, with its leading dot.
 [[nodiscard]] std::string domainOfNames(const std::string& baseUrl);
 

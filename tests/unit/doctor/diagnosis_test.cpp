@@ -347,6 +347,32 @@ TEST(Diagnosis, SaysSinceWhenAtLeast) {
     }
 }
 
+TEST(Diagnosis, TheHistoryOfADaemonThatIsGoneEndsWithItsLog) {
+    const auto at = [](int seconds) { return Time{std::chrono::seconds{seconds}}; };
+    const struct {
+        Sign sign;
+        Reach last;
+        std::size_t periods;
+        bool hasStart;
+    } rows[]{{S::DAEMON_GONE, Reach::DIRECT, 2, false},
+             {S::DAEMON_GONE, Reach::NOT_RUNNING, 1, false},
+             {S::DAEMON_RUNS, Reach::DIRECT, 1, true}};
+    for (const auto& row : rows) {
+        Evidence evidence;
+        evidence.now = at(500);
+        evidence.logEnd = at(300);
+        evidence.daemon.since = at(50);
+        evidence.history = {{row.last, at(100), "203.0.113.7", ""}};
+        evidence.add(row.sign, Source::NOW, "fact");
+        const Diagnosis diagnosis = diagnose(evidence);
+        EXPECT_EQ(diagnosis.daemon.since.has_value(), row.hasStart);
+        ASSERT_EQ(diagnosis.history.size(), row.periods);
+        if (row.periods == 1) continue;
+        EXPECT_EQ(diagnosis.history.back().reach, Reach::NOT_RUNNING);
+        EXPECT_EQ(diagnosis.history.back().since, at(300));
+    }
+}
+
 TEST(Diagnosis, WithoutALogThereIsNoEndOfIt) {
     Evidence evidence;
     evidence.fromElsewhere = true;

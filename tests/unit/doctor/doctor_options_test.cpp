@@ -35,8 +35,15 @@ TEST(DoctorOptions, AreReadOrRefusedInOneLine) {
     unlink(link.c_str());
     ASSERT_EQ(symlink(log.c_str(), link.c_str()), 0);
     const std::string overwrites = "--log a --log " + log + " --svg " + link;
+    const std::string notPicture = "--svg " + log;
+    const std::string drawn = testing::TempDir() + "pelorus-doctor-options.svg";
+    std::ofstream{drawn} << "<svg ";
+    const std::string picture = "--svg " + drawn, picturePath = "svg=" + drawn + " ";
     const Row rows[]{{"", "", ""},
                      {overwrites.c_str(), "", "--svg would overwrite a log"},
+                     {notPicture.c_str(), "", "--svg would overwrite a file that is no picture"},
+                     {picture.c_str(), picturePath.c_str(), ""},
+                     {"--s", "", "ambiguous option: --s"},
                      {"--log a --log - --no-probes --json --svg b --share",
                       "log=a log=- files json share svg=b ", ""},
                      {"--ask-service --log=c", "log=c ask ", ""},
@@ -69,6 +76,17 @@ TEST(DoctorOptions, AreReadOrRefusedInOneLine) {
                                      ", see pelorus-doctor --help\n");
         }
     }
+}
+
+TEST(DoctorOptions, HelpThatCannotBeWrittenIsAFailure) {
+    std::string name = "pelorus-doctor", option = "--help";
+    char* arguments[]{name.data(), option.data(), nullptr};
+    EXPECT_EXIT(
+        {
+            const bool isFull = std::freopen("/dev/full", "w", stdout) != nullptr;
+            std::_Exit(isFull ? parseDoctorOptions(2, arguments).exitStatus.value_or(0) : 1);
+        },
+        testing::ExitedWithCode(kNotWritten), "cannot write to standard output");
 }
 
 std::string readFile(const std::string& name) {

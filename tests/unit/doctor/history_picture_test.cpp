@@ -45,6 +45,19 @@ TEST(HistoryPicture, ShowsSharesCausesAndWhenTheySetIn) {
     EXPECT_EQ(count(texts, "1") + count(texts, "2"), 4U) << "on the band and in the list";
 }
 
+TEST(HistoryPicture, ListsManyCausesInBounds) {
+    Diagnosis diagnosis = relayed();
+    diagnosis.history.clear();
+    for (int number = 0; number < 600; ++number) {
+        const std::string text = number < 100 ? "cause " + std::to_string(number) : "no answer";
+        diagnosis.history.push_back({Reach::RELAYED, diagnosis.now - minutes{600 - number}, "",
+                                     text + " after " + std::to_string(number) + " ms"});
+    }
+    const auto texts = textsOf(historyPicture(diagnosis));
+    EXPECT_EQ(count(texts, "cause 39 after some ms"), 1U);
+    EXPECT_EQ(texts.back(), "and 61 more: see --json");
+}
+
 constexpr Reach kAll[]{Reach::DIRECT,       Reach::RELAYED,     Reach::NOT_REACHED,
                        Reach::SWITCHED_OFF, Reach::NOT_RUNNING, Reach::UNKNOWN};
 

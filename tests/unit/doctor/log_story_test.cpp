@@ -438,6 +438,8 @@ TEST(LogStory, KeepsTheLast2000Periods) {
     Evidence evidence;
     story.finish(evidence);
     EXPECT_EQ(evidence.history.size(), 2000U);
+    ASSERT_EQ(evidence.untold.size(), 1U);
+    EXPECT_EQ(evidence.untold.front().rfind("the history before its last 2000 periods: ", 0), 0U);
     EXPECT_EQ(evidence.history.back().since, at(299909));
 }
 

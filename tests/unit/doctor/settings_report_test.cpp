@@ -135,11 +135,15 @@ TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
     writeFile("run/dynamicconfig.ini", dynamic +
                                            "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
                                            "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=here\n");
-    const auto report = check("#DEVICETYPE=1\nOTHER=1\nOTHER=1\n");
+    const auto report = check(
+        "#DEVICETYPE=1\nOTHER=1\nOTHER=1\nEXTERNAL_IP=1\n"
+        "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n");
     const std::string all = ::testing::PrintToString(report.remarks);
     EXPECT_EQ(all.find("OTHER"), all.rfind("OTHER")) << "once";
+    EXPECT_FALSE(holds(all, "s3cret") || holds(all, "EXTERNAL_IP")) << all;
     for (const char* part :
-         {"# begins no comment: this sets the key #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
+         {"# begins no comment: it sets #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
+          "does not know DEVICEAUTH\"", "it sets #OLDAUTH\"", "does not know this key",
           "STARTCMD is ignored: only the static", "the daemon does not know EXTRA",
           "EXTRA is only in the copy", "the daemon does not know OTHER",
           "DEFAULT_PORTS_ONLY=TRUE replaces FALSE of line ",

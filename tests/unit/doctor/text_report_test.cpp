@@ -93,6 +93,14 @@ TEST(TextReport, FitsTheTerminal) {
     EXPECT_NE(text.find("PROBLEM  gateway has a shared address"), std::string::npos);
     EXPECT_NE(text.find("; 59 "), std::string::npos);
     EXPECT_NE(text.find("(54 earlier"), std::string::npos);
+    for (Check& check : diagnosis.checks) check.text += " " + std::string(60, 'x');
+    Layout small;
+    small.height = 23;
+    const auto lines = linesOf(diagnosis, small);
+    EXPECT_LE(lines.size(), 23U);
+    const std::string hidden = "ok       62 more that are ok: see --json";
+    const auto isHidden = [&](const std::string& line) { return line.rfind(hidden, 0) == 0; };
+    EXPECT_EQ(std::count_if(lines.begin(), lines.end(), isHidden), 1);
 }
 
 TEST(TextReport, ColoursOnlyChangeTheLook) {
@@ -110,10 +118,12 @@ TEST(TextReport, NamesWhatLiesBehindTheCause) {
     for (int number = 0; number < 5; ++number) {
         diagnosis.causes.push_back({&other, {{Source::SETTINGS, "a fact.", {}}}});
     }
+    diagnosis.causes[2].proofs.front() = {Source::NOW, "it was cut...", {}};
     const std::string text = textReport(diagnosis, {});
     EXPECT_NE(text.find("Also   Two things: one of them is odd; a fact (settings).\n"),
               std::string::npos)
         << text;
+    EXPECT_NE(text.find("is odd; it was cut...\n"), std::string::npos) << text;
     EXPECT_NE(text.find("And    other, other.\n"), std::string::npos);
 }
 

@@ -152,7 +152,7 @@ Rules gatewayRules() {
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the router has no internet address"),
     info("ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.")
         .clears(kGateway),
-    info("ConnectionManager::forwardPort - forwarding internal port: %d ").happens(LogEvent::AUTOMATIC).clears(kRefusals),
+    info("ConnectionManager::forwardPort - forwarding internal port: %d").happens(LogEvent::AUTOMATIC).clears(kRefusals),
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
         .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),

@@ -22,7 +22,7 @@ ROWS = (
     Row("two-routers", "An own router behind the provider's box, and an access point that answers "
         "as a gateway (D10, A3)",
         GatewaySetup(others=(access_point("192.168.1.2"),)), ASK_PROVIDER, RELAYED,
-        OTHER_ADDRESS, requests=80,
+        OTHER_ADDRESS, requests=80, cause="wrong-gateway-answers",
         between={0: lambda lab: lab.provider.insert("100.64.3.4")}),
     Row("old-router", "Slow, accepts only permanent mappings, forgets leases, and has no room, "
         "which it does not say (P13, T2, P1, H13)",

@@ -109,7 +109,7 @@ ROWS = (
         seconds=100, longest=100, between={0: fall_silent}),
     Row("N4b", "Prohibits NAT-PMP (ICMP)", _MINIUPNPD, BY_HAND, RELAYED,
         "retrieveExternalIP  failed to fetched external IP address, errno 113",
-        between={0: _prohibit}),
+        between={0: _prohibit}, cause="no-gateway-protocol"),
     Row("N5", "Grants the next free port instead of one that is taken", _MINIUPNPD, NOTHING,
         why="mapped public port 9093 to localport 80 ", left=(_SEVENTY,),
         between={0: lambda lab: lab.neighbour.hold(9091, 80)}),
@@ -138,7 +138,7 @@ ROWS = (
     Row("N13", "Answers from an odd port", _granting(Grant(_same, _A_WEEK, source=5350)), BY_HAND,
         RELAYED, NO_NATPMP, seconds=100, longest=100),
     Row("N14", "Answers with two bytes", _delivering(_cut(2, lambda _: True)), BY_HAND, RELAYED,
-        NO_NATPMP),
+        NO_NATPMP, cause="no-gateway-protocol"),
     Row("N14b", "Answers requests for a mapping with eight bytes", _delivering(_cut(8, _maps)),
         BY_HAND, RELAYED, NO_MAPPING, seconds=450, longest=450, requests=5000),
 )

@@ -76,6 +76,8 @@ def play(lab: Lab, row: Row) -> Played:
         _assert_outcome(lab, row, seen)
         _assert_proven(lab)
         assert not row.played or row.played(lab), "the behaviour was not met"
+        if lab.asks_doctor:
+            lab.moment("", row.cause)
     _assert_stops(lab, row)
     shows = [bool(row.why), bool(row.between), row.gateway.needs_miniupnpd]
     assert row.played or shows.count(True) >= 2 or any(

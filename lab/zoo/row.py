@@ -48,7 +48,8 @@ class Row:
     What is in `between` happens in the pause after the cycle of that number; 0 is before the first.
 
     `played` tells after the last cycle if the device has met the behaviour; the lab's own servers
-    know it themselves. Unless `https`, only HTTP comes through the gateway by then.
+    know it themselves. Unless `https`, only HTTP comes through the gateway by then. `cause` is what
+    the doctor must name first by then, if it is asked.
     """
 
     name: str
@@ -64,6 +65,7 @@ class Row:
     between: Mapping[int, Callable[[Lab], None]] = field(default_factory=dict)
     played: Callable[[Lab], bool] | None = None
     https: bool = True
+    cause: str = ""
 
     @property
     def within(self) -> int:

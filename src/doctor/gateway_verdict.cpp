@@ -78,6 +78,12 @@ void judgeAddress(const GatewayAnswer& answer, const std::string& line, Findings
     }
 }
 
+// An access point, for example, which the daemon does not use either. A gateway without an address
+// is one all the same.
+bool isOnlyAnnounced(const GatewayAnswer& answer, const std::string& route) {
+    return isFound(answer) && answer.address.empty() && !route.empty() && answer.gateway != route;
+}
+
 void judgeSilence(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
     const std::string device = upnp.unanswered;
     if (upnp.state == State::SILENT && natpmp.state == State::SILENT) {
@@ -191,10 +197,11 @@ std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natp
     return tellsAddress(answer) ? answer.address : std::string{};
 }
 
-void judgeGateway(const GatewayAnswer& upnp,
+void judgeGateway(GatewayAnswer upnp,
                   const GatewayAnswer& natpmp,
                   const std::string& route,
                   Findings& findings) {
+    if (isOnlyAnnounced(upnp, route)) upnp = {State::SILENT, "", "", true, upnp.gateway};
     if (!isFound(upnp) && !isFound(natpmp)) {
         judgeSilence(upnp, natpmp, findings);
         return;

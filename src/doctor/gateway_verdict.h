@@ -26,7 +26,7 @@ struct GatewayAnswer {
 
 /// Concludes from both protocols together. @p route is the gateway of the default route, empty if
 /// it is not known.
-void judgeGateway(const GatewayAnswer& upnp,
+void judgeGateway(GatewayAnswer upnp,
                   const GatewayAnswer& natpmp,
                   const std::string& route,
                   Findings& findings);

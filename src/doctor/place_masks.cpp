@@ -149,10 +149,11 @@ struct Place {
 
 constexpr std::string_view kTable = "gateway maps port ";
 
-constexpr std::array<Place, 26> kPlaces{{
+constexpr std::array<Place, 27> kPlaces{{
     {"connect to ", " port ", "host", Ends::BEFORE},
     {"connect to ", ":", "host", Ends::BEFORE},
     {" via ", ":", "host", Ends::BEFORE},
+    {" via ", " after ", "host", Ends::BEFORE},
     {"CONNECT to ", "", "host"},
     {"proxy tunnel to ", "", "host"},
     {"in connection to ", ":", "host", Ends::BEFORE},

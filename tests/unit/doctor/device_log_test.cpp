@@ -144,6 +144,15 @@ TEST_F(DeviceLogTest, RotatedSystemLogsOldestFirst) {
     }
 }
 
+TEST_F(DeviceLogTest, ACollectedLogNamesManyHosts) {
+    std::string lines;
+    for (int number = 0; number < 50; ++number) {
+        const std::size_t host = kSecond.find(" nas ");
+        lines += std::string{kSecond}.replace(host + 1, 3, "nas" + std::to_string(number)) + "\n";
+    }
+    EXPECT_EQ(look({plain("a", lines)}).logHosts.count("nas49"), 1U);
+}
+
 TEST_F(DeviceLogTest, TheJournalComesFirst) {
     plain("syslog", kFirst);
     plain("lines", kFirst + kSecond);

@@ -92,6 +92,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"my-nas_lan eth0.my-nas my-n... na... '203... 2003...", "host-1_lan eth0.host-1 host-1... na... '... ..."},
         {"the port wanted for internal port 443 leads to Annas-MacBook", "the port wanted for internal port 443 leads to host-1"},
         {"gateway maps port 80 to Anna's PC (Anna (Mac) Schmidt), 443 to 192.168.1.5 (b), another device", "gateway maps port 80 to host-1 (name-1), 443 to private-address-1 (name-2), another device"},
+        {"Failed to connect to box7 port 443 via proxy7 after 3 ms", "Failed to connect to host-1 port 443 via host-2 after 3 ms"},
         {"Couldn't connect to server", "Couldn't connect to server"},
         {"Failed to connect to longb...", "Failed to connect to host-1..."},
         {"Could not resolve host: box", "Could not resolve host: host-1"},

@@ -23,7 +23,6 @@ constexpr std::array<std::pair<Sign, Sign>, 20> kOver{{
     {Sign::LOGGED_SECOND_NAT, Sign::SERVICE_SEES_SAME_ADDRESS},
     {Sign::LOGGED_SECOND_NAT, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_OTHER_DEVICE, Sign::PORT_TEST_PASSES},
-    {Sign::LOGGED_TEST_SKIPPED_DISK, Sign::DISK_IN_USE},
     {Sign::LOGGED_TEST_FAILED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_PASSES},
     {Sign::LOGGED_TEST_UNANSWERED, Sign::PORT_TEST_FAILS},
@@ -55,6 +54,11 @@ bool isSecondNatOver(const Evidence& evidence) {
 void dropWhatIsOver(Evidence& evidence) {
     for (const auto& [logged, now] : kOver) {
         if (evidence.has(logged) && evidence.has(now)) drop(logged, now, evidence);
+    }
+    // A disk that was used a minute ago may be in standby all the same.
+    if (evidence.has(Sign::LOGGED_TEST_SKIPPED_DISK) && evidence.has(Sign::DISK_IN_USE) &&
+        evidence.has(Sign::DISK_ACTIVE)) {
+        drop(Sign::LOGGED_TEST_SKIPPED_DISK, Sign::DISK_ACTIVE, evidence);
     }
     if (isSecondNatOver(evidence)) {
         drop(Sign::LOGGED_SECOND_NAT, Sign::GATEWAY_ADDRESS_PUBLIC, evidence);

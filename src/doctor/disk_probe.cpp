@@ -36,6 +36,7 @@ void lookAtDisk(Findings& findings) {
             findings.ok("disk in standby");
             return;
         case DiskState::ACTIVE:
+            findings.add(Sign::DISK_ACTIVE, "disk active");
             findings.ok("disk active");
             return;
         case DiskState::UNKNOWN:

@@ -47,6 +47,7 @@ enum class Sign {
     OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
     PORT_HELD_BY_OTHER,
     WEB_SERVER_SILENT,
+    DISK_ACTIVE,  ///< by its own word
     BACK_END_ANSWERS,
     BACK_END_SILENT,
     SERVICE_REACHED,  ///< name, connection and certificate are right

@@ -49,12 +49,13 @@ std::string inCapitals(std::string key) {
 
 // Of what the daemon does not know, only what looks like a key: the rest may be a secret.
 std::string shownKey(const std::string& key) {
-    const std::size_t start = key.rfind('#', 0) == 0 ? 1 : 0;
-    constexpr const char* kLetters = "ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_";
-    const std::size_t end = std::min(key.find_first_not_of(kLetters, start), key.size());
-    const bool isKey = end > start && (end == key.size() ||
-                                       std::isalnum(static_cast<unsigned char>(key[end])) == 0);
-    return isKey ? key.substr(0, end) : "this key";
+    const auto start = key.begin() + (key.rfind('#', 0) == 0 ? 1 : 0);
+    const auto end = std::find_if_not(start, key.end(), [](unsigned char letter) {
+        return std::isupper(letter) != 0 || std::isdigit(letter) != 0 || letter == '_';
+    });
+    const bool isKey =
+        end > start && (end == key.end() || std::isalnum(static_cast<unsigned char>(*end)) == 0);
+    return isKey ? std::string{key.begin(), end} : "this key";
 }
 
 class SettingsCheck {

@@ -9,6 +9,7 @@ namespace {
 constexpr auto kMinute = std::chrono::seconds{60}.count();
 constexpr auto kHour = 60 * kMinute;
 constexpr auto kDay = 24 * kHour;
+constexpr auto kWeek = 7;  // days: from then on the hours do not matter
 
 }  // namespace
 
@@ -22,7 +23,9 @@ std::string ageInWords(std::chrono::seconds age) {
         return minutes == 0 ? hours : hours + " " + std::to_string(minutes) + " min";
     }
     const auto days = seconds / kDay;
-    return std::to_string(days) + (days == 1 ? " day" : " days");
+    const auto hours = seconds % kDay / kHour;
+    const std::string text = std::to_string(days) + (days == 1 ? " day" : " days");
+    return days >= kWeek || hours == 0 ? text : text + " " + std::to_string(hours) + " h";
 }
 
 }  // namespace pelorus::doctor

@@ -239,12 +239,12 @@ std::vector<Cause> relayCauses() {
          kNotReached,
          {{S::LOGGED_RELAY_DOES_NOT_COME_UP}, {S::TUNNEL_UNANSWERED}},
          {S::TUNNEL_SAYS_UP, S::TUNNEL_REFUSED, S::TUNNEL_FILES_UNWRITABLE},
-         "The relay does not answer, so no tunnel comes up.",
+         "The tunnel to the relay does not come up.",
          "Check that the provider lets the relay's port through; otherwise the relay is down."},
     };
 }
 
-std::vector<Cause> gatewayCauses() {
+std::vector<Cause> addressCauses() {
     return {
         {"wrong-gateway-answers",
          kNotDirect,
@@ -274,6 +274,11 @@ std::vector<Cause> gatewayCauses() {
          "reached.",
          "Put the provider's box into bridge mode, or ask the provider for a public IPv4 address. "
          "Until then the relay is the right way."},
+    };
+}
+
+std::vector<Cause> gatewayCauses() {
+    return {
         {"no-gateway-protocol",
          kNotDirect,
          {{S::NO_GATEWAY_ANSWERS}, {S::LOGGED_NO_GATEWAY}},
@@ -346,8 +351,9 @@ std::vector<Cause> outsideCauses() {
 // keeps the relay away, then the direct way.
 std::vector<Cause> table() {
     std::vector<Cause> rows;
-    for (const auto& group : {workingCauses, serviceCauses, answerCauses, publishingCauses,
-                              deviceCauses, relayCauses, gatewayCauses, outsideCauses}) {
+    for (const auto& group :
+         {workingCauses, serviceCauses, answerCauses, publishingCauses, deviceCauses, relayCauses,
+          addressCauses, gatewayCauses, outsideCauses}) {
         for (Cause& cause : group()) rows.push_back(std::move(cause));
     }
     return rows;

@@ -210,8 +210,10 @@ void endHistory(const Evidence& evidence, Diagnosis& diagnosis) {
     if (isGone || diagnosis.reach == Reach::NOT_RUNNING) diagnosis.daemon.since.reset();
     auto& history = diagnosis.history;
     if (!isGone || history.empty() || !evidence.logEnd) return;
-    const Period& last = history.back();
+    const Period last = history.back();
     if (last.reach == Reach::NOT_RUNNING || last.reach == Reach::SWITCHED_OFF) return;
+    // When it ended is not known: the headline has no time.
+    diagnosis.before = last;
     history.push_back({diagnosis.reach, std::max(*evidence.logEnd, last.since), "",
                        "the log has nothing of the daemon since, and it is gone"});
 }

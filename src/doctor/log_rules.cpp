@@ -123,7 +123,7 @@ Rules cycleRules() {
     info("ConnectionManager::createConnection() - Deviceid and DeviceAuth is empty. Idle Process.").happens(LogEvent::IDLE)
         .sets(Sign::LOGGED_CREDENTIALS_MISSING, kNoCredentials).clears({Sign::LOGGED_ATTEMPT}),
     error("TavikClient::initialize() - failed to read DEVICEID, DEVICEAUTH from dynamic config file").happens(LogEvent::IDLE)
-        .sets(Sign::LOGGED_CREDENTIALS_MISSING, kNoCredentials),
+        .sets(Sign::LOGGED_CREDENTIALS_MISSING, kNoCredentials).clears({Sign::LOGGED_ATTEMPT}),
     info("ConnectionManager::createConnection() - port-forwarding failed, [attempting relay connection].").happens(LogEvent::PORTS_LOST),
     info("TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [%s].").happens(LogEvent::STATUS),
     info("ConnectionManager::createDirectConnection - Current Status in file system: [%s].").happens(LogEvent::STATUS_THERE)

@@ -93,6 +93,13 @@ bool isMac(std::string_view word) {
     return true;
 }
 
+// A character as URLs encode it: "%2F" is no part of the word behind it.
+bool isEncoded(std::string_view text) {
+    return text.size() >= 3 && text.front() == '%' &&
+           std::isxdigit(static_cast<unsigned char>(text[1])) != 0 &&
+           std::isxdigit(static_cast<unsigned char>(text[2])) != 0;
+}
+
 // Length of the IPv4 address at a place of a word, 0 if there is none.
 std::size_t ipv4Length(std::string_view word, std::size_t at) {
     const auto isNumber = [&](std::size_t index) {
@@ -274,9 +281,11 @@ std::string PlaceMasks::hide(std::string text) {
         if (length == 0) {
             const auto* const end = std::find_if_not(rest.begin(), rest.end(), isWordLetter);
             length = static_cast<std::size_t>(end - rest.begin());
-            result += length == 0 ? std::string{rest.front()} : hideWordAt(text, at, length);
+            const bool isWord = length > 0;
+            if (!isWord) length = isEncoded(rest) ? 3 : 1;
+            result += isWord ? hideWordAt(text, at, length) : std::string{rest.substr(0, length)};
         }
-        at += std::max<std::size_t>(length, 1);
+        at += length;
     }
     return result;
 }

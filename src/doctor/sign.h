@@ -25,7 +25,7 @@ enum class Sign {
     TUNNEL_CLIENT_ALONE,   ///< no other one beside it
     TUNNEL_SAYS_UP,        ///< the client's output has the text of success
     TUNNEL_REFUSED,        ///< the client's output says that the relay refuses the credentials
-    TUNNEL_UNANSWERED,     ///< the client's output says that the relay does not answer
+    TUNNEL_UNANSWERED,     ///< the client's output says that it does not get through to the relay
     TUNNEL_FILES_UNWRITABLE,
     DISK_UNUSED,  ///< for longer than the daemon lets a port test wake it
     DISK_IN_USE,  ///< by the minutes file

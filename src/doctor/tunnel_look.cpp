@@ -180,7 +180,7 @@ private:
             blame(Sign::TUNNEL_REFUSED, "the relay refuses the device's credentials" + written);
         } else if (!said.failure.empty()) {
             blame(Sign::TUNNEL_UNANSWERED,
-                  "the relay does not answer the tunnel client: " + said.failure + written);
+                  "the tunnel client does not get through to the relay: " + said.failure + written);
         }
     }
 

@@ -13,7 +13,7 @@ namespace pelorus::doctor {
 struct TunnelOutput {
     bool isUp = false;       ///< the text of success, and no restart or end since
     bool isRefused = false;  ///< the relay has refused the credentials since
-    std::string failure{};   ///< the last line since that says that the relay does not answer
+    std::string failure{};   ///< the last line since that says that it does not get through
 };
 
 /// Reads @p output; an empty @p successText is in any line, as for the daemon.

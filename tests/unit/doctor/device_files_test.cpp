@@ -275,10 +275,16 @@ TEST_F(DeviceFilesTest, ADiskIsUnusedByTheDaemonsRule) {
 }
 
 TEST(Age, IsRoundedDown) {
-    const std::pair<int, const char*> rows[]{
-        {-5, "0 s"},           {59, "59 s"},           {60, "1 min"},           {3599, "59 min"},
-        {3600, "1 h"},         {12'000, "3 h 20 min"}, {86'399, "23 h 59 min"}, {86'400, "1 day"},
-        {1'100'000, "12 days"}};
+    const std::pair<int, const char*> rows[]{{-5, "0 s"},
+                                             {59, "59 s"},
+                                             {60, "1 min"},
+                                             {3599, "59 min"},
+                                             {3600, "1 h"},
+                                             {12'000, "3 h 20 min"},
+                                             {86'399, "23 h 59 min"},
+                                             {86'400, "1 day"},
+                                             {212'400, "2 days 11 h"},
+                                             {1'100'000, "12 days"}};
     for (const auto& [seconds, words] : rows) {
         EXPECT_EQ(doctor::ageInWords(std::chrono::seconds{seconds}), words);
     }

@@ -88,23 +88,11 @@ const std::vector<Seen> kSeen{
      Reach::RELAYED,
      "second-nat",
      1},
-    {"back end",
-     "portforwarded",
-     {S::DAEMON_RUNS, S::BACK_END_SILENT},
-     Reach::DIRECT,
-     "back-end-silent",
-     0},
     {"back end that does not take the ports",
      "failed",
      {S::DAEMON_RUNS, S::LOGGED_PUBLISHING_FAILED, S::LOGGED_BACK_END_SILENT},
      Reach::NOT_REACHED,
      "back-end-silent",
-     2},
-    {"no openvpn",
-     "failed",
-     {S::DAEMON_RUNS, S::RELAY_CLIENT_MISSING, S::NO_GATEWAY_ANSWERS},
-     Reach::NOT_REACHED,
-     "relay-client-missing",
      2},
     {"no openvpn, and none needed",
      "portforwarded",
@@ -118,12 +106,6 @@ const std::vector<Seen> kSeen{
      Reach::NOT_REACHED,
      "tunnel-died",
      2},
-    {"lost mapping",
-     "portforwarded",
-     {S::DAEMON_RUNS, S::OUR_MAPPINGS_MISSING},
-     Reach::DIRECT,
-     "mapping-lost",
-     0},
     {"direct, but the service does not reach it",
      "portforwarded",
      {S::DAEMON_RUNS, S::PORT_TEST_FAILS},
@@ -376,6 +358,8 @@ TEST(Diagnosis, TheHistoryOfADaemonThatIsGoneEndsWithItsLog) {
         if (row.periods == 1) continue;
         EXPECT_EQ(diagnosis.history.back().reach, Reach::NOT_RUNNING);
         EXPECT_EQ(diagnosis.history.back().since, at(300));
+        ASSERT_TRUE(diagnosis.before);
+        EXPECT_EQ(diagnosis.before->reach, row.last);
     }
 }
 

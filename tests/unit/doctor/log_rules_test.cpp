@@ -95,7 +95,8 @@ TEST(LogRules, FindsAnAnswerThatHoldsWhatStandsBehindItOrWasCut) {
     const std::string answer = "<p>Sorry, 3 bytes, or so</p>" + std::string(200, 'x');
     for (const char* const end : {", 90 bytes from central server.", ", 90 by", ", 9", ",", ""}) {
         LogValues values;
-        ASSERT_NE(findLogRule(begin + answer + end, values), nullptr) << end;
+        const std::string line = begin + answer + end;
+        ASSERT_NE(findLogRule(line, values), nullptr) << end;
         EXPECT_EQ(values[1].substr(0, answer.size()), answer) << end;
     }
     LogValues values;

@@ -22,7 +22,10 @@ std::array<std::size_t, 2> KnownLines::places(const LogLine& line) {
     const auto stamp = static_cast<std::uint64_t>(line.when.time_since_epoch().count());
     const std::uint64_t text = std::hash<std::string_view>{}(line.text);
     const std::uint64_t hash = (text ^ (stamp * kMix)) * kMix;
-    return {(hash >> (64 - kBits)) & kMask, (hash >> (64 - 2 * kBits)) & kMask};
+    const auto place = [hash](unsigned shift) {
+        return static_cast<std::size_t>((hash >> shift) & kMask);
+    };
+    return {place(64 - kBits), place(64 - 2 * kBits)};
 }
 
 void LineOrder::beginFile() {

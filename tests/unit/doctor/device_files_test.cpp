@@ -211,7 +211,8 @@ TEST_F(DeviceFilesTest, TheTunnelIsJudgedByItsProcessAndItsFiles) {
                  {"connecting", 601, false},
                  {"connecting", 599, true}};
     for (const auto& [status, age, counts] : refusals) {
-        const timespec written[2]{{kNow - age, 0}, {kNow - age, 0}};
+        const auto seconds = static_cast<time_t>(kNow - age);
+        const timespec written[2]{{seconds, 0}, {seconds, 0}};
         utimensat(AT_FDCWD, path("vpn/out").c_str(), written, 0);
         const Evidence evidence = look({}, {{"COMMUNICATION_STATUS", status}});
         EXPECT_EQ(evidence.has(Sign::TUNNEL_REFUSED), counts) << status << " " << age;

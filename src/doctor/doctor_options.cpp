@@ -131,12 +131,12 @@ bool isSameFile(const std::string& log, const std::string& picture) {
 // Nothing but an older picture may be overwritten.
 bool isForeignFile(const std::string& picture) {
     struct stat status {};
-    if (stat(picture.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
+    if (stat(picture.c_str(), &status) != 0) return false;
+    if (!S_ISREG(status.st_mode)) return S_ISBLK(status.st_mode);
     const FileHandle file = openFile(picture, "re");
-    std::array<char, 5> begin{};
+    std::array<char, 4> begin{};
     const std::size_t size = file ? std::fread(begin.data(), 1, begin.size(), file.get()) : 0;
-    const std::string_view text{begin.data(), size};
-    return status.st_size > 0 && text.substr(0, 4) != "<svg" && text != "<?xml";
+    return status.st_size > 0 && std::string_view{begin.data(), size} != "<svg";
 }
 
 std::optional<int> contradiction(const DoctorOptions& options) {

@@ -14,6 +14,10 @@ namespace pelorus::doctor {
 namespace {
 
 const std::set<std::string> kPrefixes{"env", "exec", "nohup", "setsid"};
+// They run what stands in their arguments.
+const std::set<std::string> kWrappers{
+    "ash", "bash", "busybox",     "chroot", "dash", "nice", "runuser", "sh", "start-stop-daemon",
+    "su",  "sudo", "systemd-run", "timeout"};
 
 // The commands of a shell command line. A separator in quotes is part of a word, and so is the
 // ampersand of a redirection.
@@ -69,8 +73,12 @@ std::string programOf(const std::string& command) {
     return isPlain ? word : std::string{};
 }
 
+std::string nameOf(const std::string& program) {
+    return program.substr(program.rfind('/') + 1);
+}
+
 bool isTunnelClient(const std::string& program) {
-    return program.substr(program.rfind('/') + 1).rfind("openvpn", 0) == 0;
+    return nameOf(program).rfind("openvpn", 0) == 0;
 }
 
 }  // namespace
@@ -84,8 +92,10 @@ std::optional<std::string> relayClientOf(const std::string& command, const std::
         programs.insert(program);
         if (isTunnelClient(program)) clients.insert(program);
     }
-    if (clients.empty() && programs.size() == 1 && programs.begin()->rfind("/", 0) == 0) {
-        return *programs.begin();
+    if (clients.empty() && programs.size() == 1) {
+        const std::string& only = *programs.begin();
+        const bool isClear = only.rfind('/', 0) == 0 && kWrappers.count(nameOf(only)) == 0;
+        return isClear ? std::optional{only} : std::nullopt;
     }
     if (clients.size() != 1) return std::nullopt;
     const std::string& client = *clients.begin();

@@ -31,7 +31,7 @@ TEST(DoctorOptions, AreReadOrRefusedInOneLine) {
     };
     // Two names of one file: a log must not be overwritten by the picture of it.
     const std::string log = testing::TempDir() + "pelorus-doctor-options.log", link = log + ".svg";
-    std::ofstream{log} << "a line";
+    std::ofstream{log} << "<?xml";
     unlink(link.c_str());
     ASSERT_EQ(symlink(log.c_str(), link.c_str()), 0);
     const std::string overwrites = "--log a --log " + log + " --svg " + link;

@@ -241,6 +241,7 @@ TEST(RelayClient, IsNamedByTheStartCommand) {
         {"sh ./start_relay openvpn", ""},
         {"sh /opt/start-relay", ""},
         {"start-relay", ""},
+        {"/bin/sh -c \"openvpn c\"", ""},
         {"$DIR/openvpn", ""},
         {"env -C /opt bin/openvpn", ""},
         {"test -x /a/openvpn && /a/openvpn || openvpn", ""},

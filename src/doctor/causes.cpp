@@ -328,7 +328,7 @@ std::vector<Cause> outsideCauses() {
         {"port-filtered",
          kNotDirect,
          {{S::LOGGED_TEST_FAILED}, {S::PORT_TEST_FAILS}},
-         {S::MANUAL_MODE, S::NO_GATEWAY_ANSWERS, S::OUR_MAPPINGS_MISSING},
+         {S::MANUAL_MODE, S::NO_GATEWAY_ANSWERS, S::LOGGED_NO_GATEWAY, S::OUR_MAPPINGS_MISSING},
          "The gateway opens the ports, but nothing from the internet comes through them.",
          "A filter in the gateway or at the provider is in the way: look there for a firewall, or "
          "ask the provider."},

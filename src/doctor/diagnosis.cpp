@@ -4,6 +4,8 @@
 #include <array>
 #include <utility>
 
+#include "doctor/text_parts.h"
+
 namespace pelorus::doctor {
 
 namespace {
@@ -46,8 +48,7 @@ bool isSecondNatOver(const Evidence& evidence) {
         return false;
     }
     const std::string& text = evidence.signs.at(Sign::LOGGED_SECOND_NAT).text;
-    const std::string end = "the service sees " + evidence.gatewayAddress;
-    return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
+    return endsWith(text, "the service sees " + evidence.gatewayAddress);
 }
 
 // Live evidence beats the log, and the reader is told so.

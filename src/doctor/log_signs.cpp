@@ -5,6 +5,7 @@
 
 #include "doctor/reach_history.h"
 #include "doctor/shown_text.h"
+#include "doctor/text_parts.h"
 
 namespace pelorus::doctor {
 
@@ -56,10 +57,6 @@ bool explains(Sign sign) {
 bool isStale(Sign sign, Time when, Time now) {
     return (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
            (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
-}
-
-bool startsWith(std::string_view text, std::string_view beginning) {
-    return text.compare(0, beginning.size(), beginning) == 0;
 }
 
 bool contains(std::string_view text, std::string_view part) {

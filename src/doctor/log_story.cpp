@@ -4,6 +4,8 @@
 #include <charconv>
 #include <utility>
 
+#include "doctor/text_parts.h"
+
 namespace pelorus::doctor {
 
 namespace {
@@ -59,10 +61,6 @@ constexpr std::array<std::string_view, 17> kUndecided{
     "ConnectionManager::createDirectConnection() - failed",
     "ConnectionManager::manualPortForward - failed",
     "ConnectionManager::createRelayConnection() - failed"};
-
-bool startsWith(std::string_view text, std::string_view beginning) {
-    return text.compare(0, beginning.size(), beginning) == 0;
-}
 
 }  // namespace
 

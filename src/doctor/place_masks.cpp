@@ -10,6 +10,7 @@
 #include "common/text.h"
 #include "doctor/address_class.h"
 #include "doctor/shown_text.h"
+#include "doctor/text_parts.h"
 
 namespace pelorus::doctor {
 
@@ -44,14 +45,6 @@ std::string lowerCase(std::string_view text) {
         letter = static_cast<char>(std::tolower(static_cast<unsigned char>(letter)));
     }
     return result;
-}
-
-bool startsWith(std::string_view text, std::string_view beginning) {
-    return text.substr(0, beginning.size()) == beginning;
-}
-
-bool endsWith(std::string_view text, std::string_view end) {
-    return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
 }
 
 // What an IPv4 address is called; empty if it tells nothing.

@@ -1,5 +1,7 @@
 #include "daemon/daemon_control.h"
 
+#include <filesystem>
+
 #include "daemon/signals.h"
 #include "daemon_fixture.h"
 

@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <fstream>
 #include <iterator>
-#include <regex>
 #include <set>
 #include <sstream>
 
@@ -96,10 +95,12 @@ std::string readFile(const std::string& name) {
 
 std::set<std::string> optionsIn(std::string text) {
     text.erase(std::remove(text.begin(), text.end(), '\\'), text.end());  // of the man page
-    const std::regex option{"--[a-z][-a-z]*"};
     std::set<std::string> options;
-    for (std::sregex_iterator found{text.begin(), text.end(), option}, end; found != end; ++found) {
-        options.insert(found->str());
+    for (auto at = text.find("--"); at != std::string::npos; at = text.find("--", at)) {
+        const auto end = text.find_first_not_of("-abcdefghijklmnopqrstuvwxyz", at);
+        const auto option = text.substr(at, end - at);
+        if (option.size() > 2 && option[2] != '-') options.insert(option);
+        at += option.size();
     }
     return options;
 }

@@ -190,6 +190,36 @@ const std::vector<Seen> kSeen{
      Reach::NOT_REACHED,
      "gateway-without-address",
      2},
+    {"direct, and a slow gateway",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::NO_GATEWAY_ANSWERS, S::GATEWAY_SILENT, S::SERVICE_REACHED},
+     Reach::DIRECT,
+     "",
+     0},
+    {"direct, but nothing answers, within or without",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::NO_GATEWAY_ANSWERS, S::SERVICE_UNREACHABLE, S::RELAY_CLIENT_MISSING},
+     Reach::NOT_REACHED,
+     "service-unreachable",
+     2},
+    {"direct, but the mappings are gone, and the relay would fail",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::OUR_MAPPINGS_MISSING, S::NO_PORT_MAPPED, S::RELAY_CLIENT_MISSING},
+     Reach::NOT_REACHED,
+     "mapping-lost",
+     2},
+    {"direct, and one of two ports is silent",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::WEB_SERVER_SILENT},
+     Reach::DIRECT,
+     "web-server-silent",
+     0},
+    {"a second router by the log, and no address told now",
+     "relayed",
+     {S::TUNNEL_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::SERVICE_REACHED, S::LOGGED_SECOND_NAT},
+     Reach::RELAYED,
+     "second-nat",
+     1},
     {"no address told, but the internet is there",
      "relayed",
      {S::TUNNEL_RUNS, S::GATEWAY_WITHOUT_ADDRESS, S::SERVICE_REACHED},
@@ -283,6 +313,17 @@ TEST(Diagnosis, BelievesTheGatewayThatHasTheAddressTheServiceSaw) {
         evidence.add(S::LOGGED_SECOND_NAT, Source::LOG,
                      "the gateway says 10.0.0.2, the service sees 203.0.113.7");
         EXPECT_EQ(firstCause(diagnose(evidence)), cause) << address;
+    }
+}
+
+TEST(Diagnosis, TakesAGatewayThatSaysZeroForNoSecondRouter) {
+    for (const auto& [signs, cause] :
+         {std::pair{std::vector<Sign>{S::TUNNEL_RUNS}, "gateway-hides-address"},
+          std::pair{std::vector<Sign>{S::TUNNEL_RUNS, S::GATEWAY_ADDRESS_PUBLIC}, ""}}) {
+        Evidence evidence = evidenceOf({"", "relayed", signs, {}, "", 0});
+        evidence.add(S::LOGGED_SECOND_NAT, Source::LOG,
+                     "the gateway says 0.0.0.0, the service sees 203.0.113.7");
+        EXPECT_EQ(firstCause(diagnose(evidence)), cause);
     }
 }
 

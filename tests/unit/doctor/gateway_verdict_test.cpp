@@ -69,7 +69,7 @@ class Gateway : public ::testing::TestWithParam<Answers> {};
 
 TEST_P(Gateway, IsJudged) {
     Findings findings;
-    judgeGateway(GetParam().upnp, GetParam().natpmp, "192.168.1.1", findings);
+    judgeGateway(GetParam().upnp, GetParam().natpmp, {"192.168.1.1"}, findings);
     EXPECT_EQ(signsOf(findings), GetParam().signs);
     ASSERT_EQ(findings.checks().size(), 1U);
     EXPECT_EQ(findings.checks()[0].text, GetParam().check);
@@ -98,7 +98,7 @@ const Answers kAnswers[] = {
      "gateway 192.168.1.1 (UPnP and NAT-PMP): address 44.128.0.20 is public"},
     {"ZeroAddress",
      found("0.0.0.0"),
-     kSilent,
+     {State::FOUND, "192.168.1.9", "44.128.0.20", true, ""},
      {Sign::GATEWAY_FOUND, Sign::GATEWAY_WITHOUT_ADDRESS},
      "gateway 192.168.1.1 (UPnP): says its address is 0.0.0.0"},
     {"Unconnected",
@@ -139,11 +139,14 @@ INSTANTIATE_TEST_SUITE_P(Answers, Gateway, ::testing::ValuesIn(kAnswers), [](con
 });
 
 TEST(Gateway, IsTheOneOfTheDefaultRoute) {
-    for (const auto& [route, isElsewhere] :
-         {std::pair{"192.168.1.1", false}, std::pair{"", false}, std::pair{"192.168.1.9", true}}) {
+    const std::pair<std::vector<std::string>, bool> rows[]{{{}, false},
+                                                           {{"192.168.1.1"}, false},
+                                                           {{"192.168.1.9"}, true},
+                                                           {{"192.168.1.9", "192.168.1.1"}, false}};
+    for (const auto& [routed, isElsewhere] : rows) {
         Findings findings;
-        judgeGateway(found("44.128.0.20"), kSilent, route, findings);
-        EXPECT_EQ(findings.has(Sign::GATEWAY_ELSEWHERE), isElsewhere) << route;
+        judgeGateway(found("44.128.0.20"), kSilent, routed, findings);
+        EXPECT_EQ(findings.has(Sign::GATEWAY_ELSEWHERE), isElsewhere);
     }
 }
 
@@ -173,17 +176,23 @@ TEST_P(Mappings, AreJudged) {
     EXPECT_EQ(signsOf(findings), row.signs);
 }
 
+const std::set<Sign> kAllLost{Sign::OUR_MAPPINGS_MISSING, Sign::NO_PORT_MAPPED};
+
 const Table kTables[] = {
     {"NothingMappedNothingPublished", {}, {}, {}},
     {"Ours", {kOurs}, {http(kOurs), {9444, 443, true, kOursForHttps}}, {}},
-    {"Lost", {kOursForHttps}, {http({})}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"Lost", {kOursForHttps}, {http({})}, kAllLost},
     {"ListedOnly", {kOurs}, {http({})}, {}},
     {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
-    {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, {Sign::OUR_MAPPINGS_MISSING}},
+    {"BothLost", {}, {http({}), {9444, 443, true, {}}}, kAllLost},
+    {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, kAllLost},
     {"NotToldAndNotInTheTable", {}, {{9091, 80, false, {}}}, {}},
     {"ToAHostByName", {kByName}, {http(kByName)}, {}},
     {"HeldByAnother", {kNeighbour}, {}, {Sign::PORT_HELD_BY_OTHER}},
-    {"TakenAway", {}, {http(kNeighbour)}, {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
+    {"TakenAway",
+     {},
+     {http(kNeighbour), {9444, 443, true, kOursForHttps}},
+     {Sign::PORT_HELD_BY_OTHER, Sign::OUR_MAPPINGS_MISSING}},
     {"OfAnotherProtocol", {{9091, "UDP", "192.168.1.9", 80, ""}}, {}, {}},
 };
 

@@ -34,7 +34,7 @@ def gateway_reboots(lab: Lab) -> None:
                    reach="not-reached")
         network.ip_batch("link set lan up", host=network.GATEWAY)
 
-        lab.step("it has forgotten the mappings, and comes back at another address and control port")
+        lab.step("it comes back without the mappings, at another address and control port")
         lab.gateway.reboot("192.168.77.254")
         assert pages_from_outside() == [None, None]
         lab.moment("the gateway has lost both ports, and no test has noticed yet", "mapping-lost",

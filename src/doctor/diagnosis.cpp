@@ -128,14 +128,16 @@ bool isGatewayOff(const Evidence& evidence) {
 }
 
 // What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
-// lead through a second router, too.
+// lead through a second router, and to other ports.
 bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
     if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
-        evidence.has(Sign::NO_WEB_SERVER) || isGatewayOff(evidence)) {
+        isGatewayOff(evidence)) {
         return true;
     }
-    if (evidence.has(Sign::MANUAL_MODE) || evidence.has(Sign::OWN_ROUTER)) return false;
+    if (evidence.has(Sign::MANUAL_MODE)) return false;
+    if (evidence.has(Sign::NO_WEB_SERVER)) return true;
+    if (evidence.has(Sign::OWN_ROUTER)) return false;
     const bool isBehindAnother =
         evidence.has(Sign::GATEWAY_ADDRESS_SHARED) || evidence.has(Sign::GATEWAY_ADDRESS_PRIVATE);
     if (isBehindAnother && !evidence.has(Sign::GATEWAY_ELSEWHERE)) return true;

@@ -173,7 +173,7 @@ const std::vector<Seen> kSeen{
      1},
     {"direct by hand behind a shared address",
      "portforwarded",
-     {S::DAEMON_RUNS, S::MANUAL_MODE, S::GATEWAY_ADDRESS_SHARED},
+     {S::DAEMON_RUNS, S::MANUAL_MODE, S::GATEWAY_ADDRESS_SHARED, S::NO_WEB_SERVER},
      Reach::DIRECT,
      "",
      0},

@@ -32,9 +32,8 @@ struct DefaultRoute {
 
 /// A host of the LAN, as far as this device has talked with it lately.
 struct LanHost {
-    std::vector<std::string>
-        addresses;          ///< that asked for, then those at the same hardware address
-    bool isSilent = false;  ///< it does not even tell its hardware address
+    std::vector<std::string> addresses;  ///< all at its hardware address, the one asked for first
+    bool isSilent = false;               ///< it does not even tell its hardware address
 };
 
 /// The host with @p address by @p table, which is in the form of /proc/net/arp.

@@ -39,7 +39,7 @@ class GatewaySetup:
     and grants that. With `personality`, the lab's own UPnP server answers and behaves like that.
     `settings` are further lines of miniupnpd's configuration. The protocols are served at the
     address `served_at` of the LAN if the default route is not where they are. `others` are further
-    UPnP servers on the LAN, each at an address of its own (192.168.77.2 and on).
+    UPnP servers on the LAN, each a computer of its own (192.168.77.2 and on).
     """
 
     upnp: bool = True
@@ -124,7 +124,7 @@ class Gateway:
             self._add_lan_address(self._setup.served_at)
         self._serve()
         for number, personality in enumerate(self._setup.others, start=2):
-            self._add_lan_address(address := f"192.168.77.{number}")
+            network.pretend_computer(network.GATEWAY, "lan", address := f"192.168.77.{number}")
             other = ScriptedGateway(personality, lambda: self.wan_address, self.diary)
             other.start(address)
             self._others.append(other)

@@ -102,6 +102,16 @@ def plug(host: str, port: str, switch_host: str, switch: str) -> None:
     ip_batch(f"link set {port} up", host=host)
 
 
+def pretend_computer(host: str, switch: str, address: str) -> None:
+    """Have a host answer at an address as if another computer, with a port of its own, did."""
+    port = f"as-{address.rpartition('.')[2]}"
+    plug(host, port, host, switch)
+    ip_batch(f"address add {address}/32 dev {port}", host=host)
+    with inside(host):
+        for name, value in (("arp_ignore", "1"), ("arp_announce", "2")):
+            Path("/proc/sys/net/ipv4/conf/all", name).write_text(value)
+
+
 def enable_forwarding(host: str) -> None:
     """Make a host pass packets on between its networks."""
     with inside(host):

@@ -130,12 +130,13 @@ class Lab:
         if self._visitor:
             self._visitor(what, ahead)
 
-    def moment(self, what: str, cause: str = "", ahead: float = 0) -> None:
+    def moment(self, what: str, cause: str = "", ahead: float = 0, reach: str = "") -> None:
         """Tell what is special now, at a moment of the story that is worth a visit.
 
-        The doctor must then name this cause first, or none if it is empty. The device's clock is
-        `ahead` seconds ahead. From the log that a daemon keeps by default it must conclude the
-        same or nothing, or that the daemon is at work.
+        The doctor must then name this cause first, or none if it is empty, and say that the device
+        is reached in the way `reach`, unless that is empty. The device's clock is `ahead` seconds
+        ahead. From the log that a daemon keeps by default it must conclude the same or nothing, or
+        that the daemon is at work.
         """
         self._told = True
         self.visit(what, ahead)
@@ -143,6 +144,7 @@ class Lab:
             return
         whole, usual = self._diagnoses(ahead)
         assert whole.cause == cause, f"the doctor says\n{whole}"
+        assert reach in {"", whole.everything["reach"]}, f"the doctor says\n{whole}"
         assert usual.cause in {cause, "", "settling"}, (
             f"from the log of a default daemon the doctor says\n{usual}")
         self.moments.append(Moment(what, cause, whole.fact))

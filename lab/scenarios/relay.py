@@ -104,8 +104,21 @@ def relay_down_at_first(lab: Lab) -> None:
     lab.moment("the relay does not answer: four tunnel clients came and went, the status is failed",
                "relay-does-not-come-up")
 
-    lab.step("the relay is back")
+    lab.step("the relay is back, but the device is sent to a name that nobody knows")
     lab.relay.start()
+    _change("relay_servers.offered", network.RELAY_ADDRESS, "relay.kavra.example")
+    _wait_for_failed_starts(lab)
+    lab.moment("the relay's name is unknown, the status is failed", "relay-unresolved")
+
+    lab.step("the device finds the relay, but expects another name in its certificate")
+    _change("relay_servers.offered", "relay.kavra.example", network.RELAY_ADDRESS)
+    _change("client.conf", "relay.kavra.example", "other.kavra.example")
+    _wait_for_failed_starts(lab)
+    lab.moment("the tunnel client does not accept the relay's certificate, the status is failed",
+               "relay-certificate")
+
+    lab.step("the device knows the relay")
+    _change("client.conf", "other.kavra.example", "relay.kavra.example")
     client = _wait_for_relayed(lab)
     assert_stops_clean(lab)
     wait_for_client_end(client)
@@ -220,7 +233,7 @@ def second_nat_appears(lab: Lab) -> None:
                                           "portforwarded", "disabled"]
 
 
-@scenario(Situation(relay=True, clock=IMPATIENT))
+@scenario(Situation(gateway=GatewaySetup(served_at="192.168.77.2"), relay=True, clock=IMPATIENT))
 def address_behind_the_gateways_back(lab: Lab) -> None:
     """The service sees another address than the gateway reports: relayed, a mapping remains."""
     start_direct(lab)
@@ -260,6 +273,20 @@ def _wait_for_direct(lab: Lab, client: int) -> None:
     wait_for_status(lab, "portforwarded")
     assert_published(lab)
     wait_for_client_end(client)
+
+
+def _change(name: str, old: str, new: str) -> None:
+    """Replace a text in a file of the tunnel client."""
+    file = _FOLDER / name
+    assert old in file.read_text()
+    file.write_text(file.read_text().replace(old, new))
+
+
+def _wait_for_failed_starts(lab: Lab) -> None:
+    """Wait until the daemon has given up four more tunnel clients, begun after now."""
+    begun = -(-len(_STARTS.read_text().split()) // 4) * 4
+    lab.wait_for(lambda: len(_STARTS.read_text().split()) >= begun + 4, "four more starts", 60)
+    wait_for_next_cycle(lab)
 
 
 def _start_relayed(lab: Lab) -> int:

@@ -162,7 +162,7 @@ def internal_ports_change(lab: Lab) -> None:
         lab.device.serve_on(8080, 8443)
         assert pages_from_outside() == [None, None]
         lab.moment("the web server has moved to other ports than the settings say",
-                   "web-server-silent")
+                   "web-server-silent", reach="not-reached")
         lab.device.change(INTERNAL_HTTP_PORT="8080", INTERNAL_HTTPS_PORT="8443")
 
     lab.step("the port test notices; port 9091 is still held by the old mapping, so 9092 is used")

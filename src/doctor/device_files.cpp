@@ -132,7 +132,6 @@ void lookAtMinutes(const std::string& path, Evidence& evidence) {
         file.text
             ? "disk unused for " + std::to_string(minutes) + " min: no port test until it is used"
             : "no port test once published: " + shownText(path) + " cannot be read";
-    evidence.add(Sign::DISK_UNUSED, Source::NOW, text);
     check(evidence, file.text ? Verdict::OK : Verdict::PROBLEM, Source::NOW, text);
 }
 

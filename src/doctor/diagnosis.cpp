@@ -51,6 +51,15 @@ bool isSecondNatOver(const Evidence& evidence) {
     return endsWith(text, "the service sees " + evidence.gatewayAddress);
 }
 
+// A gateway that says 0.0.0.0 differs from what the service sees without a second router, too.
+void dropWhatIsNoSecondNat(Evidence& evidence) {
+    const auto found = evidence.signs.find(Sign::LOGGED_SECOND_NAT);
+    if (found == evidence.signs.end() || evidence.has(Sign::MANUAL_MODE)) return;
+    if (!startsWith(found->second.text, "the gateway says 0.0.0.0,")) return;
+    evidence.signs[Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS] = found->second;
+    evidence.signs.erase(found);
+}
+
 // Live evidence beats the log, and the reader is told so.
 void dropWhatIsOver(Evidence& evidence) {
     for (const auto& [logged, now] : kOver) {
@@ -108,20 +117,32 @@ bool isOffline(const Evidence& evidence) {
     return evidence.has(Sign::SERVICE_UNRESOLVED) || evidence.has(Sign::SERVICE_UNREACHABLE);
 }
 
+// A gateway that only fails to answer still forwards, and the service may fail for others, too.
+bool isLineDown(const Evidence& evidence) {
+    return isOffline(evidence) &&
+           (evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS) || evidence.has(Sign::NO_GATEWAY_ANSWERS));
+}
+
+bool isGatewayOff(const Evidence& evidence) {
+    return isOffline(evidence) && evidence.has(Sign::GATEWAY_SILENT);
+}
+
 // What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
-// lead through a second router, too.
+// lead through a second router, and to other ports.
 bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
-    if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS)) {
+    if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
+        isGatewayOff(evidence)) {
         return true;
     }
-    if (evidence.has(Sign::MANUAL_MODE) || evidence.has(Sign::OWN_ROUTER)) return false;
+    if (evidence.has(Sign::MANUAL_MODE)) return false;
+    if (evidence.has(Sign::NO_WEB_SERVER)) return true;
+    if (evidence.has(Sign::OWN_ROUTER)) return false;
     const bool isBehindAnother =
         evidence.has(Sign::GATEWAY_ADDRESS_SHARED) || evidence.has(Sign::GATEWAY_ADDRESS_PRIVATE);
     if (isBehindAnother && !evidence.has(Sign::GATEWAY_ELSEWHERE)) return true;
-    const bool isLineDown = evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS) && isOffline(evidence);
-    return isLineDown || evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
-           evidence.has(Sign::GATEWAY_ADDRESS_CHANGED);
+    return isLineDown(evidence) || evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
+           evidence.has(Sign::GATEWAY_ADDRESS_CHANGED) || evidence.has(Sign::NO_PORT_MAPPED);
 }
 
 Reach reachOf(const Evidence& evidence) {
@@ -146,6 +167,17 @@ Reach reachOf(const Evidence& evidence) {
         if (evidence.has(Sign::LOGGED_ATTEMPT) || isKnown) return Reach::NOT_REACHED;
     }
     return said;
+}
+
+// The daemon of a device that was reached directly until now has not asked for the relay yet.
+void dropWhatIsNotNeeded(Evidence& evidence) {
+    if (lastSaid(evidence) != Reach::DIRECT) return;
+    for (const Sign sign :
+         {Sign::RELAY_CLIENT_MISSING, Sign::TUNNEL_DEVICE_MISSING, Sign::TUNNEL_FILES_UNWRITABLE,
+          Sign::TUNNEL_REFUSED, Sign::TUNNEL_UNANSWERED, Sign::RELAY_UNRESOLVED,
+          Sign::RELAY_CERTIFICATE_BAD}) {
+        evidence.signs.erase(sign);
+    }
 }
 
 // A gateway that leads to the internet has an address there.
@@ -223,6 +255,7 @@ void endHistory(const Evidence& evidence, Diagnosis& diagnosis) {
 
 Diagnosis diagnose(const Evidence& seen) {
     Evidence evidence = seen;
+    dropWhatIsNoSecondNat(evidence);
     dropWhatIsOver(evidence);
     compareAddresses(evidence);
     Diagnosis diagnosis;
@@ -232,6 +265,7 @@ Diagnosis diagnose(const Evidence& seen) {
     tellSince(evidence, diagnosis);
     tellSinceAtLeast(evidence, diagnosis);
     tellAddress(evidence, diagnosis);
+    dropWhatIsNotNeeded(evidence);
     dropWhatIsHidden(diagnosis.reach, evidence);
     diagnosis.causes = findCauses(evidence, diagnosis.reach);
     if (diagnosis.reach == Reach::UNKNOWN) dropWhatExplainsNothing(diagnosis.causes);

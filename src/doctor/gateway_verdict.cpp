@@ -25,10 +25,11 @@ bool tellsAddress(const GatewayAnswer& answer) {
     return isFound(answer) && classOf(answer.address) != AddressClass::NONE;
 }
 
-// The answer that counts: one with an address before one without, UPnP before NAT-PMP.
+// The answer that the daemon takes: any text is an address, through UPnP first.
 const GatewayAnswer& chosen(const GatewayAnswer& upnp, const GatewayAnswer& natpmp) {
-    if (tellsAddress(upnp) || !isFound(natpmp)) return upnp;
-    return tellsAddress(natpmp) || !isFound(upnp) ? natpmp : upnp;
+    const bool isUpnpTaken = isFound(upnp) && !upnp.address.empty();
+    if (isUpnpTaken || !isFound(natpmp)) return upnp;
+    return !natpmp.address.empty() || !isFound(upnp) ? natpmp : upnp;
 }
 
 std::string protocols(const GatewayAnswer& upnp, const GatewayAnswer& natpmp) {
@@ -78,10 +79,15 @@ void judgeAddress(const GatewayAnswer& answer, const std::string& line, Findings
     }
 }
 
+bool isElsewhere(const GatewayAnswer& answer, const std::vector<std::string>& routed) {
+    return !routed.empty() &&
+           std::find(routed.begin(), routed.end(), answer.gateway) == routed.end();
+}
+
 // An access point, for example, which the daemon does not use either. A gateway without an address
 // is one all the same.
-bool isOnlyAnnounced(const GatewayAnswer& answer, const std::string& route) {
-    return isFound(answer) && answer.address.empty() && !route.empty() && answer.gateway != route;
+bool isOnlyAnnounced(const GatewayAnswer& answer, const std::vector<std::string>& routed) {
+    return isFound(answer) && answer.address.empty() && isElsewhere(answer, routed);
 }
 
 void judgeSilence(const GatewayAnswer& upnp, const GatewayAnswer& natpmp, Findings& findings) {
@@ -151,14 +157,18 @@ std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
 }
 
 void judgePublished(const GatewayTable& table, Findings& findings) {
+    std::size_t faults = 0;
     for (const PublishedPort& port : table.published) {
         const std::string fault = mappingFault(table, port);
         if (fault.empty()) continue;
+        ++faults;
         const std::string text =
             "port " + std::to_string(port.externalPort) + " is published, but " + fault;
         findings.add(Sign::OUR_MAPPINGS_MISSING, text);
         findings.problem("gateway's table: " + text);
     }
+    if (faults == 0 || faults < table.published.size() || !table.isComplete) return;
+    findings.add(Sign::NO_PORT_MAPPED, "the gateway maps none of the published ports");
 }
 
 void judgeOthers(const GatewayTable& table, Findings& findings) {
@@ -199,9 +209,9 @@ std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natp
 
 void judgeGateway(GatewayAnswer upnp,
                   const GatewayAnswer& natpmp,
-                  const std::string& route,
+                  const std::vector<std::string>& routed,
                   Findings& findings) {
-    if (isOnlyAnnounced(upnp, route)) upnp = {State::SILENT, "", "", true, upnp.gateway};
+    if (isOnlyAnnounced(upnp, routed)) upnp = {State::SILENT, "", "", true, upnp.gateway};
     if (!isFound(upnp) && !isFound(natpmp)) {
         judgeSilence(upnp, natpmp, findings);
         return;
@@ -210,11 +220,17 @@ void judgeGateway(GatewayAnswer upnp,
     const std::string name = answer.gateway + protocols(upnp, natpmp);
     findings.add(Sign::GATEWAY_FOUND, "gateway " + name);
     judgeAddress(answer, "gateway " + name + ": ", findings);
-    if (route.empty() || route == answer.gateway) return;
+    if (!isElsewhere(answer, routed)) return;
     const std::string text =
-        answer.gateway + " answers as a gateway, the default route leads to " + route;
+        answer.gateway + " answers as a gateway, the default route leads to " + routed.front();
     findings.add(Sign::GATEWAY_ELSEWHERE, text);
     findings.ok("gateway: " + text);
+}
+
+void judgeSilentGateway(const std::string& address, Findings& findings) {
+    const std::string text = address + " does not answer in the home network at all";
+    findings.add(Sign::GATEWAY_SILENT, "the gateway " + text);
+    findings.problem("gateway: " + text);
 }
 
 void judgeTable(const GatewayTable& table, Findings& findings) {

@@ -24,14 +24,18 @@ struct GatewayAnswer {
     std::string unanswered;  ///< a device that announces itself or refuses, and cannot be used
 };
 
-/// Concludes from both protocols together. @p route is the gateway of the default route, empty if
-/// it is not known.
+/// Concludes from both protocols together. @p routed has the addresses of the default route's
+/// gateway, the one of the route first; empty if it is not known.
 void judgeGateway(GatewayAnswer upnp,
                   const GatewayAnswer& natpmp,
-                  const std::string& route,
+                  const std::vector<std::string>& routed,
                   Findings& findings);
 
-/// The external address that the answers tell, of whichever class; empty if there is none.
+/// Concludes from a gateway that does not even tell its hardware address.
+void judgeSilentGateway(const std::string& address, Findings& findings);
+
+/// The external address that the daemon takes from the answers, of whichever class; empty if that is
+/// none.
 [[nodiscard]] std::string externalAddress(const GatewayAnswer& upnp, const GatewayAnswer& natpmp);
 
 /// One entry of a gateway's table.
@@ -57,6 +61,7 @@ struct GatewayTable {
     std::vector<std::string> ownAddresses;
     int internalHttpPort{}, internalHttpsPort{};
     std::vector<PublishedPort> published;
+    bool isComplete = true;  ///< the entries were read to the end
 };
 
 /// Concludes from a table of mappings.

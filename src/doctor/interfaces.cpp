@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <array>
 #include <fstream>
+#include <map>
 #include <memory>
 #include <sstream>
 
@@ -21,7 +22,7 @@ namespace pelorus::doctor {
 
 namespace {
 
-constexpr std::size_t kMostRouteBytes = 64UL * 1024;
+constexpr std::size_t kMostTableBytes = 64UL * 1024;
 
 std::string addressText(in_addr address) {
     std::array<char, INET_ADDRSTRLEN> text{};
@@ -45,6 +46,15 @@ Interface& named(std::vector<Interface>& all, const std::string& name) {
 
 bool isTunOrTap(const std::string& name) {
     return access(("/sys/class/net/" + name + "/tun_flags").c_str(), F_OK) == 0;
+}
+
+// A file of /proc. Its size is not known before.
+std::string readTable(const char* path) {
+    std::ifstream file{path};
+    std::string table(kMostTableBytes, '\0');
+    file.read(table.data(), static_cast<std::streamsize>(table.size()));
+    table.resize(static_cast<std::size_t>(file.gcount()));
+    return table;
 }
 
 struct RouteLine {
@@ -129,11 +139,32 @@ std::optional<DefaultRoute> readDefaultRoute(const std::string& table) {
 }
 
 std::optional<DefaultRoute> defaultRoute() {
-    std::ifstream file{"/proc/net/route"};
-    std::string table(kMostRouteBytes, '\0');
-    file.read(table.data(), static_cast<std::streamsize>(table.size()));
-    table.resize(static_cast<std::size_t>(file.gcount()));
-    return readDefaultRoute(table);
+    return readDefaultRoute(readTable("/proc/net/route"));
+}
+
+LanHost readLanHost(const std::string& table, const std::string& address) {
+    LanHost host{{address}, false};
+    std::map<std::string, std::string> hardware;  // by address
+    std::istringstream lines{table};
+    for (std::string line; std::getline(lines, line);) {
+        std::istringstream words{line};
+        std::string known, type, flags, at;
+        words >> known >> type >> flags >> at;
+        if (flags != "0x0") {
+            hardware[known] = at;
+        } else if (known == address) {
+            host.isSilent = true;
+        }
+    }
+    const std::string own = hardware[address];
+    for (const auto& [known, at] : hardware) {
+        if (known != address && !own.empty() && at == own) host.addresses.push_back(known);
+    }
+    return host;
+}
+
+LanHost lanHost(const std::string& address) {
+    return readLanHost(readTable("/proc/net/arp"), address);
 }
 
 std::string lanAddress() {

@@ -30,6 +30,17 @@ struct DefaultRoute {
 /// That of this device.
 [[nodiscard]] std::optional<DefaultRoute> defaultRoute();
 
+/// A host of the LAN, as far as this device has talked with it lately.
+struct LanHost {
+    std::vector<std::string> addresses;  ///< all at its hardware address, the one asked for first
+    bool isSilent = false;               ///< it does not even tell its hardware address
+};
+
+/// The host with @p address by @p table, which is in the form of /proc/net/arp.
+[[nodiscard]] LanHost readLanHost(const std::string& table, const std::string& address);
+/// By the table of this device.
+[[nodiscard]] LanHost lanHost(const std::string& address);
+
 /// The device's address in its LAN, preferably on the interface of the default route; empty if it
 /// has none.
 [[nodiscard]] std::string lanAddress();

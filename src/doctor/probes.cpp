@@ -82,12 +82,15 @@ void take(const Findings& findings, Evidence& evidence) {
                            findings.checks().end());
 }
 
-// The gateway of the default route, unless that leads into a tunnel; empty if there is none.
-std::string lanGateway() {
+// The gateway of the default route, unless that leads into a tunnel; without addresses if there is
+// none.
+LanHost lanGateway() {
     const auto route = defaultRoute();
     if (!route) return {};
     for (const Interface& one : interfaces()) {
-        if (one.name == route->interface) return one.tunnel ? std::string{} : route->gateway;
+        if (one.name != route->interface) continue;
+        if (one.tunnel || route->gateway.empty()) return {};
+        return lanHost(route->gateway);
     }
     return {};
 }
@@ -105,7 +108,9 @@ public:
     void add(const Subject& subject, Findings& findings) const {
         const std::string name = subject.name;
         if (name == "UPnP") {
-            judgeGateway(answer("UPnP"), answer("NAT-PMP"), lanGateway(), findings);
+            const LanHost gateway = lanGateway();
+            judgeGateway(answer("UPnP"), answer("NAT-PMP"), gateway.addresses, findings);
+            if (gateway.isSilent) judgeSilentGateway(gateway.addresses.front(), findings);
             judgeUnfinishedTable(subject.found, findings);
         }
         if (name == "public address") {

@@ -21,13 +21,14 @@ enum class Sign {
     DAEMON_GONE,  ///< there is no such process
     TUNNEL_RUNS,  ///< the process that the pid file names
     TUNNEL_GONE,
-    SECOND_TUNNEL_CLIENT,  ///< beside the process that the pid file names
-    TUNNEL_CLIENT_ALONE,   ///< no other one beside it
-    TUNNEL_SAYS_UP,        ///< the client's output has the text of success
-    TUNNEL_REFUSED,        ///< the client's output says that the relay refuses the credentials
-    TUNNEL_UNANSWERED,     ///< the client's output says that it does not get through to the relay
+    SECOND_TUNNEL_CLIENT,   ///< beside the process that the pid file names
+    TUNNEL_CLIENT_ALONE,    ///< no other one beside it
+    TUNNEL_SAYS_UP,         ///< the client's output has the text of success
+    TUNNEL_REFUSED,         ///< the client's output says that the relay refuses the credentials
+    TUNNEL_UNANSWERED,      ///< the client's output says that it does not get through to the relay
+    RELAY_UNRESOLVED,       ///< the client's output says that the relay's name has no address
+    RELAY_CERTIFICATE_BAD,  ///< the client's output says that it does not trust the relay
     TUNNEL_FILES_UNWRITABLE,
-    DISK_UNUSED,  ///< for longer than the daemon lets a port test wake it
     DISK_IN_USE,  ///< by the minutes file
 
     // From probes.
@@ -35,9 +36,10 @@ enum class Sign {
     NO_ADDRESS,   ///< no usable one of IPv4
     HAS_ADDRESS,  ///< a usable one of IPv4, in a LAN
     NO_DEFAULT_ROUTE,
-    GATEWAY_FOUND,      ///< through UPnP or NAT-PMP
-    GATEWAY_ELSEWHERE,  ///< the one found is not that of the default route
-    NO_GATEWAY_ANSWERS,
+    GATEWAY_FOUND,       ///< through UPnP or NAT-PMP
+    GATEWAY_ELSEWHERE,   ///< the one found is not that of the default route
+    NO_GATEWAY_ANSWERS,  ///< in a way that the daemon can use
+    GATEWAY_SILENT,      ///< that of the default route does not even tell its hardware address
     GATEWAY_WITHOUT_ADDRESS,
     GATEWAY_HIDES_ADDRESS,  ///< it tells none, but leads to the internet
     GATEWAY_ADDRESS_PRIVATE,
@@ -45,9 +47,11 @@ enum class Sign {
     GATEWAY_ADDRESS_PUBLIC,
     GATEWAY_ADDRESS_CHANGED,  ///< it is not the published one
     OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
+    NO_PORT_MAPPED,           ///< to us, of those that are published
     PORT_HELD_BY_OTHER,
-    WEB_SERVER_SILENT,
-    DISK_ACTIVE,  ///< by its own word
+    WEB_SERVER_SILENT,  ///< on an internal port
+    NO_WEB_SERVER,      ///< on either of them
+    DISK_ACTIVE,        ///< by its own word
     BACK_END_ANSWERS,
     BACK_END_SILENT,
     SERVICE_REACHED,  ///< name, connection and certificate are right

@@ -6,6 +6,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <iterator>
+#include <optional>
 #include <set>
 #include <sstream>
 #include <utility>
@@ -29,20 +31,37 @@ constexpr std::size_t kTimeStamp = std::string_view{"2026-01-31 23:59:59 "}.size
 
 constexpr const char* kAsks = "link remote: ";
 constexpr const char* kAnswer = "Initial packet from";
-constexpr const char* kRefused = "control message: AUTH_FAILED";
 constexpr const char* kEnds[] = {"process restarting", "process exiting", "due to fatal error"};
-constexpr const char* kFailures[] = {
-    "Connection refused",           "Connection timed out",   "TLS key negotiation failed",
-    "TLS handshake failed",         "Inactivity timeout",     "No route to host",
-    "Cannot resolve host address:", "Network is unreachable", "VERIFY ERROR",
+
+struct Trouble {
+    const char* text;
+    Sign sign;
 };
 
-template <typename Texts>
-bool containsAny(const std::string& line, const Texts& texts) {
-    for (const char* text : texts) {
-        if (contains(line, text)) return true;
+constexpr Trouble kTroubles[] = {
+    {"control message: AUTH_FAILED", Sign::TUNNEL_REFUSED},
+    {"Cannot resolve host address:", Sign::RELAY_UNRESOLVED},
+    {"VERIFY ERROR", Sign::RELAY_CERTIFICATE_BAD},
+    {"VERIFY X509NAME ERROR", Sign::RELAY_CERTIFICATE_BAD},
+    {"Connection refused", Sign::TUNNEL_UNANSWERED},
+    {"Connection timed out", Sign::TUNNEL_UNANSWERED},
+    {"TLS key negotiation failed", Sign::TUNNEL_UNANSWERED},
+    {"TLS handshake failed", Sign::TUNNEL_UNANSWERED},
+    {"Inactivity timeout", Sign::TUNNEL_UNANSWERED},
+    {"No route to host", Sign::TUNNEL_UNANSWERED},
+    {"Network is unreachable", Sign::TUNNEL_UNANSWERED},
+};
+
+std::optional<Sign> troubleIn(const std::string& line) {
+    for (const Trouble& trouble : kTroubles) {
+        if (contains(line, trouble.text)) return trouble.sign;
     }
-    return false;
+    return std::nullopt;
+}
+
+bool endsAttempt(const std::string& line) {
+    return std::any_of(std::begin(kEnds), std::end(kEnds),
+                       [&line](const char* text) { return contains(line, text); });
 }
 
 std::string withoutTimeStamp(const std::string& line) {
@@ -176,11 +195,11 @@ private:
             if (evidence.has(Sign::TUNNEL_RUNS)) check(Verdict::OK, "tunnel client says: up");
         } else if (age && isOutdated(*age)) {
             return;
-        } else if (said.isRefused) {
+        } else if (said.trouble == Sign::TUNNEL_REFUSED) {
             blame(Sign::TUNNEL_REFUSED, "the relay refuses the device's credentials" + written);
-        } else if (!said.failure.empty()) {
-            blame(Sign::TUNNEL_UNANSWERED,
-                  "the tunnel client does not get through to the relay: " + said.failure + written);
+        } else if (said.trouble) {
+            blame(*said.trouble,
+                  "the tunnel client does not get through to the relay: " + said.line + written);
         }
     }
 
@@ -245,24 +264,31 @@ std::string tunnelFile(const Evidence& evidence, const std::string& key) {
 
 TunnelOutput readTunnelOutput(const std::string& output, const std::string& successText) {
     TunnelOutput said;
-    bool isWaiting = false;  // for the relay's first packet
+    bool isWaiting = false;    // for the relay's first packet
+    bool isExplained = false;  // what follows in the same attempt is a consequence
     std::istringstream lines{output};
     for (std::string line; std::getline(lines, line);) {
         if (line.find(successText) != std::string::npos) {
             said = {};
             said.isUp = true;
+            isExplained = false;
         }
-        if (contains(line, kRefused)) {
-            said = {false, true, ""};
-        } else if (containsAny(line, kFailures)) {
-            said.failure = shownText(withoutTimeStamp(line), kMostOfLine);
-            said.isRefused = false;
+        const auto trouble = troubleIn(line);
+        if (trouble && (!isExplained || trouble != Sign::TUNNEL_UNANSWERED)) {
+            said.trouble = trouble;
+            said.line = shownText(withoutTimeStamp(line), kMostOfLine);
+            isExplained = trouble != Sign::TUNNEL_UNANSWERED;
         }
+        if (trouble == Sign::TUNNEL_REFUSED) said.isUp = false;
         if (contains(line, kAsks)) isWaiting = true;
         if (contains(line, kAnswer)) isWaiting = false;
-        if (!containsAny(line, kEnds)) continue;
+        if (!endsAttempt(line)) continue;
         said.isUp = false;
-        if (isWaiting && said.failure.empty()) said.failure = "no answer at all";
+        isExplained = false;
+        if (isWaiting && !said.trouble) {
+            said.trouble = Sign::TUNNEL_UNANSWERED;
+            said.line = "no answer at all";
+        }
     }
     return said;
 }

@@ -2,6 +2,7 @@
 #ifndef PELORUS_DOCTOR_TUNNEL_LOOK_H
 #define PELORUS_DOCTOR_TUNNEL_LOOK_H
 
+#include <optional>
 #include <string>
 
 #include "doctor/evidence.h"
@@ -11,9 +12,9 @@ namespace pelorus::doctor {
 
 /// What the end of the client's output says.
 struct TunnelOutput {
-    bool isUp = false;       ///< the text of success, and no restart or end since
-    bool isRefused = false;  ///< the relay has refused the credentials since
-    std::string failure{};   ///< the last line since that says that it does not get through
+    bool isUp = false;              ///< the text of success, and no restart or end since
+    std::optional<Sign> trouble{};  ///< why it does not get through since
+    std::string line{};             ///< that says so; without its time
 };
 
 /// Reads @p output; an empty @p successText is in any line, as for the daemon.

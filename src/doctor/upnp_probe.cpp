@@ -184,9 +184,9 @@ void lookAtTable(const Service& service,
     for (PublishedPort& port : table.published) {
         if (isMappedByDaemon(evidence, address) && Clock::now() < end) askFor(service, port);
     }
-    const bool isComplete = readEntries(service, end, table.entries);
+    table.isComplete = readEntries(service, end, table.entries);
     judgeTable(table, findings);
-    if (!isComplete) findings.notSeen("gateway's table: it could not be read to its end");
+    if (!table.isComplete) findings.notSeen("gateway's table: it could not be read to its end");
 }
 
 void lookAtGateway(UPNPDev& gateways, const Evidence& evidence, Findings& findings) {

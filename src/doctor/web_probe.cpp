@@ -28,9 +28,13 @@ void lookAtWebServer(const Evidence& evidence, Findings& findings) {
     const std::string lan = lanAddress();
     const std::string address = lan.empty() ? "127.0.0.1" : lan;
     std::string missing;
+    bool listens = false;
     for (const int port : {http, https}) {
         const TcpConnection connection{address, port, kConnectPatience};
-        if (connection.connected()) continue;
+        if (connection.connected()) {
+            listens = true;
+            continue;
+        }
         missing += (missing.empty() ? "" : ", ") + std::string{"port "} + std::to_string(port) +
                    " of " + address + ": " + connection.obstacle();
     }
@@ -39,6 +43,7 @@ void lookAtWebServer(const Evidence& evidence, Findings& findings) {
                     std::to_string(https));
     } else {
         findings.add(Sign::WEB_SERVER_SILENT, "the web server does not listen, " + missing);
+        if (!listens) findings.add(Sign::NO_WEB_SERVER, "no web server listens");
         findings.problem("web server: " + missing);
     }
 }

@@ -83,6 +83,30 @@ TEST(DefaultRoute, IsTheOneOfLeastMetric) {
     EXPECT_EQ(best->gateway, "192.168.77.1");
 }
 
+TEST(LanHost, HasTheAddressesOfOneHardwareAddress) {
+    const std::string table =
+        "IP address       HW type     Flags       HW address            Mask     Device\n"
+        "192.168.1.1      0x1         0x2         02:00:00:00:77:01     *        eth0\n"
+        "192.168.1.2      0x1         0x2         02:00:00:00:77:02     *        eth0\n"
+        "192.168.1.254    0x1         0x2         02:00:00:00:77:01     *        eth0\n"
+        "192.168.1.3      0x1         0x0         00:00:00:00:00:00     *        eth0\n"
+        "192.168.1.4      0x1         0x0         00:00:00:00:00:00     *        eth0\n";
+    const struct {
+        std::string address;
+        std::vector<std::string> others;
+        bool isSilent;
+    } rows[]{{"192.168.1.1", {"192.168.1.254"}, false},
+             {"192.168.1.2", {}, false},
+             {"192.168.1.3", {}, true},
+             {"192.168.1.9", {}, false}};
+    for (const auto& row : rows) {
+        std::vector<std::string> all{row.address};
+        all.insert(all.end(), row.others.begin(), row.others.end());
+        EXPECT_EQ(readLanHost(table, row.address).addresses, all);
+        EXPECT_EQ(readLanHost(table, row.address).isSilent, row.isSilent) << row.address;
+    }
+}
+
 struct Network {
     std::vector<Interface> all;
     bool hasRoute;

@@ -134,13 +134,14 @@ TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
     const std::string copy = path("run/dynamicconfig.ini");
     writeFile("run/dynamicconfig.ini", dynamic +
                                            "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
-                                           "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=here\n");
+                                           "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=OLDS3CRET\nSUBDOMAIN=here\n");
     const auto report = check(
         "#DEVICETYPE=1\nOTHER=1\nOTHER=1\nEXTERNAL_IP=1\n"
-        "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n");
+        "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n#OLDS3CRET=1\n#NEWS3CRET=1\n",
+        "#DeviceAuth = NEWS3CRET\n");
     const std::string all = ::testing::PrintToString(report.remarks);
     EXPECT_EQ(all.find("OTHER"), all.rfind("OTHER")) << "once";
-    EXPECT_FALSE(holds(all, "s3cret") || holds(all, "EXTERNAL_IP")) << all;
+    EXPECT_FALSE(holds(all, "s3cret") || holds(all, "S3CRET") || holds(all, "EXTERNAL_IP")) << all;
     for (const char* part :
          {"# begins no comment: it sets #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
           "does not know DEVICEAUTH\"", "it sets #OLDAUTH\"", "does not know this key",

@@ -10,7 +10,7 @@
 namespace pelorus::doctor {
 namespace {
 
-using Settings = std::map<std::string, std::string>;
+using Settings = std::multimap<std::string, std::string>;
 
 TEST(Masks, HideSecretsInEveryForm) {
     struct Row {
@@ -24,16 +24,20 @@ TEST(Masks, HideSecretsInEveryForm) {
          "*AUTH_REMOVED* *AUTH_REMOVED* *AUTH_REMOVED*."},
         {"", "a&b=/c+d e", "", R"(a\u0026b=\/c+d e a%2526b=/c+d e a&#38;b=/c&#x2B;d e)",
          "*AUTH_REMOVED* *AUTH_REMOVED* *AUTH_REMOVED*"},
+        {"", "a&b=/c d e", "", R"(a&amp;amp;b=/c d e a%26amp%3Bb%3d/c+d+e \"a\x26b=\\/c&nbsp;d e\")",
+         R"(*AUTH_REMOVED* *AUTH_REMOVED* \"*AUTH_REMOVED*\")"},
         {"", "a&b=/c+d e", "", "cut a%26b=%... and a&amp;b%3D%2...",
          "cut *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "x%25y%zz", "", "x%25y%zz x%2525y%25zz", "*AUTH_REMOVED* *AUTH_REMOVED*"},
         {"dev7", "", "", "nas-devicedev7.kavra.example", "nas-device*ID_REMOVED*.kavra.example"},
         {"77", "", "", "port 7711", "port 7711"},
         {" abc\r", "xabcx", "", "abc xabcx", "*ID_REMOVED* *AUTH_REMOVED*"},
-        {"", "", "m\xC3\xBCller", "it is M??LLER", "it is *SUBDOMAIN_REMOVED*"},
+        {"", "", "m\xC3\xBCller", "it is M??LLER m&#252;ller", "it is *SUBDOMAIN_REMOVED* *SUBDOMAIN_REMOVED*"},
         {"", "s3cretword", "", "cut at s3cre... and s3cretwor...",
          "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
+        {"log", "relay", "gateway", "the gateway's log: logged (Relay), gateway.kavra.example",
+         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"},
         {"dev7", "", "", "on 203.0.113.7 of nas", "on 203.0.113.7 of nas"}};
     for (const Row& row : rows) {
         const Settings settings{
@@ -55,6 +59,8 @@ TEST(Masks, HideTheSecretsOfAnotherDevice) {
         {"auth=*AUTH_REMOVED* device*ID_REMOVED*.x", "auth=*AUTH_REMOVED* device*ID_REMOVED*.x"},
         {R"("device_id":"x7", deviceid%3Dx7 <id>x7</id>)", R"("device_id":"*ID_REMOVED*", deviceid%3D*ID_REMOVED* <id>*ID_REMOVED*</id>)"},
         {R"(Auth: x7 device_id = x7 \"auth\": \"x7\")", R"(Auth: *AUTH_REMOVED* device_id = *ID_REMOVED* \"auth\": \"*AUTH_REMOVED*")"},
+        {"device-id=x7, devid: x7; auth%3Ds3cret%26b Authorization: Basic x7==", "device-id=*ID_REMOVED*, devid: *ID_REMOVED*; auth%3D*AUTH_REMOVED*%26b Authorization: *AUTH_REMOVED*"},
+        {"/tmp/x/auth: need root, /rest/auth=x7", "/tmp/x/auth: need root, /rest/auth=*AUTH_REMOVED*"},
         {"AUTH: Received control message: AUTH_FAILED", "AUTH: Received control message: AUTH_FAILED"},
         {"the device is itself the router. This device.", "the device is itself the router. This device."}};
     // clang-format on

@@ -132,9 +132,10 @@ TEST(SettingValue, ATemplateMustTakeWhatItIsGiven) {
 
 TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
     const std::string copy = path("run/dynamicconfig.ini");
-    writeFile("run/dynamicconfig.ini", dynamic +
-                                           "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
-                                           "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=OLDS3CRET\nSUBDOMAIN=here\n");
+    writeFile("run/dynamicconfig.ini",
+              dynamic +
+                  "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
+                  "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=OLDS3CRET\nSUBDOMAIN=here\n");
     const auto report = check(
         "#DEVICETYPE=1\nOTHER=1\nOTHER=1\nEXTERNAL_IP=1\n"
         "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n#OLDS3CRET=1\n#NEWS3CRET=1\n",

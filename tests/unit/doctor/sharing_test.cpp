@@ -24,7 +24,8 @@ TEST(Masks, HideSecretsInEveryForm) {
          "*AUTH_REMOVED* *AUTH_REMOVED* *AUTH_REMOVED*."},
         {"", "a&b=/c+d e", "", R"(a\u0026b=\/c+d e a%2526b=/c+d e a&#38;b=/c&#x2B;d e)",
          "*AUTH_REMOVED* *AUTH_REMOVED* *AUTH_REMOVED*"},
-        {"", "a&b=/c d e", "", R"(a&amp;amp;b=/c d e a%26amp%3Bb%3d/c+d+e \"a\x26b=\\/c&nbsp;d e\")",
+        {"", "a&b=/c d e", "",
+         R"(a&amp;amp;b=/c d e a%26amp%3Bb%3d/c+d+e \"a\x26b=\\/c&nbsp;d e\")",
          R"(*AUTH_REMOVED* *AUTH_REMOVED* \"*AUTH_REMOVED*\")"},
         {"", "a&b=/c+d e", "", "cut a%26b=%... and a&amp;b%3D%2...",
          "cut *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
@@ -32,7 +33,8 @@ TEST(Masks, HideSecretsInEveryForm) {
         {"dev7", "", "", "nas-devicedev7.kavra.example", "nas-device*ID_REMOVED*.kavra.example"},
         {"77", "", "", "port 7711", "port 7711"},
         {" abc\r", "xabcx", "", "abc xabcx", "*ID_REMOVED* *AUTH_REMOVED*"},
-        {"", "", "m\xC3\xBCller", "it is M??LLER m&#252;ller", "it is *SUBDOMAIN_REMOVED* *SUBDOMAIN_REMOVED*"},
+        {"", "", "m\xC3\xBCller", "it is M??LLER m&#252;ller",
+         "it is *SUBDOMAIN_REMOVED* *SUBDOMAIN_REMOVED*"},
         {"", "s3cretword", "", "cut at s3cre... and s3cretwor...",
          "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
@@ -78,7 +80,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"version 1.7.0-54, 1.2.3.4.5, 1.2.3.400", "version 1.7.0-54, 1.2.3.4.5, 1.2.3.400"},
         {"2001:db8::1 [2001:DB8::1]:80 fe80::1%eth0", "address-1 [address-1]:80 private-address-1%eth0"},
         {"::ffff:1.2.3.4 Router::map 12:07:31", "address-1 Router::map 12:07:31"},
-        {"52:54:00:aB:cd:ef 52-54-00-AB-CD-EF", "mac-1 mac-1"},
+        {"52:54:00:aB:cd:ef 52-54-00-AB-CD-EF 525400abcdef 525400123456", "mac-1 mac-1 mac-1 525400123456"},
         {"ip=203.0.113.7&x http://203.0.113.7/", "ip=address-1&x http://address-1/"},
         {"cut at 203.0.1... cut at cloud.kavra.ex... cut...", "cut at ... cut at ... cut..."},
         {"NAS NAS.Local nasty", "host-1 host-2 nasty"},
@@ -96,7 +98,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"login?url=http%3A%2F%2F203.0.113.7%2F&from=http%3a%2f%2fmy-nas%2f", "login?url=http%3A%2F%2Faddress-1%2F&from=http%3a%2f%2fhost-1%2f"},
         {"[relay7] Inactivity timeout (--ping-restart)", "[host-1] Inactivity timeout (--ping-restart)"},
         {"CONNECT to box7: Failed to connect to box7:443 via proxy7:3128", "CONNECT to host-1: Failed to connect to host-1:443 via host-2:3128"},
-        {"my-nas_lan eth0.my-nas my-n... na... '203... 2003...", "host-1_lan eth0.host-1 host-1... na... '... ..."},
+        {"my-nas_lan eth0_my-nas my-n... na... '203... 2003...", "host-1_lan eth0_host-1 host-1... na... '... ..."},
         {"the port wanted for internal port 443 leads to Annas-MacBook", "the port wanted for internal port 443 leads to host-1"},
         {"gateway maps port 80 to Anna's PC (Anna (Mac) Schmidt), 443 to 192.168.1.5 (b), another device", "gateway maps port 80 to host-1 (name-1), 443 to private-address-1 (name-2), another device"},
         {"Failed to connect to box7 port 443 via proxy7 after 3 ms", "Failed to connect to host-1 port 443 via host-2 after 3 ms"},
@@ -110,7 +112,9 @@ TEST(Masks, HidePlacesForSharing) {
         {"reset by peer in connection to box:443", "reset by peer in connection to host-1:443"},
         {"depth=0: CN=relay3, O=x", "depth=0: CN=host-1, O=x"},
         {"the gateway maps port 80 to 192.168.1.5 (Alice's 10.0.0.1)", "the gateway maps port 80 to private-address-1 (name-1)"},
-        {"/home/alice/x.ini and /home/bob", "/home/user-1/x.ini and /home/user-2"},
+        {R"(/home/alice/x.ini and /volume1/homes/b?b+1: C:\Users\Alice\x)", R"(/home/user-1/x.ini and /volume1/homes/user-2: C:\Users\user-1\x)"},
+        {"annas.nas2:5000 annas.nas-2 TLSv1.3 x.bz2", "host-1:5000 host-2 TLSv1.3 x.bz2"},
+        {"The gateway, its gateway.lan: resolve host: gateway", "The gateway, its host-1: resolve host: host-2"},
         {"log /srv/box/syslog.1.gz: need root", "log syslog.1.gz: need root"},
         {"/etc/pelorus/globalconfig.ini, messages-20261101.gz", "/etc/pelorus/globalconfig.ini, messages-20261101.gz"},
         {"nas.kavra.example.log user.log", "host-1 user.log"},
@@ -118,7 +122,8 @@ TEST(Masks, HidePlacesForSharing) {
         {"", ""}};
     // clang-format on
     for (const auto& [text, masked] : rows) {
-        const PlaceMasks places{{"nas", "my-nas", "localhost", ""}, {"/srv/box/syslog.1.gz", "-"}};
+        const PlaceMasks places{{"nas", "my-nas", "gateway", "localhost", ""},
+                                {"/srv/box/syslog.1.gz", "-"}};
         EXPECT_EQ((Masks{Settings{}, places}.hide(text)), masked);
     }
 }

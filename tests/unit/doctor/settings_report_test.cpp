@@ -255,8 +255,8 @@ TEST_F(SettingsReportTest, OnlyTheStaticFileIsReadWhole) {
 
 TEST_F(SettingsReportTest, RubbishGivesABoundedReport) {
     std::string rubbish;
-    for (int line = 0; line < 30'000; ++line) {
-        rubbish += std::string{static_cast<char>(line % 256), static_cast<char>(line % 61)} +
+    for (int line = 0; line < 1000; ++line) {
+        rubbish += std::string{static_cast<char>(line % 256), static_cast<char>(line % 7)} +
                    std::to_string(line) + "=\x01\xFF\n";
     }
     const auto report = check("", rubbish);

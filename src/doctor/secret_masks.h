@@ -18,8 +18,8 @@ namespace pelorus::doctor {
 /// own sentences, where it stands in one.
 class SecretMasks {
 public:
-    /// With the values that @p settings give these keys, of which there may be several; other keys
-    /// are ignored.
+    /// With the values that @p settings give these keys, the first 1000 of each; other keys are
+    /// ignored.
     explicit SecretMasks(const std::multimap<std::string, std::string>& settings);
 
     /// True for a value at a place of a text that is left for others to hide.

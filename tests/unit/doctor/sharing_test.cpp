@@ -19,7 +19,6 @@ TEST(Masks, HideSecretsInEveryForm) {
     const Row rows[]{
         {"dev7", "a&b=", "smith", "Dev7 a&b= SMITH",
          "*ID_REMOVED* *AUTH_REMOVED* *SUBDOMAIN_REMOVED*"},
-        {"dev7", "a&b=", "", "?key=a%26b%3d", "?key=*AUTH_REMOVED*"},
         {"", "a&b=/c+d e", "", "a&amp;b=/c+d e a%26b%3D%2fc%2bd+e a%26b=/c+d%20e.",
          "*AUTH_REMOVED* *AUTH_REMOVED* *AUTH_REMOVED*."},
         {"", "a&b=/c+d e", "", R"(a\u0026b=\/c+d e a%2526b=/c+d e a&#38;b=/c&#x2B;d e)",
@@ -30,7 +29,6 @@ TEST(Masks, HideSecretsInEveryForm) {
         {"", "a&b=/c+d e", "", "cut a%26b=%... and a&amp;b%3D%2...",
          "cut *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "x%25y%zz", "", "x%25y%zz x%2525y%25zz", "*AUTH_REMOVED* *AUTH_REMOVED*"},
-        {"dev7", "", "", "nas-devicedev7.kavra.example", "nas-device*ID_REMOVED*.kavra.example"},
         {"77", "", "", "port 7711", "port 7711"},
         {" abc\r", "xabcx", "", "abc xabcx", "*ID_REMOVED* *AUTH_REMOVED*"},
         {"", "", "m\xC3\xBCller", "it is M??LLER m&#252;ller",
@@ -81,15 +79,11 @@ TEST(Masks, HidePlacesForSharing) {
         {"2001:db8::1 [2001:DB8::1]:80 fe80::1%eth0", "address-1 [address-1]:80 private-address-1%eth0"},
         {"::ffff:1.2.3.4 Router::map 12:07:31", "address-1 Router::map 12:07:31"},
         {"52:54:00:aB:cd:ef 52-54-00-AB-CD-EF 525400abcdef 525400123456", "mac-1 mac-1 mac-1 525400123456"},
-        {"ip=203.0.113.7&x http://203.0.113.7/", "ip=address-1&x http://address-1/"},
         {"cut at 203.0.1... cut at cloud.kavra.ex... cut...", "cut at ... cut at ... cut..."},
         {"NAS NAS.Local nasty", "host-1 host-2 nasty"},
-        {"https://cloud.kavra.example:443/x", "https://host-1:443/x"},
         {"cloud.kavra.example. *.kavra.example .kavra.example", "host-1. host-2 .host-3"},
         {"nas-device*ID_REMOVED*.kavra.example", "host-1"},
         {"7.113.0.203.in-addr.arpa", "host-1"},
-        {"Failed to connect to cloud.kavra.example port 443 after 3 ms", "Failed to connect to host-1 port 443 after 3 ms"},
-        {"connect to box port 443 failed", "connect to host-1 port 443 failed"},
         {"connect to 203.0.113.7 port 443, connect to ::1 port 443", "connect to address-1 port 443, connect to ::1 port 443"},
         {"[AF_INET6]2003:c9:1f2a:4b00:21a:4bff:fe12:3456:1194 [AF_INET6]2003::1:1194 2003::1", "[AF_INET6]address-1:1194 [AF_INET6]address-2:1194 address-2"},
         {"addr:2003:c9:1f2a:4b00:21a:4bff:fe12:3456 2003:c9:1f2a:4b00:21a:4bff:fe12:3456.443", "addr:address-1 address-1.443"},
@@ -118,8 +112,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"log /srv/box/syslog.1.gz: need root", "log syslog.1.gz: need root"},
         {"/etc/pelorus/globalconfig.ini, messages-20261101.gz", "/etc/pelorus/globalconfig.ini, messages-20261101.gz"},
         {"nas.kavra.example.log user.log", "host-1 user.log"},
-        {"LOCAL_... URLs: e.g. 2.5 s . :", "LOCAL_... URLs: e.g. 2.5 s . :"},
-        {"", ""}};
+        {"LOCAL_... URLs: e.g. 2.5 s . :", "LOCAL_... URLs: e.g. 2.5 s . :"}};
     // clang-format on
     for (const auto& [text, masked] : rows) {
         const PlaceMasks places{{"nas", "my-nas", "gateway", "localhost", ""},

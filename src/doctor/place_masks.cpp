@@ -161,7 +161,7 @@ struct Place {
 
 constexpr std::string_view kTable = "gateway maps port ";
 
-constexpr std::array<Place, 29> kPlaces{{
+constexpr std::array<Place, 27> kPlaces{{
     {"connect to ", " port ", "host", Ends::BEFORE},
     {"connect to ", ":", "host", Ends::BEFORE},
     {" via ", ":", "host", Ends::BEFORE},
@@ -173,10 +173,8 @@ constexpr std::array<Place, 29> kPlaces{{
     {"resolve host address: ", "", "host"},
     {"resolve: ", " (", "host", Ends::BEFORE},
     {"resolve proxy: ", "", "host"},
-    {"host name '", "'", "host", Ends::AT},
-    {"hostname '", "'", "host", Ends::AT},
+    {"name '", "'", "host", Ends::AT},
     {"host '", "'", "host", Ends::AT},
-    {"subject name '", "'", "host", Ends::AT},
     {"subject name (", ")", "host", Ends::AT},
     {"[", "] Inactivity timeout", "host", Ends::BEFORE},
     {"[", "] Peer Connection Initiated", "host", Ends::BEFORE},

@@ -107,16 +107,14 @@ std::size_t keyStart(std::string_view text, std::string_view key) {
     return text.npos;
 }
 
-// The tunnel's client begins its messages with AUTH, and behind the path of a file stands a colon.
-bool isNoKey(std::string_view text, std::size_t at) {
-    if (startsWith(text.substr(at), "AUTH: ")) return true;
-    const bool isPart =
-        text.substr(at, text.find(':', at) - at).find_first_of(" \"'=>") == text.npos;
+// A colon behind the name of a file is the sentence's.
+bool isInPath(std::string_view text, std::size_t at) {
     const auto isOfName = [](char letter) {
-        return isLetterOrDigit(letter) || std::string_view{"-_."}.find(letter) != kCut.npos;
+        return isLetterOrDigit(letter) ||
+               std::string_view{"-_."}.find(letter) != std::string_view::npos;
     };
     while (at > 0 && isOfName(text[at - 1])) --at;
-    return isPart && at > 0 && text[at - 1] == '/';
+    return at > 0 && text[at - 1] == '/';
 }
 
 // The places of what one reading of a text shows.
@@ -163,9 +161,12 @@ public:
         for (std::size_t at = text.find_first_of("=:>"); at != text.npos;
              at = text.find_first_of("=:>", at + 1)) {
             const auto before = text.substr(0, text.substr(0, at).find_last_not_of(kAround) + 1);
+            const bool isColon = text[at] == ':' && before.size() == at;
             for (const Marker& key : kKeys) {
                 const std::size_t start = keyStart(before, key.before);
-                if (start == text.npos || isNoKey(text, start)) continue;
+                if (start == text.npos || (isColon && isInPath(text, start))) continue;
+                // The tunnel's client begins its messages so.
+                if (startsWith(text.substr(start), "AUTH: ")) continue;
                 addUpTo(key.ends, text.find_first_not_of(kAround, at + 1), key.mask);
             }
         }

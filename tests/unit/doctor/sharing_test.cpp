@@ -37,8 +37,7 @@ TEST(Masks, HideSecretsInEveryForm) {
          "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
         {"log", "relay", "gateway", "the gateway's log: logged (Relay), gateway.kavra.example",
-         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"},
-        {"dev7", "", "", "on 203.0.113.7 of nas", "on 203.0.113.7 of nas"}};
+         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"}};
     for (const Row& row : rows) {
         const Settings settings{
             {"DEVICEID", row.id}, {"DEVICEAUTH", row.auth}, {"SUBDOMAIN", row.subdomain}};
@@ -70,8 +69,7 @@ TEST(Masks, HideTheSecretsOfAnotherDevice) {
 TEST(Masks, HidePlacesForSharing) {
     // clang-format off
     const char* const rows[][2]{
-        {"203.0.113.7:9091, 203.0.113.7.", "address-1:9091, address-1."},
-        {"203.0.113.7 and 203.0.113.8", "address-1 and address-2"},
+        {"203.0.113.7:9091, 203.0.113.8, 203.0.113.7.", "address-1:9091, address-2, address-1."},
         {"10.0.0.1 172.31.0.1 192.168.1.1 169.254.1.1", "private-address-1 private-address-2 private-address-3 private-address-4"},
         {"100.64.3.9 100.128.0.1", "shared-address-1 address-1"},
         {"127.0.0.1 0.0.0.0 255.255.255.0 ::1 ::", "127.0.0.1 0.0.0.0 255.255.255.0 ::1 ::"},

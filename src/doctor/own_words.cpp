@@ -14,14 +14,16 @@ namespace {
 
 // What facts have beside the words of the causes.
 constexpr std::string_view kOfFacts =
-    "about accepted active ago already also announced answered before connect connected connecting "
-    "did differs direct directly disabled dynamic empty error expired external failure forwarding "
-    "gave gone handshake holds host idle ignored interface known last leads least lifetime line "
-    "lines listens logged maps mappings message more need now number options packet part passed "
-    "problem process reach reaches recognised relayed request resolved response result root route "
-    "runs seconds see seen sees several severity since skipped sleep standby started state static "
-    "successful temporary test than timed timeout unknown unless unused update user value verified "
-    "via waiting where while whole writes yesterday zero";
+    "about accepted active ago already also announced announces answered before connect connected "
+    "connecting control data date did differs direct directly disabled dynamic empty error "
+    "expired external failure folder forwarding gave gone handshake hard holds host idle ignored "
+    "input interface key known last leads least level lifetime line lines link list listens "
+    "logged main mappings maps message more need now number options packet part passed pid "
+    "problem process program reach reaches recognised relayed request resolved response result "
+    "root route runs seconds see seen sees several severity signal since skipped sleep space "
+    "standby started state static successful syslog table temporary test than timed timeout told "
+    "unknown unless unused update user value verified via waiting where while whole writes "
+    "yesterday zero";
 
 bool isLetter(char letter) {
     return std::isalpha(static_cast<unsigned char>(letter)) != 0;

@@ -214,11 +214,12 @@ std::string replaced(const std::string& text, std::vector<Span> spans) {
     for (auto span = spans.begin(); span != spans.end();) {
         Span longest = *span;
         const std::size_t begin = span->begin;
-        std::size_t end = span->end;
-        for (; span != spans.end() && span->begin < end; ++span) {
+        std::size_t end = begin;
+        do {
             end = std::max(end, span->end);
             if (span->end - span->begin > longest.end - longest.begin) longest = *span;
-        }
+            ++span;
+        } while (span != spans.end() && span->begin < end);
         result.append(text, at, begin - at).append(longest.mask);
         at = end;
     }

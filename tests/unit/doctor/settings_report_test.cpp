@@ -119,7 +119,6 @@ TEST_F(SettingsReportTest, AFaultIsNamedWithFileAndLine) {
 
 TEST(SettingValue, ATemplateMustTakeWhatItIsGiven) {
     const char* const rows[][2]{
-        {"/%s?port=%d", ""},
         {"/%s?port=%u&part=100%%", ""},
         {"/", ""},
         {"/%s/%d/%s", "has more than 2 placeholders: no URL is built"},

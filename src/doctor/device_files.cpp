@@ -140,6 +140,7 @@ void lookAtMinutes(const std::string& path, Evidence& evidence) {
 void lookAtFiles(const DevicePaths& paths, Evidence& evidence) {
     const DeviceSettings settings = readDeviceSettings(paths.staticFile);
     evidence.settings = settings.merged.values;
+    evidence.secrets = settings.secrets();
     evidence.unreadSettings = settings.needsRoot ? "the settings need root" : settings.reason;
     evidence.statusWord = shownText(evidence.setting("COMMUNICATION_STATUS"), 20);
     const ProcessTable processes{paths.processes};

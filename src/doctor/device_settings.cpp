@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cctype>
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
@@ -10,6 +11,7 @@
 #include <fstream>
 
 #include "common/handles.h"
+#include "doctor/known_settings.h"
 #include "doctor/shown_text.h"
 #include "doctor/write_obstacle.h"
 
@@ -56,6 +58,17 @@ void mergeLines(SettingsMap& map,
         if (++count > kMostLines) return;
         lines.push_back({kind, line.number, line.key, std::string{line.value}, line.fate});
     });
+}
+
+// Without blanks and the # of what is meant for a comment, in capitals.
+std::string meantKey(const std::string& key) {
+    std::string result;
+    for (const char letter : key) {
+        const auto code = static_cast<unsigned char>(letter);
+        if (std::isspace(code) == 0 && letter != '#')
+            result += static_cast<char>(std::toupper(code));
+    }
+    return result;
 }
 
 class SettingsReader {
@@ -164,6 +177,19 @@ FileKind DeviceSettings::dynamicSource() const {
 std::string DeviceSettings::value(const std::string& key) const {
     const auto found = merged.values.find(key);
     return found == merged.values.end() ? std::string{} : found->second;
+}
+
+std::multimap<std::string, std::string> DeviceSettings::secrets() const {
+    std::multimap<std::string, std::string> result(merged.values.begin(), merged.values.end());
+    for (const auto& some : {lines, linesOf(dynamicFile, FileKind::DYNAMIC)}) {
+        for (const SettingsLine& line : some) {
+            const std::string key = meantKey(line.key);
+            const KnownSetting* known = findKnownSetting(key);
+            const bool isSecret = known != nullptr && known->kind == SettingKind::SECRET;
+            if (isSecret) result.emplace(key, line.value);
+        }
+    }
+    return result;
 }
 
 DeviceSettings readDeviceSettings(const std::string& staticFile) {

@@ -3,6 +3,7 @@
 #define PELORUS_DOCTOR_DEVICE_SETTINGS_H
 
 #include <cstddef>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -51,6 +52,9 @@ struct DeviceSettings {
     /// What the dynamic settings come from: the copy, or as long as there is none, the file itself.
     [[nodiscard]] FileKind dynamicSource() const;
     [[nodiscard]] std::string value(const std::string& key) const;
+    /// Every value that the files give the device's secrets, by key: also those that another line
+    /// overrides, or that stand behind # or a key in another spelling.
+    [[nodiscard]] std::multimap<std::string, std::string> secrets() const;
 };
 
 /// Reads what the daemon would read at its start. Creates no copy: where it is missing, the dynamic

@@ -75,6 +75,7 @@ struct Evidence {
     std::optional<Time> logBegin{}, logEnd{};     ///< first and last line of the daemon
     std::set<std::string> logHosts{};             ///< that logged the daemon's lines; 1000 at most
     std::map<std::string, std::string> settings;  ///< as the daemon merges them; has secrets
+    std::multimap<std::string, std::string> secrets{};  ///< all that the files hold, old ones too
     std::string unreadSettings{};  ///< why a file was not read: "the settings need root"
     std::string statusWord{};      ///< COMMUNICATION_STATUS of the settings
     DaemonState daemon{};

@@ -24,7 +24,7 @@ constexpr double kMarkHeight = 18, kMarkAbove = 28;  // the top of a mark above 
 constexpr double kAxisHeight = 64;
 constexpr double kLeastSliver = 1.5;  // a period of seconds can be seen
 constexpr double kLine = 20, kEntryGap = 8, kColumn = 585, kTextAt = 40;
-constexpr std::size_t kListLetters = 64, kSmallListLetters = 76;
+constexpr std::size_t kListLetters = 64, kSmallListLetters = 76, kNoteLetters = 160;
 constexpr std::size_t kMostTicks = 12;
 constexpr std::size_t kMostListed = 40;
 
@@ -128,7 +128,7 @@ public:
         drawAxis();
         drawBand();
         drawMarks();
-        const double bottom = drawList();
+        const double bottom = drawNotes(drawList());
         return sheet.svg(kWidth, bottom + kMargin / 2);
     }
 
@@ -144,6 +144,7 @@ private:
     [[nodiscard]] std::vector<Mark> marks() const;
     void drawMark(double left, double right, double top, const std::string& label, Reach reach);
     double drawList();
+    double drawNotes(double bottom);
     double drawEntry(std::size_t number, double x, double y);
     [[nodiscard]] std::vector<std::string> linesOf(const Entry& entry) const;
     [[nodiscard]] std::string times(const Entry& entry) const;
@@ -367,6 +368,17 @@ double HistoryPicture::drawList() {
         const std::string more = std::to_string(entries.size() - most) + " more: see --json";
         sheet.write("and " + more, {kLeft, bottom + 14, 12, kQuiet});
         bottom += kLine;
+    }
+    return bottom;
+}
+
+// What is not known may be missing in the band.
+double HistoryPicture::drawNotes(double bottom) {
+    for (const std::string& text : diagnosis.untold) {
+        for (const std::string& line : wrap("Unknown: " + text, kNoteLetters)) {
+            sheet.write(line, {kLeft, bottom + 14, 12, kQuiet});
+            bottom += kLine;
+        }
     }
     return bottom;
 }

@@ -9,7 +9,7 @@
 namespace pelorus::doctor {
 
 /// A band of statuses over time with a legend, their shares, numbered marks where a cause set in,
-/// and the causes by number: an SVG file.
+/// the causes by number, and what could not be told: an SVG file.
 [[nodiscard]] std::string historyPicture(const Diagnosis& diagnosis);
 
 }  // namespace pelorus::doctor

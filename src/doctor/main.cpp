@@ -118,12 +118,13 @@ int writePicture(const std::string& path, const std::string& picture) {
 
 Masks masksFor(const DoctorOptions& options,
                const std::map<std::string, std::string>& settings,
+               const std::multimap<std::string, std::string>& secrets,
                std::vector<std::string> hosts) {
-    if (!options.share) return Masks{settings};
+    if (!options.share) return Masks{secrets};
     if (const auto server = settings.find("SERVER_BASE_URL"); server != settings.end()) {
         hosts.push_back(serviceName(server->second));
     }
-    return Masks{settings, PlaceMasks{hosts, options.logs}};
+    return Masks{secrets, PlaceMasks{hosts, options.logs}};
 }
 
 int reportSettings(const DoctorOptions& options) {
@@ -131,7 +132,8 @@ int reportSettings(const DoctorOptions& options) {
     const std::string file = found.path;
     SettingsReport report = checkSettings(file);
     if (!found.remark.empty()) report.remarks.insert(report.remarks.begin(), found.remark);
-    Masks masks = masksFor(options, readDeviceSettings(file).merged.values, {hostName()});
+    const DeviceSettings settings = readDeviceSettings(file);
+    Masks masks = masksFor(options, settings.merged.values, settings.secrets(), {hostName()});
     const Layout how = layout();
     std::string text;
     const auto add = [&](const char* label, const std::string& line) {
@@ -161,7 +163,7 @@ int reportDiagnosis(const DoctorOptions& options) {
     if (!evidence.fromElsewhere) hosts.push_back(hostName());
     // In every text of it: masked in the finished output, a number that is a secret would spoil the
     // format where it is a coordinate or a time.
-    masksFor(options, evidence.settings, hosts).hideIn(diagnosis);
+    masksFor(options, evidence.settings, evidence.secrets, hosts).hideIn(diagnosis);
     int failure = 0;
     if (!options.picture.empty()) {
         failure = writePicture(options.picture, historyPicture(diagnosis));

@@ -5,10 +5,12 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
+#include <functional>
 #include <optional>
 
 #include "common/text.h"
 #include "doctor/address_class.h"
+#include "doctor/own_words.h"
 #include "doctor/shown_text.h"
 #include "doctor/text_parts.h"
 
@@ -75,22 +77,29 @@ std::string canonical(const in6_addr& address) {
     return text.data();
 }
 
-// Six pairs of hexadecimal digits, all with the same character between them.
-bool isMac(std::string_view word) {
-    constexpr std::size_t kLength = 17;
-    if (word.size() != kLength || !isOneOf(word[2], ":-")) return false;
-    for (std::size_t index = 0; index < kLength; ++index) {
-        const bool isHex = std::isxdigit(static_cast<unsigned char>(word[index])) != 0;
-        if (index % 3 == 2 ? word[index] != word[2] : !isHex) return false;
+bool isHex(char letter) {
+    return std::isxdigit(static_cast<unsigned char>(letter)) != 0;
+}
+
+// Length of the MAC address that a text begins with, 0 if there is none: six pairs of hexadecimal
+// digits, with the same character between them, or with none and a letter among them.
+std::size_t macLength(std::string_view text) {
+    constexpr std::size_t kPairs = 6;
+    const bool isJoined = text.size() < 3 || !isOneOf(text[2], ":-");
+    const std::size_t step = isJoined ? 2 : 3, length = kPairs * step - (isJoined ? 0 : 1);
+    if (text.size() < length || (text.size() > length && isLetterOrDigit(text[length]))) return 0;
+    bool hasLetter = false;
+    for (std::size_t index = 0; index < length; ++index) {
+        const char letter = text[index];
+        if (index % step == 2 ? letter != text[2] : !isHex(letter)) return 0;
+        hasLetter |= isLetter(letter);
     }
-    return true;
+    return isJoined && !hasLetter ? 0 : length;
 }
 
 // A character as URLs encode it: "%2F" is no part of the word behind it.
 bool isEncoded(std::string_view text) {
-    return text.size() >= 3 && text.front() == '%' &&
-           std::isxdigit(static_cast<unsigned char>(text[1])) != 0 &&
-           std::isxdigit(static_cast<unsigned char>(text[2])) != 0;
+    return text.size() >= 3 && text.front() == '%' && isHex(text[1]) && isHex(text[2]);
 }
 
 // Length of the IPv4 address at a place of a word, 0 if there is none.
@@ -110,8 +119,8 @@ std::size_t ipv4Length(std::string_view word, std::size_t at) {
 
 // With nothing but a number between its name and an ending that no domain has: "syslog.1.gz".
 bool isFileName(std::string_view word) {
-    constexpr std::array<std::string_view, 11> kEndings{"conf", "cfg",  "crt", "gz",  "ini", "log",
-                                                        "out",  "ovpn", "pem", "pid", "txt"};
+    constexpr std::array<std::string_view, 12> kEndings{"bz2", "conf", "cfg",  "crt", "gz",  "ini",
+                                                        "log", "out",  "ovpn", "pem", "pid", "txt"};
     const std::string_view ending = word.substr(word.rfind('.') + 1);
     const std::string_view middle =
         word.substr(word.find('.'), word.size() - ending.size() - word.find('.'));
@@ -119,15 +128,17 @@ bool isFileName(std::string_view word) {
            std::none_of(middle.begin(), middle.end(), isLetter);
 }
 
-// Labels with dots between them, the last one of letters: "nas.kavra.example", "*.example".
+// Labels with dots between them, the last one with a letter in front: "nas.kavra.example", "*.nas2".
 bool looksLikeName(std::string_view word) {
     const std::size_t dot = word.rfind('.');
     if (dot == word.npos || dot == 0 || word.size() - dot < 3) return false;
     if (word.find("..") != word.npos || word.find(':') != word.npos) return false;
     const std::string_view last = word.substr(dot + 1);
-    const bool isDomain =
-        startsWith(last, "xn--") || std::all_of(last.begin(), last.end(), isLetter);
-    return isDomain && !isFileName(word);
+    const bool isLabel =
+        isLetter(last.front()) && std::all_of(last.begin(), last.end(), [](char letter) {
+            return isLetterOrDigit(letter) || letter == '-';
+        });
+    return isLabel && !isFileName(word);
 }
 
 // How the end of a name is found.
@@ -136,6 +147,7 @@ enum class Ends {
     BEFORE,   // the text behind it, which follows the word
     AT,       // the text behind it, whatever the name holds
     AS_USER,  // the @ of a URL
+    IN_PATH,  // what ends a part of a path
     AS_ITEM,  // of a list: its client or what others call it
 };
 
@@ -161,10 +173,8 @@ constexpr std::array<Place, 27> kPlaces{{
     {"resolve host address: ", "", "host"},
     {"resolve: ", " (", "host", Ends::BEFORE},
     {"resolve proxy: ", "", "host"},
-    {"host name '", "'", "host", Ends::AT},
-    {"hostname '", "'", "host", Ends::AT},
+    {"name '", "'", "host", Ends::AT},
     {"host '", "'", "host", Ends::AT},
-    {"subject name '", "'", "host", Ends::AT},
     {"subject name (", ")", "host", Ends::AT},
     {"[", "] Inactivity timeout", "host", Ends::BEFORE},
     {"[", "] Peer Connection Initiated", "host", Ends::BEFORE},
@@ -172,8 +182,10 @@ constexpr std::array<Place, 27> kPlaces{{
     {"://", "@", "user", Ends::AS_USER},
     {"://", "", "host"},
     {"@", "", "host"},
-    {"/home/", "", "user"},
-    {"/Users/", "", "user"},
+    {"/home/", "", "user", Ends::IN_PATH},
+    {"/homes/", "", "user", Ends::IN_PATH},
+    {"/Users/", "", "user", Ends::IN_PATH},
+    {"\\Users\\", "", "user", Ends::IN_PATH},
     {" leads to ", "", "host", Ends::AS_ITEM, "the port wanted for internal port "},
     {" to ", "", "host", Ends::AS_ITEM, kTable},
     {" (", ")", "name", Ends::AS_ITEM, kTable},
@@ -207,6 +219,8 @@ std::size_t namedLength(const Place& place, std::string_view text, std::size_t a
     text.remove_prefix(at);
     if (place.ends == Ends::AS_ITEM) return itemLength(place, text);
     if (place.ends == Ends::AS_USER) return userLength(text);
+    if (place.ends == Ends::IN_PATH)
+        return std::min(text.find_first_of(" /\\\"'<>:;,)"), text.size());
     const auto* const end = std::find_if_not(text.begin(), text.end(), [](char letter) {
         return isWordLetter(letter) && letter != ':';
     });
@@ -225,7 +239,7 @@ std::size_t namedLength(const Place& place, std::string_view text, std::size_t a
 std::size_t ipv6Length(std::string_view word, std::size_t at) {
     const std::string_view rest = word.substr(at);
     const auto* const end = std::find_if_not(rest.begin(), rest.end(), [](char letter) {
-        return isOneOf(letter, ".:") || std::isxdigit(static_cast<unsigned char>(letter)) != 0;
+        return isOneOf(letter, ".:") || isHex(letter);
     });
     constexpr std::size_t kLongest = INET6_ADDRSTRLEN;
     auto length = std::min(static_cast<std::size_t>(end - rest.begin()), kLongest);
@@ -239,7 +253,6 @@ std::size_t ipv6Length(std::string_view word, std::size_t at) {
 // Too little for a mask, but the beginning of an address.
 bool isBeginning(std::string_view text) {
     constexpr std::size_t kGroup = 4;
-    const auto isHex = [](unsigned char letter) { return std::isxdigit(letter) != 0; };
     return text.size() <= kGroup && std::all_of(text.begin(), text.end(), isHex) &&
            std::any_of(text.begin(), text.end(), isDigit);
 }
@@ -274,9 +287,9 @@ std::string PlaceMasks::hide(std::string text) {
         if (length == 0) {
             const auto* const end = std::find_if_not(rest.begin(), rest.end(), isWordLetter);
             length = static_cast<std::size_t>(end - rest.begin());
-            const bool isWord = length > 0;
-            if (!isWord) length = isEncoded(rest) ? 3 : 1;
-            result += isWord ? hideWordAt(text, at, length) : std::string{rest.substr(0, length)};
+            const bool isHidden = length > 0 && !isOwnWord(text, at, 1);
+            if (length == 0) length = isEncoded(rest) ? 3 : 1;
+            result += isHidden ? hideWordAt(text, at, length) : std::string{rest.substr(0, length)};
         }
         at += length;
     }
@@ -350,18 +363,17 @@ std::string PlaceMasks::hideParts(std::string_view word) {
 }
 
 PlaceMasks::Part PlaceMasks::partAt(std::string_view word, std::size_t at) const {
-    constexpr std::size_t kMacLength = 17;
     if (at > 0 && isLetterOrDigit(word[at - 1])) return {};
     const std::string_view rest = word.substr(at);
     if (const std::size_t length = ipv6Length(word, at); length > 0) {
         const auto address = ipv6(rest.substr(0, length));
         return {length, kindOf(*address), canonical(*address)};
     }
-    if (isMac(rest.substr(0, kMacLength)) &&
-        (rest.size() == kMacLength || !isLetterOrDigit(rest[kMacLength]))) {
-        std::string place = lowerCase(rest.substr(0, kMacLength));
-        std::replace(place.begin(), place.end(), '-', ':');
-        return {kMacLength, "mac", place};
+    if (const std::size_t length = macLength(rest); length > 0) {
+        std::string digits = lowerCase(rest.substr(0, length));
+        digits.erase(std::remove_if(digits.begin(), digits.end(), std::not_fn(isHex)),
+                     digits.end());
+        return {length, "mac", digits};
     }
     if (const std::size_t length = ipv4Length(word, at); length > 0) {
         const std::string place{rest.substr(0, length)};

@@ -14,11 +14,13 @@ namespace pelorus::doctor {
 /// Replaces device ids, authorisations and subdomains by their masks: the values of DEVICEID,
 /// DEVICEAUTH and SUBDOMAIN, also as URLs, XML and JSON encode them and cut off by three dots, and
 /// those of other devices where URLs, answers and public names show them. A value of less than three
-/// characters stays: it is part of too many words.
+/// characters stays: it is part of too many words. So does one that reads as a word of the doctor's
+/// own sentences, where it stands in one.
 class SecretMasks {
 public:
-    /// With @p settings as the daemon merges them.
-    explicit SecretMasks(const std::map<std::string, std::string>& settings);
+    /// With the values that @p settings give these keys, the first 1000 of each; other keys are
+    /// ignored.
+    explicit SecretMasks(const std::multimap<std::string, std::string>& settings);
 
     /// True for a value at a place of a text that is left for others to hide.
     using Exception =
@@ -33,7 +35,7 @@ private:
         const char* mask;
     };
 
-    std::vector<Secret> secrets;  // the longest first
+    std::vector<Secret> secrets;
 };
 
 }  // namespace pelorus::doctor

@@ -74,9 +74,9 @@ public:
             checkSafety();
         }
         for (auto* list : {&report.problems, &report.remarks}) {
-            for (std::string& line : *list) line = masks.hide(line);
             const std::size_t more = list->size() - std::min(list->size(), kMostReported);
             list->resize(list->size() - more);
+            for (std::string& line : *list) line = masks.hide(line);
             if (more > 0) list->push_back("and " + std::to_string(more) + " more");
         }
         return report;
@@ -301,7 +301,7 @@ private:
 
     const DeviceSettings settings;
     // A line shows keys and paths, and somebody may have written a secret there.
-    const SecretMasks masks{settings.merged.values};
+    const SecretMasks masks{settings.secrets()};
     SettingsReport report;
 };
 

@@ -15,8 +15,8 @@ namespace pelorus::doctor {
 /// Removes the device's secrets, and for sharing addresses and names too.
 class Masks {
 public:
-    /// With @p settings as the daemon merges them; with @p sharedPlaces for sharing.
-    explicit Masks(const std::map<std::string, std::string>& settings,
+    /// With @p settings as SecretMasks takes them; with @p sharedPlaces for sharing.
+    explicit Masks(const std::multimap<std::string, std::string>& settings,
                    std::optional<PlaceMasks> sharedPlaces = {})
         : secrets{settings}, places{std::move(sharedPlaces)} {}
 

@@ -31,7 +31,7 @@ void check(const pelorus::doctor::Evidence& evidence) {
 }
 
 void checkMasks(const std::string& text) {
-    const std::map<std::string, std::string> settings{{"DEVICEAUTH", "s3cret"}};
+    const std::multimap<std::string, std::string> settings{{"DEVICEAUTH", "s3cret"}};
     pelorus::doctor::Masks masks{settings, pelorus::doctor::PlaceMasks{{"nas"}}};
     assert(masks.hide(text).find("s3cret") == std::string::npos);
 }

@@ -100,8 +100,10 @@ protected:
 };
 
 TEST_F(DeviceFilesTest, AHealthyDeviceHasNoProblem) {
-    const Evidence evidence = look({}, {{"COMMUNICATION_STATUS", "portforwarded"}});
+    const Evidence evidence =
+        look({}, {{"COMMUNICATION_STATUS", "portforwarded"}, {"#SUBDOMAIN", "x"}});
     EXPECT_EQ(problems(evidence), "");
+    EXPECT_GT(evidence.secrets.count("SUBDOMAIN"), 0U) << "known, so that it is masked";
     EXPECT_EQ(evidence.signs.size(), 3U) << shown(evidence);
     EXPECT_TRUE(evidence.has(Sign::HAS_CREDENTIALS));
     EXPECT_TRUE(evidence.has(Sign::DISK_IN_USE));

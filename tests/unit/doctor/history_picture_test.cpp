@@ -48,6 +48,7 @@ TEST(HistoryPicture, ShowsSharesCausesAndWhenTheySetIn) {
 TEST(HistoryPicture, ListsManyCausesInBounds) {
     Diagnosis diagnosis = relayed();
     diagnosis.history.clear();
+    diagnosis.untold = {"the periods before"};
     for (int number = 0; number < 600; ++number) {
         const std::string text = number < 100 ? "cause " + std::to_string(number) : "no answer";
         diagnosis.history.push_back({Reach::RELAYED, diagnosis.now - minutes{600 - number}, "",
@@ -55,7 +56,8 @@ TEST(HistoryPicture, ListsManyCausesInBounds) {
     }
     const auto texts = textsOf(historyPicture(diagnosis));
     EXPECT_EQ(count(texts, "cause 39 after some ms"), 1U);
-    EXPECT_EQ(texts.back(), "and 61 more: see --json");
+    EXPECT_EQ(count(texts, "and 61 more: see --json"), 1U);
+    EXPECT_EQ(texts.back(), "Unknown: the periods before");
 }
 
 constexpr Reach kAll[]{Reach::DIRECT,       Reach::RELAYED,     Reach::NOT_REACHED,

@@ -119,7 +119,6 @@ TEST_F(SettingsReportTest, AFaultIsNamedWithFileAndLine) {
 
 TEST(SettingValue, ATemplateMustTakeWhatItIsGiven) {
     const char* const rows[][2]{
-        {"/%s?port=%d", ""},
         {"/%s?port=%u&part=100%%", ""},
         {"/", ""},
         {"/%s/%d/%s", "has more than 2 placeholders: no URL is built"},
@@ -132,15 +131,17 @@ TEST(SettingValue, ATemplateMustTakeWhatItIsGiven) {
 
 TEST_F(SettingsReportTest, WhatHasNoEffectIsRemarkedOn) {
     const std::string copy = path("run/dynamicconfig.ini");
-    writeFile("run/dynamicconfig.ini", dynamic +
-                                           "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
-                                           "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=here\n");
+    writeFile("run/dynamicconfig.ini",
+              dynamic +
+                  "DEVICETYPE=5\nSTARTCMD=id\nEXTRA=1\n"
+                  "DEFAULT_PORTS_ONLY=TRUE\nSUBDOMAIN=OLDS3CRET\nSUBDOMAIN=here\n");
     const auto report = check(
         "#DEVICETYPE=1\nOTHER=1\nOTHER=1\nEXTERNAL_IP=1\n"
-        "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n");
+        "DEVICEAUTH: s3cret==\n#OLDAUTH s3cret==\nAs3cret==\n#OLDS3CRET=1\n#NEWS3CRET=1\n",
+        "#DeviceAuth = NEWS3CRET\n");
     const std::string all = ::testing::PrintToString(report.remarks);
     EXPECT_EQ(all.find("OTHER"), all.rfind("OTHER")) << "once";
-    EXPECT_FALSE(holds(all, "s3cret") || holds(all, "EXTERNAL_IP")) << all;
+    EXPECT_FALSE(holds(all, "s3cret") || holds(all, "S3CRET") || holds(all, "EXTERNAL_IP")) << all;
     for (const char* part :
          {"# begins no comment: it sets #DEVICETYPE", "DEVICETYPE=5 replaces 1 of ",
           "does not know DEVICEAUTH\"", "it sets #OLDAUTH\"", "does not know this key",
@@ -243,7 +244,7 @@ TEST_F(SettingsReportTest, EveryFolderAndLinkOnTheWayCounts) {
 }
 
 TEST_F(SettingsReportTest, OnlyTheStaticFileIsReadWhole) {
-    const std::string filler(2'000'000, '\n');
+    const std::string filler(1'100'000, '\n');
     fixed.insert(0, filler);
     EXPECT_TRUE(check().usable);
     EXPECT_EQ(problem(""), "");
@@ -253,8 +254,8 @@ TEST_F(SettingsReportTest, OnlyTheStaticFileIsReadWhole) {
 
 TEST_F(SettingsReportTest, RubbishGivesABoundedReport) {
     std::string rubbish;
-    for (int line = 0; line < 30'000; ++line) {
-        rubbish += std::string{static_cast<char>(line % 256), static_cast<char>(line % 61)} +
+    for (int line = 0; line < 1000; ++line) {
+        rubbish += std::string{static_cast<char>(line % 256), static_cast<char>(line % 7)} +
                    std::to_string(line) + "=\x01\xFF\n";
     }
     const auto report = check("", rubbish);

@@ -129,6 +129,16 @@ void tellHosts(Evidence& evidence) {
                               "; if they are several, read the lines of one only");
 }
 
+void tellSilence(const LogStory& story, Evidence& evidence) {
+    const std::string when = "its last line is of " + shownTime(*story.end()) +
+                             ", though the log goes on until " + shownTime(evidence.now);
+    evidence.untold.push_back(evidence.hasProgressLines
+                                  ? "how it is reached: the daemon logs each cycle, but " + when +
+                                        "; nothing says why"
+                                  : "whether the daemon still runs: " + when +
+                                        "; such silence is normal at its severity");
+}
+
 void summarise(const LogStory& story, Evidence& evidence) {
     const std::string more = "run the daemon with -l 6";
     if (!story.end()) {
@@ -147,6 +157,7 @@ void summarise(const LogStory& story, Evidence& evidence) {
                                   more);
         return;
     }
+    if (story.isSilent()) tellSilence(story, evidence);
     if (evidence.hasProgressLines) return;
     evidence.untold.push_back(
         "whether a tunnel came up or was kept, and when the next cycle comes: the log has errors "
@@ -157,8 +168,10 @@ void summarise(const LogStory& story, Evidence& evidence) {
 }  // namespace
 
 void lookAtLog(const LogChoice& choice, Evidence& evidence) {
+    const bool isKnown = !evidence.fromElsewhere && evidence.hasSettings();
     LogStory story{evidence.has(Sign::MANUAL_MODE) ? LogStory::Ports::MANUAL
-                                                   : LogStory::Ports::AUTOMATIC};
+                   : isKnown                       ? LogStory::Ports::AUTOMATIC
+                                                   : LogStory::Ports::UNKNOWN};
     LineOrder order{story, evidence.now};
     if (!choice.files.empty()) {
         readChosen(choice, order, evidence);

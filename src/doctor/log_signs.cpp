@@ -19,7 +19,8 @@ constexpr std::string_view kMissing = "(not logged)";
 constexpr std::string_view kDropped = "Failed writing received data";
 
 // What is no reason why the device is not reached.
-constexpr std::array<Sign, 2> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END};
+constexpr std::array<Sign, 3> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END,
+                                         Sign::LOGGED_PORT_OPENED};
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
                                       Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
                                       Sign::LOGGED_SERVICE_CERTIFICATE};
@@ -40,6 +41,7 @@ const std::vector<Sign> kTestOutcomes{
     Sign::LOGGED_MANUAL_PORT_INVALID, Sign::LOGGED_MANUAL_RULED_OUT};
 
 // What is logged anew in every cycle, or in every daily look at the names.
+constexpr auto kLongestSearch = 15min;  // at a start, or at the start of a tunnel
 constexpr auto kLongestCycle = 2h;
 constexpr auto kLongestUntilNames = 25h;
 const std::vector<Sign> kEachCycle{Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_NO_GATEWAY,
@@ -55,7 +57,8 @@ bool explains(Sign sign) {
 }
 
 bool isStale(Sign sign, Time when, Time now) {
-    return (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
+    return (sign == Sign::LOGGED_ATTEMPT && now - when > kLongestSearch) ||
+           (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
            (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
 }
 
@@ -92,8 +95,14 @@ void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
         value(rule.kept) = shownText(rule.kept == Kept::PORT ? portOf(text) : text);
     }
     clear(rule.cleared);
-    if (rule.exception && has(*rule.exception)) return;
+    if (rule.exception && isOfAttempt(*rule.exception, when)) return;
     for (const Sign sign : rule.set) set(sign, when, filled(rule.words, values));
+}
+
+// Without cycles in the log, attempts are told apart by the time.
+bool LogSigns::isOfAttempt(Sign sign, Time when) const {
+    if (!has(sign)) return false;
+    return cycle > 0 ? cycles.at(sign) == cycle : when - *signs.at(sign).when <= kAttemptTime;
 }
 
 // Success is not logged at every severity.
@@ -186,6 +195,8 @@ void LogSigns::failTest(Time when) {
         const std::string& port = value(Kept::PORT);
         set(Sign::LOGGED_TEST_FAILED, when,
             "the service could not reach " + (port.empty() ? "the port" : "port " + port));
+        // That a port is opened is logged as progress only.
+        if (cycle == 0) set(Sign::LOGGED_PORT_OPENED, when, "a port was opened");
     }
 }
 
@@ -254,6 +265,7 @@ std::string LogSigns::reasonText() const {
 std::map<Sign, Fact> LogSigns::lasting(Time now, bool byHand) const {
     std::map<Sign, Fact> left;
     for (const auto& [sign, fact] : signs) {
+        if (sign == Sign::LOGGED_PORT_OPENED) continue;
         if (!isReplaced(sign, byHand) && !isStale(sign, *fact.when, now)) left[sign] = fact;
     }
     return left;
@@ -268,7 +280,7 @@ bool LogSigns::isReplaced(Sign sign, bool byHand) const {
            (!byHand && std::any_of(kGatewayOutcomes.begin(), kGatewayOutcomes.end(), isLater));
 }
 
-// Both are there. Without cycles in the log, attempts are told apart by the time.
+// Both are there.
 bool LogSigns::isEarlier(Sign sign, Sign later) const {
     if (cycle > 0) return cycles.at(sign) < cycles.at(later);
     return *signs.at(later).when - *signs.at(sign).when > kAttemptTime;

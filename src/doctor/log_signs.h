@@ -92,6 +92,7 @@ private:
         return kept[static_cast<std::size_t>(what)];
     }
     [[nodiscard]] bool serviceFails() const;
+    [[nodiscard]] bool isOfAttempt(Sign sign, Time when) const;
     [[nodiscard]] bool isReplaced(Sign sign, bool byHand) const;
     [[nodiscard]] bool isEarlier(Sign sign, Sign later) const;
     void concludeBackEnd(const LogRule& rule);

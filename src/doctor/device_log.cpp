@@ -139,10 +139,16 @@ void tellSilence(const LogStory& story, Evidence& evidence) {
                                         "; such silence is normal at its severity");
 }
 
-void summarise(const LogStory& story, Evidence& evidence) {
+void summarise(const LogStory& story, int unstamped, Evidence& evidence) {
     const std::string more = "run the daemon with -l 6";
+    if (unstamped > 0) {
+        cannotSee("log: the time stamp of " + std::to_string(unstamped) +
+                      (unstamped == 1 ? " line" : " lines") +
+                      " of the daemon is not understood, or lies ahead",
+                  evidence);
+    }
     if (!story.end()) {
-        cannotSee("log: it has no line of the daemon", evidence);
+        if (unstamped == 0) cannotSee("log: it has no line of the daemon", evidence);
         evidence.untold.push_back("how it was before: no log of the daemon was found; " + more);
         return;
     }
@@ -186,7 +192,7 @@ void lookAtLog(const LogChoice& choice, Evidence& evidence) {
     }
     story.finish(evidence);
     evidence.logHosts = order.hosts();
-    summarise(story, evidence);
+    summarise(story, order.unstamped(), evidence);
 }
 
 }  // namespace pelorus::doctor

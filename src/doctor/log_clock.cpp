@@ -21,7 +21,7 @@ constexpr auto kAfterStart = 1h;
 }  // namespace
 
 Time LogClock::take(const LogLine& line, std::optional<Time> start) {
-    const Time stamp = line.when;
+    const Time stamp = stampOf(line);
     correction.reset();
     if (!last) {
         now = stamp;
@@ -40,6 +40,13 @@ Time LogClock::take(const LogLine& line, std::optional<Time> start) {
     }
     last = stamp;
     return now;
+}
+
+// In an hour that comes twice, time goes on.
+Time LogClock::stampOf(const LogLine& line) const {
+    const bool isSecond = line.isTwice && last && !lostSince && line.when < now - kDisorder &&
+                          line.when + 1h >= now - kDisorder;
+    return isSecond ? line.when + 1h : line.when;
 }
 
 void LogClock::jumpBack(const LogLine& line) {

@@ -62,6 +62,13 @@ bool isStale(Sign sign, Time when, Time now) {
            (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
 }
 
+// Names that are wrong keep no way closed, and one port is free where another is refused.
+bool outweighs(Sign sign, Sign earlier) {
+    if (earlier == Sign::LOGGED_PORT_HELD_BY_OTHER) return sign == Sign::LOGGED_GATEWAY_REFUSES;
+    return isAmong(kEachDay, earlier) &&
+           (isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign));
+}
+
 bool contains(std::string_view text, std::string_view part) {
     return text.find(part) != std::string_view::npos;
 }
@@ -121,7 +128,10 @@ void LogSigns::set(Sign sign, Time when, const std::string& text) {
         return;
     }
     signs[sign] = {Source::LOG, text, when};
-    if (!reason && explains(sign)) reason = Reason{sign, when};
+    if (!explains(sign)) return;
+    if (!reason || (reason->text.empty() && outweighs(sign, reason->sign))) {
+        reason = Reason{sign, when};
+    }
 }
 
 void LogSigns::clear(const std::vector<Sign>& cleared) {
@@ -188,10 +198,12 @@ void LogSigns::takeRefusal(std::string_view answer, Time when) {
         "an answer of the local back end stopped in the middle");
 }
 
-void LogSigns::failTest(Time when) {
+void LogSigns::failTest(Time when, bool byHand) {
     if (reason && isAmong(kServiceSigns, reason->sign)) reason->text = reasonText();
     if (!serviceFails() && !has(Sign::LOGGED_SERVICE_NONSENSE) &&
         !has(Sign::LOGGED_TEST_UNANSWERED)) {
+        const bool isBeside = byHand && reason && reason->sign == Sign::LOGGED_NO_GATEWAY;
+        if (isBeside) reason.reset();
         const std::string& port = value(Kept::PORT);
         set(Sign::LOGGED_TEST_FAILED, when,
             "the service could not reach " + (port.empty() ? "the port" : "port " + port));

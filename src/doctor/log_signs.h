@@ -42,8 +42,8 @@ public:
     /// The service's answer to a port test. True if the port passed.
     bool takeTestAnswer(std::string_view answer, Time when);
 
-    /// The port test as a whole failed.
-    void failTest(Time when);
+    /// The port test as a whole failed. @p byHand: it needed no gateway that speaks a protocol.
+    void failTest(Time when, bool byHand);
 
     /// A request to the service got no answer.
     void failService(Time when);

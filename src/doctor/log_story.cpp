@@ -169,7 +169,7 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             takeTestAnswer(values[1], when);
             break;
         case LogEvent::TEST_FAILED:
-            signs.failTest(when);
+            signs.failTest(when, gateway.isByHand());
             lose(when);
             break;
         case LogEvent::TEST_RETRIED:

@@ -22,6 +22,7 @@ constexpr auto kTestInterval = 240s;
 
 void LogGateway::start() {
     *this = LogGateway{ports};
+    mayBePublished = false;
 }
 
 void LogGateway::take(LogEvent event, Time when, LogSigns& signs) {
@@ -94,7 +95,7 @@ void LogGateway::concludeFromRelay(Time when, LogSigns& signs) {
         const bool mayBeByHand = guessed && ports != Ports::AUTOMATIC;
         if (!mayBeByHand) signs.blame(Sign::LOGGED_NO_GATEWAY);
     }
-    tested = false;
+    tested = mayBePublished = false;
     retest = Retest::NONE;
     endSearch();
 }
@@ -115,7 +116,9 @@ void LogGateway::takeTestUrl(std::string_view url) {
     url.remove_prefix(begin + kAddress.size());
     const bool hasAddress = !url.empty() && url.front() != '&';
     if (hasAddress) ports = Ports::AUTOMATIC;
-    if (!hasAddress && !tested) ports = Ports::MANUAL;
+    if (hasAddress || tested || mayBePublished) return;
+    ports = Ports::MANUAL;
+    natpmp = natpmp && !guessed;
 }
 
 bool LogGateway::isOriginUnknown() const {

@@ -66,9 +66,10 @@ private:
     std::optional<Time> lastSilence;  // of UPnP
     int hurried = 0;  // passes in a row, sooner than a published port is tested again
     bool progress = false;
-    bool natpmp = false;   // the gateway speaks it, as far as the log tells
-    bool guessed = false;  // only because a port was tested, maybe one forwarded by hand
-    bool tested = false;   // a port passed, and the relay was not used since
+    bool natpmp = false;         // the gateway speaks it, as far as the log tells
+    bool guessed = false;        // only because a port was tested, maybe one forwarded by hand
+    bool tested = false;         // a port passed, and the relay was not used since
+    bool mayBePublished = true;  // before the log began
 };
 
 }  // namespace pelorus::doctor

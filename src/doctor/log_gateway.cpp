@@ -123,7 +123,7 @@ void LogGateway::takeTestUrl(std::string_view url) {
 
 bool LogGateway::isOriginUnknown() const {
     if (progress || !guessed || ports != Ports::UNKNOWN) return false;
-    return lastSilence && *lastTest - *lastSilence <= kAttemptTime;
+    return lastSilence && lastTest && *lastTest - *lastSilence <= kAttemptTime;
 }
 
 bool LogGateway::isInDoubt(Time now) const {

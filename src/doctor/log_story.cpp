@@ -407,7 +407,7 @@ std::string LogStory::addressOf(Reach reach) const {
 }
 
 // With progress each cycle is logged, and when the next one comes.
-void LogStory::endInSilence(Evidence& evidence) {
+void LogStory::endInSilence(const Evidence& evidence) {
     if (!evidence.fromElsewhere || ended || !lastLine) return;
     const Time due = std::max(*lastLine, nextCycle.value_or(*lastLine));
     silent = evidence.now - due > kSilence;

@@ -54,7 +54,7 @@ private:
     void correct(const LogClock::Correction& correction);
     void takeText(std::string_view text, Time when);
     void settleTest(Time when);
-    void endInSilence(Evidence& evidence);
+    void endInSilence(const Evidence& evidence);
     void tellDoubts(Evidence& evidence) const;
     void settlePending(std::string_view text, Time when);
     void becomePending();

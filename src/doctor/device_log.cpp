@@ -133,7 +133,7 @@ void tellSilence(const LogStory& story, Evidence& evidence) {
     const std::string when = "its last line is of " + shownTime(*story.end()) +
                              ", though the log goes on until " + shownTime(evidence.now);
     evidence.untold.push_back(evidence.hasProgressLines
-                                  ? "how it is reached: the daemon logs each cycle, but " + when +
+                                  ? "how it is reached: the daemon logs each cycle, and " + when +
                                         "; nothing says why"
                                   : "whether the daemon still runs: " + when +
                                         "; such silence is normal at its severity");

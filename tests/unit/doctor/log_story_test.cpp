@@ -2,73 +2,12 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <vector>
+
+#include "logged_lines.h"
 
 namespace pelorus::doctor {
 namespace {
-
-constexpr const char *
-    kStart = "main - pelorus daemon starting up, Version: [1.7.0], PID: [64], SID: [64]",
-   *kNoUpnp = "Router::upnp_discover - UPnP Discover failed to return any response.",
-   *kNoNatpmp = "Router::natpmp_discover - failed to get External IP address",
-   *kTunnelStarts =
-       "VPNManager::openVPNConnection() - httpGet openvpn client relay servers and other settings.",
-   *kTunnelUp = "VPNManager::openVPNConnection() - openVPN has started successfully",
-   *kPause = "DaemonControl::run - retry connection after 120 secs.",
-   *kPassed =
-       "TavikClient::testPort[1] - httpGet got <port_test><status>Success</status>"
-       "<external_ip>203.0.113.7</external_ip></port_test>, 90 bytes from central server.",
-   *kFailedAnswer =
-       "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status></port_test>, 52 "
-       "bytes from central server.",
-   *kSecondNatAnswer =
-       "TavikClient::testPort[1] - httpGet got <port_test><status>failure</status><remote_external_ip>"
-       "203.0.113.7</remote_external_ip><external_ip>100.64.3.9</external_ip></port_test>, 90 bytes "
-       "from central server.",
-   *kSecondNat =
-       "TavikClient::testPort - Enforce connection as RELAY (double-NAT detected: Server-returned "
-       "external IP != router's external IP).",
-   *kPublished =
-       "TavikClient::updateServerMapping - httpGet got <status>Success</status>, 24 bytes.",
-   *kStatusDirect =
-       "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [portforwarded].",
-   *kStatusFailed = "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [failed].",
-   *kTestFailed = "TavikClient::testPort - port map check failed.",
-   *kRelayFailed = "ConnectionManager::createRelayConnection() - failed to create VPN connection.",
-   *kStaleTunnel = "VPNManager::isVPNRunning() - unlink stale openVPN pid file /run/openvpn.pid",
-   *kCopyMissing = "GlobalConfig::getProperty() - failed to stat TEMP dynamic config file: [x]",
-   *kSigterm = "sigTrap - Received SIGTERM signal.",
-   *kOff = "DaemonControl::disableRemoteAccess - remote access is disabled.",
-   *kSecondNatFact = "the gateway says 100.64.3.9, the service sees 203.0.113.7";
-
-using Lines = std::vector<std::pair<int, const char*>>;  // seconds, and what is logged then
-
-Time at(int seconds) {
-    return Time{std::chrono::seconds{seconds}};
-}
-
-Evidence told(const Lines& lines, int now, bool fromElsewhere = false) {
-    LogStory story{fromElsewhere ? LogStory::Ports::UNKNOWN : LogStory::Ports::AUTOMATIC};
-    for (const auto& [second, text] : lines) story.take({at(second), text});
-    Evidence evidence;
-    evidence.fromElsewhere = fromElsewhere;
-    evidence.now = at(now);
-    story.finish(evidence);
-    return evidence;
-}
-
-// "0 RELAYED: cause|...".
-std::string historyOf(const Evidence& evidence) {
-    constexpr const char* kNames[]{"direct", "relayed", "not reached", "off", "not running", "?"};
-    std::string text;
-    for (const Period& period : evidence.history) {
-        text += std::to_string(period.since.time_since_epoch().count()) + " " +
-                kNames[static_cast<int>(period.reach)] +
-                (period.address.empty() ? "" : " " + period.address) + ": " + period.cause + "|";
-    }
-    return text;
-}
 
 TEST(LogStory, HistoryAndSigns) {
     const std::string direct =
@@ -357,88 +296,6 @@ TEST(LogStory, TellsPortsThatAreForwardedByHandFromElsewhere) {
     for (const auto& [lines, isManual] : rows) {
         EXPECT_EQ(told(lines, 30, true).has(Sign::MANUAL_MODE), isManual);
         EXPECT_FALSE(told(lines, 30).has(Sign::MANUAL_MODE));
-    }
-}
-
-// Without progress, a log from elsewhere leaves much open.
-TEST(LogStory, TellsFromElsewhereNoMoreThanTheLogCarries) {
-    constexpr int kDay = 86400;
-    const std::string direct = "9 direct: the ports passed their test and were published|";
-    const char* const byHand =
-        "TavikClient::testPort[1] - port check failed, retrying in 5 seconds, url:  "
-        "[https://x/?external_ip=&port=8081].";
-    const char* const mapped =
-        "TavikClient::testPort[1] - port check failed, retrying in 5 seconds, url:  "
-        "[https://x/?external_ip=203.0.113.7&port=9091].";
-    const struct {
-        const char* name;
-        Lines lines;
-        int end;  // of the log
-        std::string history;
-        std::vector<Sign> signs;
-        std::string untold;  // begins with this
-    } rows[]{
-        {"silence in spite of progress",
-         {{0, kStart}, {9, kPublished}, {10, kPause}},
-         kDay,
-         direct + "10 ?: the daemon logged nothing more|",
-         {},
-         ""},
-        {"a pause", {{0, kStart}, {9, kPublished}, {10, kPause}}, 3600, direct, {}, ""},
-        {"silence without progress", {{0, kStart}, {9, kPublished}}, kDay, direct, {}, ""},
-        {"a start, and nothing more",
-         {{0, kStart}},
-         kDay,
-         "0 not reached: the daemon started|",
-         {},
-         ""},
-        {"a test of ports forwarded by hand, without a gateway",
-         {{0, kTunnelStarts}, {90, kNoUpnp}, {93, kFailedAnswer}, {93, byHand}, {93, kTestFailed}},
-         400,
-         "0 relayed: the tunnel came up|",
-         {Sign::MANUAL_MODE, Sign::LOGGED_TEST_FAILED},
-         ""},
-        {"a test of ports forwarded by hand, or of one published before the log begins",
-         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, byHand}, {3, kTestFailed}},
-         9,
-         "",
-         {},
-         "why the port test fails: "},
-        {"a test of ports that were mapped",
-         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, mapped}, {3, kTestFailed}},
-         9,
-         "",
-         {Sign::LOGGED_TEST_FAILED},
-         ""},
-        {"a test, and none for hours in which a gateway may have gone",
-         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, kTestFailed}, {kDay, kNoUpnp}},
-         kDay,
-         "",
-         {},
-         "whether the gateway still speaks NAT-PMP: "},
-        {"ports pass in every search, and are not published",
-         {{0, kPassed}, {130, kPassed}, {260, kPassed}, {390, kPassed}, {800, kPassed}},
-         801,
-         "",
-         {},
-         "how it is reached: a port passes its test again"},
-        {"published ports are tested again",
-         {{0, kPassed}, {250, kPassed}, {500, kPassed}, {750, kPassed}},
-         801,
-         "0 direct 203.0.113.7: |",
-         {},
-         ""},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        const Evidence evidence = told(row.lines, row.end, true);
-        EXPECT_EQ(historyOf(evidence), row.history);
-        std::vector<Sign> signs;
-        for (const auto& [sign, fact] : evidence.signs) signs.push_back(sign);
-        EXPECT_EQ(signs, row.signs);
-        const std::string unsaid = evidence.untold.empty() ? "" : evidence.untold.back();
-        EXPECT_EQ(unsaid.substr(0, row.untold.empty() ? unsaid.npos : row.untold.size()),
-                  row.untold);
     }
 }
 

@@ -52,6 +52,9 @@ def manual_ports(lab: Lab) -> None:
     lab.device.disk_wakes()
     lab.moment("the settings name a port that nobody forwards: every cycle tests it, and fails",
                "manual-ports-closed")
+    with lab.daemon.held():
+        told = lab.default_log_says()
+    assert told.cause == "manual-ports-closed", told
 
     lab.step("the user forwards that port, but to another device")
     with lab.daemon.held():

@@ -326,7 +326,7 @@ std::vector<Cause> gatewayCauses() {
          kNotDirect,
          {{S::LOGGED_GATEWAY_REFUSES}},
          {},
-         "The gateway refuses every port that the device asks for.",
+         "The gateway refuses ports that the device needs.",
          "Allow this device to open ports in the gateway's settings. Some gateways forward only to "
          "ports from 1024 up: then move the web server there."},
     };

@@ -129,10 +129,26 @@ void tellHosts(Evidence& evidence) {
                               "; if they are several, read the lines of one only");
 }
 
-void summarise(const LogStory& story, Evidence& evidence) {
+void tellSilence(const LogStory& story, Evidence& evidence) {
+    const std::string when = "its last line is of " + shownTime(*story.end()) +
+                             ", though the log goes on until " + shownTime(evidence.now);
+    evidence.untold.push_back(evidence.hasProgressLines
+                                  ? "how it is reached: the daemon logs each cycle, and " + when +
+                                        "; nothing says why"
+                                  : "whether the daemon still runs: " + when +
+                                        "; such silence is normal at its severity");
+}
+
+void summarise(const LogStory& story, int unstamped, Evidence& evidence) {
     const std::string more = "run the daemon with -l 6";
+    if (unstamped > 0) {
+        cannotSee("log: the time stamp of " + std::to_string(unstamped) +
+                      (unstamped == 1 ? " line" : " lines") +
+                      " of the daemon is not understood, or lies ahead",
+                  evidence);
+    }
     if (!story.end()) {
-        cannotSee("log: it has no line of the daemon", evidence);
+        if (unstamped == 0) cannotSee("log: it has no line of the daemon", evidence);
         evidence.untold.push_back("how it was before: no log of the daemon was found; " + more);
         return;
     }
@@ -147,6 +163,7 @@ void summarise(const LogStory& story, Evidence& evidence) {
                                   more);
         return;
     }
+    if (story.isSilent()) tellSilence(story, evidence);
     if (evidence.hasProgressLines) return;
     evidence.untold.push_back(
         "whether a tunnel came up or was kept, and when the next cycle comes: the log has errors "
@@ -157,8 +174,10 @@ void summarise(const LogStory& story, Evidence& evidence) {
 }  // namespace
 
 void lookAtLog(const LogChoice& choice, Evidence& evidence) {
+    const bool isKnown = !evidence.fromElsewhere && evidence.hasSettings();
     LogStory story{evidence.has(Sign::MANUAL_MODE) ? LogStory::Ports::MANUAL
-                                                   : LogStory::Ports::AUTOMATIC};
+                   : isKnown                       ? LogStory::Ports::AUTOMATIC
+                                                   : LogStory::Ports::UNKNOWN};
     LineOrder order{story, evidence.now};
     if (!choice.files.empty()) {
         readChosen(choice, order, evidence);
@@ -173,7 +192,7 @@ void lookAtLog(const LogChoice& choice, Evidence& evidence) {
     }
     story.finish(evidence);
     evidence.logHosts = order.hosts();
-    summarise(story, evidence);
+    summarise(story, order.unstamped(), evidence);
 }
 
 }  // namespace pelorus::doctor

@@ -41,7 +41,10 @@ void LineOrder::endFile(std::optional<Time> stamp) {
 
 void LineOrder::take(std::string_view text) {
     const auto line = readLogLine(text, now);
-    if (!line) return;
+    if (!line) {
+        if (lacksStamp(text, now)) ++left;
+        return;
+    }
     // A file that repeats lines begins with one. Old stamps alone may come from a clock set back.
     if (std::exchange(isFirst, false)) repeating = known.has(*line);
     if (line->when > newest) repeating = false;

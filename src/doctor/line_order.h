@@ -45,6 +45,9 @@ public:
     /// The last stamp of the newest file, of any program; unset if none has ended.
     [[nodiscard]] std::optional<Time> end() const { return last; }
 
+    /// How many lines of the daemon were left out, because their stamps cannot be read.
+    [[nodiscard]] int unstamped() const { return left; }
+
     /// Whose lines were passed on; a few at most.
     [[nodiscard]] const std::set<std::string>& hosts() const { return met; }
 
@@ -58,6 +61,7 @@ private:
     KnownLines known;
     std::string lastHost;
     std::set<std::string> met;
+    int left = 0;
     bool isFirst = true;     // of its file
     bool repeating = false;  // so far all lines of this file were in others
 };

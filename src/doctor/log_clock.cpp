@@ -8,6 +8,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
+constexpr auto kRepeated = 1h;         // at the end of summer time
 constexpr auto kDisorder = 5min;       // of lines that a system logger received
 constexpr auto kLost = 24h;            // a correction goes less far back
 constexpr auto kSetRight = 1h;         // a smaller step ahead may be a pause between two lines
@@ -21,7 +22,7 @@ constexpr auto kAfterStart = 1h;
 }  // namespace
 
 Time LogClock::take(const LogLine& line, std::optional<Time> start) {
-    const Time stamp = line.when;
+    const Time stamp = stampOf(line);
     correction.reset();
     if (!last) {
         now = stamp;
@@ -40,6 +41,13 @@ Time LogClock::take(const LogLine& line, std::optional<Time> start) {
     }
     last = stamp;
     return now;
+}
+
+// In an hour that comes twice, time goes on.
+Time LogClock::stampOf(const LogLine& line) const {
+    const bool isSecond = line.isTwice && last && !lostSince && line.when < now - kDisorder &&
+                          line.when + kRepeated >= now - kDisorder;
+    return isSecond ? line.when + kRepeated : line.when;
 }
 
 void LogClock::jumpBack(const LogLine& line) {

@@ -30,6 +30,7 @@ public:
     int jumps = 0;                         ///< how often the clock was set, or lost
 
 private:
+    [[nodiscard]] Time stampOf(const LogLine& line) const;
     void jumpBack(const LogLine& line);
     void goOnLost(Time stamp);
 

@@ -2,6 +2,8 @@
 
 #include <array>
 #include <cctype>
+#include <charconv>
+#include <cstdint>
 #include <ctime>
 
 namespace pelorus::doctor {
@@ -73,12 +75,49 @@ std::optional<int> takeZone(std::string_view& text) {
     return sign * (*hours * 3600 + *minutes * 60);
 }
 
-Time localTime(std::tm parts) {
-    parts.tm_isdst = -1;
-    return Time{std::chrono::seconds{std::mktime(&parts)}};
+struct Stamp {
+    Time when{};
+    bool isTwice = false;  // an hour later the clock showed the same
+};
+
+bool shows(std::time_t seconds, const std::tm& parts) {
+    std::tm shown{};
+    return localtime_r(&seconds, &shown) != nullptr && shown.tm_hour == parts.tm_hour &&
+           shown.tm_mday == parts.tm_mday;
 }
 
-std::optional<Time> takeIsoStamp(std::string_view& line, Time now) {
+// Normalises @p parts.
+Stamp localTime(std::tm& parts) {
+    constexpr std::time_t kHour = 3600;
+    parts.tm_isdst = -1;
+    const std::time_t seconds = std::mktime(&parts);
+    const bool isSecond = shows(seconds - kHour, parts);
+    const Time when{std::chrono::seconds{isSecond ? seconds - kHour : seconds}};
+    return {when, isSecond || shows(seconds + kHour, parts)};
+}
+
+void skipFraction(std::string_view& text) {
+    if (!take(text, '.') && !take(text, ',')) return;
+    while (!text.empty() && isDigit(text.front())) text.remove_prefix(1);
+}
+
+// "1795316400.123456".
+std::optional<Stamp> takeUnixStamp(std::string_view& line, Time now) {
+    constexpr std::size_t kDigits = 10;
+    std::string_view rest = line;
+    std::int64_t seconds = 0;
+    const auto [end, error] = std::from_chars(rest.data(), rest.data() + rest.size(), seconds);
+    rest.remove_prefix(static_cast<std::size_t>(end - rest.data()));
+    if (error != std::errc{} || line.size() - rest.size() > kDigits) return std::nullopt;
+    if (rest.empty() || rest.front() != '.') return std::nullopt;
+    skipFraction(rest);
+    const Time when{std::chrono::seconds{seconds}};
+    if (!take(rest, ' ') || when > now + kFuture) return std::nullopt;
+    line = rest;
+    return Stamp{when};
+}
+
+std::optional<Stamp> takeIsoStamp(std::string_view& line, Time now) {
     std::string_view rest = line;
     std::tm parts{};
     const auto year = takeNumber(rest, 4, kEarliestYear, kLatestYear);
@@ -89,21 +128,20 @@ std::optional<Time> takeIsoStamp(std::string_view& line, Time now) {
     if (!day || !(take(rest, 'T') || take(rest, ' ')) || !takeClock(rest, parts)) {
         return std::nullopt;
     }
-    if (take(rest, '.') || take(rest, ',')) {
-        while (!rest.empty() && isDigit(rest.front())) rest.remove_prefix(1);
-    }
+    skipFraction(rest);
     const auto zone = takeZone(rest);
     if (!take(rest, ' ')) return std::nullopt;
     parts.tm_year = *year - kTmYear;
     parts.tm_mon = *month - 1;
     parts.tm_mday = *day;
-    const Time when = zone ? Time{std::chrono::seconds{timegm(&parts) - *zone}} : localTime(parts);
-    if (when > now + kFuture) return std::nullopt;
+    const Stamp stamp =
+        zone ? Stamp{Time{std::chrono::seconds{timegm(&parts) - *zone}}} : localTime(parts);
+    if (stamp.when > now + kFuture) return std::nullopt;
     line = rest;
-    return when;
+    return stamp;
 }
 
-std::optional<Time> latestNotInFuture(const std::tm& parts, Time now) {
+std::optional<Stamp> latestNotInFuture(const std::tm& parts, Time now) {
     const auto seconds = static_cast<std::time_t>(now.time_since_epoch().count());
     std::tm today{};
     if (localtime_r(&seconds, &today) == nullptr) return std::nullopt;
@@ -111,34 +149,35 @@ std::optional<Time> latestNotInFuture(const std::tm& parts, Time now) {
     for (int back = -1; back <= kYearsBack; ++back) {
         std::tm tried = parts;
         tried.tm_year = today.tm_year - back;
-        tried.tm_isdst = -1;
-        const Time when{std::chrono::seconds{std::mktime(&tried)}};
-        if (tried.tm_mday == parts.tm_mday && when <= now + kFuture) return when;
+        const Stamp stamp = localTime(tried);
+        if (tried.tm_mday == parts.tm_mday && stamp.when <= now + kFuture) return stamp;
     }
     return std::nullopt;
 }
 
 // Time zones change on the hour: the lines of one hour share the costly part. Only hours that lie
 // well in the past are kept.
-std::optional<Time> classicTime(const std::tm& parts, Time now) {
+std::optional<Stamp> classicTime(const std::tm& parts, Time now) {
     struct Hour {
         int month = -1, day = -1, hour = -1;
         Time now{}, begin{};
+        bool isTwice = false;
     };
     thread_local Hour known;
     const auto within = std::chrono::seconds{parts.tm_min * 60 + parts.tm_sec};
     if (known.month == parts.tm_mon && known.day == parts.tm_mday && known.hour == parts.tm_hour &&
         known.now == now) {
-        return known.begin + within;
+        return Stamp{known.begin + within, known.isTwice};
     }
-    const auto when = latestNotInFuture(parts, now);
-    if (when && *when + std::chrono::hours{1} <= now + kFuture) {
-        known = {parts.tm_mon, parts.tm_mday, parts.tm_hour, now, *when - within};
+    const auto stamp = latestNotInFuture(parts, now);
+    if (stamp && stamp->when + std::chrono::hours{1} <= now + kFuture) {
+        known = {parts.tm_mon, parts.tm_mday,        parts.tm_hour,
+                 now,          stamp->when - within, stamp->isTwice};
     }
-    return when;
+    return stamp;
 }
 
-std::optional<Time> takeClassicStamp(std::string_view& line, Time now) {
+std::optional<Stamp> takeClassicStamp(std::string_view& line, Time now) {
     constexpr std::size_t kName = 3;
     if (line.size() < kName + 1) return std::nullopt;
     const std::size_t month = kMonths.find(line.substr(0, kName));
@@ -147,14 +186,14 @@ std::optional<Time> takeClassicStamp(std::string_view& line, Time now) {
     if (!take(rest, ' ')) return std::nullopt;
     std::tm parts{};
     const auto day = take(rest, ' ') ? takeNumber(rest, 1, 1, 9) : takeNumber(rest, 2, 1, 31);
-    if (!day || !take(rest, ' ') || !takeClock(rest, parts) || !take(rest, ' ')) {
-        return std::nullopt;
-    }
+    if (!day || !take(rest, ' ') || !takeClock(rest, parts)) return std::nullopt;
+    skipFraction(rest);
+    if (!take(rest, ' ')) return std::nullopt;
     parts.tm_mon = static_cast<int>(month / kName);
     parts.tm_mday = *day;
-    const auto when = classicTime(parts, now);
-    if (when) line = rest;
-    return when;
+    const auto stamp = classicTime(parts, now);
+    if (stamp) line = rest;
+    return stamp;
 }
 
 void skipPriority(std::string_view& line) {
@@ -190,25 +229,45 @@ std::string_view withoutEnd(std::string_view text) {
     }
 }
 
+std::optional<Stamp> takeAnyStamp(std::string_view& line, Time now) {
+    skipPriority(line);
+    if (line.empty() || !isDigit(line.front())) return takeClassicStamp(line, now);
+    const auto stamp = takeIsoStamp(line, now);
+    return stamp ? stamp : takeUnixStamp(line, now);
+}
+
 }  // namespace
 
 std::optional<Time> takeStamp(std::string_view& line, Time now) {
-    skipPriority(line);
-    if (!line.empty() && isDigit(line.front())) return takeIsoStamp(line, now);
-    return takeClassicStamp(line, now);
+    const auto stamp = takeAnyStamp(line, now);
+    return stamp ? std::optional{stamp->when} : std::nullopt;
+}
+
+bool lacksStamp(std::string_view line, Time now) {
+    constexpr int kMostWordsBefore = 10;  // blanks within brackets included
+    if (takeStamp(line, now)) return false;
+    for (int words = 0; words <= kMostWordsBefore && !line.empty(); ++words) {
+        const std::size_t end = line.find(' ');
+        const std::string_view word = line.substr(0, end);
+        if (isDaemon(word)) return true;
+        line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
+    }
+    return false;
 }
 
 std::optional<LogLine> readLogLine(std::string_view line, Time now) {
     skipPriority(line);
     const bool isYearKnown = !line.empty() && isDigit(line.front());
-    const auto when = takeStamp(line, now);
-    if (!when) return std::nullopt;
+    const auto stamp = takeAnyStamp(line, now);
+    if (!stamp) return std::nullopt;
     std::string_view host;
     for (int words = 0; words < kMostWords; ++words) {
         const std::size_t end = line.find(' ');
         const std::string_view word = line.substr(0, end);
         line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
-        if (isDaemon(word)) return LogLine{*when, withoutEnd(line), host, isYearKnown};
+        if (isDaemon(word)) {
+            return LogLine{stamp->when, withoutEnd(line), host, isYearKnown, stamp->isTwice};
+        }
         if (words == 0) host = word;
         if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;
         // Between host and program only "facility.severity".

@@ -152,17 +152,20 @@ Rules gatewayRules() {
         .sets(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS, "the router has no internet address"),
     info("ConnectionManager::createDirectConnection - Elapsed time %jd, portTestInterval %jd, allocatedHttpPort %d, allocatedHttpsPort %d.")
         .clears(kGateway),
-    info("ConnectionManager::forwardPort - forwarding internal port: %d").happens(LogEvent::AUTOMATIC).clears(kRefusals),
-    info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals),
-    info("Router::mapPort() - internal port: %d is already mapped to another IP: %s")
+    notice("ConnectionManager::createDirectConnection - Resetting HTTP allocated ports").happens(LogEvent::AUTOMATIC),
+    info("ConnectionManager::forwardPort - forwarding internal port: %d").happens(LogEvent::AUTOMATIC)
+        .clears({Sign::LOGGED_GATEWAY_REFUSES, Sign::LOGGED_PORT_HELD_BY_OTHER, Sign::LOGGED_PORT_OPENED}),
+    info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals)
+        .sets(Sign::LOGGED_PORT_OPENED, "port {1} was opened"),
+    info("Router::mapPort() - internal port: %d is already mapped to another IP: %s").unless(Sign::LOGGED_PORT_OPENED)
         .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),
-    info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d")
+    info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d").unless(Sign::LOGGED_PORT_OPENED)
         .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (UPnP error {3})"),
-    info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d")
+    info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d").unless(Sign::LOGGED_PORT_OPENED)
         .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (NAT-PMP)"),
     error("CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u").onlyIf(4, "0"),
-    error("CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u")
-        .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (NAT-PMP)"),
+    error("CMnatpmp::portMappingRequest  failed to map public port %d to localport %d, protocol %d, lifetime %u").unless(Sign::LOGGED_PORT_OPENED)
+        .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (NAT-PMP)").happens(LogEvent::NATPMP_REFUSES),
     };
 }
 
@@ -183,7 +186,7 @@ Rules testRules() {
         .clears({Sign::LOGGED_TEST_FAILED}).happens(LogEvent::PORTS_LOST),
     info("TavikClient::testPort - Requested external IP: [%s] / Respond remote external IP: [%s].").keeps(Kept::GATEWAY),
     info("TavikClient::testPort - Response remote external IP: [%s].").keeps(Kept::SERVICE),
-    error("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s]").keeps(Kept::PORT, 3),
+    error("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s]").keeps(Kept::PORT, 3).happens(LogEvent::TEST_RETRIED),
     error("TavikClient::testPort - port map check failed.").happens(LogEvent::TEST_FAILED),
     info("TavikClient::testPort - port map check success.").clears({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE}),
     info("TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [%s]").keeps(Kept::TESTED),
@@ -194,9 +197,9 @@ Rules testRules() {
     error("TavikClient curlRcvData - Buffer overrun detected, read buffer too small")
         .sets(Sign::LOGGED_SERVICE_NONSENSE, "an answer was longer than any that the service gives"),
     error("ConnectionManager::manualPortForward - bad value for manually configured HTTP Port.")
-        .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTP port is not a port number"),
+        .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTP port is not a port number").happens(LogEvent::MANUAL),
     error("ConnectionManager::manualPortForward - bad value for manually configured HTTPS Port.")
-        .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTPS port is not a port number"),
+        .sets(Sign::LOGGED_MANUAL_PORT_INVALID, "the manual HTTPS port is not a port number").happens(LogEvent::MANUAL),
     info("ConnectionManager::manualPortForward - allocatedHttpPort %d").happens(LogEvent::MANUAL).clears({Sign::LOGGED_MANUAL_PORT_INVALID}),
     info("ConnectionManager::manualPortForward - relay mode is enforced, therefore don't manual forward ports.")
         .sets(Sign::LOGGED_MANUAL_RULED_OUT, "manual ports are not tested since a second router was found"),

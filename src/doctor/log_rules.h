@@ -32,6 +32,7 @@ enum class LogEvent {
     AUTOMATIC,     ///< the ports are mapped by the daemon
     TEST_ANSWER,   ///< value 2: the service's answer to a port test
     TEST_FAILED,   ///< the port test as a whole
+    TEST_RETRIED,  ///< value 3: the URL of a port test without success
     TEST_UNANSWERED,
     SERVICE_FAILED,  ///< a request to the service got no answer
     PUBLISHED,       ///< the service has the record; the back end is told next
@@ -41,6 +42,7 @@ enum class LogEvent {
     UPNP_SILENT,
     NATPMP_FOUND,
     NATPMP_SILENT,
+    NATPMP_REFUSES,
     PORTS_LOST,    ///< the direct path is given up
     ADDRESS_LOST,  ///< no way in is left: the names, or the router's address
     COPY_MISSING,  ///< the machine was restarted, if this comes first in a start

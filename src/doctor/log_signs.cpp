@@ -19,7 +19,8 @@ constexpr std::string_view kMissing = "(not logged)";
 constexpr std::string_view kDropped = "Failed writing received data";
 
 // What is no reason why the device is not reached.
-constexpr std::array<Sign, 2> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END};
+constexpr std::array<Sign, 3> kNoReasons{Sign::LOGGED_ATTEMPT, Sign::LOGGED_END,
+                                         Sign::LOGGED_PORT_OPENED};
 const std::vector<Sign> kServiceSigns{Sign::LOGGED_SERVICE_UNRESOLVED,
                                       Sign::LOGGED_SERVICE_UNREACHABLE, Sign::LOGGED_SERVICE_SILENT,
                                       Sign::LOGGED_SERVICE_CERTIFICATE};
@@ -40,6 +41,7 @@ const std::vector<Sign> kTestOutcomes{
     Sign::LOGGED_MANUAL_PORT_INVALID, Sign::LOGGED_MANUAL_RULED_OUT};
 
 // What is logged anew in every cycle, or in every daily look at the names.
+constexpr auto kLongestSearch = 15min;  // at a start, or at the start of a tunnel
 constexpr auto kLongestCycle = 2h;
 constexpr auto kLongestUntilNames = 25h;
 const std::vector<Sign> kEachCycle{Sign::LOGGED_NO_ADDRESS, Sign::LOGGED_NO_GATEWAY,
@@ -55,8 +57,16 @@ bool explains(Sign sign) {
 }
 
 bool isStale(Sign sign, Time when, Time now) {
-    return (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
+    return (sign == Sign::LOGGED_ATTEMPT && now - when > kLongestSearch) ||
+           (isAmong(kEachCycle, sign) && now - when > kLongestCycle) ||
            (isAmong(kEachDay, sign) && now - when > kLongestUntilNames);
+}
+
+// Names that are wrong keep no way closed, and one port is free where another is refused.
+bool outweighs(Sign sign, Sign earlier) {
+    if (earlier == Sign::LOGGED_PORT_HELD_BY_OTHER) return sign == Sign::LOGGED_GATEWAY_REFUSES;
+    return isAmong(kEachDay, earlier) &&
+           (isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign));
 }
 
 bool contains(std::string_view text, std::string_view part) {
@@ -92,8 +102,14 @@ void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
         value(rule.kept) = shownText(rule.kept == Kept::PORT ? portOf(text) : text);
     }
     clear(rule.cleared);
-    if (rule.exception && has(*rule.exception)) return;
+    if (rule.exception && isOfAttempt(*rule.exception, when)) return;
     for (const Sign sign : rule.set) set(sign, when, filled(rule.words, values));
+}
+
+// Without cycles in the log, attempts are told apart by the time.
+bool LogSigns::isOfAttempt(Sign sign, Time when) const {
+    if (!has(sign)) return false;
+    return cycle > 0 ? cycles.at(sign) == cycle : when - *signs.at(sign).when <= kAttemptTime;
 }
 
 // Success is not logged at every severity.
@@ -112,7 +128,10 @@ void LogSigns::set(Sign sign, Time when, const std::string& text) {
         return;
     }
     signs[sign] = {Source::LOG, text, when};
-    if (!reason && explains(sign)) reason = Reason{sign, when};
+    if (!explains(sign)) return;
+    if (!reason || (reason->text.empty() && outweighs(sign, reason->sign))) {
+        reason = Reason{sign, when};
+    }
 }
 
 void LogSigns::clear(const std::vector<Sign>& cleared) {
@@ -179,13 +198,17 @@ void LogSigns::takeRefusal(std::string_view answer, Time when) {
         "an answer of the local back end stopped in the middle");
 }
 
-void LogSigns::failTest(Time when) {
+void LogSigns::failTest(Time when, bool byHand) {
     if (reason && isAmong(kServiceSigns, reason->sign)) reason->text = reasonText();
     if (!serviceFails() && !has(Sign::LOGGED_SERVICE_NONSENSE) &&
         !has(Sign::LOGGED_TEST_UNANSWERED)) {
+        const bool isBeside = byHand && reason && reason->sign == Sign::LOGGED_NO_GATEWAY;
+        if (isBeside) reason.reset();
         const std::string& port = value(Kept::PORT);
         set(Sign::LOGGED_TEST_FAILED, when,
             "the service could not reach " + (port.empty() ? "the port" : "port " + port));
+        // That a port is opened is logged as progress only.
+        if (cycle == 0) set(Sign::LOGGED_PORT_OPENED, when, "a port was opened");
     }
 }
 
@@ -254,6 +277,7 @@ std::string LogSigns::reasonText() const {
 std::map<Sign, Fact> LogSigns::lasting(Time now, bool byHand) const {
     std::map<Sign, Fact> left;
     for (const auto& [sign, fact] : signs) {
+        if (sign == Sign::LOGGED_PORT_OPENED) continue;
         if (!isReplaced(sign, byHand) && !isStale(sign, *fact.when, now)) left[sign] = fact;
     }
     return left;
@@ -268,7 +292,7 @@ bool LogSigns::isReplaced(Sign sign, bool byHand) const {
            (!byHand && std::any_of(kGatewayOutcomes.begin(), kGatewayOutcomes.end(), isLater));
 }
 
-// Both are there. Without cycles in the log, attempts are told apart by the time.
+// Both are there.
 bool LogSigns::isEarlier(Sign sign, Sign later) const {
     if (cycle > 0) return cycles.at(sign) < cycles.at(later);
     return *signs.at(later).when - *signs.at(sign).when > kAttemptTime;

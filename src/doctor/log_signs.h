@@ -42,8 +42,8 @@ public:
     /// The service's answer to a port test. True if the port passed.
     bool takeTestAnswer(std::string_view answer, Time when);
 
-    /// The port test as a whole failed.
-    void failTest(Time when);
+    /// The port test as a whole failed. @p byHand: it needed no gateway that speaks a protocol.
+    void failTest(Time when, bool byHand);
 
     /// A request to the service got no answer.
     void failService(Time when);
@@ -92,6 +92,7 @@ private:
         return kept[static_cast<std::size_t>(what)];
     }
     [[nodiscard]] bool serviceFails() const;
+    [[nodiscard]] bool isOfAttempt(Sign sign, Time when) const;
     [[nodiscard]] bool isReplaced(Sign sign, bool byHand) const;
     [[nodiscard]] bool isEarlier(Sign sign, Sign later) const;
     void concludeBackEnd(const LogRule& rule);

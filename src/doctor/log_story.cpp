@@ -13,6 +13,7 @@ namespace {
 constexpr std::string_view kPassed = "the ports passed their test and were published";
 constexpr std::string_view kTunnelUp = "the tunnel came up";
 constexpr std::string_view kToldToEnd = "the daemon was told to end by a signal";
+constexpr std::string_view kFellSilent = "the daemon logged nothing more";
 constexpr std::string_view kSilent = "nothing was logged until the daemon started again";
 
 using namespace std::chrono_literals;
@@ -96,6 +97,7 @@ Time LogStory::timeOf(const LogLine& line) {
 }
 
 void LogStory::correct(const LogClock::Correction& correction) {
+    gateway.correct(correction);
     for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
         if (*time) *time = correction.of(**time);
     }
@@ -130,7 +132,10 @@ void LogStory::becomePending() {
 }
 
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
-    if (rule.severity >= 6) progress = true;
+    if (rule.severity >= 6) {
+        progress = true;
+        gateway.seeProgress();
+    }
     signs.take(rule, when, values);
     // Without a log option nothing announces the start, and the default holds.
     if (rule.event == LogEvent::STARTED) level = kLeastLevel;
@@ -141,6 +146,7 @@ void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
 }
 
 void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
+    gateway.take(event, when, signs);
     switch (event) {
         case LogEvent::IDLE:
             assume(Reach::NOT_REACHED);
@@ -160,16 +166,16 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             assumeFrom(values[0]);
             break;
         case LogEvent::TEST_ANSWER:
-            concludeGateway();
             takeTestAnswer(values[1], when);
             break;
         case LogEvent::TEST_FAILED:
-            concludeGateway();
-            signs.failTest(when);
+            signs.failTest(when, gateway.isByHand());
             lose(when);
             break;
+        case LogEvent::TEST_RETRIED:
+            gateway.takeTestUrl(values[2]);
+            break;
         case LogEvent::TEST_UNANSWERED:
-            concludeGateway();
             signs.failTestRequest(when);
             break;
         case LogEvent::SERVICE_FAILED:
@@ -183,45 +189,9 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
             signs.takeRefusal(values[0], when);
             break;
         default:
-            happenAtGateway(event, when);
             happenInLife(event, when);
             happenInRelay(event, when);
     }
-}
-
-void LogStory::happenAtGateway(LogEvent event, Time when) {
-    switch (event) {
-        case LogEvent::UPNP_SILENT:
-            // NAT-PMP, which is tried next, reports success as progress only.
-            if (!natpmp && !signs.has(Sign::LOGGED_GATEWAY_WITHOUT_ADDRESS)) {
-                signs.set(Sign::LOGGED_NO_GATEWAY, when, "no gateway answers UPnP");
-            }
-            break;
-        case LogEvent::MANUAL:
-            ports = Ports::MANUAL;
-            break;
-        case LogEvent::AUTOMATIC:
-            ports = Ports::AUTOMATIC;
-            break;
-        case LogEvent::NATPMP_FOUND:
-            natpmp = true;
-            break;
-        case LogEvent::NATPMP_SILENT:
-            natpmp = false;
-            signs.failGateway();
-            break;
-        default:
-            break;
-    }
-}
-
-// Without progress NAT-PMP's success is not logged. But the search tests no port that a gateway has
-// not mapped. Only one that passed before is tested without a gateway, until the relay is used.
-void LogStory::concludeGateway() {
-    if (progress || tested || ports == Ports::MANUAL) return;
-    if (!signs.has(Sign::LOGGED_NO_GATEWAY)) return;
-    signs.clear({Sign::LOGGED_NO_GATEWAY});
-    natpmp = true;
 }
 
 void LogStory::happenInLife(LogEvent event, Time when) {
@@ -284,7 +254,6 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
             // No tunnel stands, or none is started.
             if (history.reach() != Reach::RELAYED) giveUp(when);
             tornDown = false;
-            tested = false;
             pending = {Reach::RELAYED, when};
             break;
         case LogEvent::RELAY_UP:
@@ -313,7 +282,8 @@ void LogStory::start(Time when) {
     passed.reset();
     signs.forget();
     nextCycle.reset();
-    signalled = ended = progress = natpmp = tested = tornDown = false;
+    signalled = ended = progress = tornDown = false;
+    gateway.start();
     ++startCount;
     since = when;
     become(Reach::NOT_REACHED, when, std::string{kDaemonStarted});
@@ -380,8 +350,13 @@ void LogStory::takeStatus(std::string_view word, Time when) {
 
 void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     if (!signs.takeTestAnswer(answer, when)) return;
-    tested = true;
-    if (!passed) passed = when;
+    gateway.passTest(when);
+    if (gateway.isSearchRepeated() && !progress) {
+        passed.reset();
+        history.withdraw();
+    } else if (!passed) {
+        passed = when;
+    }
 }
 
 // The direct path does not work. A tunnel that stands, or may stand, is not touched by that.
@@ -431,12 +406,44 @@ std::string LogStory::addressOf(Reach reach) const {
     return reach == Reach::DIRECT ? signs.address() : "";
 }
 
+// With progress each cycle is logged, and when the next one comes.
+void LogStory::endInSilence(const Evidence& evidence) {
+    if (!evidence.fromElsewhere || ended || !lastLine) return;
+    const Time due = std::max(*lastLine, nextCycle.value_or(*lastLine));
+    silent = evidence.now - due > kSilence;
+    if (!silent || !progress) return;
+    history.add({Reach::UNKNOWN, *lastLine, "", std::string{kFellSilent}});
+    signs.forget();
+}
+
+void LogStory::tellDoubts(Evidence& evidence) const {
+    if (gateway.isSearchRepeated() && evidence.history.empty()) {
+        evidence.untold.emplace_back(
+            "how it is reached: a port passes its test again and again, but is not published, so a "
+            "later step fails that is not logged; run the daemon with -l 6");
+    }
+    if (!evidence.fromElsewhere || !evidence.has(Sign::LOGGED_TEST_FAILED)) return;
+    if (gateway.isInDoubt(evidence.now)) {
+        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
+        evidence.untold.emplace_back(
+            "whether the gateway still speaks NAT-PMP: UPnP is silent, and no port has been tested "
+            "for hours, so there is no gateway any more, or the disk sleeps; run the daemon with -l "
+            "6");
+    } else if (gateway.isOriginUnknown()) {
+        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
+        evidence.untold.emplace_back(
+            "why the port test fails: the log does not tell whether the ports are opened through "
+            "NAT-PMP, and filtered, or were forwarded by hand; run the daemon with -l 6");
+    }
+}
+
 void LogStory::finish(Evidence& evidence) {
     if (passed) assume(Reach::DIRECT);
     // A log from elsewhere ends with the record if all went well.
     const bool isDone = evidence.fromElsewhere && isPending(Reach::DIRECT);
     if (pending && (isDone || evidence.now - pending->since > kAttemptTime)) becomePending();
     if (history.isOverdue(evidence.now)) history.explainStart(signs.reasonText());
+    endInSilence(evidence);
     const bool isCounted =
         evidence.has(Sign::SECOND_TUNNEL_CLIENT) || evidence.has(Sign::TUNNEL_CLIENT_ALONE);
     if (orphan && history.reach() == Reach::RELAYED && !isCounted) {
@@ -452,7 +459,7 @@ void LogStory::finish(Evidence& evidence) {
     // A clock that was set makes nonsense of it.
     const bool pauses = nextCycle && *pauseBegin <= evidence.now && evidence.now <= *nextCycle;
     if (pauses && !evidence.has(Sign::DAEMON_GONE)) evidence.daemon.nextCycle = nextCycle;
-    const bool byHand = ports == Ports::MANUAL;
+    const bool byHand = gateway.isByHand();
     for (const auto& [sign, fact] : signs.lasting(evidence.now, byHand)) {
         const bool isOfEnd = std::count(kSignsOfTheEnd.begin(), kSignsOfTheEnd.end(), sign) != 0;
         if (isOfEnd || !isQuiet()) evidence.signs[sign] = fact;
@@ -462,6 +469,7 @@ void LogStory::finish(Evidence& evidence) {
         evidence.add(Sign::MANUAL_MODE, Source::LOG, "the ports are forwarded by hand");
     }
     evidence.history.assign(history.periods().begin(), history.periods().end());
+    tellDoubts(evidence);
     if (history.dropped() > 0) {
         evidence.untold.push_back(
             "the history before its last " + std::to_string(evidence.history.size()) +

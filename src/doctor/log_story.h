@@ -8,6 +8,7 @@
 
 #include "doctor/evidence.h"
 #include "doctor/log_clock.h"
+#include "doctor/log_gateway.h"
 #include "doctor/log_line.h"
 #include "doctor/log_rules.h"
 #include "doctor/log_signs.h"
@@ -18,10 +19,9 @@ namespace pelorus::doctor {
 /// Follows what the daemon did. Its memory does not grow with the length of the log.
 class LogStory {
 public:
-    /// Whether the device's settings have ports that are forwarded by hand.
-    enum class Ports { AUTOMATIC, MANUAL };
+    using Ports = LogGateway::Ports;
 
-    explicit LogStory(Ports kind = Ports::AUTOMATIC) : ports{kind} {}
+    explicit LogStory(Ports kind = Ports::AUTOMATIC) : gateway{kind} {}
 
     /// The next line.
     void take(const LogLine& line);
@@ -34,6 +34,8 @@ public:
     [[nodiscard]] int starts() const { return startCount; }
     /// Too few lines are logged to follow what happens: no results, by what the last start said.
     [[nodiscard]] bool isQuiet() const { return level < kLeastLevel; }
+    /// A log from elsewhere goes on for long after the daemon's last line.
+    [[nodiscard]] bool isSilent() const { return silent; }
     /// The severity up to which the daemon logs.
     [[nodiscard]] int severity() const { return level; }
     [[nodiscard]] std::optional<Time> begin() const { return firstLine; }
@@ -52,15 +54,15 @@ private:
     void correct(const LogClock::Correction& correction);
     void takeText(std::string_view text, Time when);
     void settleTest(Time when);
+    void endInSilence(const Evidence& evidence);
+    void tellDoubts(Evidence& evidence) const;
     void settlePending(std::string_view text, Time when);
     void becomePending();
     [[nodiscard]] bool isPending(Reach reach) const { return pending && pending->reach == reach; }
     void apply(const LogRule& rule, Time when, const LogValues& values);
     void happen(LogEvent event, Time when, const LogValues& values);
-    void happenAtGateway(LogEvent event, Time when);
     void happenInLife(LogEvent event, Time when);
     void happenInRelay(LogEvent event, Time when);
-    void concludeGateway();
     void start(Time when);
     void endSuddenly(Time when);
     void switchOff(Time when);
@@ -80,7 +82,7 @@ private:
     LogSigns signs;
     ReachHistory history;
     std::optional<Pending> pending;
-    Ports ports;
+    LogGateway gateway;
     std::optional<Time> firstLine, lastLine, since, pauseBegin, nextCycle;
     std::optional<Time> lastOfRun;  // the last line, but for those that precede a start
     std::optional<Time> passed;     // a port, in a log that has not told yet how it was before
@@ -89,10 +91,9 @@ private:
     bool signalled = false;  // told to end
     bool ended = true;       // no daemon is there, or it is on its way out
     bool progress = false;   // since the last start there was a line of severity 6
-    bool natpmp = false;     // the gateway speaks it, as far as the log tells
-    bool tested = false;     // a port passed, and the relay was not used since
-    bool orphan = false;     // an earlier daemon ended suddenly and may have left its tunnel
-    bool tornDown = false;   // no connection of this cycle's beginning is left
+    bool silent = false;
+    bool orphan = false;    // an earlier daemon ended suddenly and may have left its tunnel
+    bool tornDown = false;  // no connection of this cycle's beginning is left
     int startCount = 0;
 };
 

@@ -80,8 +80,9 @@ enum class Sign {
     LOGGED_SECOND_NAT,  ///< the service sees another address than the gateway's
     LOGGED_NO_GATEWAY,
     LOGGED_GATEWAY_WITHOUT_ADDRESS,
-    LOGGED_GATEWAY_REFUSES,  ///< every port that was asked for
+    LOGGED_GATEWAY_REFUSES,  ///< every port of one kind that was asked for
     LOGGED_PORT_HELD_BY_OTHER,
+    LOGGED_PORT_OPENED,  ///< a port of the last search; only to understand other lines
     LOGGED_TEST_FAILED,
     LOGGED_TEST_SKIPPED_DISK,
     LOGGED_SERVICE_WAIT,

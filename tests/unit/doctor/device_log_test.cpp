@@ -125,6 +125,18 @@ TEST_F(DeviceLogTest, StampsWithoutYearsReachFurtherBackThanOne) {
     EXPECT_EQ(evidence.daemon.since, evidence.logBegin);
 }
 
+TEST_F(DeviceLogTest, TimeGoesOnInAnHourThatComesTwice) {
+    setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
+    tzset();
+    std::string log;
+    for (const char* const time : {"01:50", "02:10", "02:50", "02:10", "02:50", "03:10"}) {
+        log += "Oct 25 " + std::string{time} + ":00 nas Pelorus: x\n";
+    }
+    const Evidence evidence = look({plain("a", log)});
+    EXPECT_EQ(evidence.checks.back().text.find("jumped"), std::string::npos);
+    EXPECT_EQ(*evidence.logEnd - *evidence.logBegin, std::chrono::minutes{140});
+}
+
 TEST_F(DeviceLogTest, SaysThatTheLinesMayBeOfSeveralDevices) {
     std::string other = kSecond;
     other.replace(other.find("nas"), 3, "box");
@@ -194,6 +206,8 @@ TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
         std::string file;
         std::string problem;
     } rows[]{{plain("cut.gz", bytes), "its end is missing"},
+             {plain("boot", "[    2.345678] nas Pelorus[12]: x\n"),
+              "the time stamp of 1 line of the daemon is not understood"},
              {path("absent"), "No such file or directory"},
              {folder, "it is no regular file"},
              {plain("bad.gz", bytes.substr(0, 40) + std::string(400, '?')), "it is damaged"}};

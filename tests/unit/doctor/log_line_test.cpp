@@ -36,6 +36,9 @@ TEST_F(LogLineTest, StampsOfEveryLogger) {
         {"2026-11-22T02:40:00+0100 nas Pelorus[7]: x", kNow - 4800},
         {"2026-11-22T01:40:00Z nas Pelorus[7]: x", kNow - 4800},
         {"2026-11-22T02:40:00 nas Pelorus: x", kNow - 4800},
+        {"Nov 22 03:00:00.123456 nas Pelorus[12]: x", kNow - 3600},
+        {"1795316400.123456 nas Pelorus[12]: x", kNow},
+        {"1795316400 nas Pelorus[12]: x", -1},
         {"2026-11-23T03:00:00Z nas Pelorus: x", kNow + 86400},  // a clock or zone of another device
         {"2026-11-23T03:00:01Z nas Pelorus: x", -1},
         {"Nov 31 12:00:00 nas Pelorus: x", -1},
@@ -50,6 +53,29 @@ TEST_F(LogLineTest, StampsOfEveryLogger) {
         const auto line = readLogLine(row.line, at(kNow));
         EXPECT_EQ(line ? line->when.time_since_epoch().count() : -1, row.seconds) << row.line;
     }
+}
+
+TEST_F(LogLineTest, AnHourThatComesTwiceIsItsFirstOne) {
+    for (const char* const line :
+         {"Oct 25 02:30:00 nas Pelorus: x", "2026-10-25 02:30:00 nas Pelorus: x"}) {
+        const auto read = readLogLine(line, at(kNow));
+        ASSERT_TRUE(read) << line;
+        EXPECT_EQ(read->when, at(1792888200)) << line;
+        EXPECT_TRUE(read->isTwice) << line;
+    }
+    EXPECT_FALSE(readLogLine("Oct 25 03:30:00 nas Pelorus: x", at(kNow))->isTwice);
+    EXPECT_FALSE(readLogLine("Oct 25 01:30:00 nas Pelorus: x", at(kNow))->isTwice);
+}
+
+TEST_F(LogLineTest, MayLackAStamp) {
+    const std::pair<const char*, bool> rows[]{
+        {"[    2.345678] nas Pelorus[12]: x", true},
+        {"Sun 2026-11-22 03:00:00 UTC nas Pelorus[12]: x", true},
+        {"2036-11-22T03:00:00Z nas Pelorus[12]: x", true},
+        {"[    2.345678] nas kernel: elorus", false},
+        {"Nov 22 03:00:00 nas cron: Pelorus: x", false},
+    };
+    for (const auto& [line, lacks] : rows) EXPECT_EQ(lacksStamp(line, at(kNow)), lacks) << line;
 }
 
 TEST_F(LogLineTest, OnlyTheDaemonsLinesWithoutTheirEnds) {

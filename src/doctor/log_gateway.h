@@ -1,0 +1,77 @@
+// What a log tells of the gateway, also where it does not say so.
+#ifndef PELORUS_DOCTOR_LOG_GATEWAY_H
+#define PELORUS_DOCTOR_LOG_GATEWAY_H
+
+#include <optional>
+#include <string_view>
+
+#include "doctor/evidence.h"
+#include "doctor/log_rules.h"
+#include "doctor/log_signs.h"
+
+namespace pelorus::doctor {
+
+/// Concludes whether there is a gateway. Without progress in the log, the success of NAT-PMP is not
+/// logged, nor whether ports are forwarded by hand.
+class LogGateway {
+public:
+    /// Whether the device's settings have ports that are forwarded by hand.
+    enum class Ports { UNKNOWN, AUTOMATIC, MANUAL };
+
+    explicit LogGateway(Ports kind) : ports{kind} {}
+
+    /// A new run of the daemon.
+    void start();
+
+    /// A line of severity 6 was logged.
+    void seeProgress() { progress = true; }
+
+    /// Takes any event.
+    void take(LogEvent event, Time when, LogSigns& signs);
+
+    /// The URL of a port test. The daemon names no address for ports that it has not mapped itself.
+    void takeTestUrl(std::string_view url);
+
+    /// A port passed its test.
+    void passTest(Time when);
+
+    /// Ports pass their test more often than published ones are tested: a step of the search fails
+    /// after that.
+    [[nodiscard]] bool isSearchRepeated() const { return hurried > 2; }
+
+    [[nodiscard]] bool isByHand() const { return ports == Ports::MANUAL; }
+
+    /// Nothing tells whether the port that was tested last was opened through NAT-PMP or by hand.
+    [[nodiscard]] bool isOriginUnknown() const;
+
+    /// Nothing tells at @p now whether the gateway still speaks NAT-PMP.
+    [[nodiscard]] bool isInDoubt(Time now) const;
+
+    /// The clock was wrong.
+    void correct(const LogClock::Correction& correction);
+
+private:
+    // The test of a port that was published, and the search after its failure.
+    enum class Retest { NONE, FAILED, DISCOVERING, SEARCHED };
+
+    void endSearch() { hurried = 0; }
+    void takeSilence(Time when, LogSigns& signs);
+    void concludeFromTest(Time when, LogSigns& signs);
+    void concludeFromRelay(Time when, LogSigns& signs);
+
+    Ports ports;
+    Retest retest = Retest::NONE;
+    std::optional<Time> lastPass;
+    std::optional<Time> lastTest;     // of a port, or the last attempt to map one
+    std::optional<Time> lastSilence;  // of UPnP
+    int hurried = 0;  // passes in a row, sooner than a published port is tested again
+    bool progress = false;
+    bool natpmp = false;         // the gateway speaks it, as far as the log tells
+    bool guessed = false;        // only because a port was tested, maybe one forwarded by hand
+    bool tested = false;         // a port passed, and the relay was not used since
+    bool mayBePublished = true;  // before the log began
+};
+
+}  // namespace pelorus::doctor
+
+#endif

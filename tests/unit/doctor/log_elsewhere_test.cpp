@@ -1,0 +1,94 @@
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "logged_lines.h"
+
+namespace pelorus::doctor {
+namespace {
+
+// Without progress, a log from elsewhere leaves much open.
+TEST(LogElsewhere, TellsNoMoreThanItsLinesCarry) {
+    constexpr int kDay = 86400;
+    const std::string direct = "9 direct: the ports passed their test and were published|";
+    const char* const byHand =
+        "TavikClient::testPort[1] - port check failed, retrying in 5 seconds, url:  "
+        "[https://x/?external_ip=&port=8081].";
+    const char* const mapped =
+        "TavikClient::testPort[1] - port check failed, retrying in 5 seconds, url:  "
+        "[https://x/?external_ip=203.0.113.7&port=9091].";
+    const struct {
+        const char* name;
+        Lines lines;
+        int end;  // of the log
+        std::string history;
+        std::vector<Sign> signs;
+        std::string untold;  // begins with this
+    } rows[]{
+        {"silence in spite of progress",
+         {{0, kStart}, {9, kPublished}, {10, kPause}},
+         kDay,
+         direct + "10 ?: the daemon logged nothing more|",
+         {},
+         ""},
+        {"a pause", {{0, kStart}, {9, kPublished}, {10, kPause}}, 3600, direct, {}, ""},
+        {"silence without progress", {{0, kStart}, {9, kPublished}}, kDay, direct, {}, ""},
+        {"a start, and nothing more",
+         {{0, kStart}},
+         kDay,
+         "0 not reached: the daemon started|",
+         {},
+         ""},
+        {"a test of ports forwarded by hand, without a gateway",
+         {{0, kTunnelStarts}, {90, kNoUpnp}, {93, kFailedAnswer}, {93, byHand}, {93, kTestFailed}},
+         400,
+         "0 relayed: the tunnel came up|",
+         {Sign::MANUAL_MODE, Sign::LOGGED_TEST_FAILED},
+         ""},
+        {"a test of ports forwarded by hand, or of one published before the log begins",
+         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, byHand}, {3, kTestFailed}},
+         9,
+         "",
+         {},
+         "why the port test fails: "},
+        {"a test of ports that were mapped",
+         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, mapped}, {3, kTestFailed}},
+         9,
+         "",
+         {Sign::LOGGED_TEST_FAILED},
+         ""},
+        {"a test, and none for hours in which a gateway may have gone",
+         {{0, kNoUpnp}, {3, kFailedAnswer}, {3, kTestFailed}, {kDay, kNoUpnp}},
+         kDay,
+         "",
+         {},
+         "whether the gateway still speaks NAT-PMP: "},
+        {"ports pass in every search, and are not published",
+         {{0, kPassed}, {130, kPassed}, {260, kPassed}, {390, kPassed}, {800, kPassed}},
+         801,
+         "",
+         {},
+         "how it is reached: a port passes its test again"},
+        {"published ports are tested again",
+         {{0, kPassed}, {250, kPassed}, {500, kPassed}, {750, kPassed}},
+         801,
+         "0 direct 203.0.113.7: |",
+         {},
+         ""},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        const Evidence evidence = told(row.lines, row.end, true);
+        EXPECT_EQ(historyOf(evidence), row.history);
+        std::vector<Sign> signs;
+        for (const auto& [sign, fact] : evidence.signs) signs.push_back(sign);
+        EXPECT_EQ(signs, row.signs);
+        const std::string unsaid = evidence.untold.empty() ? "" : evidence.untold.back();
+        EXPECT_EQ(unsaid.substr(0, row.untold.empty() ? unsaid.npos : row.untold.size()),
+                  row.untold);
+    }
+}
+
+}  // namespace
+}  // namespace pelorus::doctor

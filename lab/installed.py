@@ -49,7 +49,8 @@ PELORUS_OPTIONS="-l 5"
 _MODES = {
     "etc/pelorus": (0o755, "root"), "etc/pelorus/globalconfig.ini": (0o644, "root"),
     "etc/default/pelorus": (0o644, "root"), "run/pelorus-relay": (0o700, "root"),
-    "var/lib/pelorus": (0o770, "www-data"), "run/pelorus": (0o770, "www-data")}
+    "var/lib/pelorus": (0o770, "www-data"), "run/pelorus": (0o770, "www-data"),
+    "usr/share/doc/pelorus/doctor.md": (0o644, "root")}
 _AS = {name: ("setpriv", "--reuid", number, "--regid", number, "--clear-groups")
        for name, number in (("nobody", "65534"), ("www-data", "33"))}
 # What changes by itself, whatever is installed.

@@ -121,10 +121,13 @@ std::string jumpsInWords(int jumps) {
 
 void tellHosts(Evidence& evidence) {
     if (evidence.logHosts.size() < 2) return;
+    constexpr std::size_t kMostNames = 3;
     std::string names;
+    std::size_t shown = 0;
     for (const std::string& host : evidence.logHosts) {
-        names += (names.empty() ? "" : ", ") + shownText(host);
+        if (shown++ < kMostNames) names += (names.empty() ? "" : ", ") + shownText(host);
     }
+    if (shown > kMostNames) names += " and " + std::to_string(shown - kMostNames) + " more";
     evidence.untold.push_back("whether this is one device: the log has lines of " + names +
                               "; if they are several, read the lines of one only");
 }

@@ -48,7 +48,7 @@ public:
     /// How many lines of the daemon were left out, because their stamps cannot be read.
     [[nodiscard]] int unstamped() const { return left; }
 
-    /// Whose lines were passed on; a few at most.
+    /// Whose lines were passed on; at most a thousand.
     [[nodiscard]] const std::set<std::string>& hosts() const { return met; }
 
 private:

@@ -61,6 +61,11 @@ constexpr Compactness kCompactness[]{{false, false, true, 8, 3}, {true, false, t
                                      {true, true, true, 3, 1},   {true, true, true, 1, 0},
                                      {true, true, false, 1, 0}};
 
+struct ShownChecks {
+    std::vector<Check> checks;
+    std::size_t hidden = 0;  // that are ok
+};
+
 class TextReport {
 public:
     TextReport(const Diagnosis& subject, const Layout& layout)
@@ -93,7 +98,7 @@ private:
     [[nodiscard]] std::string factWithSource(const Fact& fact) const;
     [[nodiscard]] std::string nextCycle() const;
     void addNextCycle(std::vector<Check>& all) const;
-    [[nodiscard]] std::vector<Check> checksToShow(const Compactness& compactness) const;
+    [[nodiscard]] ShownChecks checksToShow(const Compactness& compactness) const;
     [[nodiscard]] Lines checks(const Compactness& compactness) const;
     // Room for the text of a check between its verdict and its source.
     [[nodiscard]] std::size_t checkWidth() const {
@@ -233,7 +238,7 @@ void TextReport::addNextCycle(std::vector<Check>& all) const {
     }
 }
 
-std::vector<Check> TextReport::checksToShow(const Compactness& compactness) const {
+ShownChecks TextReport::checksToShow(const Compactness& compactness) const {
     std::vector<Check> all = diagnosis.checks;
     addNextCycle(all);
     if (compactness.joinsAll) {
@@ -245,7 +250,7 @@ std::vector<Check> TextReport::checksToShow(const Compactness& compactness) cons
             return left.source < right.source;
         });
     }
-    if (!compactness.joinsNeighbours) return all;
+    if (!compactness.joinsNeighbours) return {std::move(all), 0};
     std::vector<Check> shown;
     std::size_t hidden = 0;
     for (Check& check : all) {
@@ -262,15 +267,11 @@ std::vector<Check> TextReport::checksToShow(const Compactness& compactness) cons
             shown.push_back(std::move(check));
         }
     }
-    if (hidden > 0) {
-        const std::string text = std::to_string(hidden) + " more that are ok: see --json";
-        shown.push_back({Verdict::OK, Source::NOW, text});
-    }
-    return shown;
+    return {std::move(shown), hidden};
 }
 
 Lines TextReport::checks(const Compactness& compactness) const {
-    const std::vector<Check> shown = checksToShow(compactness);
+    const auto [shown, hidden] = checksToShow(compactness);
     std::size_t longest = 0;
     for (const Check& check : shown) longest = std::max(longest, letters(check.text));
     const std::size_t textWidth = std::min(longest, checkWidth());
@@ -285,6 +286,10 @@ Lines TextReport::checks(const Compactness& compactness) const {
         first.replace(0, name.size(),
                       colours ? verdictColour(check.verdict) + name + kEndOfColour : name);
         append(lines, wrapped);
+    }
+    if (hidden > 0) {
+        append(lines, hang(padded("ok", kVerdictWidth),
+                           std::to_string(hidden) + " more that are ok: see --json", width));
     }
     for (const std::string& text : diagnosis.untold) append(lines, hang("unknown  ", text, width));
     return lines;

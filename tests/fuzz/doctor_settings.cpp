@@ -53,7 +53,7 @@ void pelorus::fuzz::tryText(const std::string& text) {
     doctor::lookAtFiles({file, output, output, folder}, evidence);
     checkEvidence(evidence);
     assert(std::filesystem::exists(copy) == (part.size() > 3));
-    checkText(doctor::readTunnelOutput(part[2], part[0]).failure);
+    checkText(doctor::readTunnelOutput(part[2], part[0]).line);
 
     // The daemon's copying cuts lines at zero bytes.
     if (part.size() > 3 || part[1].find('\0') == std::string::npos) {

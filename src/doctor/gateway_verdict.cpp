@@ -145,7 +145,8 @@ std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
         // One that knows no single entries may list it all the same.
         const bool isListed =
             std::any_of(table.entries.begin(), table.entries.end(), [&](const TableEntry& entry) {
-                return entry.externalPort == port.externalPort && isOwn(table, entry);
+                return entry.externalPort == port.externalPort &&
+                       (isOwn(table, entry) || !tellsClient(entry));
             });
         return isListed ? "" : "the gateway does not map it";
     }

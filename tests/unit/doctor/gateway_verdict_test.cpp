@@ -163,6 +163,7 @@ const Table kTables[] = {
     {"Ours", {kOurs}, {http(kOurs), {9444, 443, true, kOursForHttps}}, {}},
     {"Lost", {kOursForHttps}, {http({})}, kAllLost},
     {"ListedOnly", {kOurs}, {http({})}, {}},
+    {"ListedOnlyAndByName", {kByName}, {http({})}, {}},
     {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
     {"BothLost", {}, {http({}), {9444, 443, true, {}}}, kAllLost},
     {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, kAllLost},

@@ -228,8 +228,15 @@ void judgeGateway(GatewayAnswer upnp,
     findings.ok("gateway: " + text);
 }
 
-void judgeSilentGateway(const std::string& address, Findings& findings) {
-    const std::string text = address + " does not answer in the home network at all";
+void judgeSilentGateway(const GatewayAnswer& upnp,
+                        const GatewayAnswer& natpmp,
+                        const std::vector<std::string>& routed,
+                        Findings& findings) {
+    for (const GatewayAnswer& answer : {upnp, natpmp}) {
+        const std::string& device = isFound(answer) ? answer.gateway : answer.unanswered;
+        if (std::find(routed.begin(), routed.end(), device) != routed.end()) return;
+    }
+    const std::string text = routed.front() + " does not answer in the home network at all";
     findings.add(Sign::GATEWAY_SILENT, "the gateway " + text);
     findings.problem("gateway: " + text);
 }

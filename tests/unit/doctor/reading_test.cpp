@@ -90,20 +90,25 @@ TEST(LanHost, HasTheAddressesOfOneHardwareAddress) {
         "192.168.1.2      0x1         0x2         02:00:00:00:77:02     *        eth0\n"
         "192.168.1.254    0x1         0x2         02:00:00:00:77:01     *        eth0\n"
         "192.168.1.3      0x1         0x0         00:00:00:00:00:00     *        eth0\n"
-        "192.168.1.4      0x1         0x0         00:00:00:00:00:00     *        eth0\n";
+        "192.168.1.4      0x1         0x0         00:00:00:00:00:00     *        eth0\n"
+        "192.168.1.2      0x1         0x0         00:00:00:00:00:00     *        eth1\n"
+        "192.168.1.7      0x1         0x2         02:00:00:00:77:01     *        eth1\n";
     const struct {
+        const char* interface;
         std::string address;
         std::vector<std::string> others;
         bool isSilent;
-    } rows[]{{"192.168.1.1", {"192.168.1.254"}, false},
-             {"192.168.1.2", {}, false},
-             {"192.168.1.3", {}, true},
-             {"192.168.1.9", {}, false}};
+    } rows[]{{"eth0", "192.168.1.1", {"192.168.1.254"}, false},
+             {"eth0", "192.168.1.2", {}, false},
+             {"eth1", "192.168.1.2", {}, true},
+             {"eth0", "192.168.1.3", {}, true},
+             {"eth0", "192.168.1.9", {}, false}};
     for (const auto& row : rows) {
         std::vector<std::string> all{row.address};
         all.insert(all.end(), row.others.begin(), row.others.end());
-        EXPECT_EQ(readLanHost(table, row.address).addresses, all);
-        EXPECT_EQ(readLanHost(table, row.address).isSilent, row.isSilent) << row.address;
+        const LanHost host = readLanHost(table, {row.interface, row.address});
+        EXPECT_EQ(host.addresses, all);
+        EXPECT_EQ(host.isSilent, row.isSilent) << row.interface << " " << row.address;
     }
 }
 

@@ -49,8 +49,8 @@ enum class Sign {
     OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
     NO_PORT_MAPPED,           ///< to us, of those that are published
     PORT_HELD_BY_OTHER,
-    WEB_SERVER_SILENT,  ///< on an internal port
-    NO_WEB_SERVER,      ///< on either of them
+    WEB_SERVER_SILENT,  ///< on the internal HTTP port
+    NO_WEB_SERVER,      ///< nor on that for HTTPS
     DISK_ACTIVE,        ///< by its own word
     BACK_END_ANSWERS,
     BACK_END_SILENT,

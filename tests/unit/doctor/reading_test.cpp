@@ -11,15 +11,22 @@
 #include "doctor/question_probe.h"
 #include "doctor/start_command.h"
 #include "doctor/url_host.h"
+#include "doctor/web_probe.h"
 
 namespace pelorus::doctor {
 
 namespace {
 
+std::vector<Sign> signsOf(const Findings& findings) {
+    std::vector<Sign> signs;
+    for (const auto& seen : findings.signs()) signs.push_back(seen.sign);
+    return signs;
+}
+
 // Nothing without a sign, or with several.
 std::optional<Sign> onlySign(const Findings& findings) {
-    if (findings.signs().size() != 1) return std::nullopt;
-    return findings.signs().front().sign;
+    const std::vector<Sign> signs = signsOf(findings);
+    return signs.size() == 1 ? std::optional{signs.front()} : std::nullopt;
 }
 
 std::string hostText(const std::string& url) {
@@ -138,9 +145,7 @@ TEST(Network, IsJudgedByItsFirstLack) {
             row.all,
             row.hasRoute ? std::optional{DefaultRoute{"eth0", "192.168.1.1"}} : std::nullopt,
             findings);
-        std::vector<Sign> signs;
-        for (const auto& seen : findings.signs()) signs.push_back(seen.sign);
-        EXPECT_EQ(signs, row.signs) << &row - rows;
+        EXPECT_EQ(signsOf(findings), row.signs) << &row - rows;
     }
 }
 
@@ -154,6 +159,29 @@ TEST(Tunnel, IsMissedWhileItsClientIsUp) {
         Findings findings;
         judgeMissingTunnel(all, findings);
         EXPECT_EQ(!findings.checks().empty(), isMissed);
+    }
+}
+
+// The service tests the HTTP port only.
+TEST(WebServer, IsSilentWhereTheServiceTestsIt) {
+    const struct {
+        const char *http, *https;  // why there is no connection
+        std::vector<Sign> signs;
+        const char* check;
+    } rows[]{
+        {"", "", {}, "web server listens on 80 and 443"},
+        {"", "refused", {}, "web server: port 443 of 192.168.1.5: refused"},
+        {"refused", "", {Sign::WEB_SERVER_SILENT}, "web server: port 80 of 192.168.1.5: refused"},
+        {"refused",
+         "no answer",
+         {Sign::WEB_SERVER_SILENT, Sign::NO_WEB_SERVER},
+         "web server: port 80 of 192.168.1.5: refused, port 443 of 192.168.1.5: no answer"}};
+    for (const auto& row : rows) {
+        Findings findings;
+        judgeWebServer("192.168.1.5", {80, row.http}, {443, row.https}, findings);
+        EXPECT_EQ(signsOf(findings), row.signs);
+        ASSERT_EQ(findings.checks().size(), 1U);
+        EXPECT_EQ(findings.checks()[0].text, row.check);
     }
 }
 

@@ -214,7 +214,8 @@ void judgeNetwork(const std::vector<Interface>& all,
 void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings) {
     const auto isUp = [](const Interface& entry) { return entry.up && entry.tunnel; };
     if (std::any_of(all.begin(), all.end(), isUp)) return;
-    findings.problem("tunnel interface: none is up, although the tunnel client says that it is");
+    findings.add(Sign::NO_TUNNEL_INTERFACE, "no tunnel interface is up");
+    findings.problem("tunnel interface: none is up, although the tunnel client runs");
 }
 
 }  // namespace pelorus::doctor

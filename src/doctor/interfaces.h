@@ -53,7 +53,7 @@ void judgeNetwork(const std::vector<Interface>& all,
                   const std::optional<DefaultRoute>& route,
                   Findings& findings);
 
-/// Says so when no tunnel is up, although the tunnel client says that it is.
+/// Concludes from the interfaces of a device whose tunnel client runs and should have its tunnel up.
 void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings);
 
 }  // namespace pelorus::doctor

@@ -62,6 +62,7 @@ enum class Sign {
     NAMES_RIGHT,
     NAMES_LEAD_ELSEWHERE,
     NAMES_UNRESOLVED,
+    NO_TUNNEL_INTERFACE,   ///< is up, while the tunnel client runs
     RELAY_CLIENT_MISSING,  ///< no openvpn program
     TUNNEL_DEVICE_MISSING,
     SERVICE_SEES_SAME_ADDRESS,  ///< as the gateway says

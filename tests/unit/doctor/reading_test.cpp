@@ -159,6 +159,7 @@ TEST(Tunnel, IsMissedWhileItsClientIsUp) {
         Findings findings;
         judgeMissingTunnel(all, findings);
         EXPECT_EQ(!findings.checks().empty(), isMissed);
+        EXPECT_EQ(findings.has(Sign::NO_TUNNEL_INTERFACE), isMissed);
     }
 }
 

@@ -127,7 +127,7 @@ def relay_down_at_first(lab: Lab) -> None:
 
 @scenario(Situation(gateway=SILENT, relay=True, clock=RELAYED))
 def tunnel_client_dies(lab: Lab) -> None:
-    """The tunnel client is killed: the next cycle starts another."""
+    """The tunnel client is killed: the next cycle starts another. Then the relay goes away."""
     client = _start_relayed(lab)
 
     lab.step("the client is killed; until the next cycle the status still says relayed")
@@ -146,6 +146,15 @@ def tunnel_client_dies(lab: Lab) -> None:
     assert lab.relay.connections() == 2
     second = tunnel_client()
     lab.moment("another tunnel client has been started", "no-gateway-protocol")
+
+    lab.step("the relay goes away; the client runs on, without its interface")
+    with lab.daemon.held():
+        lab.relay.server.stop()
+        wait_until(lambda: "process restarting" in lab.device.tunnel_output().read_text(),
+                   "the client to miss the relay", 20)
+        assert lab.device.status == "relayed"
+        lab.moment("the relay is gone, and the daemon has not noticed yet",
+                   "relay-does-not-come-up", reach="not-reached")
     assert_stops_clean(lab)
     wait_for_client_end(second)
     assert lab.device.statuses_sent() == ["connecting", "relayed", "disabled"]

@@ -177,9 +177,9 @@ std::vector<Cause> deviceCauses() {
         {"web-server-silent",
          kRunning,
          {{S::WEB_SERVER_SILENT}},
-         {S::CREDENTIALS_MISSING},
-         "The device's own web server does not listen on the ports that are to be forwarded, so "
-         "nothing answers there even if the way is open.",
+         {S::CREDENTIALS_MISSING, S::MANUAL_MODE},
+         "The device's own web server does not listen on its HTTP port, so every port test fails "
+         "even if the way is open.",
          "Start the web server, or correct INTERNAL_HTTP_PORT and INTERNAL_HTTPS_PORT."},
         {"back-end-silent",
          kRunning,

@@ -73,6 +73,8 @@ void dropWhatIsOver(Evidence& evidence) {
     if (isSecondNatOver(evidence)) {
         drop(Sign::LOGGED_SECOND_NAT, Sign::GATEWAY_ADDRESS_PUBLIC, evidence);
     }
+    // The usual table of routes need not be the only one.
+    if (evidence.has(Sign::SERVICE_REACHED)) evidence.signs.erase(Sign::NO_DEFAULT_ROUTE);
     // A run with -u logs the same as a daemon that is switched off.
     if (evidence.setting("ENABLEREMOTEACCESS") == "1") {
         evidence.signs.erase(Sign::LOGGED_REMOTE_ACCESS_OFF);
@@ -117,10 +119,10 @@ bool isOffline(const Evidence& evidence) {
     return evidence.has(Sign::SERVICE_UNRESOLVED) || evidence.has(Sign::SERVICE_UNREACHABLE);
 }
 
-// A gateway that only fails to answer still forwards, and the service may fail for others, too.
+// A gateway that only fails to answer still forwards, and the service may be down for everybody.
 bool isLineDown(const Evidence& evidence) {
-    return isOffline(evidence) &&
-           (evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS) || evidence.has(Sign::NO_GATEWAY_ANSWERS));
+    if (isOffline(evidence) && evidence.has(Sign::GATEWAY_WITHOUT_ADDRESS)) return true;
+    return evidence.has(Sign::NO_GATEWAY_ANSWERS) && evidence.has(Sign::SERVICE_UNRESOLVED);
 }
 
 bool isGatewayOff(const Evidence& evidence) {
@@ -128,14 +130,14 @@ bool isGatewayOff(const Evidence& evidence) {
 }
 
 // What is seen now of a device that says that it is reached directly. Ports forwarded by hand may
-// lead through a second router, and to other ports.
+// lead through a second router, and to other ports; only the settings tell whether there are any.
 bool isDisproved(const Evidence& evidence) {
     if (evidence.has(Sign::PORT_TEST_PASSES)) return false;
     if (evidence.has(Sign::PORT_TEST_FAILS) || evidence.has(Sign::OTHER_DEVICE_ANSWERS) ||
         isGatewayOff(evidence)) {
         return true;
     }
-    if (evidence.has(Sign::MANUAL_MODE)) return false;
+    if (evidence.has(Sign::MANUAL_MODE) || !evidence.hasSettings()) return false;
     if (evidence.has(Sign::NO_WEB_SERVER)) return true;
     if (evidence.has(Sign::OWN_ROUTER)) return false;
     const bool isBehindAnother =
@@ -143,6 +145,17 @@ bool isDisproved(const Evidence& evidence) {
     if (isBehindAnother && !evidence.has(Sign::GATEWAY_ELSEWHERE)) return true;
     return isLineDown(evidence) || evidence.has(Sign::SERVICE_SEES_OTHER_ADDRESS) ||
            evidence.has(Sign::GATEWAY_ADDRESS_CHANGED) || evidence.has(Sign::NO_PORT_MAPPED);
+}
+
+// Trouble that the client gets over leaves the interface up. Only both together are proof.
+bool isTunnelLost(const Evidence& evidence) {
+    if (evidence.has(Sign::TUNNEL_GONE)) return true;
+    if (!evidence.has(Sign::NO_TUNNEL_INTERFACE) || evidence.has(Sign::TUNNEL_SAYS_UP))
+        return false;
+    constexpr std::array kTroubles{Sign::TUNNEL_REFUSED, Sign::TUNNEL_UNANSWERED,
+                                   Sign::RELAY_UNRESOLVED, Sign::RELAY_CERTIFICATE_BAD};
+    return std::any_of(kTroubles.begin(), kTroubles.end(),
+                       [&](Sign sign) { return evidence.has(sign); });
 }
 
 Reach reachOf(const Evidence& evidence) {
@@ -158,7 +171,7 @@ Reach reachOf(const Evidence& evidence) {
     }
     if (evidence.has(Sign::CREDENTIALS_MISSING)) return Reach::NOT_REACHED;
     const Reach said = lastSaid(evidence);
-    if (said == Reach::RELAYED && evidence.has(Sign::TUNNEL_GONE)) return Reach::NOT_REACHED;
+    if (said == Reach::RELAYED && isTunnelLost(evidence)) return Reach::NOT_REACHED;
     if (said == Reach::DIRECT && isDisproved(evidence)) return Reach::NOT_REACHED;
     if (said == Reach::UNKNOWN) {
         if (evidence.has(Sign::TUNNEL_RUNS)) return Reach::RELAYED;

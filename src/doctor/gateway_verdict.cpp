@@ -145,7 +145,8 @@ std::string mappingFault(const GatewayTable& table, const PublishedPort& port) {
         // One that knows no single entries may list it all the same.
         const bool isListed =
             std::any_of(table.entries.begin(), table.entries.end(), [&](const TableEntry& entry) {
-                return entry.externalPort == port.externalPort && isOwn(table, entry);
+                return entry.externalPort == port.externalPort &&
+                       (isOwn(table, entry) || !tellsClient(entry));
             });
         return isListed ? "" : "the gateway does not map it";
     }
@@ -227,8 +228,15 @@ void judgeGateway(GatewayAnswer upnp,
     findings.ok("gateway: " + text);
 }
 
-void judgeSilentGateway(const std::string& address, Findings& findings) {
-    const std::string text = address + " does not answer in the home network at all";
+void judgeSilentGateway(const GatewayAnswer& upnp,
+                        const GatewayAnswer& natpmp,
+                        const std::vector<std::string>& routed,
+                        Findings& findings) {
+    for (const GatewayAnswer& answer : {upnp, natpmp}) {
+        const std::string& device = isFound(answer) ? answer.gateway : answer.unanswered;
+        if (std::find(routed.begin(), routed.end(), device) != routed.end()) return;
+    }
+    const std::string text = routed.front() + " does not answer in the home network at all";
     findings.add(Sign::GATEWAY_SILENT, "the gateway " + text);
     findings.problem("gateway: " + text);
 }

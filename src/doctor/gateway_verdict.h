@@ -31,8 +31,12 @@ void judgeGateway(GatewayAnswer upnp,
                   const std::vector<std::string>& routed,
                   Findings& findings);
 
-/// Concludes from a gateway that does not even tell its hardware address.
-void judgeSilentGateway(const std::string& address, Findings& findings);
+/// Concludes from a gateway of the default route that does not even tell its hardware address,
+/// unless it has answered through one of the protocols.
+void judgeSilentGateway(const GatewayAnswer& upnp,
+                        const GatewayAnswer& natpmp,
+                        const std::vector<std::string>& routed,
+                        Findings& findings);
 
 /// The external address that the daemon takes from the answers, of whichever class; empty if that is
 /// none.

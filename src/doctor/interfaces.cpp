@@ -142,29 +142,30 @@ std::optional<DefaultRoute> defaultRoute() {
     return readDefaultRoute(readTable("/proc/net/route"));
 }
 
-LanHost readLanHost(const std::string& table, const std::string& address) {
-    LanHost host{{address}, false};
+LanHost readLanHost(const std::string& table, const DefaultRoute& route) {
+    LanHost host{{route.gateway}, false};
     std::map<std::string, std::string> hardware;  // by address
     std::istringstream lines{table};
     for (std::string line; std::getline(lines, line);) {
         std::istringstream words{line};
-        std::string known, type, flags, at;
-        words >> known >> type >> flags >> at;
+        std::string known, type, flags, at, mask, interface;
+        words >> known >> type >> flags >> at >> mask >> interface;
+        if (interface != route.interface) continue;
         if (flags != "0x0") {
             hardware[known] = at;
-        } else if (known == address) {
+        } else if (known == route.gateway) {
             host.isSilent = true;
         }
     }
-    const std::string own = hardware[address];
+    const std::string own = hardware[route.gateway];
     for (const auto& [known, at] : hardware) {
-        if (known != address && !own.empty() && at == own) host.addresses.push_back(known);
+        if (known != route.gateway && !own.empty() && at == own) host.addresses.push_back(known);
     }
     return host;
 }
 
-LanHost lanHost(const std::string& address) {
-    return readLanHost(readTable("/proc/net/arp"), address);
+LanHost lanHost(const DefaultRoute& route) {
+    return readLanHost(readTable("/proc/net/arp"), route);
 }
 
 std::string lanAddress() {
@@ -213,7 +214,8 @@ void judgeNetwork(const std::vector<Interface>& all,
 void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings) {
     const auto isUp = [](const Interface& entry) { return entry.up && entry.tunnel; };
     if (std::any_of(all.begin(), all.end(), isUp)) return;
-    findings.problem("tunnel interface: none is up, although the tunnel client says that it is");
+    findings.add(Sign::NO_TUNNEL_INTERFACE, "no tunnel interface is up");
+    findings.problem("tunnel interface: none is up, although the tunnel client runs");
 }
 
 }  // namespace pelorus::doctor

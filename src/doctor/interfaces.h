@@ -36,10 +36,11 @@ struct LanHost {
     bool isSilent = false;               ///< it does not even tell its hardware address
 };
 
-/// The host with @p address by @p table, which is in the form of /proc/net/arp.
-[[nodiscard]] LanHost readLanHost(const std::string& table, const std::string& address);
+/// The gateway of @p route by @p table, which is in the form of /proc/net/arp. What other
+/// interfaces know of its address does not count.
+[[nodiscard]] LanHost readLanHost(const std::string& table, const DefaultRoute& route);
 /// By the table of this device.
-[[nodiscard]] LanHost lanHost(const std::string& address);
+[[nodiscard]] LanHost lanHost(const DefaultRoute& route);
 
 /// The device's address in its LAN, preferably on the interface of the default route; empty if it
 /// has none.
@@ -52,7 +53,7 @@ void judgeNetwork(const std::vector<Interface>& all,
                   const std::optional<DefaultRoute>& route,
                   Findings& findings);
 
-/// Says so when no tunnel is up, although the tunnel client says that it is.
+/// Concludes from the interfaces of a device whose tunnel client runs and should have its tunnel up.
 void judgeMissingTunnel(const std::vector<Interface>& all, Findings& findings);
 
 }  // namespace pelorus::doctor

@@ -189,7 +189,7 @@ Rules testRules() {
     error("TavikClient::testPort[%d] - port check failed, retrying in %d seconds, url:  [%s]").keeps(Kept::PORT, 3).happens(LogEvent::TEST_RETRIED),
     error("TavikClient::testPort - port map check failed.").happens(LogEvent::TEST_FAILED),
     info("TavikClient::testPort - port map check success.").clears({Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT, Sign::LOGGED_OTHER_DEVICE}),
-    info("TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [%s]").keeps(Kept::TESTED),
+    info("TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [%s], start:").keeps(Kept::TESTED),
     error("TavikClient::testPort - Port test response Device ID '%s' is different")
         .happens(LogEvent::PORTS_LOST).sets(Sign::LOGGED_OTHER_DEVICE, "another device answered the port test"),
     error("TavikClient::testPort - Port test response contains empty request device ID")

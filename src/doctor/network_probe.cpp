@@ -45,8 +45,8 @@ void lookAtRelayNeeds(const Evidence& evidence, Findings& findings) {
         findings.problem("relay client: there is no device /dev/net/tun");
     }
     if (hasClient && hasDevice) findings.ok("relay client and /dev/net/tun are there");
-    const bool saysUp = evidence.has(Sign::TUNNEL_RUNS) && evidence.has(Sign::TUNNEL_SAYS_UP);
-    if (saysUp && evidence.statusWord == "relayed") judgeMissingTunnel(interfaces(), findings);
+    const bool needsTunnel = evidence.has(Sign::TUNNEL_RUNS) && evidence.statusWord == "relayed";
+    if (needsTunnel) judgeMissingTunnel(interfaces(), findings);
 }
 
 }  // namespace pelorus::doctor

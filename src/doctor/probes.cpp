@@ -90,7 +90,7 @@ LanHost lanGateway() {
     for (const Interface& one : interfaces()) {
         if (one.name != route->interface) continue;
         if (one.tunnel || route->gateway.empty()) return {};
-        return lanHost(route->gateway);
+        return lanHost(*route);
     }
     return {};
 }
@@ -110,7 +110,9 @@ public:
         if (name == "UPnP") {
             const LanHost gateway = lanGateway();
             judgeGateway(answer("UPnP"), answer("NAT-PMP"), gateway.addresses, findings);
-            if (gateway.isSilent) judgeSilentGateway(gateway.addresses.front(), findings);
+            if (gateway.isSilent) {
+                judgeSilentGateway(answer("UPnP"), answer("NAT-PMP"), gateway.addresses, findings);
+            }
             judgeUnfinishedTable(subject.found, findings);
         }
         if (name == "public address") {

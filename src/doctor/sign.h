@@ -49,8 +49,8 @@ enum class Sign {
     OUR_MAPPINGS_MISSING,     ///< the gateway, asked for a published port, does not map it to us
     NO_PORT_MAPPED,           ///< to us, of those that are published
     PORT_HELD_BY_OTHER,
-    WEB_SERVER_SILENT,  ///< on an internal port
-    NO_WEB_SERVER,      ///< on either of them
+    WEB_SERVER_SILENT,  ///< on the internal HTTP port
+    NO_WEB_SERVER,      ///< nor on that for HTTPS
     DISK_ACTIVE,        ///< by its own word
     BACK_END_ANSWERS,
     BACK_END_SILENT,
@@ -62,6 +62,7 @@ enum class Sign {
     NAMES_RIGHT,
     NAMES_LEAD_ELSEWHERE,
     NAMES_UNRESOLVED,
+    NO_TUNNEL_INTERFACE,   ///< is up, while the tunnel client runs
     RELAY_CLIENT_MISSING,  ///< no openvpn program
     TUNNEL_DEVICE_MISSING,
     SERVICE_SEES_SAME_ADDRESS,  ///< as the gateway says

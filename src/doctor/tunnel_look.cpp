@@ -42,6 +42,8 @@ constexpr Trouble kTroubles[] = {
     {"control message: AUTH_FAILED", Sign::TUNNEL_REFUSED},
     {"Cannot resolve host address:", Sign::RELAY_UNRESOLVED},
     {"VERIFY ERROR", Sign::RELAY_CERTIFICATE_BAD},
+    {"VERIFY KU ERROR", Sign::RELAY_CERTIFICATE_BAD},
+    {"VERIFY EKU ERROR", Sign::RELAY_CERTIFICATE_BAD},
     {"VERIFY X509NAME ERROR", Sign::RELAY_CERTIFICATE_BAD},
     {"Connection refused", Sign::TUNNEL_UNANSWERED},
     {"Connection timed out", Sign::TUNNEL_UNANSWERED},

@@ -15,6 +15,12 @@ constexpr std::chrono::seconds kConnectPatience{2};
 constexpr std::chrono::seconds kAnswerPatience{3};
 constexpr const char* kBackEndKey = "LOCAL_SETCOMMSTATUSURL";
 
+// Why nothing listens there; empty when something does.
+std::string obstacleAt(const std::string& address, int port) {
+    const TcpConnection connection{address, port, kConnectPatience};
+    return connection.connected() ? std::string{} : connection.obstacle();
+}
+
 void silent(Findings& findings, const std::string& text) {
     findings.add(Sign::BACK_END_SILENT, "the local back end " + text);
     findings.problem("local back end " + text);
@@ -27,25 +33,29 @@ void lookAtWebServer(const Evidence& evidence, Findings& findings) {
     const int https = scanInt(evidence.setting("INTERNAL_HTTPS_PORT").c_str()).value_or(443);
     const std::string lan = lanAddress();
     const std::string address = lan.empty() ? "127.0.0.1" : lan;
+    judgeWebServer(address, {http, obstacleAt(address, http)}, {https, obstacleAt(address, https)},
+                   findings);
+}
+
+void judgeWebServer(const std::string& address,
+                    const WebPort& http,
+                    const WebPort& https,
+                    Findings& findings) {
     std::string missing;
-    bool listens = false;
-    for (const int port : {http, https}) {
-        const TcpConnection connection{address, port, kConnectPatience};
-        if (connection.connected()) {
-            listens = true;
-            continue;
-        }
-        missing += (missing.empty() ? "" : ", ") + std::string{"port "} + std::to_string(port) +
-                   " of " + address + ": " + connection.obstacle();
+    for (const WebPort& port : {http, https}) {
+        if (port.obstacle.empty()) continue;
+        missing += (missing.empty() ? "" : ", ") + std::string{"port "} +
+                   std::to_string(port.number) + " of " + address + ": " + port.obstacle;
     }
     if (missing.empty()) {
-        findings.ok("web server listens on " + std::to_string(http) + " and " +
-                    std::to_string(https));
-    } else {
-        findings.add(Sign::WEB_SERVER_SILENT, "the web server does not listen, " + missing);
-        if (!listens) findings.add(Sign::NO_WEB_SERVER, "no web server listens");
-        findings.problem("web server: " + missing);
+        findings.ok("web server listens on " + std::to_string(http.number) + " and " +
+                    std::to_string(https.number));
+        return;
     }
+    findings.problem("web server: " + missing);
+    if (http.obstacle.empty()) return;
+    findings.add(Sign::WEB_SERVER_SILENT, "the web server does not listen, " + missing);
+    if (!https.obstacle.empty()) findings.add(Sign::NO_WEB_SERVER, "no web server listens");
 }
 
 void lookAtBackEnd(const Evidence& evidence, Findings& findings) {
@@ -66,8 +76,12 @@ void lookAtBackEnd(const Evidence& evidence, Findings& findings) {
     } else if (connection.answers("HEAD / HTTP/1.0\r\n\r\n", kAnswerPatience)) {
         findings.add(Sign::BACK_END_ANSWERS, "the local back end answers" + where);
         findings.ok("local back end answers" + where);
-    } else {
+    } else if (evidence.has(Sign::LOGGED_BACK_END_SILENT)) {
         silent(findings, "listens" + where + ", but does not answer");
+    } else {
+        // The daemon waits ten times as long for a busy device.
+        findings.notSeen("local back end: it listens" + where + ", but gave no answer within " +
+                         std::to_string(kAnswerPatience.count()) + " s");
     }
 }
 

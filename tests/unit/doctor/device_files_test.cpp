@@ -260,6 +260,8 @@ TEST(TunnelOutput, TheLastWordCounts) {
          "TLS Error: TLS handshake failed?"},
         {up + restarted + untrusted + failed + restarted, false, Sign::RELAY_CERTIFICATE_BAD,
          "VERIFY ERROR: depth=1, error=certificate is not yet valid"},
+        {"VERIFY KU ERROR\n" + restarted, false, Sign::RELAY_CERTIFICATE_BAD, "VERIFY KU ERROR"},
+        {"VERIFY EKU ERROR\n" + restarted, false, Sign::RELAY_CERTIFICATE_BAD, "VERIFY EKU ERROR"},
         {closed + unnamed + restarted, false, Sign::RELAY_UNRESOLVED,
          "RESOLVE: Cannot resolve host address: relay:1194"},
     };

@@ -57,6 +57,12 @@ const std::vector<Seen> kSeen{
      Reach::NOT_REACHED,
      "no-network",
      2},
+    {"no route in the usual table, but the service is reached",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::NO_DEFAULT_ROUTE, S::SERVICE_REACHED},
+     Reach::DIRECT,
+     "",
+     0},
     {"no address in the log",
      "failed",
      {S::DAEMON_RUNS, S::LOGGED_NO_ADDRESS},
@@ -137,10 +143,16 @@ const std::vector<Seen> kSeen{
      0},
     {"direct, but nothing answers, within or without",
      "portforwarded",
-     {S::DAEMON_RUNS, S::NO_GATEWAY_ANSWERS, S::SERVICE_UNREACHABLE, S::RELAY_CLIENT_MISSING},
+     {S::DAEMON_RUNS, S::NO_GATEWAY_ANSWERS, S::SERVICE_UNRESOLVED, S::RELAY_CLIENT_MISSING},
      Reach::NOT_REACHED,
-     "service-unreachable",
+     "service-unresolved",
      2},
+    {"direct, a deaf gateway, and the service is down",
+     "portforwarded",
+     {S::DAEMON_RUNS, S::NO_GATEWAY_ANSWERS, S::SERVICE_UNREACHABLE},
+     Reach::DIRECT,
+     "service-unreachable",
+     0},
     {"direct, but the mappings are gone, and the relay would fail",
      "portforwarded",
      {S::DAEMON_RUNS, S::OUR_MAPPINGS_MISSING, S::NO_PORT_MAPPED, S::RELAY_CLIENT_MISSING},
@@ -161,10 +173,29 @@ const std::vector<Seen> kSeen{
      1},
     {"direct by hand behind a shared address",
      "portforwarded",
-     {S::DAEMON_RUNS, S::MANUAL_MODE, S::GATEWAY_ADDRESS_SHARED, S::NO_WEB_SERVER},
+     {S::DAEMON_RUNS, S::MANUAL_MODE, S::GATEWAY_ADDRESS_SHARED, S::WEB_SERVER_SILENT,
+      S::NO_WEB_SERVER},
      Reach::DIRECT,
      "",
      0},
+    {"relayed by the client's word, but the tunnel is down",
+     "relayed",
+     {S::TUNNEL_RUNS, S::NO_TUNNEL_INTERFACE, S::TUNNEL_UNANSWERED, S::NO_GATEWAY_ANSWERS},
+     Reach::NOT_REACHED,
+     "relay-does-not-come-up",
+     2},
+    {"a tunnel that had trouble, and is up",
+     "relayed",
+     {S::TUNNEL_RUNS, S::NO_TUNNEL_INTERFACE, S::TUNNEL_UNANSWERED, S::TUNNEL_SAYS_UP},
+     Reach::RELAYED,
+     "",
+     1},
+    {"a tunnel in trouble whose interface was not looked at",
+     "relayed",
+     {S::TUNNEL_RUNS, S::TUNNEL_UNANSWERED},
+     Reach::RELAYED,
+     "",
+     1},
     {"credentials since the log",
      "",
      {S::DAEMON_RUNS, S::LOGGED_CREDENTIALS_MISSING, S::HAS_CREDENTIALS},
@@ -204,6 +235,14 @@ TEST(Diagnosis, NamesTheCauseThatTheSignsCarry) {
         EXPECT_EQ(firstCause(diagnosis), seen.cause) << seen.name;
         EXPECT_EQ(exitStatus(diagnosis), seen.status) << seen.name;
     }
+}
+
+TEST(Diagnosis, DoesNotDisproveWithoutTheSettingsWhatTheLogSays) {
+    Evidence evidence = evidenceOf({"", nullptr, {S::GATEWAY_ADDRESS_PRIVATE}, {}, "", 0});
+    evidence.history = {{Reach::DIRECT, {}, "203.0.113.7", ""}};
+    EXPECT_EQ(diagnose(evidence).reach, Reach::DIRECT);
+    evidence.unreadSettings.clear();
+    EXPECT_EQ(diagnose(evidence).reach, Reach::NOT_REACHED);
 }
 
 TEST(Diagnosis, BelievesTheGatewayThatHasTheAddressTheServiceSaw) {

@@ -130,6 +130,22 @@ TEST(Gateway, IsTheOneOfTheDefaultRoute) {
     }
 }
 
+TEST(Gateway, IsSilentUnlessItAnswers) {
+    const GatewayAnswer elsewhere{State::FOUND, "192.168.1.2", "44.128.0.20", true, ""};
+    const struct {
+        GatewayAnswer upnp, natpmp;
+        bool isSilent;
+    } rows[]{{kSilent, kSilent, true},
+             {elsewhere, kSilent, true},
+             {elsewhere, found("44.128.0.20"), false},
+             {kSilent, unusable("192.168.1.1"), false}};
+    for (const auto& row : rows) {
+        Findings findings;
+        judgeSilentGateway(row.upnp, row.natpmp, {"192.168.1.1"}, findings);
+        EXPECT_EQ(findings.has(Sign::GATEWAY_SILENT), row.isSilent) << &row - rows;
+    }
+}
+
 struct Table {
     std::string name;
     std::vector<TableEntry> entries;
@@ -163,6 +179,7 @@ const Table kTables[] = {
     {"Ours", {kOurs}, {http(kOurs), {9444, 443, true, kOursForHttps}}, {}},
     {"Lost", {kOursForHttps}, {http({})}, kAllLost},
     {"ListedOnly", {kOurs}, {http({})}, {}},
+    {"ListedOnlyAndByName", {kByName}, {http({})}, {}},
     {"OnlyHttpsLost", {}, {http(kOurs), {9444, 443, true, {}}}, {Sign::OUR_MAPPINGS_MISSING}},
     {"BothLost", {}, {http({}), {9444, 443, true, {}}}, kAllLost},
     {"OursToAnotherPort", {}, {http(kForHttpElsewhere)}, kAllLost},

@@ -86,6 +86,12 @@ TEST(LogRules, FindsValues) {
     ASSERT_NE(rule, nullptr);
     EXPECT_EQ(values[0], "203.0.113.9");
     EXPECT_EQ(values[1], "203.0.113.7");
+    rule = findLogRule(
+        "TavikClient::testPort - PORT TEST RESPONSE, GOT EXTERNAL IP: [203.0.113.7], start: [100], "
+        "end: [111]. ",
+        values);
+    ASSERT_NE(rule, nullptr);
+    EXPECT_EQ(values[0], "203.0.113.7");
     EXPECT_EQ(findLogRule("DaemonControl::run - sleep x secs.", values), nullptr);
     EXPECT_EQ(findLogRule("", values), nullptr);
 }

@@ -11,15 +11,22 @@
 #include "doctor/question_probe.h"
 #include "doctor/start_command.h"
 #include "doctor/url_host.h"
+#include "doctor/web_probe.h"
 
 namespace pelorus::doctor {
 
 namespace {
 
+std::vector<Sign> signsOf(const Findings& findings) {
+    std::vector<Sign> signs;
+    for (const auto& seen : findings.signs()) signs.push_back(seen.sign);
+    return signs;
+}
+
 // Nothing without a sign, or with several.
 std::optional<Sign> onlySign(const Findings& findings) {
-    if (findings.signs().size() != 1) return std::nullopt;
-    return findings.signs().front().sign;
+    const std::vector<Sign> signs = signsOf(findings);
+    return signs.size() == 1 ? std::optional{signs.front()} : std::nullopt;
 }
 
 std::string hostText(const std::string& url) {
@@ -90,20 +97,25 @@ TEST(LanHost, HasTheAddressesOfOneHardwareAddress) {
         "192.168.1.2      0x1         0x2         02:00:00:00:77:02     *        eth0\n"
         "192.168.1.254    0x1         0x2         02:00:00:00:77:01     *        eth0\n"
         "192.168.1.3      0x1         0x0         00:00:00:00:00:00     *        eth0\n"
-        "192.168.1.4      0x1         0x0         00:00:00:00:00:00     *        eth0\n";
+        "192.168.1.4      0x1         0x0         00:00:00:00:00:00     *        eth0\n"
+        "192.168.1.2      0x1         0x0         00:00:00:00:00:00     *        eth1\n"
+        "192.168.1.7      0x1         0x2         02:00:00:00:77:01     *        eth1\n";
     const struct {
+        const char* interface;
         std::string address;
         std::vector<std::string> others;
         bool isSilent;
-    } rows[]{{"192.168.1.1", {"192.168.1.254"}, false},
-             {"192.168.1.2", {}, false},
-             {"192.168.1.3", {}, true},
-             {"192.168.1.9", {}, false}};
+    } rows[]{{"eth0", "192.168.1.1", {"192.168.1.254"}, false},
+             {"eth0", "192.168.1.2", {}, false},
+             {"eth1", "192.168.1.2", {}, true},
+             {"eth0", "192.168.1.3", {}, true},
+             {"eth0", "192.168.1.9", {}, false}};
     for (const auto& row : rows) {
         std::vector<std::string> all{row.address};
         all.insert(all.end(), row.others.begin(), row.others.end());
-        EXPECT_EQ(readLanHost(table, row.address).addresses, all);
-        EXPECT_EQ(readLanHost(table, row.address).isSilent, row.isSilent) << row.address;
+        const LanHost host = readLanHost(table, {row.interface, row.address});
+        EXPECT_EQ(host.addresses, all);
+        EXPECT_EQ(host.isSilent, row.isSilent) << row.interface << " " << row.address;
     }
 }
 
@@ -133,9 +145,7 @@ TEST(Network, IsJudgedByItsFirstLack) {
             row.all,
             row.hasRoute ? std::optional{DefaultRoute{"eth0", "192.168.1.1"}} : std::nullopt,
             findings);
-        std::vector<Sign> signs;
-        for (const auto& seen : findings.signs()) signs.push_back(seen.sign);
-        EXPECT_EQ(signs, row.signs) << &row - rows;
+        EXPECT_EQ(signsOf(findings), row.signs) << &row - rows;
     }
 }
 
@@ -149,6 +159,30 @@ TEST(Tunnel, IsMissedWhileItsClientIsUp) {
         Findings findings;
         judgeMissingTunnel(all, findings);
         EXPECT_EQ(!findings.checks().empty(), isMissed);
+        EXPECT_EQ(findings.has(Sign::NO_TUNNEL_INTERFACE), isMissed);
+    }
+}
+
+// The service tests the HTTP port only.
+TEST(WebServer, IsSilentWhereTheServiceTestsIt) {
+    const struct {
+        const char *http, *https;  // why there is no connection
+        std::vector<Sign> signs;
+        const char* check;
+    } rows[]{
+        {"", "", {}, "web server listens on 80 and 443"},
+        {"", "refused", {}, "web server: port 443 of 192.168.1.5: refused"},
+        {"refused", "", {Sign::WEB_SERVER_SILENT}, "web server: port 80 of 192.168.1.5: refused"},
+        {"refused",
+         "no answer",
+         {Sign::WEB_SERVER_SILENT, Sign::NO_WEB_SERVER},
+         "web server: port 80 of 192.168.1.5: refused, port 443 of 192.168.1.5: no answer"}};
+    for (const auto& row : rows) {
+        Findings findings;
+        judgeWebServer("192.168.1.5", {80, row.http}, {443, row.https}, findings);
+        EXPECT_EQ(signsOf(findings), row.signs);
+        ASSERT_EQ(findings.checks().size(), 1U);
+        EXPECT_EQ(findings.checks()[0].text, row.check);
     }
 }
 

@@ -11,6 +11,7 @@
 #include "common/text.h"
 #include "doctor/address_class.h"
 #include "doctor/own_words.h"
+#include "doctor/quotations.h"
 #include "doctor/shown_text.h"
 #include "doctor/text_parts.h"
 
@@ -159,8 +160,6 @@ struct Place {
     std::string_view in{};  // the text has this part somewhere
 };
 
-constexpr std::string_view kTable = "gateway maps port ";
-
 constexpr std::array<Place, 27> kPlaces{{
     {"connect to ", " port ", "host", Ends::BEFORE},
     {"connect to ", ":", "host", Ends::BEFORE},
@@ -186,7 +185,7 @@ constexpr std::array<Place, 27> kPlaces{{
     {"/homes/", "", "user", Ends::IN_PATH},
     {"/Users/", "", "user", Ends::IN_PATH},
     {"\\Users\\", "", "user", Ends::IN_PATH},
-    {" leads to ", "", "host", Ends::AS_ITEM, "the port wanted for internal port "},
+    {" leads to ", "", "host", Ends::AS_ITEM, kPortWanted},
     {" to ", "", "host", Ends::AS_ITEM, kTable},
     {" (", ")", "name", Ends::AS_ITEM, kTable},
 }};

@@ -37,7 +37,11 @@ TEST(Masks, HideSecretsInEveryForm) {
          "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
         {"log", "relay", "gateway", "the gateway's log: logged (Relay), gateway.kavra.example",
-         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"}};
+         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"},
+        {"log", "relay", "home", "no answer from the service: relay, home <a>",
+         "no answer from the service: *AUTH_REMOVED*, *SUBDOMAIN_REMOVED* <a>"},
+        {"device", "", "web", "gateway maps port 80 to x (web), not this device's address",
+         "gateway maps port 80 to x (*SUBDOMAIN_REMOVED*), not this device's address"}};
     for (const Row& row : rows) {
         const Settings settings{
             {"DEVICEID", row.id}, {"DEVICEAUTH", row.auth}, {"SUBDOMAIN", row.subdomain}};

@@ -223,7 +223,8 @@ void LogSigns::failService(Time when) {
         set(Sign::LOGGED_SERVICE_UNREACHABLE, when, std::string{kNoConnection} + error);
     } else {
         set(Sign::LOGGED_SERVICE_SILENT, when,
-            error.empty() ? "no answer from the service" : std::string{kNoAnswer} + error);
+            error.empty() ? std::string{"no answer from the service"}
+                          : std::string{kNoAnswer} + error);
     }
 }
 

@@ -6,6 +6,7 @@
 
 #include "common/text.h"
 #include "doctor/address_class.h"
+#include "doctor/quotations.h"
 
 namespace pelorus::doctor {
 
@@ -192,8 +193,8 @@ void judgeOthers(const GatewayTable& table, Findings& findings) {
         append(held, std::to_string(entry.externalPort) + " to " + entry.client + name);
     }
     if (held.empty()) return;
-    findings.add(Sign::PORT_HELD_BY_OTHER, "the gateway maps port " + held);
-    const std::string line = "gateway maps port " + held + ", not this device's address";
+    findings.add(Sign::PORT_HELD_BY_OTHER, "the " + std::string{kTable} + held);
+    const std::string line = std::string{kTable} + held + std::string{kNotOurs};
     if (inTheWay) {
         findings.problem(line);
     } else {

@@ -158,7 +158,7 @@ Rules gatewayRules() {
     info("Router::mapPort() - success - external port: %d has been mapped").clears(kRefusals)
         .sets(Sign::LOGGED_PORT_OPENED, "port {1} was opened"),
     info("Router::mapPort() - internal port: %d is already mapped to another IP: %s").unless(Sign::LOGGED_PORT_OPENED)
-        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|the port wanted for internal port {1} leads to another device"),
+        .sets(Sign::LOGGED_PORT_HELD_BY_OTHER, "the port wanted for internal port {1} leads to {2}|another device has the port wanted for internal port {1}"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d, status: %d").unless(Sign::LOGGED_PORT_OPENED)
         .sets(Sign::LOGGED_GATEWAY_REFUSES, "the gateway refuses port {1} (UPnP error {3})"),
     info("Router::mapPort() - fail - failed to map external port: %d, to internal port: %d").unless(Sign::LOGGED_PORT_OPENED)

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "doctor/quotations.h"
 #include "doctor/reach_history.h"
 #include "doctor/shown_text.h"
 #include "doctor/text_parts.h"
@@ -178,8 +179,7 @@ bool LogSigns::takeTestAnswer(std::string_view answer, Time when) {
         return true;
     }
     if (!contains(answer, "<status>") && asked.empty() && seen.empty()) {
-        set(Sign::LOGGED_SERVICE_NONSENSE, when,
-            "the service's answer to a port test is not understood: " + shownText(answer));
+        set(Sign::LOGGED_SERVICE_NONSENSE, when, std::string{kNotUnderstood} + shownText(answer));
         return false;
     }
     if (!asked.empty()) value(Kept::GATEWAY) = asked;
@@ -218,13 +218,13 @@ void LogSigns::failService(Time when) {
     if (contains(error, "resolve")) {
         set(Sign::LOGGED_SERVICE_UNRESOLVED, when, "the service's name does not resolve");
     } else if (contains(error, "certificate") || contains(error, "CA cert")) {
-        set(Sign::LOGGED_SERVICE_CERTIFICATE, when,
-            "the service's certificate is not accepted: " + error);
+        set(Sign::LOGGED_SERVICE_CERTIFICATE, when, std::string{kNotAccepted} + error);
     } else if (contains(error, "connect to")) {
-        set(Sign::LOGGED_SERVICE_UNREACHABLE, when, "no connection to the service: " + error);
+        set(Sign::LOGGED_SERVICE_UNREACHABLE, when, std::string{kNoConnection} + error);
     } else {
         set(Sign::LOGGED_SERVICE_SILENT, when,
-            "no answer from the service" + (error.empty() ? "" : ": " + error));
+            error.empty() ? std::string{"no answer from the service"}
+                          : std::string{kNoAnswer} + error);
     }
 }
 

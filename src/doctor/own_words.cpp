@@ -6,6 +6,7 @@
 #include <string>
 
 #include "doctor/causes.h"
+#include "doctor/quotations.h"
 #include "doctor/text_parts.h"
 
 namespace pelorus::doctor {
@@ -56,6 +57,14 @@ const std::set<std::string>& ownWords() {
     return words;
 }
 
+bool isQuoted(std::string_view text, std::size_t at) {
+    if (endsWith(text, kNotOurs) && at + kNotOurs.size() > text.size()) return false;
+    return std::any_of(kQuotations.begin(), kQuotations.end(), [&](std::string_view beginning) {
+        const std::size_t found = text.find(beginning);
+        return found != text.npos && found + beginning.size() <= at;
+    });
+}
+
 // Behind the word there is only punctuation up to the next blank.
 bool goesOnAsSentence(std::string_view rest) {
     if (startsWith(rest, "'s")) rest.remove_prefix(2);
@@ -66,6 +75,7 @@ bool goesOnAsSentence(std::string_view rest) {
 }  // namespace
 
 bool isOwnWord(std::string_view text, std::size_t at, std::size_t length) {
+    if (isQuoted(text, at)) return false;
     std::size_t begin = at, end = at;
     while (begin > 0 && isLetter(text[begin - 1])) --begin;
     while (end < text.size() && isLetter(text[end])) ++end;

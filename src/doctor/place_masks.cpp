@@ -7,10 +7,12 @@
 #include <cctype>
 #include <functional>
 #include <optional>
+#include <sstream>
 
 #include "common/text.h"
 #include "doctor/address_class.h"
 #include "doctor/own_words.h"
+#include "doctor/quotations.h"
 #include "doctor/shown_text.h"
 #include "doctor/text_parts.h"
 
@@ -148,7 +150,7 @@ enum class Ends {
     AT,       // the text behind it, whatever the name holds
     AS_USER,  // the @ of a URL
     IN_PATH,  // what ends a part of a path
-    AS_ITEM,  // of a list: its client or what others call it
+    AS_ITEM,  // of a list: a part of a certificate's subject, a client or what others call it
 };
 
 // Where a name stands whatever it looks like.
@@ -159,9 +161,7 @@ struct Place {
     std::string_view in{};  // the text has this part somewhere
 };
 
-constexpr std::string_view kTable = "gateway maps port ";
-
-constexpr std::array<Place, 27> kPlaces{{
+constexpr std::array<Place, 31> kPlaces{{
     {"connect to ", " port ", "host", Ends::BEFORE},
     {"connect to ", ":", "host", Ends::BEFORE},
     {" via ", ":", "host", Ends::BEFORE},
@@ -178,7 +178,11 @@ constexpr std::array<Place, 27> kPlaces{{
     {"subject name (", ")", "host", Ends::AT},
     {"[", "] Inactivity timeout", "host", Ends::BEFORE},
     {"[", "] Peer Connection Initiated", "host", Ends::BEFORE},
-    {"CN=", "", "host"},
+    {"CN=", "", "host", Ends::AS_ITEM},
+    {"O=", "", "name", Ends::AS_ITEM},
+    {"OU=", "", "name", Ends::AS_ITEM},
+    {" L=", "", "name", Ends::AS_ITEM},
+    {", must be ", "", "host", Ends::AS_ITEM, "X509NAME ERROR: "},
     {"://", "@", "user", Ends::AS_USER},
     {"://", "", "host"},
     {"@", "", "host"},
@@ -186,7 +190,7 @@ constexpr std::array<Place, 27> kPlaces{{
     {"/homes/", "", "user", Ends::IN_PATH},
     {"/Users/", "", "user", Ends::IN_PATH},
     {"\\Users\\", "", "user", Ends::IN_PATH},
-    {" leads to ", "", "host", Ends::AS_ITEM, "the port wanted for internal port "},
+    {" leads to ", "", "host", Ends::AS_ITEM, kPortWanted},
     {" to ", "", "host", Ends::AS_ITEM, kTable},
     {" (", ")", "name", Ends::AS_ITEM, kTable},
 }};
@@ -200,11 +204,10 @@ std::size_t itemLength(const Place& place, std::string_view text) {
     }
     for (std::size_t end = text.find(')'); end != text.npos; end = text.find(')', end + 1)) {
         const std::string_view rest = text.substr(end + 1);
-        const bool isNext = startsWith(rest, ", ") && rest.size() > 2 &&
-                            (isDigit(rest[2]) || rest.substr(2) == "another device");
-        if (rest.empty() || isNext || startsWith(rest, "; ")) return end;
+        const bool isNext = startsWith(rest, ", ") && rest.size() > 2 && isDigit(rest[2]);
+        if (rest.empty() || isNext || rest == kNotOurs || startsWith(rest, "; ")) return end;
     }
-    return endsWith(text, kCut) ? text.size() : 0;
+    return text.size();
 }
 
 std::size_t userLength(std::string_view text) {
@@ -238,11 +241,8 @@ std::size_t namedLength(const Place& place, std::string_view text, std::size_t a
 // Length of the IPv6 address at a place of a word, 0 if there is none. A port may follow.
 std::size_t ipv6Length(std::string_view word, std::size_t at) {
     const std::string_view rest = word.substr(at);
-    const auto* const end = std::find_if_not(rest.begin(), rest.end(), [](char letter) {
-        return isOneOf(letter, ".:") || isHex(letter);
-    });
-    constexpr std::size_t kLongest = INET6_ADDRSTRLEN;
-    auto length = std::min(static_cast<std::size_t>(end - rest.begin()), kLongest);
+    const std::size_t end = rest.find_first_not_of("0123456789abcdefABCDEF.:");
+    std::size_t length = std::min({end, rest.size(), std::size_t{INET6_ADDRSTRLEN}});
     for (; length > 1; --length) {
         const bool isWhole = length == rest.size() || !isLetterOrDigit(rest[length]);
         if (isWhole && ipv6(rest.substr(0, length))) return length;
@@ -252,8 +252,7 @@ std::size_t ipv6Length(std::string_view word, std::size_t at) {
 
 // Too little for a mask, but the beginning of an address.
 bool isBeginning(std::string_view text) {
-    constexpr std::size_t kGroup = 4;
-    return text.size() <= kGroup && std::all_of(text.begin(), text.end(), isHex) &&
+    return text.size() <= 4 && std::all_of(text.begin(), text.end(), isHex) &&
            std::any_of(text.begin(), text.end(), isDigit);
 }
 
@@ -261,18 +260,27 @@ bool isBeginning(std::string_view text) {
 
 PlaceMasks::PlaceMasks(const std::vector<std::string>& hosts, std::vector<std::string> logs)
     : logPaths{std::move(logs)} {
-    for (const std::string& host : hosts) {
-        const std::string name = lowerCase(host);
-        known.insert(name);
-        known.insert(name.substr(0, name.find('.')));
+    for (const std::string& host : hosts) learn(lowerCase(host));
+    known.erase("localhost");
+}
+
+// What no word has stands between names; an address is found without being known.
+void PlaceMasks::learn(const std::string& host) {
+    if (ipv4Length(host, 0) != host.size()) known.insert(host);
+    std::string names = host;
+    std::replace_if(names.begin(), names.end(), std::not_fn(isWordLetter), ' ');
+    std::istringstream stream{names};
+    for (std::string name; stream >> name;) {
+        for (const std::string& part : {name, name.substr(0, name.find('.'))}) {
+            if (part.size() > 2 && std::any_of(part.begin(), part.end(), isLetter))
+                known.insert(part);
+        }
     }
-    for (const char* quiet : {"", "localhost"}) known.erase(quiet);
 }
 
 std::string PlaceMasks::hide(std::string text) {
     for (const std::string& path : logPaths) {
-        const std::string name = path.substr(path.rfind('/') + 1);
-        if (name != path) replaceAll(text, shownText(path, 100), name);
+        replaceAll(text, shownText(path, 100), shownText(path.substr(path.rfind('/') + 1), 100));
     }
     std::string result;
     for (std::size_t at = 0; at < text.size();) {
@@ -330,17 +338,15 @@ std::string PlaceMasks::hideWord(std::string_view word) {
     }
     if (isOneOf(word.front(), ".-")) return word.front() + hideWord(word.substr(1));
     const std::string name = lowerCase(word.substr(0, word.find(':')));
-    if (isHost(name)) return replacement("host", name) + hideParts(word.substr(name.size()));
-    return hideParts(word);
+    const bool isHost = known.count(name) != 0 || looksLikeName(name);
+    return isHost ? replacement("host", name) + hideParts(word.substr(name.size()))
+                  : hideParts(word);
 }
 
 // What is left of an address or a name would be told.
 std::string PlaceMasks::hideCut(std::string_view left) {
     constexpr std::size_t kLeastOfHost = 3;
-    const auto isLost = [](char letter) { return isOneOf(letter, ".:"); };
-    if (std::any_of(left.begin(), left.end(), isLost) || isBeginning(left)) {
-        return std::string{kCut};
-    }
+    if (left.find_first_of(".:") != left.npos || isBeginning(left)) return std::string{kCut};
     const std::string name = lowerCase(left);
     const auto host = known.lower_bound(name);
     const bool isPart =
@@ -398,10 +404,6 @@ bool PlaceMasks::hidesAround(std::string_view text, std::size_t at, std::size_t 
     PlaceMasks trial = *this;
     const std::string hidden = lowerCase(trial.hideWord(text.substr(begin, end - begin)));
     return hidden.find(lowerCase(part)) == hidden.npos;
-}
-
-bool PlaceMasks::isHost(const std::string& name) const {
-    return known.count(name) != 0 || looksLikeName(name);
 }
 
 std::string PlaceMasks::replacement(const std::string& kind, const std::string& place) {

@@ -15,7 +15,7 @@ namespace pelorus::doctor {
 /// DEVICEAUTH and SUBDOMAIN, also as URLs, XML and JSON encode them and cut off by three dots, and
 /// those of other devices where URLs, answers and public names show them. A value of less than three
 /// characters stays: it is part of too many words. So does one that reads as a word of the doctor's
-/// own sentences, where it stands in one.
+/// own sentences, where it stands in one and not in what that repeats of others.
 class SecretMasks {
 public:
     /// With the values that @p settings give these keys, the first 1000 of each; other keys are

@@ -15,6 +15,7 @@
 #include "common/files.h"
 #include "common/text.h"
 #include "doctor/age.h"
+#include "doctor/quotations.h"
 #include "doctor/shown_text.h"
 #include "doctor/write_obstacle.h"
 
@@ -200,8 +201,7 @@ private:
         } else if (said.trouble == Sign::TUNNEL_REFUSED) {
             blame(Sign::TUNNEL_REFUSED, "the relay refuses the device's credentials" + written);
         } else if (said.trouble) {
-            blame(*said.trouble,
-                  "the tunnel client does not get through to the relay: " + said.line + written);
+            blame(*said.trouble, std::string{kNoTunnel} + said.line + written);
         }
     }
 

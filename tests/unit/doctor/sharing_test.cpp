@@ -37,7 +37,11 @@ TEST(Masks, HideSecretsInEveryForm) {
          "cut at *AUTH_REMOVED*... and *AUTH_REMOVED*..."},
         {"", "s3cretword", "", "s3c... s3c", "s3c... s3c"},
         {"log", "relay", "gateway", "the gateway's log: logged (Relay), gateway.kavra.example",
-         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"}};
+         "the gateway's log: logged (Relay), *SUBDOMAIN_REMOVED*.kavra.example"},
+        {"log", "relay", "home", "no answer from the service: relay, home <a>",
+         "no answer from the service: *AUTH_REMOVED*, *SUBDOMAIN_REMOVED* <a>"},
+        {"device", "", "web", "gateway maps port 80 to x (web), not this device's address",
+         "gateway maps port 80 to x (*SUBDOMAIN_REMOVED*), not this device's address"}};
     for (const Row& row : rows) {
         const Settings settings{
             {"DEVICEID", row.id}, {"DEVICEAUTH", row.auth}, {"SUBDOMAIN", row.subdomain}};
@@ -79,6 +83,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"52:54:00:aB:cd:ef 52-54-00-AB-CD-EF 525400abcdef 525400123456", "mac-1 mac-1 mac-1 525400123456"},
         {"cut at 203.0.1... cut at cloud.kavra.ex... cut...", "cut at ... cut at ... cut..."},
         {"NAS NAS.Local nasty", "host-1 host-2 nasty"},
+        {"on 2026-11-10 10:00 10.0.0.5, ANNAS-nas/relay1, m??llers/lan4", "on 2026-11-10 10:00 private-address-1, host-1/host-2, m??host-3/host-4"},
         {"cloud.kavra.example. *.kavra.example .kavra.example", "host-1. host-2 .host-3"},
         {"nas-device*ID_REMOVED*.kavra.example", "host-1"},
         {"7.113.0.203.in-addr.arpa", "host-1"},
@@ -92,7 +97,7 @@ TEST(Masks, HidePlacesForSharing) {
         {"CONNECT to box7: Failed to connect to box7:443 via proxy7:3128", "CONNECT to host-1: Failed to connect to host-1:443 via host-2:3128"},
         {"my-nas_lan eth0_my-nas my-n... na... '203... 2003...", "host-1_lan eth0_host-1 host-1... na... '... ..."},
         {"the port wanted for internal port 443 leads to Annas-MacBook", "the port wanted for internal port 443 leads to host-1"},
-        {"gateway maps port 80 to Anna's PC (Anna (Mac) Schmidt), 443 to 192.168.1.5 (b), another device", "gateway maps port 80 to host-1 (name-1), 443 to private-address-1 (name-2), another device"},
+        {"gateway maps port 80 to Anna's PC (Anna (Mac) Schmidt), 443 to 192.168.1.5 (b), not this device's address", "gateway maps port 80 to host-1 (name-1), 443 to private-address-1 (name-2), not this device's address"},
         {"Failed to connect to box7 port 443 via proxy7 after 3 ms", "Failed to connect to host-1 port 443 via host-2 after 3 ms"},
         {"Couldn't connect to server", "Couldn't connect to server"},
         {"Failed to connect to longb...", "Failed to connect to host-1..."},
@@ -102,8 +107,10 @@ TEST(Masks, HidePlacesForSharing) {
         {"SSL: certificate subject name (box) does not match target hostname 'Box'", "SSL: certificate subject name (host-1) does not match target hostname 'host-1'"},
         {"subject name matches target host name 'cloud.kavra.exa...", "subject name matches target host name 'host-1..."},
         {"reset by peer in connection to box:443", "reset by peer in connection to host-1:443"},
-        {"depth=0: CN=relay3, O=x", "depth=0: CN=host-1, O=x"},
+        {"depth=0: C=DE, L=Jena, O=Anna GmbH, OU=IT, CN=Annas CA 1, emailAddress=a@b.de", "depth=0: C=DE, L=name-1, O=name-2, OU=name-3, CN=host-1, emailAddress=user-1@host-2"},
+        {"VERIFY X509NAME ERROR: CN=relay7, must be relay8 (3 s ago)", "VERIFY X509NAME ERROR: CN=host-1, must be host-2 (3 s ago)"},
         {"the gateway maps port 80 to 192.168.1.5 (Alice's 10.0.0.1)", "the gateway maps port 80 to private-address-1 (name-1)"},
+        {"the gateway maps port 80 to 192.168.1.5 (Alice's), not this", "the gateway maps port 80 to private-address-1 (name-1"},
         {R"(/home/alice/x.ini and /volume1/homes/b?b+1: C:\Users\Alice\x)", R"(/home/user-1/x.ini and /volume1/homes/user-2: C:\Users\user-1\x)"},
         {"annas.nas2:5000 annas.nas-2 TLSv1.3 x.bz2", "host-1:5000 host-2 TLSv1.3 x.bz2"},
         {"The gateway, its gateway.lan: resolve host: gateway", "The gateway, its host-1: resolve host: host-2"},
@@ -113,7 +120,8 @@ TEST(Masks, HidePlacesForSharing) {
         {"LOCAL_... URLs: e.g. 2.5 s . :", "LOCAL_... URLs: e.g. 2.5 s . :"}};
     // clang-format on
     for (const auto& [text, masked] : rows) {
-        const PlaceMasks places{{"nas", "my-nas", "gateway", "localhost", ""},
+        const PlaceMasks places{{"nas", "my-nas", "gateway", "localhost", "", "10.0.0.5",
+                                 "annas-nas/relay1", "m\xC3\xBCllers/lan4", "11.lan", "[2026"},
                                 {"/srv/box/syslog.1.gz", "-"}};
         EXPECT_EQ((Masks{Settings{}, places}.hide(text)), masked);
     }

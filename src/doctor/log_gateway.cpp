@@ -15,8 +15,6 @@ constexpr std::string_view kAddress = "external_ip=";
 constexpr std::string_view kNoUpnp = "no gateway answers UPnP";
 // A relayed device searches in every cycle, unless its disk sleeps.
 constexpr auto kLongestSearch = 2h;
-// Between two tests of a published port there is more.
-constexpr auto kTestInterval = 240s;
 
 }  // namespace
 
@@ -53,10 +51,6 @@ void LogGateway::take(LogEvent event, Time when, LogSigns& signs) {
         case LogEvent::TEST_FAILED:
         case LogEvent::TEST_UNANSWERED:
             concludeFromTest(when, signs);
-            break;
-        case LogEvent::PUBLISHED:
-        case LogEvent::PUBLISHING_FAILED:
-            endSearch();
             break;
         case LogEvent::RELAY_STARTS:
             concludeFromRelay(when, signs);
@@ -97,14 +91,9 @@ void LogGateway::concludeFromRelay(Time when, LogSigns& signs) {
     }
     tested = mayBePublished = false;
     retest = Retest::NONE;
-    endSearch();
 }
 
-void LogGateway::passTest(Time when) {
-    if (!isSearchRepeated()) {
-        hurried = lastPass && when - *lastPass <= kTestInterval ? hurried + 1 : 0;
-    }
-    lastPass = when;
+void LogGateway::passTest() {
     tested = true;
     retest = Retest::NONE;
 }
@@ -132,7 +121,7 @@ bool LogGateway::isInDoubt(Time now) const {
 }
 
 void LogGateway::correct(const LogClock::Correction& correction) {
-    for (std::optional<Time>* const time : {&lastPass, &lastTest, &lastSilence}) {
+    for (std::optional<Time>* const time : {&lastTest, &lastSilence}) {
         if (*time) *time = correction.of(**time);
     }
 }

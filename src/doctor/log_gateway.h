@@ -33,11 +33,7 @@ public:
     void takeTestUrl(std::string_view url);
 
     /// A port passed its test.
-    void passTest(Time when);
-
-    /// Ports pass their test more often than published ones are tested: a step of the search fails
-    /// after that.
-    [[nodiscard]] bool isSearchRepeated() const { return hurried > 2; }
+    void passTest();
 
     [[nodiscard]] bool isByHand() const { return ports == Ports::MANUAL; }
 
@@ -54,17 +50,14 @@ private:
     // The test of a port that was published, and the search after its failure.
     enum class Retest { NONE, FAILED, DISCOVERING, SEARCHED };
 
-    void endSearch() { hurried = 0; }
     void takeSilence(Time when, LogSigns& signs);
     void concludeFromTest(Time when, LogSigns& signs);
     void concludeFromRelay(Time when, LogSigns& signs);
 
     Ports ports;
     Retest retest = Retest::NONE;
-    std::optional<Time> lastPass;
     std::optional<Time> lastTest;     // of a port, or the last attempt to map one
     std::optional<Time> lastSilence;  // of UPnP
-    int hurried = 0;  // passes in a row, sooner than a published port is tested again
     bool progress = false;
     bool natpmp = false;         // the gateway speaks it, as far as the log tells
     bool guessed = false;        // only because a port was tested, maybe one forwarded by hand

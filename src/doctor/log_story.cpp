@@ -350,13 +350,8 @@ void LogStory::takeStatus(std::string_view word, Time when) {
 
 void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     if (!signs.takeTestAnswer(answer, when)) return;
-    gateway.passTest(when);
-    if (gateway.isSearchRepeated() && !progress) {
-        passed.reset();
-        history.withdraw();
-    } else if (!passed) {
-        passed = when;
-    }
+    gateway.passTest();
+    if (!passed) passed = when;
 }
 
 // The direct path does not work. A tunnel that stands, or may stand, is not touched by that.
@@ -417,11 +412,6 @@ void LogStory::endInSilence(const Evidence& evidence) {
 }
 
 void LogStory::tellDoubts(Evidence& evidence) const {
-    if (gateway.isSearchRepeated() && evidence.history.empty()) {
-        evidence.untold.emplace_back(
-            "how it is reached: a port passes its test again and again, but is not published, so a "
-            "later step fails that is not logged; run the daemon with -l 6");
-    }
     if (!evidence.fromElsewhere || !evidence.has(Sign::LOGGED_TEST_FAILED)) return;
     if (gateway.isInDoubt(evidence.now)) {
         evidence.signs.erase(Sign::LOGGED_TEST_FAILED);

@@ -129,6 +129,10 @@ void LogStory::becomePending() {
     pending.reset();
     signs.clear(change.reach == Reach::DIRECT ? kDirectSigns : kRelayedSigns);
     become(change.reach, change.since, std::string{kPassed});
+    if (change.reach == Reach::DIRECT) signs.forgetReason();
+    if (tornFrom == Reach::UNKNOWN || tornFrom == change.reach) return;
+    signs.expectLook(change.since);
+    tornFrom = Reach::UNKNOWN;
 }
 
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
@@ -240,8 +244,7 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
             if (history.reach() != Reach::RELAYED) lose(when);
             break;
         case LogEvent::ADDRESS_LOST:
-            tornDown = true;
-            lose(when);
+            tearDown(when);
             break;
         case LogEvent::TUNNEL_DIED:
             if (history.reach() != Reach::RELAYED) break;
@@ -268,6 +271,13 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
         default:
             break;
     }
+}
+
+void LogStory::tearDown(Time when) {
+    const Reach reach = history.reach();
+    if (reach == Reach::DIRECT || reach == Reach::RELAYED) tornFrom = reach;
+    tornDown = true;
+    lose(when);
 }
 
 void LogStory::start(Time when) {

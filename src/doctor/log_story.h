@@ -58,6 +58,7 @@ private:
     void tellDoubts(Evidence& evidence) const;
     void settlePending(std::string_view text, Time when);
     void becomePending();
+    void tearDown(Time when);
     [[nodiscard]] bool isPending(Reach reach) const { return pending && pending->reach == reach; }
     void apply(const LogRule& rule, Time when, const LogValues& values);
     void happen(LogEvent event, Time when, const LogValues& values);
@@ -94,6 +95,7 @@ private:
     bool silent = false;
     bool orphan = false;    // an earlier daemon ended suddenly and may have left its tunnel
     bool tornDown = false;  // no connection of this cycle's beginning is left
+    Reach tornFrom = Reach::UNKNOWN;  // how it was reached before the names, or the address, failed
     int startCount = 0;
 };
 

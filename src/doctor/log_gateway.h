@@ -37,11 +37,9 @@ public:
 
     [[nodiscard]] bool isByHand() const { return ports == Ports::MANUAL; }
 
-    /// Nothing tells whether the port that was tested last was opened through NAT-PMP or by hand.
-    [[nodiscard]] bool isOriginUnknown() const;
-
-    /// Nothing tells at @p now whether the gateway still speaks NAT-PMP.
-    [[nodiscard]] bool isInDoubt(Time now) const;
+    /// Takes what may be over, or may have another cause, from the signs of a log from elsewhere, and
+    /// says so.
+    void tellDoubts(Evidence& evidence) const;
 
     /// The clock was wrong.
     void correct(const LogClock::Correction& correction);
@@ -51,8 +49,11 @@ private:
     enum class Retest { NONE, FAILED, DISCOVERING, SEARCHED };
 
     void takeSilence(Time when, LogSigns& signs);
+    void takeRefusal(Time when, LogSigns& signs);
     void concludeFromTest(Time when, LogSigns& signs);
     void concludeFromRelay(Time when, LogSigns& signs);
+    [[nodiscard]] bool isOriginUnknown() const;
+    [[nodiscard]] bool isInDoubt(Time now) const;
 
     Ports ports;
     Retest retest = Retest::NONE;
@@ -62,7 +63,7 @@ private:
     bool natpmp = false;         // the gateway speaks it, as far as the log tells
     bool guessed = false;        // only because a port was tested, maybe one forwarded by hand
     bool tested = false;         // a port passed, and the relay was not used since
-    bool mayBePublished = true;  // before the log began
+    bool mayBePublished = true;  // before the log began, and not tested since
 };
 
 }  // namespace pelorus::doctor

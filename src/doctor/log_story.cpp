@@ -421,22 +421,6 @@ void LogStory::endInSilence(const Evidence& evidence) {
     signs.forget();
 }
 
-void LogStory::tellDoubts(Evidence& evidence) const {
-    if (!evidence.fromElsewhere || !evidence.has(Sign::LOGGED_TEST_FAILED)) return;
-    if (gateway.isInDoubt(evidence.now)) {
-        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
-        evidence.untold.emplace_back(
-            "whether the gateway still speaks NAT-PMP: UPnP is silent, and no port has been tested "
-            "for hours, so there is no gateway any more, or the disk sleeps; run the daemon with -l "
-            "6");
-    } else if (gateway.isOriginUnknown()) {
-        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
-        evidence.untold.emplace_back(
-            "why the port test fails: the log does not tell whether the ports are opened through "
-            "NAT-PMP, and filtered, or were forwarded by hand; run the daemon with -l 6");
-    }
-}
-
 void LogStory::finish(Evidence& evidence) {
     if (passed) assume(Reach::DIRECT);
     // A log from elsewhere ends with the record if all went well.
@@ -469,7 +453,7 @@ void LogStory::finish(Evidence& evidence) {
         evidence.add(Sign::MANUAL_MODE, Source::LOG, "the ports are forwarded by hand");
     }
     evidence.history.assign(history.periods().begin(), history.periods().end());
-    tellDoubts(evidence);
+    if (evidence.fromElsewhere) gateway.tellDoubts(evidence);
     if (history.dropped() > 0) {
         evidence.untold.push_back(
             "the history before its last " + std::to_string(evidence.history.size()) +

@@ -55,7 +55,6 @@ private:
     void takeText(std::string_view text, Time when);
     void settleTest(Time when);
     void endInSilence(const Evidence& evidence);
-    void tellDoubts(Evidence& evidence) const;
     void settlePending(std::string_view text, Time when);
     void becomePending();
     void tearDown(Time when);

@@ -22,6 +22,10 @@ using namespace std::chrono_literals;
 constexpr auto kPublishTime = 2min;
 // A device that is reached directly logs its tests, unless its disk sleeps.
 constexpr auto kSilence = 1h;
+// Between two cycles, both of which log something.
+constexpr auto kLongestPause = 10min;
+// Comes before the first line of a start.
+constexpr std::string_view kStartRule = "===";
 
 // What a published port disproves.
 const std::vector<Sign> kDirectSigns{Sign::LOGGED_ATTEMPT,
@@ -80,14 +84,17 @@ void LogStory::take(const LogLine& line) {
 void LogStory::takeText(std::string_view text, Time when) {
     LogValues values;
     const LogRule* const rule = findLogRule(text, values);
-    const bool isOfNextRun = rule != nullptr && rule->event == LogEvent::COPY_MISSING;
+    const bool isOfNextRun =
+        rule != nullptr ? rule->event == LogEvent::COPY_MISSING : startsWith(text, kStartRule);
     const bool wasAnnounced = std::exchange(announced, false);
     if (rule == nullptr) {
-        announced = wasAnnounced && startsWith(text, "===");
+        announced = wasAnnounced && isOfNextRun;
     } else if (rule->event != LogEvent::STARTED || !wasAnnounced) {
         apply(*rule, when, values);
     }
-    if (!isOfNextRun) lastOfRun = when;
+    if (isOfNextRun) return;
+    if (!lastOfRun || when - *lastOfRun > kLongestPause) steadySince = when;
+    lastOfRun = when;
 }
 
 Time LogStory::timeOf(const LogLine& line) {
@@ -98,7 +105,8 @@ Time LogStory::timeOf(const LogLine& line) {
 
 void LogStory::correct(const LogClock::Correction& correction) {
     gateway.correct(correction);
-    for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
+    for (std::optional<Time>* const time :
+         {&firstLine, &lastLine, &lastOfRun, &steadySince, &since, &passed}) {
         if (*time) *time = correction.of(**time);
     }
     if (pending) pending->since = correction.of(pending->since);
@@ -120,7 +128,7 @@ void LogStory::settlePending(std::string_view text, Time when) {
         (pending->reach == Reach::RELAYED && startsWith(text, kTunnel)) ||
         std::any_of(kUndecided.begin(), kUndecided.end(),
                     [text](std::string_view beginning) { return startsWith(text, beginning); });
-    const bool starts = startsWith(text, "main -") || startsWith(text, "===");
+    const bool starts = startsWith(text, "main -") || startsWith(text, kStartRule);
     if (when - pending->since > kAttemptTime || !(undecided || starts)) becomePending();
 }
 
@@ -301,10 +309,12 @@ void LogStory::start(Time when) {
     signs.set(Sign::LOGGED_ATTEMPT, when, "the daemon started, with no result yet");
 }
 
-// Without progress a relayed run is silent for days.
+// Without progress a relayed run is silent for days, unless its searches fail in a way that is logged.
 void LogStory::endSuddenly(Time when) {
-    const bool isDirect = history.reach() == Reach::DIRECT;
-    if (isDirect && !progress && when - *lastOfRun > kSilence) {
+    const bool isTalkative =
+        history.reach() == Reach::DIRECT || *lastOfRun - *steadySince > kSilence;
+    const bool isDark = clock.isLost() || when - *lastOfRun > kSilence;
+    if (isTalkative && isDark && !progress) {
         history.add({Reach::UNKNOWN, *lastOfRun, "", std::string{kSilent}});
     } else {
         become(Reach::NOT_RUNNING, progress ? *lastOfRun : when, "the daemon ended suddenly");

@@ -290,14 +290,17 @@ std::optional<LogLine> readLogLine(std::string_view line, Time now) {
     const auto stamp = takeAnyStamp(line, now);
     if (!stamp) return std::nullopt;
     std::string_view host;
+    const auto found = [&](std::string_view text) {
+        return LogLine{stamp->when, withoutRepetition(withoutEnd(text)), host, isYearKnown,
+                       stamp->isTwice};
+    };
     for (int words = 0; words < kMostWords; ++words) {
         const std::size_t end = line.find(' ');
         const std::string_view word = line.substr(0, end);
         line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
-        const bool hasHeader = isVersioned && words == 1 && isDaemon(std::string{word} + ":");
-        if (hasHeader || isDaemon(word)) {
-            const std::string_view text = withoutEnd(hasHeader ? withoutHeader(line) : line);
-            return LogLine{stamp->when, withoutRepetition(text), host, isYearKnown, stamp->isTwice};
+        if (isDaemon(word)) return found(line);
+        if (isVersioned && words == 1 && isDaemon(std::string{word} + ":")) {
+            return found(withoutHeader(line));
         }
         if (words == 0) host = word;
         if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;

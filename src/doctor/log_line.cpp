@@ -211,7 +211,7 @@ bool skipPriority(std::string_view& line) {
     return isVersioned;
 }
 
-// Process, message and data: they stand between the program and the text in RFC 5424.
+// Skips process, message id and structured data: RFC 5424 has them between program and text.
 std::string_view withoutHeader(std::string_view rest) {
     for (const bool isData : {false, false, true}) {
         const std::string_view end = isData && rest.substr(0, 1) == "[" ? "] " : " ";

@@ -292,9 +292,9 @@ std::map<Sign, Fact> LogSigns::lasting(Time now, bool byHand) const {
 
 bool LogSigns::isReplaced(Sign sign, bool byHand) const {
     const auto isLater = [&](Sign other) { return has(other) && isEarlier(sign, other); };
-    const bool mayBe =
+    const bool isReplaceable =
         isOutcome(sign) || isAmong(kServiceSigns, sign) || sign == Sign::LOGGED_TEST_SKIPPED_DISK;
-    if (!mayBe) return false;
+    if (!isReplaceable) return false;
     return std::any_of(kTestOutcomes.begin(), kTestOutcomes.end(), isLater) ||
            (!byHand && std::any_of(kGatewayOutcomes.begin(), kGatewayOutcomes.end(), isLater));
 }
@@ -305,6 +305,7 @@ bool LogSigns::isEarlier(Sign sign, Sign later) const {
     return *signs.at(later).when - *signs.at(sign).when > kAttemptTime;
 }
 
+// The names have been looked at since, and nothing was logged.
 bool LogSigns::isNameRight(Sign sign, Time when, Time now) const {
     return isAmong(kEachDay, sign) && lookExpected && when <= *lookExpected &&
            now - *lookExpected > kLongestSearch;

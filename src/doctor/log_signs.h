@@ -15,7 +15,7 @@
 
 namespace pelorus::doctor {
 
-/// One way in which an attempt at the direct way ends.
+/// Whether @p sign says how an attempt at the direct way ended.
 bool isOutcome(Sign sign);
 
 /// The signs of the LOGGED_... kind, each with the time of the last line that showed it, the values
@@ -67,7 +67,7 @@ public:
     /// @p sign is the reason from now on, whatever was it before.
     void blame(Sign sign);
 
-    /// The next cycle looks at the names; only what is wrong with them is sure to be logged.
+    /// From @p when on, the next cycle looks at the names. A failure is logged at every severity.
     void expectLook(Time when) { lookExpected = when; }
 
     /// The relay failed too. It is the reason where a relay would have been the way out.

@@ -85,7 +85,7 @@ private:
     LogGateway gateway;
     std::optional<Time> firstLine, lastLine, since, pauseBegin, nextCycle;
     std::optional<Time> lastOfRun;    // the last line, but for those that precede a start
-    std::optional<Time> steadySince;  // no longer pause up to then
+    std::optional<Time> steadySince;  // no long pause from here to lastOfRun
     std::optional<Time> passed;       // a port, in a log that has not told yet how it was before
     int level = kLeastLevel;
     bool announced = false;  // the last line was a start's first one

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <utility>
 
+#include "doctor/log_signs.h"
+
 namespace pelorus::doctor {
 
 namespace {
@@ -396,6 +398,15 @@ const std::vector<Sign>* carriedBy(const Cause& cause, const Evidence& evidence)
     return nullptr;
 }
 
+// What an attempt ended with comes before a look at the names that is older: up to a day.
+bool isOvertaken(Sign sign, const Evidence& evidence) {
+    if (sign != S::LOGGED_NAMES_LEAD_ELSEWHERE && sign != S::LOGGED_NAMES_UNRESOLVED) return false;
+    const auto looked = evidence.signs.at(sign).when;
+    return std::any_of(evidence.signs.begin(), evidence.signs.end(), [&](const auto& seen) {
+        return isOutcome(seen.first) && seen.second.when > looked;
+    });
+}
+
 }  // namespace
 
 const std::vector<Cause>& allCauses() {
@@ -404,15 +415,16 @@ const std::vector<Cause>& allCauses() {
 }
 
 std::vector<NamedCause> findCauses(const Evidence& evidence, Reach reach) {
-    std::vector<NamedCause> found;
+    std::vector<NamedCause> found, overtaken;
     for (const Cause& cause : allCauses()) {
         if (!isAmong(cause.when, reach)) continue;
         const std::vector<Sign>* const signs = carriedBy(cause, evidence);
         if (signs == nullptr) continue;
         NamedCause named{&cause, {}};
         for (const Sign sign : *signs) named.proofs.push_back(evidence.signs.at(sign));
-        found.push_back(std::move(named));
+        (isOvertaken(signs->front(), evidence) ? overtaken : found).push_back(std::move(named));
     }
+    found.insert(found.end(), overtaken.begin(), overtaken.end());
     return found;
 }
 

@@ -151,7 +151,8 @@ void summarise(const LogStory& story, int unstamped, Evidence& evidence) {
                   evidence);
     }
     if (!story.end()) {
-        if (unstamped == 0) cannotSee("log: it has no line of the daemon", evidence);
+        if (unstamped > 0) return;
+        cannotSee("log: it has no line of the daemon", evidence);
         evidence.untold.push_back("how it was before: no log of the daemon was found; " + more);
         return;
     }

@@ -26,6 +26,9 @@ public:
     /// `correction` is set if earlier times were wrong.
     Time take(const LogLine& line, std::optional<Time> start);
 
+    /// The machine was restarted, and its clock is not set yet.
+    [[nodiscard]] bool isLost() const { return lostSince.has_value(); }
+
     std::optional<Correction> correction;  ///< of the last take()
     int jumps = 0;                         ///< how often the clock was set, or lost
 

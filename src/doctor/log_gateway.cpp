@@ -1,5 +1,6 @@
 #include "doctor/log_gateway.h"
 
+#include <array>
 #include <string>
 #include <string_view>
 
@@ -15,8 +16,10 @@ constexpr std::string_view kAddress = "external_ip=";
 constexpr std::string_view kNoUpnp = "no gateway answers UPnP";
 // A relayed device searches in every cycle, unless its disk sleeps.
 constexpr auto kLongestSearch = 2h;
-// Between two tests of a published port there is more.
-constexpr auto kTestInterval = 240s;
+
+// What is only found through a gateway.
+constexpr std::array<Sign, 3> kSignsOfAGateway{Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT,
+                                               Sign::LOGGED_GATEWAY_REFUSES};
 
 }  // namespace
 
@@ -37,9 +40,7 @@ void LogGateway::take(LogEvent event, Time when, LogSigns& signs) {
             ports = Ports::AUTOMATIC;
             break;
         case LogEvent::NATPMP_REFUSES:
-            ports = Ports::AUTOMATIC;
-            if (retest == Retest::DISCOVERING) retest = Retest::SEARCHED;
-            lastTest = when;
+            takeRefusal(when, signs);
             break;
         case LogEvent::NATPMP_FOUND:
             natpmp = true;
@@ -49,14 +50,13 @@ void LogGateway::take(LogEvent event, Time when, LogSigns& signs) {
             natpmp = false;
             signs.failGateway();
             break;
-        case LogEvent::TEST_ANSWER:
         case LogEvent::TEST_FAILED:
+            concludeFromTest(when, signs);
+            mayBePublished = false;
+            break;
+        case LogEvent::TEST_ANSWER:
         case LogEvent::TEST_UNANSWERED:
             concludeFromTest(when, signs);
-            break;
-        case LogEvent::PUBLISHED:
-        case LogEvent::PUBLISHING_FAILED:
-            endSearch();
             break;
         case LogEvent::RELAY_STARTS:
             concludeFromRelay(when, signs);
@@ -75,6 +75,15 @@ void LogGateway::takeSilence(Time when, LogSigns& signs) {
     }
 }
 
+void LogGateway::takeRefusal(Time when, LogSigns& signs) {
+    signs.clear({Sign::LOGGED_NO_GATEWAY});
+    ports = Ports::AUTOMATIC;
+    natpmp = true;
+    guessed = false;
+    if (retest == Retest::DISCOVERING) retest = Retest::SEARCHED;
+    lastTest = when;
+}
+
 // The search tests no port that a gateway has not mapped. Only one that passed before is tested
 // without a gateway, until the relay is used.
 void LogGateway::concludeFromTest(Time when, LogSigns& signs) {
@@ -86,9 +95,12 @@ void LogGateway::concludeFromTest(Time when, LogSigns& signs) {
     natpmp = guessed = true;
 }
 
-// After a published port fails its test, a search follows at once, if there is a gateway.
+// After a published port fails its test, or is given up, a search follows at once, if there is a
+// gateway.
 void LogGateway::concludeFromRelay(Time when, LogSigns& signs) {
-    const bool isSearchMissing = retest == Retest::FAILED || retest == Retest::DISCOVERING;
+    const bool isGivenUp = tested && lastSilence && lastTest && *lastSilence > *lastTest;
+    const bool isSearchMissing =
+        retest == Retest::FAILED || retest == Retest::DISCOVERING || isGivenUp;
     if (isSearchMissing && natpmp && !progress && !signs.has(Sign::LOGGED_SECOND_NAT)) {
         natpmp = false;
         signs.set(Sign::LOGGED_NO_GATEWAY, when, std::string{kNoUpnp});
@@ -97,14 +109,9 @@ void LogGateway::concludeFromRelay(Time when, LogSigns& signs) {
     }
     tested = mayBePublished = false;
     retest = Retest::NONE;
-    endSearch();
 }
 
-void LogGateway::passTest(Time when) {
-    if (!isSearchRepeated()) {
-        hurried = lastPass && when - *lastPass <= kTestInterval ? hurried + 1 : 0;
-    }
-    lastPass = when;
+void LogGateway::passTest() {
     tested = true;
     retest = Retest::NONE;
 }
@@ -121,18 +128,36 @@ void LogGateway::takeTestUrl(std::string_view url) {
     natpmp = natpmp && !guessed;
 }
 
+void LogGateway::tellDoubts(Evidence& evidence) const {
+    if (isInDoubt(evidence.now)) {
+        std::size_t doubtful = 0;
+        for (const Sign sign : kSignsOfAGateway) doubtful += evidence.signs.erase(sign);
+        if (doubtful == 0) return;
+        evidence.untold.emplace_back(
+            "whether the gateway still speaks NAT-PMP: UPnP is silent, and no port has been tested "
+            "for hours, so there is no gateway any more, or the disk sleeps; run the daemon with -l "
+            "6");
+    } else if (isOriginUnknown() && evidence.signs.erase(Sign::LOGGED_TEST_FAILED) != 0) {
+        evidence.untold.emplace_back(
+            "why the port test fails: the log does not tell whether the ports are opened through "
+            "NAT-PMP, and filtered, or were forwarded by hand; run the daemon with -l 6");
+    }
+}
+
+// Whether the port that was tested last was opened through NAT-PMP or by hand.
 bool LogGateway::isOriginUnknown() const {
     if (progress || !guessed || ports != Ports::UNKNOWN) return false;
     return lastSilence && lastTest && *lastTest - *lastSilence <= kAttemptTime;
 }
 
+// Whether the gateway still speaks NAT-PMP.
 bool LogGateway::isInDoubt(Time now) const {
     if (progress || !natpmp || isByHand() || !lastSilence || !lastTest) return false;
     return *lastSilence > *lastTest && now - *lastTest > kLongestSearch;
 }
 
 void LogGateway::correct(const LogClock::Correction& correction) {
-    for (std::optional<Time>* const time : {&lastPass, &lastTest, &lastSilence}) {
+    for (std::optional<Time>* const time : {&lastTest, &lastSilence}) {
         if (*time) *time = correction.of(**time);
     }
 }

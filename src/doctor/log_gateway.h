@@ -33,19 +33,13 @@ public:
     void takeTestUrl(std::string_view url);
 
     /// A port passed its test.
-    void passTest(Time when);
-
-    /// Ports pass their test more often than published ones are tested: a step of the search fails
-    /// after that.
-    [[nodiscard]] bool isSearchRepeated() const { return hurried > 2; }
+    void passTest();
 
     [[nodiscard]] bool isByHand() const { return ports == Ports::MANUAL; }
 
-    /// Nothing tells whether the port that was tested last was opened through NAT-PMP or by hand.
-    [[nodiscard]] bool isOriginUnknown() const;
-
-    /// Nothing tells at @p now whether the gateway still speaks NAT-PMP.
-    [[nodiscard]] bool isInDoubt(Time now) const;
+    /// Takes what may be over, or may have another cause, from the signs of a log from elsewhere, and
+    /// says so.
+    void tellDoubts(Evidence& evidence) const;
 
     /// The clock was wrong.
     void correct(const LogClock::Correction& correction);
@@ -54,22 +48,22 @@ private:
     // The test of a port that was published, and the search after its failure.
     enum class Retest { NONE, FAILED, DISCOVERING, SEARCHED };
 
-    void endSearch() { hurried = 0; }
     void takeSilence(Time when, LogSigns& signs);
+    void takeRefusal(Time when, LogSigns& signs);
     void concludeFromTest(Time when, LogSigns& signs);
     void concludeFromRelay(Time when, LogSigns& signs);
+    [[nodiscard]] bool isOriginUnknown() const;
+    [[nodiscard]] bool isInDoubt(Time now) const;
 
     Ports ports;
     Retest retest = Retest::NONE;
-    std::optional<Time> lastPass;
     std::optional<Time> lastTest;     // of a port, or the last attempt to map one
     std::optional<Time> lastSilence;  // of UPnP
-    int hurried = 0;  // passes in a row, sooner than a published port is tested again
     bool progress = false;
     bool natpmp = false;         // the gateway speaks it, as far as the log tells
     bool guessed = false;        // only because a port was tested, maybe one forwarded by hand
     bool tested = false;         // a port passed, and the relay was not used since
-    bool mayBePublished = true;  // before the log began
+    bool mayBePublished = true;  // before the log began, and not tested since
 };
 
 }  // namespace pelorus::doctor

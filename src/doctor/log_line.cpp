@@ -1,10 +1,12 @@
 #include "doctor/log_line.h"
 
+#include <algorithm>
 #include <array>
 #include <cctype>
 #include <charconv>
 #include <cstdint>
 #include <ctime>
+#include <string>
 
 namespace pelorus::doctor {
 
@@ -22,6 +24,8 @@ constexpr auto kFuture = 24h;
 constexpr int kMostWords = 3;
 constexpr std::string_view kMonths = "JanFebMarAprMayJunJulAugSepOctNovDec";
 constexpr std::string_view kNewline = "#012";  // as some system loggers write it
+constexpr std::string_view kVersion = "1 ";
+constexpr std::string_view kRepeated = "message repeated ";
 
 bool isDigit(char character) {
     return std::isdigit(static_cast<unsigned char>(character)) != 0;
@@ -196,10 +200,26 @@ std::optional<Stamp> takeClassicStamp(std::string_view& line, Time now) {
     return stamp;
 }
 
-void skipPriority(std::string_view& line) {
-    if (line.empty() || line.front() != '<') return;
+// True if the header of RFC 5424 follows: the priority has a version behind it.
+bool skipPriority(std::string_view& line) {
+    if (line.empty() || line.front() != '<') return false;
     const std::size_t end = line.find_first_not_of("0123456789", 1);
-    if (end != std::string_view::npos && end > 1 && line[end] == '>') line.remove_prefix(end + 1);
+    if (end == std::string_view::npos || end == 1 || line[end] != '>') return false;
+    line.remove_prefix(end + 1);
+    const bool isVersioned = line.substr(0, kVersion.size()) == kVersion;
+    if (isVersioned) line.remove_prefix(kVersion.size());
+    return isVersioned;
+}
+
+// Skips process, message id and structured data: RFC 5424 has them between program and text.
+std::string_view withoutHeader(std::string_view rest) {
+    for (const bool isData : {false, false, true}) {
+        const std::string_view end = isData && rest.substr(0, 1) == "[" ? "] " : " ";
+        const std::size_t found = rest.find(end);
+        if (found == std::string_view::npos) return {};
+        rest.remove_prefix(found + end.size());
+    }
+    return rest;
 }
 
 // "Pelorus:" or "Pelorus[123]:".
@@ -229,6 +249,15 @@ std::string_view withoutEnd(std::string_view text) {
     }
 }
 
+// A system logger may write what comes again and again only once.
+std::string_view withoutRepetition(std::string_view text) {
+    constexpr std::string_view kTimes = " times: [ ";
+    if (text.substr(0, kRepeated.size()) != kRepeated || text.back() != ']') return text;
+    const std::size_t times = text.find_first_not_of("0123456789", kRepeated.size());
+    if (text.substr(std::min(times, text.size()), kTimes.size()) != kTimes) return text;
+    return text.substr(times + kTimes.size(), text.size() - times - kTimes.size() - 1);
+}
+
 std::optional<Stamp> takeAnyStamp(std::string_view& line, Time now) {
     skipPriority(line);
     if (line.empty() || !isDigit(line.front())) return takeClassicStamp(line, now);
@@ -256,17 +285,22 @@ bool lacksStamp(std::string_view line, Time now) {
 }
 
 std::optional<LogLine> readLogLine(std::string_view line, Time now) {
-    skipPriority(line);
+    const bool isVersioned = skipPriority(line);
     const bool isYearKnown = !line.empty() && isDigit(line.front());
     const auto stamp = takeAnyStamp(line, now);
     if (!stamp) return std::nullopt;
     std::string_view host;
+    const auto found = [&](std::string_view text) {
+        return LogLine{stamp->when, withoutRepetition(withoutEnd(text)), host, isYearKnown,
+                       stamp->isTwice};
+    };
     for (int words = 0; words < kMostWords; ++words) {
         const std::size_t end = line.find(' ');
         const std::string_view word = line.substr(0, end);
         line.remove_prefix(end == std::string_view::npos ? line.size() : end + 1);
-        if (isDaemon(word)) {
-            return LogLine{stamp->when, withoutEnd(line), host, isYearKnown, stamp->isTwice};
+        if (isDaemon(word)) return found(line);
+        if (isVersioned && words == 1 && isDaemon(std::string{word} + ":")) {
+            return found(withoutHeader(line));
         }
         if (words == 0) host = word;
         if (word.empty() || word.back() == ':' || line.empty()) return std::nullopt;

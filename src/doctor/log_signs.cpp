@@ -66,8 +66,7 @@ bool isStale(Sign sign, Time when, Time now) {
 // Names that are wrong keep no way closed, and one port is free where another is refused.
 bool outweighs(Sign sign, Sign earlier) {
     if (earlier == Sign::LOGGED_PORT_HELD_BY_OTHER) return sign == Sign::LOGGED_GATEWAY_REFUSES;
-    return isAmong(kEachDay, earlier) &&
-           (isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign));
+    return isAmong(kEachDay, earlier) && isOutcome(sign);
 }
 
 bool contains(std::string_view text, std::string_view part) {
@@ -93,6 +92,10 @@ std::string_view portOf(std::string_view url) {
 }
 
 }  // namespace
+
+bool isOutcome(Sign sign) {
+    return isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign);
+}
 
 void LogSigns::take(const LogRule& rule, Time when, const LogValues& values) {
     if (rule.event == LogEvent::CYCLE) ++cycle;
@@ -150,6 +153,7 @@ void LogSigns::clear(const std::vector<Sign>& cleared) {
 void LogSigns::forget() {
     signs.clear();
     reason.reset();
+    lookExpected.reset();
     cycle = 0;
     backEndTold = false;
 }
@@ -159,6 +163,7 @@ void LogSigns::correct(const LogClock::Correction& correction) {
         if (fact.when) fact.when = correction.of(*fact.when);
     }
     if (reason) reason->when = correction.of(reason->when);
+    if (lookExpected) lookExpected = correction.of(*lookExpected);
 }
 
 // What is tested has been mapped, and the way to the service was there.
@@ -278,16 +283,18 @@ std::map<Sign, Fact> LogSigns::lasting(Time now, bool byHand) const {
     std::map<Sign, Fact> left;
     for (const auto& [sign, fact] : signs) {
         if (sign == Sign::LOGGED_PORT_OPENED) continue;
-        if (!isReplaced(sign, byHand) && !isStale(sign, *fact.when, now)) left[sign] = fact;
+        const bool isOver = isReplaced(sign, byHand) || isStale(sign, *fact.when, now) ||
+                            isNameRight(sign, *fact.when, now);
+        if (!isOver) left[sign] = fact;
     }
     return left;
 }
 
 bool LogSigns::isReplaced(Sign sign, bool byHand) const {
     const auto isLater = [&](Sign other) { return has(other) && isEarlier(sign, other); };
-    const bool isOutcome = isAmong(kGatewayOutcomes, sign) || isAmong(kTestOutcomes, sign) ||
-                           isAmong(kServiceSigns, sign) || sign == Sign::LOGGED_TEST_SKIPPED_DISK;
-    if (!isOutcome) return false;
+    const bool isReplaceable =
+        isOutcome(sign) || isAmong(kServiceSigns, sign) || sign == Sign::LOGGED_TEST_SKIPPED_DISK;
+    if (!isReplaceable) return false;
     return std::any_of(kTestOutcomes.begin(), kTestOutcomes.end(), isLater) ||
            (!byHand && std::any_of(kGatewayOutcomes.begin(), kGatewayOutcomes.end(), isLater));
 }
@@ -296,6 +303,12 @@ bool LogSigns::isReplaced(Sign sign, bool byHand) const {
 bool LogSigns::isEarlier(Sign sign, Sign later) const {
     if (cycle > 0) return cycles.at(sign) < cycles.at(later);
     return *signs.at(later).when - *signs.at(sign).when > kAttemptTime;
+}
+
+// The names have been looked at since, and nothing was logged.
+bool LogSigns::isNameRight(Sign sign, Time when, Time now) const {
+    return isAmong(kEachDay, sign) && lookExpected && when <= *lookExpected &&
+           now - *lookExpected > kLongestSearch;
 }
 
 std::string LogSigns::address() const {

@@ -15,6 +15,9 @@
 
 namespace pelorus::doctor {
 
+/// Whether @p sign says how an attempt at the direct way ended.
+bool isOutcome(Sign sign);
+
 /// The signs of the LOGGED_... kind, each with the time of the last line that showed it, the values
 /// that later lines need, and the reason: the first thing that went wrong in the current cycle, or,
 /// where cycles are not logged, in the last minutes.
@@ -36,7 +39,7 @@ public:
     /// The clock was wrong.
     void correct(const LogClock::Correction& correction);
 
-    /// A new cycle.
+    /// A new cycle, or a device that is reached directly.
     void forgetReason() { reason.reset(); }
 
     /// The service's answer to a port test. True if the port passed.
@@ -63,6 +66,9 @@ public:
 
     /// @p sign is the reason from now on, whatever was it before.
     void blame(Sign sign);
+
+    /// From @p when on, the next cycle looks at the names. A failure is logged at every severity.
+    void expectLook(Time when) { lookExpected = when; }
 
     /// The relay failed too. It is the reason where a relay would have been the way out.
     void blameRelay();
@@ -95,6 +101,7 @@ private:
     [[nodiscard]] bool isOfAttempt(Sign sign, Time when) const;
     [[nodiscard]] bool isReplaced(Sign sign, bool byHand) const;
     [[nodiscard]] bool isEarlier(Sign sign, Sign later) const;
+    [[nodiscard]] bool isNameRight(Sign sign, Time when, Time now) const;
     void concludeBackEnd(const LogRule& rule);
     [[nodiscard]] std::string filled(std::string_view words, const LogValues& values) const;
     [[nodiscard]] std::string filledWording(std::string_view words, const LogValues& values) const;
@@ -103,6 +110,7 @@ private:
     std::map<Sign, int> cycles;  // in which each was last shown
     std::array<std::string, static_cast<std::size_t>(Kept::COUNT)> kept{};
     std::optional<Reason> reason;
+    std::optional<Time> lookExpected;
     int cycle = 0;             // of this run; 0 as long as none was logged
     bool backEndTold = false;  // a failure to do so would be the next thing logged
 };

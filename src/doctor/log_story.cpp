@@ -22,6 +22,10 @@ using namespace std::chrono_literals;
 constexpr auto kPublishTime = 2min;
 // A device that is reached directly logs its tests, unless its disk sleeps.
 constexpr auto kSilence = 1h;
+// Between two cycles, both of which log something.
+constexpr auto kLongestPause = 10min;
+// Comes before the first line of a start.
+constexpr std::string_view kStartRule = "===";
 
 // What a published port disproves.
 const std::vector<Sign> kDirectSigns{Sign::LOGGED_ATTEMPT,
@@ -80,14 +84,17 @@ void LogStory::take(const LogLine& line) {
 void LogStory::takeText(std::string_view text, Time when) {
     LogValues values;
     const LogRule* const rule = findLogRule(text, values);
-    const bool isOfNextRun = rule != nullptr && rule->event == LogEvent::COPY_MISSING;
+    const bool isOfNextRun =
+        rule != nullptr ? rule->event == LogEvent::COPY_MISSING : startsWith(text, kStartRule);
     const bool wasAnnounced = std::exchange(announced, false);
     if (rule == nullptr) {
-        announced = wasAnnounced && startsWith(text, "===");
+        announced = wasAnnounced && isOfNextRun;
     } else if (rule->event != LogEvent::STARTED || !wasAnnounced) {
         apply(*rule, when, values);
     }
-    if (!isOfNextRun) lastOfRun = when;
+    if (isOfNextRun) return;
+    if (!lastOfRun || when - *lastOfRun > kLongestPause) steadySince = when;
+    lastOfRun = when;
 }
 
 Time LogStory::timeOf(const LogLine& line) {
@@ -98,7 +105,8 @@ Time LogStory::timeOf(const LogLine& line) {
 
 void LogStory::correct(const LogClock::Correction& correction) {
     gateway.correct(correction);
-    for (std::optional<Time>* const time : {&firstLine, &lastLine, &lastOfRun, &since, &passed}) {
+    for (std::optional<Time>* const time :
+         {&firstLine, &lastLine, &lastOfRun, &steadySince, &since, &passed}) {
         if (*time) *time = correction.of(**time);
     }
     if (pending) pending->since = correction.of(pending->since);
@@ -120,7 +128,7 @@ void LogStory::settlePending(std::string_view text, Time when) {
         (pending->reach == Reach::RELAYED && startsWith(text, kTunnel)) ||
         std::any_of(kUndecided.begin(), kUndecided.end(),
                     [text](std::string_view beginning) { return startsWith(text, beginning); });
-    const bool starts = startsWith(text, "main -") || startsWith(text, "===");
+    const bool starts = startsWith(text, "main -") || startsWith(text, kStartRule);
     if (when - pending->since > kAttemptTime || !(undecided || starts)) becomePending();
 }
 
@@ -129,6 +137,10 @@ void LogStory::becomePending() {
     pending.reset();
     signs.clear(change.reach == Reach::DIRECT ? kDirectSigns : kRelayedSigns);
     become(change.reach, change.since, std::string{kPassed});
+    if (change.reach == Reach::DIRECT) signs.forgetReason();
+    if (tornFrom == Reach::UNKNOWN || tornFrom == change.reach) return;
+    signs.expectLook(change.since);
+    tornFrom = Reach::UNKNOWN;
 }
 
 void LogStory::apply(const LogRule& rule, Time when, const LogValues& values) {
@@ -240,8 +252,7 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
             if (history.reach() != Reach::RELAYED) lose(when);
             break;
         case LogEvent::ADDRESS_LOST:
-            tornDown = true;
-            lose(when);
+            tearDown(when);
             break;
         case LogEvent::TUNNEL_DIED:
             if (history.reach() != Reach::RELAYED) break;
@@ -270,6 +281,13 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
     }
 }
 
+void LogStory::tearDown(Time when) {
+    const Reach reach = history.reach();
+    if (reach == Reach::DIRECT || reach == Reach::RELAYED) tornFrom = reach;
+    tornDown = true;
+    lose(when);
+}
+
 void LogStory::start(Time when) {
     // A failure to publish would have come before; a client may run without a tunnel yet.
     const bool hadClient = isPending(Reach::RELAYED);
@@ -291,10 +309,12 @@ void LogStory::start(Time when) {
     signs.set(Sign::LOGGED_ATTEMPT, when, "the daemon started, with no result yet");
 }
 
-// Without progress a relayed run is silent for days.
+// Without progress a relayed run is silent for days, unless its searches fail in a way that is logged.
 void LogStory::endSuddenly(Time when) {
-    const bool isDirect = history.reach() == Reach::DIRECT;
-    if (isDirect && !progress && when - *lastOfRun > kSilence) {
+    const bool isTalkative =
+        history.reach() == Reach::DIRECT || *lastOfRun - *steadySince > kSilence;
+    const bool isDark = clock.isLost() || when - *lastOfRun > kSilence;
+    if (isTalkative && isDark && !progress) {
         history.add({Reach::UNKNOWN, *lastOfRun, "", std::string{kSilent}});
     } else {
         become(Reach::NOT_RUNNING, progress ? *lastOfRun : when, "the daemon ended suddenly");
@@ -350,13 +370,8 @@ void LogStory::takeStatus(std::string_view word, Time when) {
 
 void LogStory::takeTestAnswer(std::string_view answer, Time when) {
     if (!signs.takeTestAnswer(answer, when)) return;
-    gateway.passTest(when);
-    if (gateway.isSearchRepeated() && !progress) {
-        passed.reset();
-        history.withdraw();
-    } else if (!passed) {
-        passed = when;
-    }
+    gateway.passTest();
+    if (!passed) passed = when;
 }
 
 // The direct path does not work. A tunnel that stands, or may stand, is not touched by that.
@@ -416,27 +431,6 @@ void LogStory::endInSilence(const Evidence& evidence) {
     signs.forget();
 }
 
-void LogStory::tellDoubts(Evidence& evidence) const {
-    if (gateway.isSearchRepeated() && evidence.history.empty()) {
-        evidence.untold.emplace_back(
-            "how it is reached: a port passes its test again and again, but is not published, so a "
-            "later step fails that is not logged; run the daemon with -l 6");
-    }
-    if (!evidence.fromElsewhere || !evidence.has(Sign::LOGGED_TEST_FAILED)) return;
-    if (gateway.isInDoubt(evidence.now)) {
-        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
-        evidence.untold.emplace_back(
-            "whether the gateway still speaks NAT-PMP: UPnP is silent, and no port has been tested "
-            "for hours, so there is no gateway any more, or the disk sleeps; run the daemon with -l "
-            "6");
-    } else if (gateway.isOriginUnknown()) {
-        evidence.signs.erase(Sign::LOGGED_TEST_FAILED);
-        evidence.untold.emplace_back(
-            "why the port test fails: the log does not tell whether the ports are opened through "
-            "NAT-PMP, and filtered, or were forwarded by hand; run the daemon with -l 6");
-    }
-}
-
 void LogStory::finish(Evidence& evidence) {
     if (passed) assume(Reach::DIRECT);
     // A log from elsewhere ends with the record if all went well.
@@ -469,7 +463,7 @@ void LogStory::finish(Evidence& evidence) {
         evidence.add(Sign::MANUAL_MODE, Source::LOG, "the ports are forwarded by hand");
     }
     evidence.history.assign(history.periods().begin(), history.periods().end());
-    tellDoubts(evidence);
+    if (evidence.fromElsewhere) gateway.tellDoubts(evidence);
     if (history.dropped() > 0) {
         evidence.untold.push_back(
             "the history before its last " + std::to_string(evidence.history.size()) +

@@ -55,9 +55,9 @@ private:
     void takeText(std::string_view text, Time when);
     void settleTest(Time when);
     void endInSilence(const Evidence& evidence);
-    void tellDoubts(Evidence& evidence) const;
     void settlePending(std::string_view text, Time when);
     void becomePending();
+    void tearDown(Time when);
     [[nodiscard]] bool isPending(Reach reach) const { return pending && pending->reach == reach; }
     void apply(const LogRule& rule, Time when, const LogValues& values);
     void happen(LogEvent event, Time when, const LogValues& values);
@@ -84,8 +84,9 @@ private:
     std::optional<Pending> pending;
     LogGateway gateway;
     std::optional<Time> firstLine, lastLine, since, pauseBegin, nextCycle;
-    std::optional<Time> lastOfRun;  // the last line, but for those that precede a start
-    std::optional<Time> passed;     // a port, in a log that has not told yet how it was before
+    std::optional<Time> lastOfRun;    // the last line, but for those that precede a start
+    std::optional<Time> steadySince;  // no long pause from here to lastOfRun
+    std::optional<Time> passed;       // a port, in a log that has not told yet how it was before
     int level = kLeastLevel;
     bool announced = false;  // the last line was a start's first one
     bool signalled = false;  // told to end
@@ -94,6 +95,7 @@ private:
     bool silent = false;
     bool orphan = false;    // an earlier daemon ended suddenly and may have left its tunnel
     bool tornDown = false;  // no connection of this cycle's beginning is left
+    Reach tornFrom = Reach::UNKNOWN;  // how it was reached before the names, or the address, failed
     int startCount = 0;
 };
 

@@ -30,18 +30,12 @@ void ReachHistory::add(Period next) {
         ++forgotten;
     }
     passing = reached == Reach::NOT_REACHED;
-    assumed = assumed && all.size() == 1;
 }
 
 void ReachHistory::assume(Period first) {
     if (!all.empty()) return;
     all.push_back(std::move(first));
     passing = false;
-    assumed = true;
-}
-
-void ReachHistory::withdraw() {
-    if (assumed) all.clear();
 }
 
 void ReachHistory::correct(const LogClock::Correction& correction) {

@@ -27,9 +27,6 @@ public:
     /// How it was when the log began, unless something is known already.
     void assume(Period first);
 
-    /// What was assumed is wrong, and nothing is known from after that.
-    void withdraw();
-
     /// The clock was wrong.
     void correct(const LogClock::Correction& correction);
 
@@ -61,7 +58,6 @@ private:
 
     std::deque<Period> all;
     std::size_t forgotten = 0;
-    bool assumed = false;  // the only period
     bool passing = false;  // the last period began in this cycle, and may not last
 };
 

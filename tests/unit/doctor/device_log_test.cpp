@@ -223,6 +223,7 @@ TEST_F(DeviceLogTest, WhatCannotBeReadIsSaid) {
     EXPECT_TRUE(look({path("cut.gz")}).hasLog);
     EXPECT_FALSE(look({plain("empty", "")}).hasLog);
     EXPECT_EQ(look({path("empty")}).untold.size(), 1U);
+    EXPECT_TRUE(look({path("boot")}).untold.empty());
 }
 
 TEST(LineFilter, CutsWhereverThePiecesEnd) {

@@ -38,6 +38,7 @@ TEST_F(LogLineTest, StampsOfEveryLogger) {
         {"2026-11-22T02:40:00 nas Pelorus: x", kNow - 4800},
         {"Nov 22 03:00:00.123456 nas Pelorus[12]: x", kNow - 3600},
         {"1795316400.123456 nas Pelorus[12]: x", kNow},
+        {"<133>1 2026-11-22T01:40:00.123Z nas Pelorus 12 - - x", kNow - 4800},
         {"1795316400 nas Pelorus[12]: x", -1},
         {"2026-11-23T03:00:00Z nas Pelorus: x", kNow + 86400},  // a clock or zone of another device
         {"2026-11-23T03:00:01Z nas Pelorus: x", -1},
@@ -86,6 +87,8 @@ TEST_F(LogLineTest, OnlyTheDaemonsLinesWithoutTheirEnds) {
         {"nas Pelorus[12]: sigTrap - x.#012#012 ", "sigTrap - x."},
         {"nas pelorus:  desc: y\r", " desc: y"},
         {"pelorus Pelorus: host of that name", "host of that name"},
+        {"nas Pelorus[12]: message repeated 84 times: [ sigTrap - x.]", "sigTrap - x."},
+        {"nas Pelorus: message repeated by hand: [ x]", "message repeated by hand: [ x]"},
         {"nas pelorus-doctor[3]: x", nullptr},
         {"nas pelorus.sh: x", nullptr},
         {"nas Pelorus[]: x", nullptr},
@@ -101,6 +104,9 @@ TEST_F(LogLineTest, OnlyTheDaemonsLinesWithoutTheirEnds) {
         EXPECT_EQ(line ? line->text : "foreign", row.text != nullptr ? row.text : "foreign")
             << row.rest;
     }
+    const auto line =
+        readLogLine("<133>1 2026-11-22T01:40:00Z nas pelorus 12 - [a b=\"c d\"] x - y", at(kNow));
+    EXPECT_EQ(line ? line->text : "foreign", "x - y");
 }
 
 }  // namespace

@@ -220,6 +220,7 @@ TEST(LogStory, HistoryAndSigns) {
           {9, kPublished},
           {300, kPassed},
           {90000, kCopyMissing},
+          {90000, "====="},
           {90000, kStart},
           {90009, kPublished},
           {90020, kPause}},
@@ -269,6 +270,20 @@ TEST(LogStory, HistoryAndSigns) {
         std::vector<Sign> wanted = row.signs;
         std::sort(wanted.begin(), wanted.end());
         EXPECT_EQ(signs, wanted);
+    }
+}
+
+// A tunnel that stands may be silent for days, unless the daemon searches in vain in every cycle.
+TEST(LogStory, ASilenceThatIsNewToARelayedDeviceIsDark) {
+    const std::pair<int, std::string> rows[]{
+        {300, "7500 ?: nothing was logged until the daemon started again|"},
+        {1500, "90000 not running: the daemon ended suddenly|"}};
+    for (const auto& [pause, dark] : rows) {
+        Lines lines{{0, kStart}, {5, kNoUpnp}, {6, kTunnelStarts}};
+        for (int now = pause; now <= 7500; now += pause) lines.emplace_back(now, kNoUpnp);
+        lines.insert(lines.end(), {{90000, "====="}, {90000, kStart}});
+        EXPECT_EQ(historyOf(told(lines, 90010)), "6 relayed: no gateway answers UPnP|" + dark +
+                                                     "90000 not reached: the daemon started|");
     }
 }
 
@@ -350,6 +365,15 @@ TEST(LogStory, AClockThatJumpsMakesNoDurations) {
          "25920009 direct: " + fact +
              "25920010 not running: the daemon ended suddenly|26006400 "
              "direct: " +
+             fact},
+        {"lost by a restart, without progress",
+         {{kFar, kStart},
+          {kFar + 9, kPublished},
+          {9, kStart},
+          {kFar + kDay, kPublished},
+          {kFar + kDay + 9, kPassed}},
+         "25920009 direct: " + fact +
+             "25920009 ?: nothing was logged until the daemon started again|26006400 direct: " +
              fact},
         {"far ahead, and set right",
          {{kFar, kStart},

@@ -271,12 +271,12 @@ ShownChecks TextReport::checksToShow(const Compactness& compactness) const {
 }
 
 Lines TextReport::checks(const Compactness& compactness) const {
-    const auto [shown, hidden] = checksToShow(compactness);
+    const ShownChecks shown = checksToShow(compactness);
     std::size_t longest = 0;
-    for (const Check& check : shown) longest = std::max(longest, letters(check.text));
+    for (const Check& check : shown.checks) longest = std::max(longest, letters(check.text));
     const std::size_t textWidth = std::min(longest, checkWidth());
     Lines lines;
-    for (const Check& check : shown) {
+    for (const Check& check : shown.checks) {
         const std::string name{wordsFor(check.verdict).inReport};
         Lines wrapped =
             hang(std::string(kVerdictWidth, ' '), check.text, kVerdictWidth + textWidth);
@@ -287,9 +287,9 @@ Lines TextReport::checks(const Compactness& compactness) const {
                       colours ? verdictColour(check.verdict) + name + kEndOfColour : name);
         append(lines, wrapped);
     }
-    if (hidden > 0) {
+    if (shown.hidden > 0) {
         append(lines, hang(padded("ok", kVerdictWidth),
-                           std::to_string(hidden) + " more that are ok: see --json", width));
+                           std::to_string(shown.hidden) + " more that are ok: see --json", width));
     }
     for (const std::string& text : diagnosis.untold) append(lines, hang("unknown  ", text, width));
     return lines;

@@ -1,6 +1,5 @@
 #include "doctor/log_gateway.h"
 
-#include <array>
 #include <string>
 #include <string_view>
 
@@ -18,8 +17,6 @@ constexpr std::string_view kNoUpnp = "no gateway answers UPnP";
 constexpr auto kLongestSearch = 2h;
 
 // What is only found through a gateway.
-constexpr std::array<Sign, 3> kSignsOfAGateway{Sign::LOGGED_TEST_FAILED, Sign::LOGGED_SECOND_NAT,
-                                               Sign::LOGGED_GATEWAY_REFUSES};
 
 }  // namespace
 
@@ -101,7 +98,8 @@ void LogGateway::concludeFromRelay(Time when, LogSigns& signs) {
     const bool isGivenUp = tested && lastSilence && lastTest && *lastSilence > *lastTest;
     const bool isSearchMissing =
         retest == Retest::FAILED || retest == Retest::DISCOVERING || isGivenUp;
-    if (isSearchMissing && natpmp && !progress && !signs.has(Sign::LOGGED_SECOND_NAT)) {
+    if (isSearchMissing && !isByHand() && natpmp && !progress &&
+        !signs.has(Sign::LOGGED_SECOND_NAT)) {
         natpmp = false;
         signs.set(Sign::LOGGED_NO_GATEWAY, when, std::string{kNoUpnp});
         const bool mayBeByHand = guessed && ports != Ports::AUTOMATIC;
@@ -130,13 +128,11 @@ void LogGateway::takeTestUrl(std::string_view url) {
 
 void LogGateway::tellDoubts(Evidence& evidence) const {
     if (isInDoubt(evidence.now)) {
-        std::size_t doubtful = 0;
-        for (const Sign sign : kSignsOfAGateway) doubtful += evidence.signs.erase(sign);
-        if (doubtful == 0) return;
+        if (evidence.signs.erase(Sign::LOGGED_TEST_FAILED) == 0) return;
         evidence.untold.emplace_back(
             "whether the gateway still speaks NAT-PMP: UPnP is silent, and no port has been tested "
-            "for hours, so there is no gateway any more, or the disk sleeps; run the daemon with -l "
-            "6");
+            "for hours, so there is no gateway any more, or nothing searches for one, as while the "
+            "disk sleeps; run the daemon with -l 6");
     } else if (isOriginUnknown() && evidence.signs.erase(Sign::LOGGED_TEST_FAILED) != 0) {
         evidence.untold.emplace_back(
             "why the port test fails: the log does not tell whether the ports are opened through "

@@ -8,6 +8,8 @@
 #include <ctime>
 #include <string>
 
+#include "doctor/text_parts.h"
+
 namespace pelorus::doctor {
 
 namespace {
@@ -211,14 +213,17 @@ bool skipPriority(std::string_view& line) {
     return isVersioned;
 }
 
-// Skips process, message id and structured data: RFC 5424 has them between program and text.
+// Skips process, message id and structured data: RFC 5424 has them between program and text, which
+// may begin with a byte order mark.
 std::string_view withoutHeader(std::string_view rest) {
+    constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
     for (const bool isData : {false, false, true}) {
         const std::string_view end = isData && rest.substr(0, 1) == "[" ? "] " : " ";
         const std::size_t found = rest.find(end);
         if (found == std::string_view::npos) return {};
         rest.remove_prefix(found + end.size());
     }
+    if (startsWith(rest, kByteOrderMark)) rest.remove_prefix(kByteOrderMark.size());
     return rest;
 }
 

@@ -190,6 +190,9 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
         case LogEvent::TEST_UNANSWERED:
             signs.failTestRequest(when);
             break;
+        case LogEvent::NATPMP_REFUSES:
+            passed.reset();  // the port of the other service
+            break;
         case LogEvent::SERVICE_FAILED:
             signs.failService(when);
             break;

@@ -104,8 +104,8 @@ TEST_F(LogLineTest, OnlyTheDaemonsLinesWithoutTheirEnds) {
         EXPECT_EQ(line ? line->text : "foreign", row.text != nullptr ? row.text : "foreign")
             << row.rest;
     }
-    const auto line =
-        readLogLine("<133>1 2026-11-22T01:40:00Z nas pelorus 12 - [a b=\"c d\"] x - y", at(kNow));
+    const auto line = readLogLine(
+        "<133>1 2026-11-22T01:40:00Z nas pelorus 12 - [a b=\"c d\"] \xEF\xBB\xBFx - y", at(kNow));
     EXPECT_EQ(line ? line->text : "foreign", "x - y");
 }
 

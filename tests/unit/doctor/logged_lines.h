@@ -33,6 +33,10 @@ inline constexpr const char *
        "external IP != router's external IP).",
    *kPublished =
        "TavikClient::updateServerMapping - httpGet got <status>Success</status>, 24 bytes.",
+   *kRefused =
+       "CMnatpmp::portMappingRequest  failed to map public port 9536 to localport 443, protocol 2, "
+       "lifetime 3600, errno 0",
+   *kNoPort = "ConnectionManager::manualPortForward - bad value for manually configured HTTP Port.",
    *kStatusDirect =
        "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [portforwarded].",
    *kStatusFailed = "TavikClient::updateLocalCommStatus - Update COMMUNICATION status : [failed].",

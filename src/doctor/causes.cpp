@@ -211,7 +211,7 @@ std::vector<Cause> deviceCauses() {
     };
 }
 
-std::vector<Cause> relayCauses() {
+std::vector<Cause> clientCauses() {
     return {
         {"tunnel-files-unwritable",
          kNotReached,
@@ -244,6 +244,11 @@ std::vector<Cause> relayCauses() {
          {},
          "Two tunnel clients run, and may disconnect each other.",
          "Stop the older one with kill -9, or restart the device."},
+    };
+}
+
+std::vector<Cause> relayCauses() {
+    return {
         {"relay-unresolved",
          kNotReached,
          {{S::RELAY_UNRESOLVED}},
@@ -377,8 +382,8 @@ std::vector<Cause> outsideCauses() {
 std::vector<Cause> table() {
     std::vector<Cause> rows;
     for (const auto& group :
-         {workingCauses, serviceCauses, answerCauses, publishingCauses, deviceCauses, relayCauses,
-          addressCauses, gatewayCauses, outsideCauses}) {
+         {workingCauses, serviceCauses, answerCauses, publishingCauses, deviceCauses, clientCauses,
+          relayCauses, addressCauses, gatewayCauses, outsideCauses}) {
         for (Cause& cause : group()) rows.push_back(std::move(cause));
     }
     return rows;

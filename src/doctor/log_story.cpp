@@ -190,9 +190,6 @@ void LogStory::happen(LogEvent event, Time when, const LogValues& values) {
         case LogEvent::TEST_UNANSWERED:
             signs.failTestRequest(when);
             break;
-        case LogEvent::NATPMP_REFUSES:
-            passed.reset();  // the port of the other service
-            break;
         case LogEvent::SERVICE_FAILED:
             signs.failService(when);
             break;
@@ -253,6 +250,9 @@ void LogStory::happenInRelay(LogEvent event, Time when) {
         case LogEvent::PORTS_LOST:
             pending.reset();
             if (history.reach() != Reach::RELAYED) lose(when);
+            break;
+        case LogEvent::NATPMP_REFUSES:
+            passed.reset();  // the port of the other service
             break;
         case LogEvent::ADDRESS_LOST:
             tearDown(when);

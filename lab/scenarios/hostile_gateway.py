@@ -232,12 +232,14 @@ def hostile_back_end(lab: Lab) -> None:
     wait_for_log(lab, _ATTACKED)
     assert (time.monotonic() - began) * _TENFOLD < 30 + _SEARCH_SECONDS
     lab.moment("the back end answers at a byte in four seconds", "back-end-refuses")
+    lab.device.answer_slowly(0)
+    _assert_stops_in_time(lab)
     lab.device.keep_silent()
+    lab.start_daemon(*OPTIONS)
     wait_for_log(lab, "failed to get response from localhost")
     lab.moment("the back end hangs", "back-end-silent")
     lab.device.keep_silent(False)
-    lab.device.answer_slowly(0)
-    _assert_stops_in_time(lab)
+    assert lab.stop_daemon() == "SIGTERM"
 
 
 def _assert_endures(lab: Lab, reason: str, seconds: int, cause: str) -> int:
